@@ -1,0 +1,7 @@
+# Every .cpp of a folder, picked up anew at each build.
+function(sources_of variable)
+  set(patterns ${ARGN})
+  list(TRANSFORM patterns APPEND "/*.cpp")
+  file(GLOB found CONFIGURE_DEPENDS ${patterns})
+  set(${variable} ${found} PARENT_SCOPE)
+endfunction()

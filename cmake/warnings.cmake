@@ -1,0 +1,10 @@
+add_compile_options(-Wall -Wextra -Wconversion -Wshadow -Wold-style-cast -Wsuggest-override
+                    -Wnon-virtual-dtor -Werror)
+# Lets ccache keep objects that use a precompiled header.
+add_compile_options(-fpch-preprocess)
+
+if(APPSYNC_SANITIZE)
+  add_compile_options(-fsanitize=${APPSYNC_SANITIZE} -fno-omit-frame-pointer
+                      -fno-sanitize-recover=all)
+  add_link_options(-fsanitize=${APPSYNC_SANITIZE})
+endif()

@@ -1,0 +1,158 @@
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/platform.h"
+
+namespace appsync::device {
+
+/// Why a device folder cannot be used.
+enum class DeviceProblem {
+  Missing,   ///< there is no device at the path
+  Exists,    ///< a new device was asked for where something stands already
+  Busy,      ///< another process is writing the device
+  Foreign,   ///< the folder holds something else, or a device of a newer version
+  Damaged,   ///< a device, but its data cannot be read
+  Unusable,  ///< the system refuses (permissions, disk full, ...)
+};
+
+struct DeviceError {
+  DeviceProblem problem = DeviceProblem::Missing;
+  /// One line for people that names the folder, the reason and what to do.
+  std::string message;
+};
+
+enum class Access {
+  Write,    ///< takes the device's lock for as long as the object lives
+  ReadOnly  ///< may look at any time, also while another process writes
+};
+
+struct DeviceOptions {
+  bool coordination = false;  ///< whether installs are driven through install coordinators
+};
+
+/// One record of the transaction log.
+struct TransactionRecord {
+  std::int64_t number = 0;  ///< ascending, from 1
+  double time = 0;          ///< seconds since 1970-01-01T00:00:00Z
+  /// The scenario's name; empty for a step of a coordinated install.
+  std::string scenario;
+  std::optional<std::uint32_t> step;
+  std::uint32_t party = 0;  ///< 0 for a scenario
+  std::uint32_t phase = 0;  ///< 0 for a scenario
+  bool success = false;
+  std::string bundleId;
+  std::string description;
+};
+
+struct LogLine {
+  double time = 0;  ///< seconds since 1970-01-01T00:00:00Z
+  LogChannel channel = LogChannel::TWLogCategorySyncBundle;
+  LogLevel level = LogLevel::Default;
+  std::string text;
+};
+
+/// A file that is being sent to the phone piece by piece. Destroying it before `finish` removes
+/// what has arrived. Used by one thread.
+class FileReceiver {
+ public:
+  virtual ~FileReceiver() = default;
+  virtual bool append(ByteView bytes, std::optional<Error>* error) noexcept = 0;
+  /// The file is whole. False when it could not be completed.
+  virtual bool finish(std::optional<Error>* error) noexcept = 0;
+};
+
+/// Told of things that a person watching the device would see, on the device's own threads.
+class DeviceWatcher {
+ public:
+  virtual ~DeviceWatcher() = default;
+  /// A termination assertion was denied because the application is in the foreground.
+  virtual void assertionDenied(std::string_view bundleId) noexcept { (void)bundleId; }
+  /// A package was installed (error none) or refused.
+  virtual void installFinished(std::string_view bundleId,
+                               const std::optional<Error>& error) noexcept {
+    (void)bundleId, (void)error;
+  }
+};
+
+/// A phone in a folder: "device.db" (SQLite, WAL), "root/" (what the phone sees as "/") and "log/".
+/// It implements every service of Platform but SyncHost, for real and persistently. All members may
+/// be called from any thread unless said otherwise; nothing throws.
+class EmbeddedDevice {
+ public:
+  /// Makes a new device in a folder that is missing or empty.
+  static bool initialize(const std::filesystem::path& folder, const DeviceOptions& options,
+                         DeviceError& error) noexcept;
+
+  /// Opens a device. With Access::Write it first finishes what a killed process left behind: sweeps
+  /// left-over containers and ends the progress of installs that nobody carries on.
+  static std::unique_ptr<EmbeddedDevice> open(const std::filesystem::path& folder, Access access,
+                                              DeviceError& error) noexcept;
+
+  virtual ~EmbeddedDevice() = default;
+
+  /// The device's services together with the host's own.
+  virtual Platform platform(SyncHost& host) noexcept = 0;
+
+  // Single services, for those who need no more.
+  virtual FileManager& files() noexcept = 0;
+  virtual AppRegistry& appRegistry() noexcept = 0;
+  virtual SystemNotifier& systemNotifier() noexcept = 0;
+  virtual HomeScreenService& homeScreen() noexcept = 0;
+  virtual Log& log() noexcept = 0;
+
+  /// Begins to receive a file at a path of the phone; parents are made, an existing file is
+  /// replaced when it is finished. nullptr (with an error) when that cannot be.
+  virtual std::unique_ptr<FileReceiver> receiveFile(std::string_view path,
+                                                    std::optional<Error>* error) noexcept = 0;
+
+  /// At most one watcher; nullptr for none. No call to the old one runs after this has returned.
+  virtual void setWatcher(DeviceWatcher* watcher) noexcept = 0;
+
+  /// The host wants to end: termination assertions are refused from now on with an unknown error
+  /// (3) and pending delays of the background queue run at once, so that waiting installs come to
+  /// an end.
+  virtual void hurry() noexcept = 0;
+
+  // What a person does on the phone.
+
+  /// Removes an application with its placeholder and data. False (with a reason) when there is
+  /// none.
+  virtual bool uninstall(std::string_view bundleId, std::optional<Error>* error) noexcept = 0;
+  virtual bool setPolicy(PolicySetting setting, PolicyValue value,
+                         std::optional<Error>* error) noexcept = 0;
+
+  // Bringing an application to the foreground and ending it need no device lock, so that a person
+  // can do both while a sync runs in another process.
+
+  /// False (with a reason) when the application is not installed, is a placeholder, may not be
+  /// launched or is kept from running by an install.
+  static bool launch(const std::filesystem::path& folder, std::string_view bundleId,
+                     DeviceError& deviceError, std::optional<Error>* error) noexcept;
+  /// Ending an application that does not run is no failure.
+  static bool quit(const std::filesystem::path& folder, std::string_view bundleId,
+                   DeviceError& deviceError, std::optional<Error>* error) noexcept;
+
+  // What people look at.
+
+  virtual DeviceOptions options() noexcept = 0;
+  /// One record per registry entry (BundleKind::All), sorted by identifier, placeholders last.
+  virtual std::vector<AppRecord> applications() noexcept = 0;
+  virtual PolicyValue policy(PolicySetting setting) noexcept = 0;
+  virtual std::vector<std::string> foregroundApplications() noexcept = 0;
+  virtual std::vector<std::string> uninstalledApplications() noexcept = 0;
+  virtual std::vector<std::string> homeScreenOrder() noexcept = 0;
+  /// The records after `afterNumber`, oldest first.
+  virtual std::vector<TransactionRecord> transactions(std::int64_t afterNumber = 0) noexcept = 0;
+  /// The log lines kept, oldest first.
+  virtual void readLog(const std::function<void(const LogLine&)>& visitor) noexcept = 0;
+};
+
+}  // namespace appsync::device

@@ -1,0 +1,37 @@
+#pragma once
+
+#include "platform/app_registry.h"
+#include "platform/background_queue.h"
+#include "platform/backup_manager.h"
+#include "platform/device_policy.h"
+#include "platform/file_manager.h"
+#include "platform/home_screen_service.h"
+#include "platform/icon_renderer.h"
+#include "platform/install_coordination.h"
+#include "platform/installer_service.h"
+#include "platform/log.h"
+#include "platform/sync_host.h"
+#include "platform/system_notifier.h"
+#include "platform/transaction_log.h"
+
+namespace appsync {
+
+/// Every service that the client uses. All outlive the client.
+struct Platform {
+  Log& log;
+  FileManager& files;
+  AppRegistry& appRegistry;
+  InstallCoordination& installCoordination;
+  InstallerService& installerService;
+  BackupManager& backupManager;
+  DevicePolicy& devicePolicy;
+  HomeScreenService& homeScreen;
+  IconRenderer& iconRenderer;
+  ImageEncoderService& imageEncoders;
+  TransactionLog& transactionLog;
+  SystemNotifier& systemNotifier;
+  SyncHost& syncHost;
+  BackgroundQueue& backgroundQueue;
+};
+
+}  // namespace appsync
