@@ -1,0 +1,89 @@
+"""The layering check lets the sources pass and catches each kind of violation."""
+
+import pathlib
+import subprocess
+import sys
+import tempfile
+import unittest
+
+ROOT = pathlib.Path(__file__).resolve().parents[2]
+CHECK = ROOT / "scripts" / "check_layers.py"
+
+
+def run(root):
+    done = subprocess.run([sys.executable, "-B", CHECK, root], capture_output=True, text=True)
+    return done.returncode, done.stdout + done.stderr
+
+
+class Layers(unittest.TestCase):
+    def check(self, path, text):
+        """Runs the check over a tree that holds this one file."""
+        with tempfile.TemporaryDirectory() as folder:
+            file = pathlib.Path(folder, path)
+            file.parent.mkdir(parents=True)
+            file.write_text(text)
+            return run(folder)
+
+    def assertRefused(self, path, text, reason):
+        code, output = self.check(path, text)
+        self.assertEqual(code, 1, output)
+        self.assertIn(reason, output)
+
+    def assertAllowed(self, path, text):
+        code, output = self.check(path, text)
+        self.assertEqual(code, 0, output)
+
+    def testTheSourcesKeepTheRule(self):
+        code, output = run(ROOT)
+        self.assertEqual(code, 0, output)
+
+    def testPluginMustNotKnowDeviceOrHost(self):
+        for header in ("device/registry.h", "host/session.h"):
+            self.assertRefused("sync/a.cpp", f'#include "{header}"\n', "sync/a.cpp:1")
+
+    def testPluginUsesNoSystemHeader(self):
+        for header in ("unistd.h", "sys/stat.h", "sqlite3.h", "archive.h", "fmt/core.h", "linux/fs.h"):
+            self.assertRefused("client/a.cpp", f"#include <{header}>\n", "standard library")
+
+    def testPlatformKnowsNobody(self):
+        self.assertRefused("platform/a.h", '#include "client/apps_client.h"\n', "must not know")
+        self.assertRefused("platform/a.h", "#include <fcntl.h>\n", "standard library")
+
+    def testDeviceAndPluginDoNotKnowEachOther(self):
+        self.assertRefused("device/a.h", '#include "transfer/queue.h"\n', "must not know transfer/")
+        self.assertRefused("device/a.h", '#include "host/loader.h"\n', "must not know host/")
+
+    def testHostMeetsThePluginOnlyThroughThePlatform(self):
+        for folder in ("client", "sync", "transfer", "coordination", "restore"):
+            self.assertRefused("host/a.cpp", f'#include "{folder}/x.h"\n', "must not know")
+
+    def testOnlyTheCodecUsesThePropertyListLibrary(self):
+        self.assertAllowed("platform/property_list_codec.cpp", "#include <plist/plist.h>\n")
+        for path in ("platform/other.cpp", "client/a.cpp", "device/a.cpp", "host/a.cpp"):
+            self.assertRefused(path, "#include <plist/plist.h>\n", "libplist")
+
+    def testDisguisedIncludesAreSeen(self):
+        self.assertRefused("sync/a.cpp", '  #  include "host/a.h"\n', "must not know host/")
+        self.assertRefused("sync/a.cpp", '/* why */ #include "host/a.h"\n', "must not know host/")
+        self.assertRefused("sync/a.cpp", '#include "../host/a.h"\n', "root of the repository")
+        self.assertRefused("sync/a.cpp", "#include <host/a.h>\n", "must not know host/")
+        self.assertRefused("sync/a.cpp", "#include SOME_HEADER\n", "standard library")
+
+    def testCommentedIncludesAreNotSeen(self):
+        self.assertAllowed("sync/a.cpp", '// #include "host/a.h"\n/*\n#include "host/b.h"\n*/\n')
+
+    def testWhatTheLayersAllow(self):
+        self.assertAllowed("sync/a.cpp", '#include "transfer/b.h"\n#include "platform/log.h"\n')
+        self.assertAllowed("host/a.cpp", '#include "device/b.h"\n#include <unistd.h>\n')
+        self.assertAllowed("device/a.cpp", '#include "platform/log.h"\n#include <sqlite3.h>\n')
+        self.assertAllowed("client/a.cpp", "#include <vector>\n#include <cstdint>\n")
+
+    def testAnEmptyTreeIsNoSuccess(self):
+        with tempfile.TemporaryDirectory() as folder:
+            code, output = run(folder)
+            self.assertEqual(code, 1)
+            self.assertIn("no sources", output)
+
+
+if __name__ == "__main__":
+    unittest.main()
