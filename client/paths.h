@@ -1,0 +1,34 @@
+#pragma once
+
+#include <string_view>
+
+namespace appsync::paths {
+
+/// Root of all sync state.
+inline constexpr std::string_view SyncRoot = "/var/mobile/Library/ApplicationSync";
+/// Where the desktop delivers its todo list and icon layout.
+inline constexpr std::string_view StagingArea = "/var/mobile/Media/PublicStaging/ApplicationSync";
+/// Where the desktop delivers packages.
+inline constexpr std::string_view StagingRoot = "/var/mobile/Media/PublicStaging";
+/// The staging area moves here at the start of a reconcile.
+inline constexpr std::string_view WorkArea = "/var/mobile/Library/ApplicationSync/HalvoStuff";
+inline constexpr std::string_view TodoList =
+    "/var/mobile/Library/ApplicationSync/HalvoStuff/ApplicationsSync.plist";
+/// The todo list as it stood when the reconcile finished; kept for diagnosis.
+inline constexpr std::string_view TodoDebugCopy =
+    "/var/mobile/Library/ApplicationSync/HalvoStuff/ApplicationsSync.plist-debug.plist";
+/// The applications that were on the device at the last sync; written by the host.
+inline constexpr std::string_view LastSyncState =
+    "/var/mobile/Library/ApplicationSync/LastSyncAppState.plist";
+inline constexpr std::string_view RestoreState =
+    "/var/mobile/Library/ApplicationSync/RestoreState.plist";
+/// The home screen's order as last received; kept for diagnosis.
+inline constexpr std::string_view SortOrder =
+    "/var/mobile/Library/ApplicationSync/AssetSortOrder.plist";
+inline constexpr std::string_view IconScratch = "/var/mobile/Library/ApplicationSync/Icons";
+
+inline constexpr std::string_view MetadataName = "HalvoMetadata.plist";
+inline constexpr std::string_view ArtworkName = "HalvoArtwork";
+inline constexpr std::string_view InfoName = "Info.plist";
+
+}  // namespace appsync::paths

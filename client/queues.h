@@ -1,0 +1,113 @@
+#pragma once
+
+#include <chrono>
+#include <condition_variable>
+#include <cstddef>
+#include <deque>
+#include <functional>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string_view>
+#include <thread>
+#include <vector>
+
+#include "platform/background_queue.h"
+
+namespace appsync {
+
+/// A counter of outstanding work that can be waited on. Thread-safe.
+class TaskGroup {
+ public:
+  void enter();
+  void leave();
+  /// Blocks, without limit, until every enter has been left.
+  void wait();
+
+ private:
+  std::mutex mutex_;
+  std::condition_variable empty_;
+  std::size_t outstanding_ = 0;
+};
+
+/// A serial queue for short bookkeeping: a task runs on the caller's thread, one at a time.
+class AccessQueue {
+ public:
+  explicit AccessQueue(std::string_view label) : label_(label) {}
+
+  std::string_view label() const { return label_; }
+
+  /// Runs the task and returns its result. A task must not call `sync` again.
+  template <typename Task>
+  auto sync(Task&& task) {
+    const std::lock_guard lock(mutex_);
+    return std::forward<Task>(task)();
+  }
+
+ private:
+  std::string_view label_;
+  std::mutex mutex_;
+};
+
+/// Runs operations in the order in which they were added, at most `maximum` at once. Threads are
+/// made as they are needed. The destructor runs what was added to its end. Thread-safe.
+class OperationQueue {
+ public:
+  explicit OperationQueue(std::size_t maximum) : maximum_(maximum) {}
+  ~OperationQueue();
+  OperationQueue(const OperationQueue&) = delete;
+  OperationQueue& operator=(const OperationQueue&) = delete;
+
+  void add(std::function<void()> operation);
+  /// Blocks until nothing runs and nothing waits.
+  void waitUntilAllOperationsAreFinished();
+
+ private:
+  void work();
+
+  const std::size_t maximum_;
+  std::mutex mutex_;
+  std::condition_variable changed_;
+  std::deque<std::function<void()>> waiting_;
+  std::vector<std::thread> threads_;
+  std::size_t idle_ = 0;
+  std::size_t running_ = 0;
+  bool closing_ = false;
+};
+
+/// Delayed tasks that belong to one owner. After `close` none runs any more. Thread-safe.
+class DelayedTasks {
+ public:
+  explicit DelayedTasks(BackgroundQueue& queue) : queue_(queue) {}
+  ~DelayedTasks() { close(); }
+
+  /// Runs the task after the delay. False when closed: the task is dropped.
+  bool after(std::chrono::milliseconds delay, std::function<void()> task);
+  /// Drops what is pending and waits for what runs; `dropped` is called once for each dropped task.
+  void close(const std::function<void()>& dropped = [] {});
+
+ private:
+  struct Task;
+
+  BackgroundQueue& queue_;
+  std::mutex mutex_;
+  std::map<std::uint64_t, std::shared_ptr<Task>> pending_;
+  std::uint64_t next_ = 0;
+  bool closed_ = false;
+};
+
+/// A counting semaphore whose wait can have a limit.
+class Semaphore {
+ public:
+  void signal();
+  /// False when the limit passed first; without a limit that never happens.
+  bool wait(std::optional<std::chrono::milliseconds> limit = std::nullopt);
+
+ private:
+  std::mutex mutex_;
+  std::condition_variable signalled_;
+  std::size_t count_ = 0;
+};
+
+}  // namespace appsync
