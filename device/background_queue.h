@@ -1,0 +1,48 @@
+#pragma once
+
+#include <condition_variable>
+#include <map>
+#include <mutex>
+#include <thread>
+#include <utility>
+
+#include "platform/background_queue.h"
+
+namespace appsync::device {
+
+/// Delays by the steady clock, all tasks on one thread in the order in which they fall due.
+class ThreadBackgroundQueue final : public BackgroundQueue {
+ public:
+  ThreadBackgroundQueue();
+  /// Drops what is pending and lets a running task end. Not to be called from a task.
+  ~ThreadBackgroundQueue() override;
+
+  Token after(std::chrono::milliseconds delay, std::function<void()> task) noexcept override;
+  /// A task that cancels itself all the same is let run to its end.
+  void cancel(Token token) noexcept override;
+
+  /// Runs all pending tasks at once, in their order, and later ones without delay.
+  void expedite() noexcept;
+
+ private:
+  using Clock = std::chrono::steady_clock;
+  using Key = std::pair<Clock::time_point, Token>;
+  using Tasks = std::map<Key, std::function<void()>>;
+
+  void run();
+
+  std::mutex mutex_;
+  std::condition_variable changed_;   ///< there is something new to wait for
+  std::condition_variable finished_;  ///< a task has ended
+  // Guarded by mutex_.
+  Tasks pending_;
+  std::map<Token, Clock::time_point> due_;  ///< of what is pending
+  Token lastToken_ = 0;
+  Token running_ = 0;  ///< 0 for none
+  bool expedited_ = false;
+  bool stopping_ = false;
+
+  std::thread thread_;
+};
+
+}  // namespace appsync::device

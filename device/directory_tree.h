@@ -1,0 +1,23 @@
+#pragma once
+
+#include <string>
+
+namespace appsync::device {
+
+// Both work on handles all the way, so that nothing moved or linked about meanwhile leads them out
+// of the tree, and follow no link. False with errno set; ENAMETOOLONG for a tree nested deeper than
+// 500 directories.
+
+/// Removes the item `name` of `directory` with all in it.
+bool removeTree(int directory, const std::string& name) noexcept;
+
+/// Copies files, directories and links; keeps modes. EINVAL for an item of another kind and for a
+/// copy into itself, EEXIST when the target exists. What was copied before a failure is removed.
+bool copyTree(int fromDirectory, const std::string& from, int toDirectory,
+              const std::string& to) noexcept;
+
+/// Removes files and links with a temporary name from the directory and all below it, as far as
+/// that can be done.
+void removeTemporaryFiles(int directory) noexcept;
+
+}  // namespace appsync::device

@@ -1,0 +1,67 @@
+#pragma once
+
+#include <condition_variable>
+#include <deque>
+#include <map>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/system_notifier.h"
+
+namespace appsync::device {
+
+/// Named notifications inside this process. Callbacks run one after another, in the order of the
+/// postings, on a thread of the notifier; an observer is called for the postings made after it was
+/// added. A state belongs to a name: every token of the name sets the same one.
+class LocalNotifier final : public SystemNotifier {
+ public:
+  LocalNotifier();
+  /// Drops what is posted but not yet delivered and lets a running callback end. Not to be called
+  /// from a callback.
+  ~LocalNotifier() override;
+
+  /// Fails (status 1) only for an empty name.
+  Registration registerCheck(std::string_view name) noexcept override;
+  void setState(int token, std::uint64_t state) noexcept override;
+  void post(std::string_view name) noexcept override;
+  void addObserver(void* observer, std::string_view name, Callback callback) noexcept override;
+  /// From inside the observer's own callback it does not wait for that callback.
+  void removeObserver(void* observer, std::string_view name) noexcept override;
+
+  /// The state last set for the name; 0 when none was.
+  std::uint64_t state(std::string_view name) noexcept;
+
+ private:
+  struct Subscription {
+    void* observer;
+    std::string name;
+    Callback callback;
+    std::uint64_t since;  ///< number of postings made before
+  };
+  struct Posting {
+    std::string name;
+    std::uint64_t number;
+  };
+
+  void run();
+  void deliver(const Posting& posting, std::unique_lock<std::mutex>& lock);
+
+  std::mutex mutex_;
+  std::condition_variable posted_;
+  std::condition_variable returned_;  ///< a callback has returned
+  // Guarded by mutex_.
+  std::vector<std::string> tokenNames_;  ///< of token n + 1
+  std::map<std::string, std::uint64_t, std::less<>> states_;
+  std::map<std::uint64_t, Subscription> subscriptions_;  ///< in the order they were added
+  std::uint64_t lastSubscription_ = 0;
+  std::uint64_t running_ = 0;  ///< subscription being called, 0 for none
+  std::deque<Posting> postings_;
+  std::uint64_t postingCount_ = 0;
+  bool stopping_ = false;
+
+  std::thread thread_;
+};
+
+}  // namespace appsync::device
