@@ -1,0 +1,24 @@
+#pragma once
+
+#include <optional>
+#include <string>
+
+#include "platform/bytes.h"
+#include "platform/error.h"
+#include "platform/property_list.h"
+
+namespace appsync {
+
+/// The dictionary that the bytes hold. nullopt and an error when they are no property list or hold
+/// something else.
+std::optional<PropertyList::Dictionary> parseDictionary(ByteView bytes,
+                                                        std::optional<Error>* error);
+
+// What an application's store metadata says of it.
+
+std::optional<std::string> metadataVersion(const PropertyList::Dictionary& metadata);
+/// The title or, failing that, the item's name.
+std::optional<std::string> metadataName(const PropertyList::Dictionary& metadata);
+bool metadataProhibitsLaunch(const PropertyList::Dictionary& metadata);
+
+}  // namespace appsync
