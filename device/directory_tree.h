@@ -12,12 +12,12 @@ namespace appsync::device {
 bool removeTree(int directory, const std::string& name) noexcept;
 
 /// Copies files, directories and links; keeps modes. EINVAL for an item of another kind and for a
-/// copy into itself, EEXIST when the target exists. What was copied before a failure is removed.
+/// copy into itself, EEXIST when the target exists. The target appears in one step.
 bool copyTree(int fromDirectory, const std::string& from, int toDirectory,
               const std::string& to) noexcept;
 
-/// Removes files and links with a temporary name from the directory and all below it, as far as
-/// that can be done.
+/// Removes every item with a temporary name from the directory and all below it, as far as that can
+/// be done.
 void removeTemporaryFiles(int directory) noexcept;
 
 }  // namespace appsync::device

@@ -30,7 +30,7 @@ class TemporaryFile {
   int fd() const noexcept { return file_.get(); }
 
   /// Replaces what has this name in the directory, except a directory. False with errno set; the
-  /// name then still has what it had.
+  /// name then still has what it had, unless only putting the directory on disk failed.
   bool takePlaceOf(const std::string& name, Durability durability) noexcept;
 
  private:
