@@ -16,7 +16,8 @@ enum class PropertyListFormat { Xml, Binary };
 struct PropertyListLimits {
   std::size_t bytes = std::size_t{64} << 20;
   std::size_t objects = 2'000'000;
-  std::size_t depth = 128;
+  std::size_t depth = 128;  ///< arrays and dictionaries inside each other; never above 512
+  std::size_t dictionaryEntries = 100'000;  ///< in one dictionary
 };
 
 /// Parses an XML or binary property list. Bytes that are neither, exceed the limits, hold a
@@ -26,9 +27,12 @@ struct PropertyListLimits {
 std::optional<PropertyList> parsePropertyList(ByteView bytes, std::optional<Error>* error = nullptr,
                                               const PropertyListLimits& limits = {});
 
-/// Serialises a tree. Fails (nullopt, error) on a null anywhere in it, a string or key with a NUL
-/// byte or that is no UTF-8, or a nesting that the parser's default limits would refuse.
-/// Thread-safe.
+/// Serialises a tree, so that parsing gives an equal one. Fails (nullopt, error) on what a reader
+/// could not have back: a null anywhere, a string or key with a NUL byte or that is no UTF-8, a
+/// date that is no finite number, a tree beyond the parser's default limits; in XML also a control
+/// character other than tab, line feed and carriage return, and a date outside the years 1000 to
+/// 9999. XML holds dates in whole seconds (rounded down) and neither a negative zero nor the bits
+/// of a NaN. Thread-safe.
 std::optional<Bytes> serializePropertyList(const PropertyList& value, PropertyListFormat format,
                                            std::optional<Error>* error = nullptr);
 

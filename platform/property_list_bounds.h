@@ -1,0 +1,31 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/bytes.h"
+#include "platform/property_list_codec.h"
+
+namespace appsync {
+
+// Checks made on the bytes of a property list before a parser builds anything from them. They are
+// pure and need memory in proportion to the bytes only.
+
+/// Deeper trees are refused whatever the limits say: parser and tree recurse.
+inline constexpr std::size_t MaximumPropertyListDepth = 512;
+
+/// Why a binary property list is refused, or nullopt. Beyond its structure this bounds what it
+/// expands to, since objects may be shared: `limits.objects` objects and `limits.bytes` bytes.
+std::optional<std::string> binaryPropertyListProblem(ByteView bytes,
+                                                     const PropertyListLimits& limits);
+
+/// The same XML property list without anything that parsers read differently: no comments,
+/// attributes, CDATA, blanks between elements or character references; integers in plain decimal.
+/// nullopt, with `problem` told in one line, when it is malformed or beyond the limits. `document`
+/// has no byte-order mark.
+std::optional<std::string> canonicalXmlPropertyList(std::string_view document,
+                                                    const PropertyListLimits& limits,
+                                                    std::string& problem);
+
+}  // namespace appsync

@@ -1,0 +1,332 @@
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <cstdint>
+#include <vector>
+
+#include "platform/property_list_bounds.h"
+#include "platform/property_list_xml_values.h"
+#include "platform/utf8.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::string_view Blanks = " \t\r\n";
+
+bool isNameCharacter(char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); }
+
+class XmlReader {
+ public:
+  XmlReader(std::string_view document, const PropertyListLimits& limits)
+      : document_(document),
+        limits_(limits),
+        depthLimit_(std::min(limits.depth, MaximumPropertyListDepth)) {
+    out_.reserve(document.size() + 32);
+  }
+
+  bool run() {
+    return isUtf8(document_) || fail("it is not valid UTF-8")
+               ? readProlog() && readContents() && readEpilog()
+               : false;
+  }
+  std::string takeOutput() { return std::move(out_); }
+  std::string problem() const {
+    const auto line = std::count(document_.begin(), document_.begin() + std::ptrdiff_t(at_), '\n');
+    return std::string(problem_) + " (line " + std::to_string(line + 1) + ")";
+  }
+
+ private:
+  struct Container {
+    std::string_view name;
+    bool isDictionary = false;
+    bool hasKey = false;  ///< a key has been read, its value not yet
+    std::size_t entries = 0;
+  };
+  struct Tag {
+    std::string_view name;
+    bool closes = false;      ///< "</name>"
+    bool closesSelf = false;  ///< "<name/>"
+  };
+
+  bool fail(const char* problem) {
+    problem_ = problem;
+    return false;
+  }
+
+  bool startsWith(std::string_view text) const { return document_.substr(at_).starts_with(text); }
+
+  void skipBlanks() { at_ = std::min(document_.find_first_not_of(Blanks, at_), document_.size()); }
+
+  /// Moves behind `end`, looked for from `skip` bytes on.
+  bool skipPast(std::string_view end, std::size_t skip, const char* problem) {
+    const std::size_t found = document_.find(end, at_ + skip);
+    if (found == document_.npos) return fail(problem);
+    at_ = found + end.size();
+    return true;
+  }
+
+  /// Blanks, comments and processing instructions.
+  bool skipMiscellany() {
+    for (;;) {
+      skipBlanks();
+      if (startsWith("<!--")) {
+        if (!skipPast("-->", 4, "a comment has no end")) return false;
+      } else if (startsWith("<?")) {
+        if (!skipPast("?>", 2, "a processing instruction has no end")) return false;
+      } else {
+        return true;
+      }
+    }
+  }
+
+  bool readProlog() {
+    if (startsWith("<?xml") && !checkDeclaration()) return false;
+    if (!skipMiscellany()) return false;
+    if (startsWith("<!DOCTYPE") && !(skipDocumentType() && skipMiscellany())) return false;
+    Tag tag;
+    if (!readTag(tag, true)) return false;
+    if (tag.name != "plist" || tag.closes) return fail("it has no plist element");
+    if (tag.closesSelf) return fail("it holds no value");
+    out_ += "<plist>";
+    return true;
+  }
+
+  bool checkDeclaration() {
+    const std::size_t end = document_.find("?>", at_);
+    const std::string_view text = document_.substr(at_, end - at_);
+    const std::size_t name = text.find("encoding");
+    if (end == document_.npos || name == text.npos) return true;
+    const std::size_t open = text.find_first_of("\"'", name);
+    if (open == text.npos) return fail("the declaration is damaged");
+    std::string encoding(text.substr(open + 1, text.find(text[open], open + 1) - open - 1));
+    std::transform(encoding.begin(), encoding.end(), encoding.begin(),
+                   [](char c) { return c >= 'A' && c <= 'Z' ? char(c - 'A' + 'a') : c; });
+    return encoding == "utf-8" || encoding == "utf8" || encoding == "us-ascii" ||
+           fail("its encoding is not UTF-8");
+  }
+
+  bool skipDocumentType() {
+    const std::size_t open = document_.find('[', at_);
+    if (!skipPast(">", 0, "the document type has no end")) return false;
+    return open >= at_ || fail("it declares entities of its own");
+  }
+
+  /// Attributes say nothing here but a version, so only the plist element may have them.
+  bool readTag(Tag& tag, bool mayHaveAttributes) {
+    if (!startsWith("<"))
+      return fail(at_ == document_.size() ? "it is cut off" : "text in between");
+    ++at_;
+    tag.closes = startsWith("/");
+    if (tag.closes) ++at_;
+    const std::size_t start = at_;
+    while (at_ < document_.size() && isNameCharacter(document_[at_])) ++at_;
+    tag.name = document_.substr(start, at_ - start);
+    if (mayHaveAttributes && !skipAttributes()) return false;
+    skipBlanks();
+    tag.closesSelf = !tag.closes && startsWith("/");
+    if (tag.closesSelf) ++at_;
+    if (!startsWith(">")) return fail("an element is malformed");
+    ++at_;
+    return true;
+  }
+
+  bool skipAttributes() {
+    for (;;) {
+      at_ = std::min(document_.find_first_of("\"'/>", at_), document_.size());
+      if (at_ == document_.size()) return fail("it is cut off");
+      const char found = document_[at_];
+      if (found == '/' || found == '>') return true;
+      if (!skipPast(std::string_view(&found, 1), 1, "it is cut off")) return false;
+    }
+  }
+
+  bool readContents() {
+    bool hasValue = false;
+    for (;;) {
+      Tag tag;
+      if (!skipMiscellany() || !readTag(tag, false)) return false;
+      if (containers_.empty() && tag.closes && tag.name == "plist") break;
+      if (containers_.empty() && hasValue) return fail("it holds more than one value");
+      if (!readElement(tag)) return false;
+      hasValue = true;
+    }
+    out_ += "</plist>";
+    return hasValue || fail("it holds no value");
+  }
+
+  bool readEpilog() {
+    if (!skipMiscellany()) return false;
+    return at_ == document_.size() || fail("something follows the plist element");
+  }
+
+  bool readElement(const Tag& tag) {
+    if (tag.closes) return closeContainer(tag.name);
+    if (++objects_ > limits_.objects) return fail("it holds too many objects");
+    if (tag.name == "key") return readKey(tag);
+    if (!containers_.empty() && !beginEntry()) return false;
+    if (tag.name == "array" || tag.name == "dict") return openContainer(tag);
+    return readScalar(tag);
+  }
+
+  /// A value comes next in the innermost container.
+  bool beginEntry() {
+    Container& container = containers_.back();
+    if (!container.isDictionary) return true;
+    if (!container.hasKey) return fail("a dictionary's value has no key");
+    container.hasKey = false;
+    return true;
+  }
+
+  bool openContainer(const Tag& tag) {
+    if (containers_.size() == depthLimit_) return fail("it is nested too deeply");
+    emit("<", tag.name, tag.closesSelf ? "/>" : ">");
+    if (!tag.closesSelf) containers_.push_back({tag.name, tag.name == "dict"});
+    return true;
+  }
+
+  bool closeContainer(std::string_view name) {
+    if (containers_.empty() || containers_.back().name != name)
+      return fail("an element is closed that is not open");
+    if (containers_.back().hasKey) return fail("a dictionary's key has no value");
+    emit("</", name, ">");
+    containers_.pop_back();
+    return true;
+  }
+
+  bool readKey(const Tag& tag) {
+    if (containers_.empty() || !containers_.back().isDictionary)
+      return fail("a key stands outside a dictionary");
+    Container& container = containers_.back();
+    if (container.hasKey) return fail("a dictionary's key has no value");
+    if (++container.entries > limits_.dictionaryEntries)
+      return fail("a dictionary has too many entries");
+    container.hasKey = true;
+    return readText(tag) && emitElement("key", text_);
+  }
+
+  bool readScalar(const Tag& tag) {
+    if (!readText(tag)) return false;
+    if (tag.name == "string") return emitElement(tag.name, text_);
+    if (tag.name == "true" || tag.name == "false") {
+      if (text_.find_first_not_of(Blanks) != text_.npos) return fail("a boolean holds text");
+      emit("<", tag.name, "/>");
+      return true;
+    }
+    if (tag.name == "data")
+      return canonicalXmlData(text_) ? emitElement(tag.name, text_) : fail("data is not Base64");
+    const std::size_t start = std::min(text_.find_first_not_of(Blanks), text_.size());
+    text_.erase(text_.find_last_not_of(Blanks) + 1).erase(0, std::min(start, text_.size()));
+    if (tag.name == "integer")
+      return canonicalXmlInteger(text_) ? emitElement(tag.name, text_)
+                                        : fail("an integer is malformed or too large");
+    if (tag.name == "real")
+      return canonicalXmlReal(text_) ? emitElement(tag.name, text_)
+                                     : fail("a real is malformed or too large");
+    if (tag.name == "date")
+      return isXmlDate(text_) ? emitElement(tag.name, text_) : fail("a date is malformed");
+    return fail("an element has an unknown name");
+  }
+
+  /// Reads up to and with the end tag; leaves the text, with only "&", "<" and ">" escaped, in
+  /// `text_`.
+  bool readText(const Tag& tag) {
+    text_.clear();
+    if (tag.closesSelf) return true;
+    for (;;) {
+      const std::size_t end = std::min(document_.find_first_of("<&", at_), document_.size());
+      if (!appendPlain(document_.substr(at_, end - at_))) return false;
+      at_ = end;
+      if (startsWith("&")) {
+        if (!readReference()) return false;
+      } else if (startsWith("<![CDATA[")) {
+        if (!readCharacterData()) return false;
+      } else if (startsWith("<!--")) {
+        if (!skipPast("-->", 4, "a comment has no end")) return false;
+      } else {
+        Tag closing;
+        if (!readTag(closing, false)) return false;
+        return (closing.closes && closing.name == tag.name) ||
+               fail("an element stands inside a value");
+      }
+    }
+  }
+
+  bool appendPlain(std::string_view text) {
+    for (std::size_t at = 0; at < text.size();) {
+      const std::size_t end = std::min(text.find('>', at), text.size());
+      text_ += text.substr(at, end - at);
+      if (end < text.size()) text_ += "&gt;";
+      at = end + 1;
+    }
+    return isXmlText(text) || fail("it holds a control character");
+  }
+
+  bool readCharacterData() {
+    constexpr std::size_t opening = 9;
+    const std::size_t start = at_ + opening;
+    if (!skipPast("]]>", opening, "character data has no end")) return false;
+    const std::string_view text = document_.substr(start, at_ - 3 - start);
+    for (const char c : text) appendEscaped(static_cast<unsigned char>(c), c);
+    return isXmlText(text) || fail("it holds a control character");
+  }
+
+  bool readReference() {
+    constexpr std::size_t longest = 16;
+    const std::size_t length = document_.substr(at_, longest).find(';');
+    if (length == document_.npos) return fail("an entity is malformed");
+    const auto character = xmlReference(document_.substr(at_ + 1, length - 1));
+    if (!character) return fail("an entity is unknown or no character");
+    appendEscaped(*character, 0);
+    at_ += length + 1;
+    return true;
+  }
+
+  /// Appends a character, or the raw byte of one, escaped where it would be read as markup.
+  void appendEscaped(char32_t character, char rawByte) {
+    if (character == U'&') {
+      text_ += "&amp;";
+    } else if (character == U'<') {
+      text_ += "&lt;";
+    } else if (character == U'>') {
+      text_ += "&gt;";
+    } else if (rawByte) {
+      text_ += rawByte;
+    } else {
+      appendUtf8(text_, character);
+    }
+  }
+
+  void emit(std::string_view before, std::string_view name, std::string_view after) {
+    out_.append(before).append(name).append(after);
+  }
+
+  bool emitElement(std::string_view name, std::string_view text) {
+    emit("<", name, ">");
+    out_ += text;
+    emit("</", name, ">");
+    return true;
+  }
+
+  std::string_view document_;
+  PropertyListLimits limits_;
+  std::size_t depthLimit_;
+  std::size_t at_ = 0;
+  std::size_t objects_ = 0;
+  std::vector<Container> containers_;
+  std::string text_;
+  std::string out_;
+  const char* problem_ = "";
+};
+
+}  // namespace
+
+std::optional<std::string> canonicalXmlPropertyList(std::string_view document,
+                                                    const PropertyListLimits& limits,
+                                                    std::string& problem) {
+  XmlReader reader(document, limits);
+  if (reader.run()) return reader.takeOutput();
+  problem = reader.problem();
+  return std::nullopt;
+}
+
+}  // namespace appsync
