@@ -18,6 +18,8 @@
 
 namespace appsync {
 
+struct TransferCandidate;
+
 /// Whether an application had been taken off the device, leaving a placeholder.
 enum class DemotionStatus : std::uint64_t { NotDemoted = 0, Intentional = 1, Automatic = 2 };
 
@@ -101,7 +103,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   void assetInstallFailed(const SyncAssetPtr& asset, const Error& error) noexcept override;
   void _enqueueAssetInstall(const SyncAssetPtr& asset);
   void _performAssetInstall(const SyncAssetPtr& asset);
-  bool _isRecoverableError(const Error& error);
+  /// No error at all is not recoverable.
+  bool _isRecoverableError(const std::optional<Error>& error);
 
   // --- Installs through coordinators (coordination/install.cpp) ---
   bool prepareAppForInstallUsingCoordination(const SyncAssetPtr& asset, bool existingApp);
@@ -185,16 +188,23 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   bool _runsInSyncHost() const;
   void _performDeletions(const PropertyList::Array& todoList);
   void _sendIconLayout();
-  SyncAssetPtr _prepareAsset(const struct TransferCandidate& candidate);
+  SyncAssetPtr _prepareAsset(const TransferCandidate& candidate);
   bool _handOffUncoordinated(const SyncAssetPtr& asset, bool hadPlaceholder);
   bool _handOffCoordinated(const SyncAssetPtr& asset);
-  void _assetReceived(const SyncAssetPtr& asset, bool existingApp);
-  void _restoreAssetReceived(const SyncAssetPtr& asset);
-  void _assetTransferFailed(const SyncAssetPtr& asset, const std::optional<Error>& error,
-                            bool existingApp, bool userCancelled);
+  void _assetReceived(const SyncAssetPtr& asset, const std::shared_ptr<InstallProgress>& progress,
+                      bool existingApp);
+  void _restoreAssetReceived(const SyncAssetPtr& asset,
+                             const std::shared_ptr<InstallProgress>& progress);
+  void _assetTransferFailed(const SyncAssetPtr& asset,
+                            const std::shared_ptr<InstallProgress>& progress,
+                            const std::optional<Error>& error, bool existingApp,
+                            bool userCancelled);
+  void _cancelApplicationRestore(const SyncAsset& asset, std::string_view lineIfCoordinated);
   void _settleOutstandingTransfers(bool success, const std::set<std::string>& outstanding);
   void _retryAssetInstall(const SyncAssetPtr& asset);
-  void _removeFailedPlaceholder(const SyncAssetPtr& asset);
+  void _removeFailedPlaceholder(const SyncAsset& asset);
+  void _copyIcon(const std::optional<FileLocation>& icon, const std::string& target);
+  void _installPackage(const SyncAssetPtr& asset);
 
   const Platform _platform;
   const ClientLog _log;
@@ -206,10 +216,10 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   std::atomic<std::uint32_t> _numAppInstallsAttempted{0};
   /// Assets whose transfer has reported progress and has not ended.
   std::set<std::string> _outstandingXFTTransfers;
-  /// Applications not to be requested in this sync.
-  std::set<std::string> _qlpAppsToIgnore;
   OperationQueue _installOperationQueue;
   BackupManager& _backupManager;
+  /// Applications not to be requested in this sync.
+  std::set<std::string> _qlpAppsToIgnore;
   AccessQueue _accessQueue;
   /// Whether installs go through coordinators; asked once.
   bool _useInstallCoordinator = false;

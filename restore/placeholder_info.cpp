@@ -1,6 +1,8 @@
 #include "restore/placeholder_info.h"
 
+#include "client/paths.h"
 #include "platform/bundle.h"
+#include "platform/property_list_codec.h"
 
 namespace appsync {
 namespace {
@@ -35,6 +37,38 @@ PropertyList periodicalFlag(const PropertyList::Dictionary& info) {
 bool infoProhibitsLaunch(const PropertyList::Dictionary& info) {
   const PropertyList* flag = find(info, LaunchProhibitedKey);
   return flag && flag->booleanValue();
+}
+
+bool writePlaceholderInfo(FileManager& files, std::string_view path,
+                          const PropertyList::Dictionary& info) {
+  const std::optional<Bytes> bytes = serializePropertyList(info, PropertyListFormat::Xml);
+  return bytes && files.writeAtomically(joinPath(path, paths::InfoName), *bytes);
+}
+
+PropertyList::Dictionary placeholderOptions(std::string_view bundleId, InstallType installType) {
+  return {{std::string(SWPackageTypeKey), SWPackageTypePlaceholder},
+          {std::string(KBBundleIdentifier), bundleId},
+          {std::string(SWInstallTypeKey), static_cast<std::int64_t>(installType)}};
+}
+
+void logPlaceholderInstall(const ClientLog& log, bool installed, std::string_view path,
+                           const PropertyList::Dictionary& info) {
+  const auto value = [&info](std::string_view key) { return *find(info, key); };
+  const PropertyList name = value(KBBundleDisplayName);
+  const PropertyList identifier = value(KBBundleIdentifier);
+  const PropertyList version = value(KBBundleVersion);
+  const PropertyList periodical = value(PeriodicalKey);
+  if (installed) {
+    log.normal(
+        "Installed Placeholder app from path %{public}@: %{public}@ [%{public}@ %{public}@] "
+        "[isPeriodix: %{public}@]",
+        path, name, identifier, version, periodical);
+  } else {
+    log.error(
+        "Placeholder app install failed from path %{public}@: %{public}@ [%{public}@ %{public}@] "
+        "[isPeriodix: %{public}@]",
+        path, name, identifier, version, periodical);
+  }
 }
 
 }  // namespace appsync

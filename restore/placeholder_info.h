@@ -4,6 +4,8 @@
 #include <string>
 #include <string_view>
 
+#include "client/log_message.h"
+#include "platform/app_registry.h"
 #include "platform/file_manager.h"
 #include "platform/property_list.h"
 
@@ -31,5 +33,17 @@ PropertyList periodicalFlag(const PropertyList::Dictionary& info);
 
 /// Whether the dictionary's LaunchProhibitedKey reads as true.
 bool infoProhibitsLaunch(const PropertyList::Dictionary& info);
+
+/// Writes the Info.plist of the placeholder bundle at `path` atomically. False also when an entry
+/// is null.
+bool writePlaceholderInfo(FileManager& files, std::string_view path,
+                          const PropertyList::Dictionary& info);
+
+/// The options with which every placeholder bundle is handed to the registry.
+PropertyList::Dictionary placeholderOptions(std::string_view bundleId, InstallType installType);
+
+/// Logs the registry's answer for the bundle at `path` with this Info.plist.
+void logPlaceholderInstall(const ClientLog& log, bool installed, std::string_view path,
+                           const PropertyList::Dictionary& info);
 
 }  // namespace appsync

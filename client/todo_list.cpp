@@ -1,0 +1,85 @@
+// The todo list: what the desktop wants of each application and how far it has got.
+
+#include <algorithm>
+
+#include "client/apps_client.h"
+#include "client/paths.h"
+#include "platform/property_list_codec.h"
+
+namespace appsync {
+namespace {
+
+/// The property list in a file. none without `damaged` for a missing or empty file.
+std::optional<PropertyList> readPlist(FileManager& files, std::string_view path,
+                                      std::optional<Error>* error, bool& damaged) {
+  const std::optional<Bytes> bytes = files.contentsAtPath(path, error);
+  if (!bytes || bytes->empty()) return std::nullopt;
+  std::optional<PropertyList> parsed = parsePropertyList(*bytes, error);
+  damaged = !parsed;
+  return parsed;
+}
+
+bool names(const PropertyList& entry, std::string_view identifier) {
+  const PropertyList* value = entry.find("identifier");
+  const std::string* text = value ? value->asString() : nullptr;
+  return text && *text == identifier;
+}
+
+}  // namespace
+
+std::optional<PropertyList::Array> AppsClient::_loadPlist(std::string_view path,
+                                                          std::optional<Error>* error) const {
+  bool damaged = false;
+  std::optional<PropertyList> list = readPlist(_platform.files, path, error, damaged);
+  if (damaged) _log.error("couldn't parse todo list");
+  if (!list) return std::nullopt;
+  PropertyList::Array* array = list->asArray();
+  if (!array) {
+    _log.error("todo list is not an array");
+    return std::nullopt;
+  }
+  return std::move(*array);
+}
+
+std::optional<PropertyList::Dictionary> AppsClient::_loadDemotedAppsPlist(
+    std::string_view path, std::optional<Error>* error) const {
+  bool damaged = false;
+  std::optional<PropertyList> list = readPlist(_platform.files, path, error, damaged);
+  if (damaged) _log.error("couldn't parse demoted apps list");
+  if (!list) return std::nullopt;
+  PropertyList::Dictionary* dictionary = list->asDictionary();
+  if (!dictionary) {
+    _log.error("demoted apps list is not a dictionary");
+    return std::nullopt;
+  }
+  return std::move(*dictionary);
+}
+
+void AppsClient::changeAssetID(std::string_view identifier, std::string_view toDo) {
+  const std::lock_guard lock(_stateFileMutex);
+  std::optional<PropertyList::Array> list = _loadPlist(paths::TodoList);
+  if (!list) return;
+  const auto entry = std::ranges::find_if(
+      *list, [identifier](const PropertyList& item) { return names(item, identifier); });
+  if (entry == list->end()) return;
+
+  PropertyList& operation = (*entry->asDictionary())["operation"];
+  _log.normal("Changing %{public}@ from %{public}@ to %{public}@", identifier, operation, toDo);
+  operation = toDo;
+  const std::optional<Bytes> bytes =
+      serializePropertyList(std::move(*list), PropertyListFormat::Binary);
+  if (bytes) _platform.files.writeAtomically(paths::TodoList, *bytes);
+}
+
+std::optional<std::string> AppsClient::_operationStateForIdentifier(
+    std::string_view identifier) const {
+  const std::optional<PropertyList::Array> list = _loadPlist(paths::TodoList);
+  if (!list) return std::nullopt;
+  const auto entry = std::ranges::find_if(
+      *list, [identifier](const PropertyList& item) { return names(item, identifier); });
+  if (entry == list->end()) return std::nullopt;
+  const std::string* operation = findString(*entry->asDictionary(), "operation");
+  return operation ? std::optional(*operation) : std::nullopt;
+}
+
+}  // namespace appsync

@@ -1,0 +1,110 @@
+// Takes over what the desktop staged: deletions and the icon layout at once, installs as transfers
+// later.
+
+#include "client/apps_client.h"
+#include "client/identifier_safety.h"
+#include "client/paths.h"
+#include "platform/property_list_codec.h"
+
+namespace appsync {
+namespace {
+
+/// A restore from a backup that a desktop made.
+constexpr std::int32_t RestoreFromDesktopBackup = 2;
+
+bool isSafeRemoval(const PropertyList& entry) {
+  const PropertyList* operation = entry.find("operation");
+  return isSafe(entry.find("identifier")) && operation && *operation == PropertyList("remove");
+}
+
+/// Moves the staging area to the work area, in place of the previous one. none: go on; otherwise
+/// the reconcile is over with this result.
+std::optional<bool> takeOverStagingArea(FileManager& files, const ClientLog& log,
+                                        std::optional<Error>* error) {
+  files.removeItem(paths::WorkArea);
+  if (!files.createDirectory(paths::SyncRoot, true, {}, error)) {
+    log.error("can't create work area");
+    return false;
+  }
+  if (!files.fileExists(paths::StagingArea)) {
+    log.normal("Nothing to do");
+    return true;
+  }
+  if (!files.moveItem(paths::StagingArea, paths::WorkArea, error)) {
+    log.error("Can't move staging area");
+    return false;
+  }
+  return std::nullopt;
+}
+
+}  // namespace
+
+bool AppsClient::reconcileSync(const PropertyList&, std::string_view newAnchor,
+                               const ProgressCallback&, std::optional<Error>* error) noexcept {
+  _log.normal("starting to reconcile sync with new anchor %{public}@", newAnchor);
+  std::optional<bool> result = takeOverStagingArea(_platform.files, _log, error);
+  if (!result) {
+    const bool removalAllowed = _appRemovalAllowed();
+    std::optional<PropertyList::Array> todoList = _loadPlist(paths::TodoList);
+    if (!todoList) {
+      _log.normal("Nothing to do from Halvo");
+    } else if (!removalAllowed) {
+      _log.normal("Not processing deletes because app removal is restricted");
+    } else {
+      _performDeletions(*todoList);
+    }
+    _notifyDashel(true);
+    _sendIconLayout();
+    if (todoList) {
+      const std::optional<Bytes> bytes =
+          serializePropertyList(std::move(*todoList), PropertyListFormat::Binary);
+      if (bytes) _platform.files.writeAtomically(paths::TodoDebugCopy, *bytes);
+    }
+    result = true;
+  }
+  _log.normal("finished reconcile sync");
+  return *result;
+}
+
+void AppsClient::_performDeletions(const PropertyList::Array& todoList) {
+  std::vector<std::string> deletions;
+  deletions.reserve(8);
+  for (const PropertyList& entry : todoList) {
+    if (!isSafeRemoval(entry)) continue;
+    deletions.push_back(*entry.find("identifier")->asString());
+    _log.normal("%{public}@ targeted for termination", deletions.back());
+  }
+  if (deletions.empty()) return;
+
+  _log.normal("performing %llu deletions", deletions.size());
+  for (const std::string& identifier : deletions) {
+    if (_useInstallCoordinator) {
+      uninstallAppUsingCoordination(identifier);
+      continue;
+    }
+    const bool removed = _platform.appRegistry.uninstallApplication(identifier, {});
+    if (!removed) _log.error("Uninstall of %{public}@ failed.", identifier);
+    _platform.transactionLog.logScenario("Halvo Sync", 0, removed, identifier,
+                                         removed ? "Uninstall succeeded" : "Uninstall failed");
+  }
+}
+
+void AppsClient::_sendIconLayout() {
+  const std::optional<Bytes> layout =
+      _platform.files.contentsAtPath(joinPath(paths::WorkArea, "DashelIconState.plist"));
+  if (!layout || layout->empty()) return;
+  _log.normal("Sending iconlayout to DS");
+  const HomeScreenService::Port port = _platform.homeScreen.serverPort();
+  _platform.homeScreen.setIconState(port, *layout);
+}
+
+bool AppsClient::reconcileRestoreOfType(std::int32_t type, std::optional<Error>* error) noexcept {
+  _log.normal("reconcileRestoreOfType %d", type);
+  _notifyDashel(true);
+  _platform.files.createDirectory(paths::SyncRoot, true, {});
+  if (type == RestoreFromDesktopBackup) _processHalvoRestoreInfo();
+  if (error) error->reset();
+  return true;
+}
+
+}  // namespace appsync

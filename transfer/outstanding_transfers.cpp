@@ -1,0 +1,157 @@
+// Which packages the host must still send, and what is made ready for each of them.
+
+#include "client/apps_client.h"
+#include "client/paths.h"
+#include "transfer/in_progress_query.h"
+#include "transfer/transfer_candidates.h"
+#include "transfer/transfer_rules.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::string_view Dataclass = "Application";
+
+void dropInProgress(AppRegistry& registry, PropertyList::Dictionary& entries,
+                    const ClientLog& log) {
+  const InProgressAssetQuery::Answer answer =
+      InProgressAssetQuery::currentInProgressAssetIDs(registry, log);
+  if (answer.inProgress) {
+    log.normal("Assets already in progress (not returning these): %{public}@", *answer.inProgress);
+    for (const std::string& identifier : *answer.inProgress) entries.erase(identifier);
+  } else {
+    log.error("Failed to get list of assets already in progress!");
+  }
+  if (answer.restoring) {
+    log.normal("Assets currently restoring: %{public}@", *answer.restoring);
+  } else {
+    log.error("Failed to get list of assets currently restoring!");
+  }
+}
+
+void renewIconScratch(FileManager& files, const ClientLog& log) {
+  files.removeItem(paths::IconScratch);
+  std::optional<Error> error;
+  if (!files.createDirectory(paths::IconScratch, false, {}, &error)) {
+    log.error("Can't create icon scratch dir! %{public}@", error);
+  }
+}
+
+/// 1: the package; 2: its data, since the package is here already; 3: both.
+std::uint32_t assetParts(bool isRestore, bool packageIsHere) {
+  if (!isRestore) return kTWAssetPartApplication;
+  if (packageIsHere) return kTWAssetPartApplicationData;
+  return kTWAssetPartApplication | kTWAssetPartApplicationData;
+}
+
+/// Whether the package that an earlier, interrupted restore received is still there.
+bool packageIsHere(FileManager& files, const std::string& identifier,
+                   const std::optional<PropertyList>& rememberedPath, const ClientLog& log) {
+  const std::string* path = rememberedPath ? rememberedPath->asString() : nullptr;
+  if (!path) return false;
+  if (files.fileExists(*path)) {
+    log.normal("Recovered download path for %{public}@ at %{public}@", identifier, *path);
+    return true;
+  }
+  log.normal("Download path recovered for %{public}@ but the file is missing: %{public}@",
+             identifier, *path);
+  return false;
+}
+
+}  // namespace
+
+std::vector<SyncAssetPtr> AppsClient::outstandingAssetTransfers() noexcept {
+  std::vector<SyncAssetPtr> result;
+  result.reserve(16);
+  const bool installationAllowed = _appInstallationAllowed();
+  const std::optional<PropertyList::Array> todoList = _loadPlist(paths::TodoList);
+  _log.oversize("outstandingAssetTransfers starting with todoList %{public}@", todoList);
+
+  CandidateEntries entries;
+  const std::set<std::string> systemAppPlaceholders = _getSystemAppPlaceholders();
+  _enumeratePlaceholdersWithBlock([&entries](const AppRecord& record, bool&) {
+    entries.existingPlaceholders.insert_or_assign(record.applicationIdentifier,
+                                                  placeholderEntry(record));
+  });
+  entries.all = entries.existingPlaceholders;
+  _log.oversize(
+      "outstandingAssetTransfers preExistingPlaceHolders %{public}@, idsWeWant %{public}@",
+      entries.existingPlaceholders, entries.all);
+  if (todoList) addTodoEntries(*todoList, entries, _log);
+  dropInProgress(_platform.appRegistry, entries.all, _log);
+  const std::vector<PropertyList> ordered = _orderTheItems(entries.all);
+  renewIconScratch(_platform.files, _log);
+
+  const TransferContext context{installationAllowed, _useInstallCoordinator, _qlpAppsToIgnore,
+                                systemAppPlaceholders, entries.wanted};
+  for (const PropertyList& entry : ordered) {
+    const std::optional<TransferCandidate> candidate = readCandidate(entry, _platform.files);
+    if (!candidate || !isWanted(*candidate, context, _log)) continue;
+    const SyncAssetPtr asset = _prepareAsset(*candidate);
+    const bool handedOff =
+        _useInstallCoordinator
+            ? _handOffCoordinated(asset)
+            : _handOffUncoordinated(asset,
+                                    entries.existingPlaceholders.contains(asset->identifier));
+    if (handedOff) result.push_back(asset);
+  }
+  return result;
+}
+
+SyncAssetPtr AppsClient::_prepareAsset(const TransferCandidate& app) {
+  const std::string prettyName =
+      app.displayName ? *app.displayName : app.nameFromHalvo.value_or(app.identifier);
+  const std::string container = app.container.value_or(std::string());
+  const std::string bundlePath = app.bundlePath.value_or(std::string());
+  const bool rendered = _makeIconFromBundlePath(app.bundlePath, app.iconPath);
+
+  const SyncAssetPtr asset = _platform.syncHost.makeDownload(app.identifier, Dataclass, prettyName);
+  asset->icon =
+      FileLocation::file(rendered ? app.iconPath : joinPath(container, paths::ArtworkName));
+  asset->isRestore = app.isRestore;
+
+  const bool here =
+      packageIsHere(_platform.files, app.identifier,
+                    _restoreStatePropertyForKey("path", app.identifier, app.version), _log);
+  PropertyList::Dictionary options;
+  options.emplace(AssetPartsKey, static_cast<std::int64_t>(assetParts(app.isRestore, here)));
+  if (app.version) options.emplace(AssetVersionKey, *app.version);
+  asset->variantOptions = std::move(options);
+  asset->storePlist = joinPath(container, paths::MetadataName);
+  asset->infoPlist = joinPath(bundlePath, paths::InfoName);
+  _log.normal(
+      "Asset %{public}@ (pretty=%{public}@, version=%{public}@) prepped with icon %{public}@, at "
+      "%{public}@, meta at %{public}@, info at %{public}@, storePid=%lld, isRestore=%c",
+      app.identifier, prettyName, app.version, asset->icon, app.bundlePath, asset->storePlist,
+      asset->infoPlist, asset->storePID, asset->isRestore);
+  return asset;
+}
+
+/// An application whose placeholder stood before this call is not asked for again.
+bool AppsClient::_handOffUncoordinated(const SyncAssetPtr& asset, bool hadPlaceholder) {
+  if (hadPlaceholder) {
+    _log.normal("Not creating a placeholder app for %{public}@ because we already have one",
+                asset->identifier);
+    return false;
+  }
+  _createPlaceHolderApplication(asset);
+  return true;
+}
+
+bool AppsClient::_handOffCoordinated(const SyncAssetPtr& asset) {
+  const std::string& identifier = asset->identifier;
+  const std::optional<AppRecord> record =
+      _platform.appRegistry.recordForIdentifier(identifier, false);
+  const bool existing = record && record->isInstalled && !record->isPlaceholder;
+  if (existing) {
+    _log.normal("App %{public}@ is already installed and will be updated.", identifier);
+  }
+  if (!prepareAppForInstallUsingCoordination(asset, existing)) {
+    _log.error("Not requesting app asset for %{public}@", identifier);
+    changeAssetID(identifier, "FAILED");
+    return false;
+  }
+  if (existing) _accessQueue.sync([&] { _updatingApps.insert(identifier); });
+  return true;
+}
+
+}  // namespace appsync
