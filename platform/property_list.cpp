@@ -152,6 +152,13 @@ bool textIsTrue(std::string_view text) {
 
 }  // namespace
 
+PropertyList::PropertyList(const PropertyList& other) = default;
+PropertyList::PropertyList(PropertyList&& other) noexcept = default;
+PropertyList& PropertyList::operator=(const PropertyList& other) = default;
+PropertyList& PropertyList::operator=(PropertyList&& other) noexcept = default;
+PropertyList::~PropertyList() = default;
+bool PropertyList::operator==(const PropertyList& other) const = default;
+
 PropertyList::PropertyList(std::uint64_t value) {
   // One representation per number, so that equality compares numbers.
   if (value <= std::uint64_t{std::numeric_limits<std::int64_t>::max()}) {

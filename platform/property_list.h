@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <variant>
 #include <vector>
 
@@ -31,6 +32,13 @@ class PropertyList {
   enum class Type { Null, Boolean, Integer, Real, String, Data, Date, Array, Dictionary };
 
   PropertyList() noexcept = default;
+  // Out of line, so that not every user compiles the code for nine types.
+  PropertyList(const PropertyList& other);
+  PropertyList(PropertyList&& other) noexcept;
+  PropertyList& operator=(const PropertyList& other);
+  PropertyList& operator=(PropertyList&& other) noexcept;
+  ~PropertyList();
+
   PropertyList(bool value) : value_(value) {}
   PropertyList(int value) : value_(std::int64_t{value}) {}
   PropertyList(std::int64_t value) : value_(value) {}
@@ -76,7 +84,7 @@ class PropertyList {
   /// The value under `key` of a dictionary; nullptr when there is none or this is no dictionary.
   const PropertyList* find(std::string_view key) const;
 
-  bool operator==(const PropertyList&) const = default;
+  bool operator==(const PropertyList& other) const;
 
  private:
   std::variant<std::monostate, bool, std::int64_t, std::uint64_t, double, std::string, Data, Date,
