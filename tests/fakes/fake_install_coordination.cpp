@@ -1,0 +1,286 @@
+#include "tests/fakes/fake_install_coordination.h"
+
+#include <algorithm>
+#include <ranges>
+
+namespace appsync::fakes {
+
+namespace {
+
+std::string_view kindName(CoordinatorKind kind) {
+  switch (kind) {
+    case CoordinatorKind::Any:
+      return "any";
+    case CoordinatorKind::Initiating:
+      return "initiating";
+    case CoordinatorKind::Updating:
+      return "updating";
+    case CoordinatorKind::Restoring:
+      return "restoring";
+    case CoordinatorKind::RestoringDemoted:
+      return "restoring demoted";
+  }
+  return "unknown";
+}
+
+}  // namespace
+
+class FakeInstallCoordination::Listener : public CoordinatorEventListener {
+ public:
+  Listener(FakeInstallCoordination& service, std::set<CoordinationClientId> forClients,
+           CoordinatorObserver& receiver)
+      : clients(std::move(forClients)), delegate(receiver), service_(service) {}
+  ~Listener() override { service_.removeListener(this); }
+
+  const std::set<CoordinationClientId> clients;
+  CoordinatorObserver& delegate;
+
+ private:
+  FakeInstallCoordination& service_;
+};
+
+bool FakeInstallCoordination::coordinationIsEnabled() noexcept {
+  context_.trace.add(TraceQuery, callText("InstallCoordination.coordinationIsEnabled"));
+  const std::scoped_lock lock(mutex_);
+  return enabled_;
+}
+
+std::shared_ptr<InstallCoordinator> FakeInstallCoordination::coordinatorFor(
+    CoordinatorKind kind, std::string_view bundleId, CoordinationClientId client,
+    bool createIfNotExisting, bool* created, std::optional<Error>* error) noexcept {
+  constexpr std::string_view operation = "InstallCoordination.coordinatorFor";
+  if (created) *created = false;
+  if (context_.faults.strikes(operation, bundleId, error)) return nullptr;
+  context_.trace.add(TraceCall, callText(operation, bundleId, kindName(kind), client,
+                                         createIfNotExisting ? "create" : "look up"));
+  const std::scoped_lock lock(mutex_);
+  for (const auto& coordinator : coordinators_) {
+    const FakeInstallCoordinator::State state = coordinator->state();
+    if (state.bundleIdentifier != bundleId || state.cancellation) continue;
+    const bool fits = kind == CoordinatorKind::Any || state.kind == kind;
+    if (fits || state.creator != client) return coordinator;
+  }
+  if (!createIfNotExisting || kind == CoordinatorKind::Any) return nullptr;
+  FakeInstallCoordinator::State state;
+  state.kind = kind;
+  state.bundleIdentifier = bundleId;
+  state.creator = client;
+  coordinators_.push_back(std::make_shared<FakeInstallCoordinator>(context_, std::move(state)));
+  if (created) *created = true;
+  return coordinators_.back();
+}
+
+std::shared_ptr<PathTransferPromise> FakeInstallCoordination::createPathTransferPromise(
+    std::string_view name, CoordinationClientId client,
+    const std::optional<FileLocation>& transferPath, std::uint64_t diskSpaceNeeded) noexcept {
+  constexpr std::string_view operation = "InstallCoordination.createPathTransferPromise";
+  if (context_.faults.next(operation, name)) return nullptr;
+  context_.trace.add(TraceCall, callText(operation, name, client, transferPath, diskSpaceNeeded));
+  const std::scoped_lock lock(mutex_);
+  PromiseState state{std::string(name), client, nextPromise_++, diskSpaceNeeded,
+                     transferPath,      0,      false,          {}};
+  pathPromises_.push_back(std::make_shared<FakePathTransferPromise>(context_, std::move(state)));
+  return pathPromises_.back();
+}
+
+std::shared_ptr<OutOfBandTransferPromise> FakeInstallCoordination::createOutOfBandTransferPromise(
+    std::string_view name, CoordinationClientId client, std::uint64_t diskSpaceNeeded) noexcept {
+  constexpr std::string_view operation = "InstallCoordination.createOutOfBandTransferPromise";
+  if (context_.faults.next(operation, name)) return nullptr;
+  context_.trace.add(TraceCall, callText(operation, name, client, diskSpaceNeeded));
+  const std::scoped_lock lock(mutex_);
+  PromiseState state{std::string(name), client, nextPromise_++, diskSpaceNeeded, {}, 0, false, {}};
+  outOfBandPromises_.push_back(
+      std::make_shared<FakeOutOfBandTransferPromise>(context_, std::move(state)));
+  return outOfBandPromises_.back();
+}
+
+std::shared_ptr<InstallPlaceholder> FakeInstallCoordination::createAppPlaceholder(
+    std::string_view appName, std::string_view bundleId, InstallType installType,
+    CoordinationClientId client) noexcept {
+  constexpr std::string_view operation = "InstallCoordination.createAppPlaceholder";
+  if (context_.faults.next(operation, bundleId)) return nullptr;
+  context_.trace.add(TraceCall, callText(operation, bundleId, appName,
+                                         static_cast<std::uint64_t>(installType), client));
+  FakeInstallPlaceholder::State state;
+  state.name = appName;
+  state.bundleIdentifier = bundleId;
+  state.installType = installType;
+  state.client = client;
+  const std::scoped_lock lock(mutex_);
+  placeholders_.push_back(std::make_shared<FakeInstallPlaceholder>(context_, std::move(state)));
+  return placeholders_.back();
+}
+
+void FakeInstallCoordination::uninstallApp(
+    std::string_view bundleId, bool requestUserConfirmation,
+    std::function<void(const std::optional<Error>&)> completion) noexcept {
+  constexpr std::string_view operation = "InstallCoordination.uninstallApp";
+  std::optional<Error> error;
+  if (!context_.faults.strikes(operation, bundleId, &error)) {
+    context_.trace.add(TraceCall, callText(operation, bundleId, requestUserConfirmation));
+  }
+  events_.post([this, error, id = std::string(bundleId), completion = std::move(completion)] {
+    if (!error) registry_.removeAll(id);
+    completion(error);
+  });
+}
+
+Error FakeInstallCoordination::createUserPresentableError(
+    std::int64_t code, std::uint64_t flag, const std::optional<Error>& underlying) noexcept {
+  context_.trace.add(TraceQuery, callText("InstallCoordination.createUserPresentableError", code,
+                                          flag, underlying));
+  Error error{"UserPresentable", code, {{"Flag", flag}}, nullptr};
+  if (underlying) error.underlying = std::make_shared<const Error>(*underlying);
+  return error;
+}
+
+std::unique_ptr<CoordinatorEventListener> FakeInstallCoordination::createEventListener(
+    std::string_view serviceName, const std::set<CoordinationClientId>& clients,
+    CoordinatorObserver& delegate) noexcept {
+  constexpr std::string_view operation = "InstallCoordination.createEventListener";
+  PropertyList::Array shown(clients.begin(), clients.end());
+  context_.trace.add(TraceCall, callText(operation, serviceName, description(shown)));
+  auto listener = std::make_unique<Listener>(*this, clients, delegate);
+  const std::scoped_lock lock(mutex_);
+  listeners_.push_back(listener.get());
+  return listener;
+}
+
+void FakeInstallCoordination::removeObserver(CoordinatorObserver* observer) noexcept {
+  context_.trace.add(TraceCall, callText("InstallCoordination.removeObserver"));
+  std::unique_lock lock(mutex_);
+  for (const auto& coordinator : coordinators_) {
+    coordinator->edit([&](FakeInstallCoordinator::State& state) {
+      if (state.observer == observer) state.observer = nullptr;
+    });
+  }
+  delivered_.wait(lock, [&] { return delivering_ != observer; });
+}
+
+void FakeInstallCoordination::removeListener(Listener* listener) {
+  std::unique_lock lock(mutex_);
+  std::erase(listeners_, listener);
+  delivered_.wait(lock, [&] { return delivering_ != &listener->delegate; });
+}
+
+CoordinatorObserver* FakeInstallCoordination::receiver(
+    const FakeInstallCoordinator& coordinator) const {
+  const FakeInstallCoordinator::State state = coordinator.state();
+  if (state.observer) return state.observer;
+  for (Listener* listener : listeners_) {
+    if (listener->clients.contains(state.creator)) return &listener->delegate;
+  }
+  return nullptr;
+}
+
+void FakeInstallCoordination::fire(FakeInstallCoordinator& coordinator, const Event& event) {
+  events_.post([&] {
+    std::unique_lock lock(mutex_);
+    CoordinatorObserver* const observer = receiver(coordinator);
+    if (!observer) return;
+    delivering_ = observer;
+    lock.unlock();
+    event(*observer);
+    lock.lock();
+    delivering_ = nullptr;
+    delivered_.notify_all();
+  });
+  events_.drain();
+}
+
+void FakeInstallCoordination::fireDidBeginFulfillment(FakeInstallCoordinator& coordinator,
+                                                      std::uint64_t promise) {
+  fire(coordinator, [&](CoordinatorObserver& observer) {
+    observer.promiseDidBeginFulfillmentWithIdentifier(promise);
+  });
+}
+
+void FakeInstallCoordination::fireDidInstallPlaceholder(FakeInstallCoordinator& coordinator) {
+  fire(coordinator, [&](CoordinatorObserver& observer) {
+    observer.coordinatorDidInstallPlaceholder(coordinator);
+  });
+}
+
+void FakeInstallCoordination::fireDidComplete(FakeInstallCoordinator& coordinator,
+                                              std::optional<Error> error) {
+  if (error) coordinator.edit([&](FakeInstallCoordinator::State& state) { state.error = error; });
+  fire(coordinator, [&](CoordinatorObserver& observer) {
+    observer.coordinatorDidCompleteSuccessfully(coordinator);
+  });
+}
+
+void FakeInstallCoordination::fireShouldPrioritize(FakeInstallCoordinator& coordinator) {
+  fire(coordinator,
+       [&](CoordinatorObserver& observer) { observer.coordinatorShouldPrioritize(coordinator); });
+}
+
+void FakeInstallCoordination::fireCanceled(FakeInstallCoordinator& coordinator, const Error& reason,
+                                           CoordinationClientId client) {
+  fire(coordinator, [&](CoordinatorObserver& observer) {
+    observer.coordinatorCanceledWithReason(coordinator, reason, client);
+  });
+}
+
+void FakeInstallCoordination::setEnabled(bool enabled) {
+  const std::scoped_lock lock(mutex_);
+  enabled_ = enabled;
+}
+
+std::shared_ptr<FakeInstallCoordinator> FakeInstallCoordination::seedCoordinator(
+    CoordinatorKind kind, std::optional<std::string> bundleId, CoordinationClientId creator) {
+  FakeInstallCoordinator::State state;
+  state.kind = kind;
+  state.bundleIdentifier = std::move(bundleId);
+  state.creator = creator;
+  const std::scoped_lock lock(mutex_);
+  coordinators_.push_back(std::make_shared<FakeInstallCoordinator>(context_, std::move(state)));
+  return coordinators_.back();
+}
+
+std::shared_ptr<FakeInstallCoordinator> FakeInstallCoordination::coordinator(
+    std::string_view bundleId) const {
+  const std::scoped_lock lock(mutex_);
+  for (const auto& coordinator : coordinators_ | std::views::reverse) {
+    if (coordinator->bundleIdentifier() == bundleId) return coordinator;
+  }
+  return nullptr;
+}
+
+std::size_t FakeInstallCoordination::coordinatorCount() const {
+  const std::scoped_lock lock(mutex_);
+  return coordinators_.size();
+}
+
+std::vector<std::shared_ptr<FakePathTransferPromise>> FakeInstallCoordination::pathPromises()
+    const {
+  const std::scoped_lock lock(mutex_);
+  return pathPromises_;
+}
+
+std::vector<std::shared_ptr<FakeOutOfBandTransferPromise>>
+FakeInstallCoordination::outOfBandPromises() const {
+  const std::scoped_lock lock(mutex_);
+  return outOfBandPromises_;
+}
+
+std::vector<std::shared_ptr<FakeInstallPlaceholder>> FakeInstallCoordination::placeholders() const {
+  const std::scoped_lock lock(mutex_);
+  return placeholders_;
+}
+
+std::shared_ptr<FakePathTransferPromise> FakeInstallCoordination::pathPromise(
+    std::string_view name) const {
+  const std::scoped_lock lock(mutex_);
+  for (const auto& promise : pathPromises_ | std::views::reverse) {
+    if (promise->name() == name) return promise;
+  }
+  return nullptr;
+}
+
+std::size_t FakeInstallCoordination::listenerCount() const {
+  const std::scoped_lock lock(mutex_);
+  return listeners_.size();
+}
+
+}  // namespace appsync::fakes
