@@ -1,0 +1,86 @@
+#!/usr/bin/env bash
+# Takes the sample library through three desktop syncs of a new device, and checks what comes out.
+#
+# usage: examples/demo.sh APPSYNC [FOLDER]      FOLDER: where it works, build/demo by default
+set -euo pipefail
+
+program=$(realpath "$1")
+root=$(realpath "$(dirname "${BASH_SOURCE[0]}")/..")
+mkdir -p "${2:-$root/build/demo}"
+cd "${2:-$root/build/demo}"
+export APPSYNC_DEVICE=$PWD/phone
+
+title() { printf '\n== %s\n' "$*"; }
+fail() { printf '\nThe demo failed: %s\n' "$*" >&2 && exit 1; }
+
+# Shows a command as one would type it, runs it, and insists on its exit code.
+run() { # EXPECTED_EXIT ARGUMENT...
+  local expected=$1 status=0
+  shift
+  printf '\n$ appsync %s\n' "$*"
+  "$program" "$@" || status=$?
+  ((status == expected)) || fail "\"appsync $*\" gave exit code $status, not $expected"
+}
+
+# Insists on the applications that are installed now: "name version" each, in order.
+expect_apps() {
+  local have
+  have=$("$program" --json apps | python3 -c '
+import json, sys
+for line in sys.stdin:
+    app = json.loads(line)
+    kind = " (placeholder)" if app["placeholder"] else ""
+    print(app["identifier"].removeprefix("org.example."), app["version"] + kind)')
+  diff <(printf '%s\n' "$@") <(printf '%s\n' "$have") >difference ||
+    fail "these applications were expected (<) and found (>):"$'\n'"$(cat difference)"
+}
+
+title "The sample library: 12 applications, packed by appsync, zip, 7-Zip, Python and tar"
+"$root/examples/build-library" "$program" library
+ls -sh1 library/first
+
+title "A new device"
+rm -rf phone
+run 0 init
+
+title "First sync: one package is damaged, so it fails (exit code 1) and the others are installed"
+run 1 sync library/first
+run 0 apps
+expect_apps "concord 2.3" "ditdah 1.4" "jot 3.0.1" "lantern 1.0" "lune 2.0" "measure 4.1" \
+  "meridian 1.6" "nine 2.2" "seahorse 1.1" "stillwater 1.0" "tally 1.0"
+
+title "Second sync: a newer Tally, a mended Kaleido, and Lantern is to go"
+run 0 sync library/second --remove org.example.lantern
+expect_apps "concord 2.3" "ditdah 1.4" "jot 3.0.1" "kaleido 1.2" "lune 2.0" "measure 4.1" \
+  "meridian 1.6" "nine 2.2" "seahorse 1.1" "stillwater 1.0" "tally 1.1"
+
+title "On the phone, the person deletes Jot"
+run 0 uninstall org.example.jot
+
+title "Third sync: the phone reports what is gone; the desktop gives up Jot too"
+rm library/second/Jot.zip library/second/Lantern.tar.xz
+run 0 sync library/second
+"$program" log >log.txt
+grep -F "Marking as deleted" log.txt || fail "the inventory did not report Jot as deleted"
+grep -q "org.example.jot not installed.*Marking as deleted" log.txt ||
+  fail "the inventory did not report Jot as deleted"
+
+title "What is on the phone now"
+run 0 apps
+expect_apps "concord 2.3" "ditdah 1.4" "kaleido 1.2" "lune 2.0" "measure 4.1" \
+  "meridian 1.6" "nine 2.2" "seahorse 1.1" "stillwater 1.0" "tally 1.1"
+
+title "What happened"
+run 0 history
+"$program" --json history | grep -q "Uninstall succeeded" ||
+  fail "the history does not tell that Lantern was removed"
+
+title "An installed application runs"
+tally=$("$program" --json apps | python3 -c '
+import json, sys
+print(next(a["path"] for a in map(json.loads, sys.stdin) if a["identifier"] == "org.example.tally"))')
+export APP_DATA=$PWD/data
+rm -rf data
+"phone/root$tally/Tally" add "desktop sync" 3
+
+printf '\nAll is as it should be. The device is %s\n' "$APPSYNC_DEVICE"
