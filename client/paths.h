@@ -1,5 +1,6 @@
 #pragma once
 
+#include <string>
 #include <string_view>
 
 namespace appsync::paths {
@@ -27,8 +28,17 @@ inline constexpr std::string_view SortOrder =
     "/var/mobile/Library/ApplicationSync/AssetSortOrder.plist";
 inline constexpr std::string_view IconScratch = "/var/mobile/Library/ApplicationSync/Icons";
 
-inline constexpr std::string_view MetadataName = "HalvoMetadata.plist";
-inline constexpr std::string_view ArtworkName = "HalvoArtwork";
-inline constexpr std::string_view InfoName = "Info.plist";
+/// The icon layout that the desktop wants.
+inline constexpr std::string_view IconLayout =
+    "/var/mobile/Library/ApplicationSync/HalvoStuff/DashelIconState.plist";
+
+// Files of an application's container and of its bundle.
+inline std::string metadataIn(std::string_view container) {
+  return std::string(container) + "/HalvoMetadata.plist";
+}
+inline std::string artworkIn(std::string_view container) {
+  return std::string(container) + "/HalvoArtwork";
+}
+inline std::string infoIn(std::string_view bundle) { return std::string(bundle) + "/Info.plist"; }
 
 }  // namespace appsync::paths

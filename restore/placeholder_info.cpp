@@ -42,7 +42,7 @@ bool infoProhibitsLaunch(const PropertyList::Dictionary& info) {
 bool writePlaceholderInfo(FileManager& files, std::string_view path,
                           const PropertyList::Dictionary& info) {
   const std::optional<Bytes> bytes = serializePropertyList(info, PropertyListFormat::Xml);
-  return bytes && files.writeAtomically(joinPath(path, paths::InfoName), *bytes);
+  return bytes && files.writeAtomically(paths::infoIn(path), *bytes);
 }
 
 PropertyList::Dictionary placeholderOptions(std::string_view bundleId, InstallType installType) {

@@ -50,8 +50,7 @@ using DictionaryOf = const PropertyList::Dictionary* (PropertyList::*)() const;
 
 void addAccounts(const ClientLog& log, FileManager& files, const AppRecord& record,
                  std::set<std::string>& accounts) {
-  const std::string path =
-      joinPath(record.bundleContainerPath.value_or(std::string()), paths::MetadataName);
+  const std::string path = paths::metadataIn(record.bundleContainerPath.value_or(std::string()));
   const std::optional<PropertyList::Dictionary> metadata = loadDictionary(files, path);
   const PropertyList::Dictionary* root = metadata ? &*metadata : nullptr;
   const DictionaryOf dictionary = &PropertyList::asDictionary;

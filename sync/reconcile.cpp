@@ -90,8 +90,7 @@ void AppsClient::_performDeletions(const PropertyList::Array& todoList) {
 }
 
 void AppsClient::_sendIconLayout() {
-  const std::optional<Bytes> layout =
-      _platform.files.contentsAtPath(joinPath(paths::WorkArea, "DashelIconState.plist"));
+  const std::optional<Bytes> layout = _platform.files.contentsAtPath(paths::IconLayout);
   if (!layout || layout->empty()) return;
   _log.normal("Sending iconlayout to DS");
   const HomeScreenService::Port port = _platform.homeScreen.serverPort();

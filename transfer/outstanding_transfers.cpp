@@ -105,8 +105,7 @@ SyncAssetPtr AppsClient::_prepareAsset(const TransferCandidate& app) {
   const bool rendered = _makeIconFromBundlePath(app.bundlePath, app.iconPath);
 
   const SyncAssetPtr asset = _platform.syncHost.makeDownload(app.identifier, Dataclass, prettyName);
-  asset->icon =
-      FileLocation::file(rendered ? app.iconPath : joinPath(container, paths::ArtworkName));
+  asset->icon = FileLocation::file(rendered ? app.iconPath : paths::artworkIn(container));
   asset->isRestore = app.isRestore;
 
   const bool here =
@@ -116,8 +115,8 @@ SyncAssetPtr AppsClient::_prepareAsset(const TransferCandidate& app) {
   options.emplace(AssetPartsKey, static_cast<std::int64_t>(assetParts(app.isRestore, here)));
   if (app.version) options.emplace(AssetVersionKey, *app.version);
   asset->variantOptions = std::move(options);
-  asset->storePlist = joinPath(container, paths::MetadataName);
-  asset->infoPlist = joinPath(bundlePath, paths::InfoName);
+  asset->storePlist = paths::metadataIn(container);
+  asset->infoPlist = paths::infoIn(bundlePath);
   _log.normal(
       "Asset %{public}@ (pretty=%{public}@, version=%{public}@) prepped with icon %{public}@, at "
       "%{public}@, meta at %{public}@, info at %{public}@, storePid=%lld, isRestore=%c",
