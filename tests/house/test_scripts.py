@@ -1,0 +1,106 @@
+"""The small tools of ./dev and CI."""
+
+import importlib.util
+import json
+import pathlib
+import subprocess
+import sys
+import tempfile
+import unittest
+
+SCRIPTS = pathlib.Path(__file__).resolve().parents[2] / "scripts"
+
+
+def load(name):
+    specification = importlib.util.spec_from_file_location(name, SCRIPTS / f"{name}.py")
+    module = importlib.util.module_from_spec(specification)
+    specification.loader.exec_module(module)
+    return module
+
+
+def run(name, *files):
+    """What a script prints when it is given files with these texts."""
+    with tempfile.TemporaryDirectory() as folder:
+        paths = []
+        for number, text in enumerate(files):
+            paths.append(pathlib.Path(folder, str(number)))
+            paths[-1].write_text(text)
+        done = subprocess.run([sys.executable, "-B", SCRIPTS / f"{name}.py", *paths],
+                              capture_output=True, text=True, check=True)
+        return done.stdout
+
+
+class Behaviours(unittest.TestCase):
+    LISTING = """Running main() from test_main.cpp
+Client.
+  KeepsItsAnchor
+  TakesAnyName/0  # GetParam() = "a"
+Fakes/FileManager.
+  WritesAtomically/1  # GetParam() = 4-byte object
+Codec/0.  # TypeParam = int
+  RoundTrip
+"""
+
+    def setUp(self):
+        self.script = load("check_behaviours")
+        self.tests = self.script.program_tests(self.LISTING)
+
+    def problems(self, row):
+        table = f"| Behaviour | Tests |\n|---|---|\n{row}\n"
+        return self.script.problems(table, self.tests)[1]
+
+    def testInstancesCountAsOneTest(self):
+        self.assertEqual(self.tests, {"Client.KeepsItsAnchor", "Client.TakesAnyName",
+                                      "FileManager.WritesAtomically", "Codec.RoundTrip"})
+
+    def testNamedTestsMustExist(self):
+        self.assertEqual(self.problems("| It keeps its anchor. | `Client.KeepsItsAnchor` |"), [])
+        self.assertEqual(self.problems("| It flies. | `Client.KeepsItsAnchor`, `Client.Flies` |"),
+                         ["line 3: there is no test Client.Flies"])
+
+    def testEachBehaviourNeedsATest(self):
+        self.assertIn("without a test", self.problems("| It flies. | |")[0])
+
+    def testAnEmptyDocumentIsNoSuccess(self):
+        self.assertEqual(self.problems("no table"), ["it names no behaviour"])
+
+    def testPythonTestsAreFound(self):
+        names = set(self.script.python_tests(pathlib.Path(__file__)))
+        self.assertIn("test_scripts.py::Behaviours.testPythonTestsAreFound", names)
+
+
+class BenchTable(unittest.TestCase):
+    def report(self, *runs):
+        return json.dumps({"benchmarks": [
+            {"name": name, "run_name": name, "real_time": time, "time_unit": unit, **more}
+            for name, time, unit, more in runs]})
+
+    def testShowsEachBenchmarkBesideItsFloor(self):
+        table = run("bench_table", self.report(
+            ("change/100/real_time", 15, "us", {}), ("change_floor/100/real_time", 10000, "ns", {}),
+            ("change/1000", 99, "us", {}), ("alone", 4, "ms", {"floor_ratio": 2.0})))
+        rows = [line.split() for line in table.splitlines()]
+        self.assertEqual(rows, [["benchmark", "time", "floor", "ratio"],
+                                ["change/100", "15", "us", "10", "us", "1.50"],
+                                ["change/1000", "99", "us"],
+                                ["alone", "4", "ms", "2", "ms", "2.00"]])
+
+    def testTakesTheMedianOfRepetitions(self):
+        table = run("bench_table", self.report(
+            ("x", 1, "ns", {}), ("x", 9, "ns", {}),
+            ("x", 5, "ns", {"aggregate_name": "median"}), ("x", 3, "ns", {"aggregate_name": "stddev"})))
+        self.assertEqual(table.splitlines()[1].split(), ["x", "5", "ns"])
+
+
+class Totals(unittest.TestCase):
+    def testAddsUpReports(self):
+        one = '<testsuite tests="7" failures="2" disabled="1" skipped="1"/>'
+        two = '<testsuite tests="5" failures="0" disabled="0" skipped="0"/>'
+        self.assertEqual(run("test_totals", one, two), "8 passed, 2 failed\n")
+
+    def testNoReportIsNothingPassed(self):
+        self.assertEqual(run("test_totals"), "0 passed, 0 failed\n")
+
+
+if __name__ == "__main__":
+    unittest.main()
