@@ -205,6 +205,12 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   void _removeFailedPlaceholder(const SyncAsset& asset);
   void _copyIcon(const std::optional<FileLocation>& icon, const std::string& target);
   void _installPackage(const SyncAssetPtr& asset);
+  /// The result of the last application that was processed; false when none was.
+  bool _restoreApplications(const PropertyList::Dictionary& restoreList);
+  bool _installRestorePlaceholder(std::string_view bundleId,
+                                  const PropertyList::Dictionary& metadata,
+                                  const std::optional<Bytes>& iconData,
+                                  const PropertyList::Dictionary& options);
 
   const Platform _platform;
   const ClientLog _log;

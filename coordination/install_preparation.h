@@ -1,0 +1,61 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "client/apps_client.h"
+
+namespace appsync {
+
+/// Makes ready the coordinator that installs or updates one application: its options, its promises
+/// and the placeholder that stands for it. Works on one thread, for one run.
+class InstallPreparation {
+ public:
+  InstallPreparation(AppsClient& client, const Platform& platform, const ClientLog& log,
+                     const SyncAsset& asset, bool existingApp);
+
+  /// Whether the package may be sent. If not, what was begun has been cancelled.
+  bool run();
+
+ private:
+  bool prepare();
+  bool addInstallOptions();
+  bool addInitialAssetPromises();
+  bool addAppAssetPromise();
+  bool addPlaceholder();
+
+  /// Copies the asset's icon into the placeholder bundle.
+  void copyIcon(const std::string& bundlePath);
+  bool addIconPromise(const std::string& bundlePath);
+  /// Fills in the placeholder up to the first failure.
+  void configurePlaceholder();
+  bool setAttributes();
+  bool setStoreMetadata();
+  void setConfigurationComplete();
+
+  void cancel();
+
+  AppsClient& client_;
+  const Platform& platform_;
+  const ClientLog& log_;
+  const SyncAsset& asset_;
+  const bool existingApp_;
+  const std::string& bundleId_;
+  const PropertyList::Dictionary info_;
+  const PropertyList::Dictionary store_;
+  const std::optional<std::string> version_;
+
+  std::shared_ptr<InstallCoordinator> coordinator_;
+  std::shared_ptr<InstallPlaceholder> placeholder_;
+  /// The placeholder, when the coordinator did not take it.
+  std::shared_ptr<InstallPlaceholder> adrift_;
+  /// Empty when the coordinator had its options already.
+  StoreMetadata storeMetadata_;
+  std::uint64_t iconSize_ = 0;  ///< bytes
+  /// Of the step that failed last.
+  std::optional<Error> error_;
+};
+
+}  // namespace appsync
