@@ -7,7 +7,8 @@
     platform/                                          may include nothing of the others
 
 The plug-in and platform/ see no header but those of the C++ standard library. The one exception is
-the property-list codec, which alone may include libplist.
+the property-list codec, which alone may include libplist, and <locale.h> to shield it from the
+process's locale.
 
 usage: check_layers.py [ROOT]        exit 0: all is well, 1: violations, one per line
 """
@@ -25,6 +26,7 @@ MAY_INCLUDE = {folder: PLUGIN | {"platform"} for folder in PLUGIN} | {
 }
 STANDARD_ONLY = PLUGIN | {"platform"}
 PLIST_FILE = "platform/property_list_codec.cpp"
+PLIST_HEADERS = {"plist/plist.h", "locale.h"}
 
 STANDARD = set(
     """algorithm any array atomic barrier bit bitset charconv chrono codecvt compare complex concepts
@@ -63,8 +65,10 @@ def problem(path, header, quoted):
         return None
     if quoted:
         return "own headers are included as \"folder/name.h\""
-    if header == "plist/plist.h":
-        return None if path == PLIST_FILE else f"only {PLIST_FILE} may use libplist"
+    if path == PLIST_FILE and header in PLIST_HEADERS:
+        return None
+    if top == "plist":
+        return f"only {PLIST_FILE} may use libplist"
     if folder in STANDARD_ONLY and header not in STANDARD:
         return f"{folder}/ may use no header but those of the C++ standard library"
     return None
