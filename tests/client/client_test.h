@@ -1,0 +1,85 @@
+#pragma once
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <initializer_list>
+#include <optional>
+#include <source_location>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "client/apps_client.h"
+#include "tests/fakes/fake_platform.h"
+
+namespace appsync {
+
+// Places as the rest of the phone knows them.
+inline const std::string SyncRootPath = "/var/mobile/Library/ApplicationSync";
+inline const std::string WorkAreaPath = SyncRootPath + "/HalvoStuff";
+inline const std::string TodoListPath = WorkAreaPath + "/ApplicationsSync.plist";
+inline const std::string LastSyncStatePath = SyncRootPath + "/LastSyncAppState.plist";
+inline const std::string RestoreStatePath = SyncRootPath + "/RestoreState.plist";
+inline const std::string StagingRootPath = "/var/mobile/Media/PublicStaging";
+
+/// A phone in memory with one client on it. A test prepares `phone`, acts through `client()` and
+/// compares the trace.
+class ClientTest : public testing::Test {
+ protected:
+  using Array = PropertyList::Array;
+  using Dictionary = PropertyList::Dictionary;
+  using Lines = std::vector<std::string>;
+
+  /// Made by the first call; the trace begins after its construction.
+  AppsClient& client() {
+    if (!client_) {
+      client_.emplace(phone.platform());
+      forgetTrace();
+    }
+    return *client_;
+  }
+  void destroyClient() { client_.reset(); }
+
+  void forgetTrace() {
+    phone.trace.clear();
+    phone.log.clear();
+  }
+
+  /// Compares everything of these kinds since the last comparison, and forgets it.
+  void expectTrace(const Lines& expected, fakes::TraceKinds kinds = fakes::TraceEffects,
+                   std::source_location where = std::source_location::current()) {
+    const testing::ScopedTrace place(where.file_name(), static_cast<int>(where.line()), "trace");
+    EXPECT_THAT(phone.trace.readable(kinds), testing::ElementsAreArray(expected));
+    forgetTrace();
+  }
+
+  /// Puts a todo list there: identifier and operation of each entry.
+  void putTodo(std::initializer_list<std::pair<std::string, std::string>> entries) {
+    Array list;
+    for (const auto& [identifier, operation] : entries) {
+      list.push_back(Dictionary{{"identifier", identifier}, {"operation", operation}});
+    }
+    phone.files.putPlist(TodoListPath, list);
+  }
+
+  /// The operation of the identifier's first entry in the todo list as it stands in the file.
+  std::optional<std::string> todoOperation(std::string_view identifier) const {
+    const std::optional<PropertyList> list = phone.files.plistAt(TodoListPath);
+    if (!list || !list->asArray()) return std::nullopt;
+    for (const PropertyList& entry : *list->asArray()) {
+      if (!entry.asDictionary() || !entry.find("identifier")) continue;
+      if (*entry.find("identifier") != PropertyList(identifier)) continue;
+      const std::string* operation = findString(*entry.asDictionary(), "operation");
+      return operation ? std::optional(*operation) : std::nullopt;
+    }
+    return std::nullopt;
+  }
+
+  fakes::FakePlatform phone;
+
+ private:
+  std::optional<AppsClient> client_;
+};
+
+}  // namespace appsync
