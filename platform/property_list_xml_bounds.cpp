@@ -106,22 +106,22 @@ class XmlReader {
   }
 
   bool skipDocumentType() {
-    const std::size_t open = document_.find('[', at_);
-    if (!skipPast(">", 0, "the document type has no end")) return false;
-    return open >= at_ || fail("it declares entities of its own");
+    const char stop = seek("[>");
+    if (stop == '[') return fail("it declares entities of its own");
+    return stop ? skipPast(">", 0, "") : fail("the document type has no end");
   }
 
   /// Attributes say nothing here but a version, so only the plist element may have them.
   bool readTag(Tag& tag, bool mayHaveAttributes) {
     if (!startsWith("<"))
-      return fail(at_ == document_.size() ? "it is cut off" : "text in between");
+      return fail(at_ == document_.size() ? "it is cut off" : "text stands outside a value");
     ++at_;
     tag.closes = startsWith("/");
     if (tag.closes) ++at_;
     const std::size_t start = at_;
     while (at_ < document_.size() && isNameCharacter(document_[at_])) ++at_;
     tag.name = document_.substr(start, at_ - start);
-    if (mayHaveAttributes && !skipAttributes()) return false;
+    if (mayHaveAttributes && !seek("/>")) return fail("it is cut off");
     skipBlanks();
     tag.closesSelf = !tag.closes && startsWith("/");
     if (tag.closesSelf) ++at_;
@@ -130,13 +130,15 @@ class XmlReader {
     return true;
   }
 
-  bool skipAttributes() {
+  /// Moves to the first of `stops` that stands outside quotes; 0 when there is none.
+  char seek(std::string_view stops) {
+    const std::string wanted = "\"'" + std::string(stops);
     for (;;) {
-      at_ = std::min(document_.find_first_of("\"'/>", at_), document_.size());
-      if (at_ == document_.size()) return fail("it is cut off");
+      at_ = std::min(document_.find_first_of(wanted, at_), document_.size());
+      if (at_ == document_.size()) return 0;
       const char found = document_[at_];
-      if (found == '/' || found == '>') return true;
-      if (!skipPast(std::string_view(&found, 1), 1, "it is cut off")) return false;
+      if (stops.find(found) != stops.npos) return found;
+      if (!skipPast(std::string_view(&found, 1), 1, "")) return 0;
     }
   }
 
