@@ -157,7 +157,7 @@ PropertyList::PropertyList(PropertyList&& other) noexcept = default;
 PropertyList& PropertyList::operator=(const PropertyList& other) = default;
 PropertyList& PropertyList::operator=(PropertyList&& other) noexcept = default;
 PropertyList::~PropertyList() = default;
-bool PropertyList::operator==(const PropertyList& other) const = default;
+bool PropertyList::operator==(const PropertyList& other) const { return value_ == other.value_; }
 
 PropertyList::PropertyList(std::uint64_t value) {
   // One representation per number, so that equality compares numbers.
