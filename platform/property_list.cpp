@@ -12,11 +12,6 @@ namespace {
 
 constexpr std::size_t ShownDataBytes = 16;
 
-template <class... Handlers>
-struct Overloaded : Handlers... {
-  using Handlers::operator()...;
-};
-
 template <class Number>
 void appendNumber(std::string& out, Number number) {
   std::array<char, 32> buffer;
@@ -169,15 +164,12 @@ PropertyList::PropertyList(std::uint64_t value) {
 }
 
 PropertyList::Type PropertyList::type() const {
-  return std::visit(
-      Overloaded{[](std::monostate) { return Type::Null; }, [](bool) { return Type::Boolean; },
-                 [](std::int64_t) { return Type::Integer; },
-                 [](std::uint64_t) { return Type::Integer; }, [](double) { return Type::Real; },
-                 [](const std::string&) { return Type::String; },
-                 [](const Data&) { return Type::Data; }, [](const Date&) { return Type::Date; },
-                 [](const Array&) { return Type::Array; },
-                 [](const Dictionary&) { return Type::Dictionary; }},
-      value_);
+  // In the order of the variant, which has two alternatives for integers.
+  static constexpr std::array types = {Type::Null,  Type::Boolean,   Type::Integer, Type::Integer,
+                                       Type::Real,  Type::String,    Type::Data,    Type::Date,
+                                       Type::Array, Type::Dictionary};
+  static_assert(types.size() == std::variant_size_v<decltype(value_)>);
+  return types[value_.index()];
 }
 
 std::optional<bool> PropertyList::asBoolean() const {
