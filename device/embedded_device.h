@@ -69,7 +69,8 @@ class FileReceiver {
   virtual bool finish(std::optional<Error>* error) noexcept = 0;
 };
 
-/// Told of things that a person watching the device would see, on the device's own threads.
+/// Told of things that a person watching the device would see, on the threads that bring them
+/// about and before the call that does so returns. Must not replace the watcher.
 class DeviceWatcher {
  public:
   virtual ~DeviceWatcher() = default;
@@ -128,6 +129,12 @@ class EmbeddedDevice {
   virtual bool uninstall(std::string_view bundleId, std::optional<Error>* error) noexcept = 0;
   virtual bool setPolicy(PolicySetting setting, PolicyValue value,
                          std::optional<Error>* error) noexcept = 0;
+
+  /// Puts an application on the device that comes with the system: kind BundleKind::System, not to
+  /// be uninstalled.
+  virtual bool addSystemApplication(std::string_view bundleId, std::string_view displayName,
+                                    std::string_view version,
+                                    std::optional<Error>* error) noexcept = 0;
 
   // Bringing an application to the foreground and ending it need no device lock, so that a person
   // can do both while a sync runs in another process.

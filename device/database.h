@@ -1,0 +1,108 @@
+#pragma once
+
+#include <SQLiteCpp/SQLiteCpp.h>
+
+#include <concepts>
+#include <functional>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <type_traits>
+
+#include "platform/bytes.h"
+#include "platform/error.h"
+#include "platform/log.h"
+
+namespace appsync::device {
+
+/// A prepared statement with its arguments. Throws SQLite::Exception; used within Database's work.
+class Query {
+ public:
+  template <typename... Arguments>
+  Query(SQLite::Database& database, const char* sql, const Arguments&... arguments)
+      : statement_(database, sql) {
+    int index = 0;
+    (bind(++index, arguments), ...);
+  }
+
+  /// Steps to the next row; false when there is none.
+  bool next() { return statement_.executeStep(); }
+  /// Runs a statement that gives no rows; the number of rows it changed.
+  int run() { return statement_.exec(); }
+
+  // Columns of the current row, from 0.
+  std::int64_t integer(int column) const { return statement_.getColumn(column).getInt64(); }
+  bool boolean(int column) const { return integer(column) != 0; }
+  double real(int column) const { return statement_.getColumn(column).getDouble(); }
+  std::string text(int column) const { return statement_.getColumn(column).getString(); }
+  std::optional<std::string> optionalText(int column) const;
+  std::optional<Bytes> optionalBytes(int column) const;
+  bool isNull(int column) const { return statement_.getColumn(column).isNull(); }
+  template <typename Enumeration>
+  Enumeration as(int column) const {
+    return static_cast<Enumeration>(integer(column));
+  }
+
+ private:
+  void bind(int index, std::nullopt_t) { statement_.bind(index); }
+  void bind(int index, std::string_view text) { statement_.bind(index, std::string(text)); }
+  void bind(int index, const char* text) { bind(index, std::string_view(text)); }
+  void bind(int index, const std::string& text) { statement_.bind(index, text); }
+  void bind(int index, double value) { statement_.bind(index, value); }
+  void bind(int index, const Bytes& bytes) {
+    statement_.bind(index, bytes.data(), static_cast<int>(bytes.size()));
+  }
+  template <typename Number>
+  requires std::integral<Number> || std::is_enum_v<Number>
+  void bind(int index, Number value) { statement_.bind(index, static_cast<std::int64_t>(value)); }
+  template <typename Value>
+  void bind(int index, const std::optional<Value>& value) {
+    value ? bind(index, *value) : bind(index, std::nullopt);
+  }
+
+  mutable SQLite::Statement statement_;
+};
+
+/// Thrown by work to roll it back and give its caller this error.
+struct Refused {
+  Error error;
+};
+
+/// The connection to a device's database. Thread-safe: one piece of work runs at a time, so work
+/// must not call back into the database. Failures are logged and become errors; nothing throws.
+class Database {
+ public:
+  using Work = std::function<void(SQLite::Database&)>;
+
+  enum class Commit {
+    Ordinary,  ///< survives the end of the process; a power failure may undo the last changes
+    OnDisk     ///< on disk when the call returns, with all changes before it
+  };
+
+  Database(SQLite::Database connection, bool writable, Log& log)
+      : connection_(std::move(connection)), writable_(writable), log_(log) {}
+
+  bool writable() const { return writable_; }
+
+  /// `purpose` names the work in the log: "the policies could not be read".
+  bool read(std::string_view purpose, const Work& work,
+            std::optional<Error>* error = nullptr) noexcept;
+  /// Runs the work in one transaction.
+  bool change(std::string_view purpose, Commit commit, const Work& work,
+              std::optional<Error>* error = nullptr) noexcept;
+
+ private:
+  bool attempt(std::string_view purpose, const std::function<void()>& work,
+               std::optional<Error>* error) noexcept;
+
+  std::mutex mutex_;
+  SQLite::Database connection_;
+  const bool writable_;
+  Log& log_;
+};
+
+/// The system's error number that says best what SQLite found, with SQLite's text.
+Error errorOf(const SQLite::Exception& exception);
+
+}  // namespace appsync::device

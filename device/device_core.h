@@ -1,0 +1,23 @@
+#pragma once
+
+#include "device/containers.h"
+#include "device/database.h"
+#include "device/keyed_mutex.h"
+#include "device/registry_observers.h"
+#include "device/watcher_slot.h"
+
+namespace appsync::device {
+
+/// What the device's services share; all of it outlives them.
+struct DeviceCore {
+  Database& database;
+  FileManager& files;            ///< every change of the phone's files goes through it
+  ConfinedFileManager& handles;  ///< opens files of the same phone
+  Containers& containers;
+  Log& log;
+  RegistryObservers& observers;
+  WatcherSlot& watcher;
+  KeyedMutex& applicationLocks;  ///< held by what installs or removes an application
+};
+
+}  // namespace appsync::device

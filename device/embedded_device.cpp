@@ -1,0 +1,271 @@
+#include "device/embedded_device.h"
+
+#include <fmt/format.h>
+
+#include <cerrno>
+
+#include "device/app_registry.h"
+#include "device/application_rows.h"
+#include "device/background_queue.h"
+#include "device/backup_manager.h"
+#include "device/device_folder.h"
+#include "device/device_policy.h"
+#include "device/file_receiver.h"
+#include "device/foreground.h"
+#include "device/home_screen.h"
+#include "device/identifiers.h"
+#include "device/installer_service.h"
+#include "device/installs.h"
+#include "device/log_files.h"
+#include "device/no_coordination.h"
+#include "device/recovery.h"
+#include "device/schema.h"
+#include "device/system_notifier.h"
+#include "device/transaction_log.h"
+
+#if __has_include("device/icon_renderer.h") && __has_include("device/image_encoder.h")
+#include "device/icon_renderer.h"
+#include "device/image_encoder.h"
+#else  // until the renderer is in the tree
+namespace appsync::device {
+struct DeviceIconRenderer final : IconRenderer {
+  explicit DeviceIconRenderer(FileManager&) {}
+  std::optional<Image> renderHomeScreenIcon(const Bundle&) noexcept override { return {}; }
+};
+struct PngEncoderService final : ImageEncoderService {
+  std::unique_ptr<ImageEncoder> create(Bytes&, std::string_view, std::size_t) noexcept override {
+    return nullptr;
+  }
+};
+}  // namespace appsync::device
+#endif
+
+namespace appsync::device {
+namespace {
+
+/// A folder that has been found to be a device, open. `lock` is there only for writing.
+struct OpenFolder {
+  DevicePaths paths;
+  std::unique_ptr<WriteLock> lock;
+  std::unique_ptr<LogFiles> log;
+  std::unique_ptr<Database> database;
+};
+
+std::optional<OpenFolder> openFolder(const std::filesystem::path& folder, Access access,
+                                     DeviceError& error) {
+  OpenFolder opened{DevicePaths(folder), nullptr, nullptr, nullptr};
+  const DevicePaths& paths = opened.paths;
+  if (!checkDeviceFolder(paths, error)) return std::nullopt;
+  if (access == Access::Write) {
+    opened.lock = WriteLock::take(paths, error);
+    if (!opened.lock) return std::nullopt;
+  }
+  opened.log = std::make_unique<LogFiles>(paths.log, access == Access::Write);
+  opened.database = openDatabase(paths.folder, paths.database, access, *opened.log, error);
+  if (!opened.database) return std::nullopt;
+  if (!std::filesystem::is_directory(paths.root)) {
+    error = damagedDevice(paths.folder, "its files are missing");
+    return std::nullopt;
+  }
+  return opened;
+}
+
+class FolderDevice final : public EmbeddedDevice {
+ public:
+  explicit FolderDevice(OpenFolder opened)
+      : paths_(std::move(opened.paths)),
+        lock_(std::move(opened.lock)),
+        log_(std::move(opened.log)),
+        database_(std::move(opened.database)),
+        files_(paths_.root),
+        foreground_(paths_.foreground) {
+    if (database_->writable()) finishInterruptedWork(core_, foreground_);
+  }
+
+  bool isUsable() const { return files_.isOpen(); }
+
+  Platform platform(SyncHost& host) noexcept override {
+    return {*log_,          files_,    registry_,   coordination_, installerService_,
+            backupManager_, policy_,   homeScreen_, iconRenderer_, imageEncoders_,
+            transactions_,  notifier_, host,        queue_};
+  }
+
+  FileManager& files() noexcept override { return files_; }
+  AppRegistry& appRegistry() noexcept override { return registry_; }
+  SystemNotifier& systemNotifier() noexcept override { return notifier_; }
+  HomeScreenService& homeScreen() noexcept override { return homeScreen_; }
+  Log& log() noexcept override { return *log_; }
+
+  std::unique_ptr<FileReceiver> receiveFile(std::string_view path,
+                                            std::optional<Error>* error) noexcept override {
+    if (database_->writable()) return receiveInto(files_, path, error);
+    setError(error, Error::posix(EROFS, path));
+    return nullptr;
+  }
+
+  void setWatcher(DeviceWatcher* watcher) noexcept override { watcher_.set(watcher); }
+
+  void hurry() noexcept override {
+    homeScreen_.refuseAssertions();
+    queue_.expedite();
+  }
+
+  bool uninstall(std::string_view bundleId, std::optional<Error>* error) noexcept override {
+    if (!registry_.removeApplication(bundleId, error)) return false;
+    return foreground_.quit(std::string(bundleId), error);
+  }
+
+  bool setPolicy(PolicySetting setting, PolicyValue value,
+                 std::optional<Error>* error) noexcept override {
+    return policy_.set(setting, value, error);
+  }
+
+  bool addSystemApplication(std::string_view bundleId, std::string_view displayName,
+                            std::string_view version,
+                            std::optional<Error>* error) noexcept override {
+    return registry_.addSystemApplication(bundleId, displayName, version, error);
+  }
+
+  DeviceOptions options() noexcept override {
+    DeviceOptions options;
+    database_->read("the device's options could not be read", [&](SQLite::Database& database) {
+      Query query(database, "SELECT value FROM settings WHERE key = 'coordination'");
+      options.coordination = query.next() && query.boolean(0);
+    });
+    return options;
+  }
+
+  std::vector<AppRecord> applications() noexcept override { return registry_.records(); }
+
+  PolicyValue policy(PolicySetting setting) noexcept override {
+    return policy_.effectiveBoolValue(setting);
+  }
+
+  std::vector<std::string> foregroundApplications() noexcept override {
+    return foreground_.running();
+  }
+
+  std::vector<std::string> uninstalledApplications() noexcept override {
+    std::vector<std::string> identifiers;
+    const auto uninstalled = installerService_.lookupUninstalled();
+    if (!uninstalled) return identifiers;
+    for (const auto& [identifier, details] : *uninstalled) identifiers.push_back(identifier);
+    return identifiers;
+  }
+
+  std::vector<std::string> homeScreenOrder() noexcept override { return homeScreen_.order(); }
+
+  std::vector<TransactionRecord> transactions(std::int64_t afterNumber) noexcept override {
+    return transactions_.recordsAfter(afterNumber);
+  }
+
+  void readLog(const std::function<void(const LogLine&)>& visitor) noexcept override {
+    log_->read(visitor);
+  }
+
+ private:
+  // In the order in which they need one another: what works on threads of its own goes first.
+  const DevicePaths paths_;
+  const std::unique_ptr<WriteLock> lock_;
+  const std::unique_ptr<LogFiles> log_;
+  const std::unique_ptr<Database> database_;
+  ConfinedFileManager files_;
+  Foreground foreground_;
+  Containers containers_{files_, files_, *log_};
+  WatcherSlot watcher_;
+  KeyedMutex applicationLocks_;
+  RegistryObservers observers_{[this] { return reportInstalls(*database_); }};
+  DeviceCore core_{*database_, files_,     files_,   containers_,
+                   *log_,      observers_, watcher_, applicationLocks_};
+  DeviceAppRegistry registry_{core_};
+  DeviceInstallerService installerService_{*database_};
+  DeviceBackupManager backupManager_{core_};
+  StoredDevicePolicy policy_{*database_};
+  StoredTransactionLog transactions_{*database_};
+  DeviceHomeScreen homeScreen_{core_, foreground_};
+  DeviceIconRenderer iconRenderer_{files_};
+  PngEncoderService imageEncoders_;
+  LocalNotifier notifier_;
+  ThreadBackgroundQueue queue_;
+  NoCoordination coordination_{queue_};
+};
+
+DeviceError unusable(const std::filesystem::path& folder, std::string_view reason) {
+  return deviceError(DeviceProblem::Unusable, folder, reason,
+                     "check the permissions of the folder and the free space");
+}
+
+/// Why a person cannot bring the application to the foreground; none if they can.
+std::optional<Error> objectionToLaunch(Database& database, std::string_view bundleId) {
+  ApplicationRows rows;
+  std::optional<Error> error;
+  const bool read = database.read(
+      "the registry could not be read",
+      [&](SQLite::Database& connection) { rows = findApplication(connection, bundleId); }, &error);
+  if (!read) return error;
+  const auto refuse = [&](int code, std::string_view reason) {
+    return Error::withDescription(POSIXErrorDomain, code, fmt::format("{} {}", bundleId, reason));
+  };
+  if (!rows.any()) return refuse(ENOENT, "is not installed");
+  if (!rows.installed) return refuse(ENOENT, "is not installed yet");
+  if (rows.installed->launchProhibited) return refuse(EPERM, "may not be launched");
+  return std::nullopt;
+}
+
+}  // namespace
+
+bool EmbeddedDevice::initialize(const std::filesystem::path& folder, const DeviceOptions& options,
+                                DeviceError& error) noexcept {
+  try {
+    return makeDeviceFolder(DevicePaths(folder), options, error);
+  } catch (const std::exception& failure) {
+    error = unusable(folder, failure.what());
+    return false;
+  }
+}
+
+std::unique_ptr<EmbeddedDevice> EmbeddedDevice::open(const std::filesystem::path& folder,
+                                                     Access access, DeviceError& error) noexcept {
+  try {
+    std::optional<OpenFolder> opened = openFolder(folder, access, error);
+    if (!opened) return nullptr;
+    auto device = std::make_unique<FolderDevice>(std::move(*opened));
+    if (device->isUsable()) return device;
+    error = unusable(folder, "its files cannot be opened");
+  } catch (const std::exception& failure) {
+    error = unusable(folder, failure.what());
+  }
+  return nullptr;
+}
+
+bool EmbeddedDevice::launch(const std::filesystem::path& folder, std::string_view bundleId,
+                            DeviceError& deviceError, std::optional<Error>* error) noexcept {
+  try {
+    const std::optional<OpenFolder> opened = openFolder(folder, Access::ReadOnly, deviceError);
+    if (!opened) return false;
+    const auto objection = [&] { return objectionToLaunch(*opened->database, bundleId); };
+    if (isUsableIdentifier(bundleId)) {
+      return Foreground(opened->paths.foreground).launch(std::string(bundleId), objection, error);
+    }
+    if (error) *error = objection();
+  } catch (const std::exception& failure) {
+    deviceError = unusable(folder, failure.what());
+  }
+  return false;
+}
+
+bool EmbeddedDevice::quit(const std::filesystem::path& folder, std::string_view bundleId,
+                          DeviceError& deviceError, std::optional<Error>* error) noexcept {
+  try {
+    const std::optional<OpenFolder> opened = openFolder(folder, Access::ReadOnly, deviceError);
+    if (!opened) return false;
+    // What no application can be called does not run.
+    return !isUsableIdentifier(bundleId) ||
+           Foreground(opened->paths.foreground).quit(std::string(bundleId), error);
+  } catch (const std::exception& failure) {
+    deviceError = unusable(folder, failure.what());
+  }
+  return false;
+}
+
+}  // namespace appsync::device

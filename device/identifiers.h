@@ -1,0 +1,11 @@
+#pragma once
+
+#include <string_view>
+
+namespace appsync::device {
+
+/// Whether a bundle identifier from outside may become the name of a file or directory: letters,
+/// digits, '.', '_' and '-', at least one of them a letter or digit, at most 200 bytes.
+bool isUsableIdentifier(std::string_view identifier);
+
+}  // namespace appsync::device

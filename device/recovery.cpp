@@ -1,0 +1,108 @@
+#include "device/recovery.h"
+
+#include <fmt/format.h>
+
+#include <cerrno>
+#include <set>
+
+#include "device/application_rows.h"
+#include "device/installs.h"
+#include "device/removal.h"
+
+namespace appsync::device {
+namespace {
+
+void note(DeviceCore& core, std::string_view text) {
+  core.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default, text);
+}
+
+std::vector<ApplicationRow> readRows(DeviceCore& core, bool& read) {
+  std::vector<ApplicationRow> rows;
+  read = core.database.read("the registry could not be read",
+                            [&](SQLite::Database& database) { rows = allApplications(database); });
+  return rows;
+}
+
+/// Only what is known to be missing counts: a bundle that cannot be looked at is left alone.
+bool isGone(DeviceCore& core, const ApplicationRow& row) {
+  std::optional<Error> error;
+  if (core.files.attributesOfItem(joinPath(row.bundlePath(), "Info.plist"), &error)) return false;
+  return error && error->domain == POSIXErrorDomain && error->code == ENOENT;
+}
+
+/// The rows that remain.
+std::vector<ApplicationRow> dropRowsWithoutBundle(DeviceCore& core,
+                                                  std::vector<ApplicationRow> rows) {
+  std::vector<ApplicationRow> gone;
+  std::erase_if(rows, [&](const ApplicationRow& row) {
+    const bool isMissing = isGone(core, row);
+    if (isMissing) gone.push_back(row);
+    return isMissing;
+  });
+  for (const ApplicationRow& row : gone) {
+    note(core, fmt::format("{} is dropped from the registry: {} is gone", row.identifier,
+                           row.bundlePath()));
+    core.database.change("a row without a bundle could not be dropped", Database::Commit::Ordinary,
+                         [&](SQLite::Database& database) { eraseApplication(database, row); });
+  }
+  return rows;
+}
+
+void removeUnnamedContainers(DeviceCore& core, const std::vector<ApplicationRow>& rows) {
+  std::set<std::string> named;
+  for (const ApplicationRow& row : rows) named.insert(row.container);
+  for (const std::string& container : core.containers.list()) {
+    if (named.contains(container)) continue;
+    note(core, fmt::format("{} is removed: nothing in the registry names it", container));
+    core.containers.remove(container);
+  }
+}
+
+void removeAllAbandonedData(DeviceCore& core) {
+  std::vector<std::string> identifiers;
+  core.database.read("the list of abandoned data could not be read",
+                     [&](SQLite::Database& database) {
+                       Query query(database, "SELECT identifier FROM abandoned_data");
+                       while (query.next()) identifiers.push_back(query.text(0));
+                     });
+  for (const std::string& identifier : identifiers) removeAbandonedData(core, identifier, nullptr);
+}
+
+void pauseInstalls(DeviceCore& core) {
+  core.database.change("the installs under way could not be paused", Database::Commit::Ordinary,
+                       [](SQLite::Database& database) {
+                         Query(database,
+                               "DELETE FROM installs WHERE over OR identifier NOT IN "
+                               "(SELECT identifier FROM applications WHERE placeholder)")
+                             .run();
+                         Query(database, "UPDATE installs SET state = ? WHERE state IN (?, ?)",
+                               InstallState::Paused, InstallState::Waiting, InstallState::Active)
+                             .run();
+                       });
+}
+
+void clearForeground(const Foreground& foreground, const std::vector<ApplicationRow>& rows) {
+  foreground.sweep();
+  std::set<std::string_view> installed;
+  for (const ApplicationRow& row : rows) {
+    if (!row.placeholder) installed.insert(row.identifier);
+  }
+  for (const std::string& identifier : foreground.running()) {
+    if (!installed.contains(identifier)) foreground.quit(identifier, nullptr);
+  }
+}
+
+}  // namespace
+
+void finishInterruptedWork(DeviceCore& core, Foreground& foreground) {
+  bool read = false;
+  std::vector<ApplicationRow> rows = readRows(core, read);
+  if (!read) return;  // nothing is removed on the word of a registry that cannot be read
+  rows = dropRowsWithoutBundle(core, std::move(rows));
+  removeUnnamedContainers(core, rows);
+  removeAllAbandonedData(core);
+  pauseInstalls(core);
+  clearForeground(foreground, rows);
+}
+
+}  // namespace appsync::device

@@ -1,0 +1,16 @@
+#pragma once
+
+#include "device/device_core.h"
+#include "device/foreground.h"
+
+namespace appsync::device {
+
+/// Finishes what a killed process left of a device that has just been opened for writing:
+/// - rows of the registry whose bundle is gone are dropped,
+/// - containers that no row names are removed, and data of applications that were being removed,
+/// - installs under way are paused, since nobody carries them on: their placeholders stand and
+///   whoever brings the package sets them going again; those without a placeholder are forgotten,
+/// - what killed processes held or left in the foreground is released.
+void finishInterruptedWork(DeviceCore& core, Foreground& foreground);
+
+}  // namespace appsync::device
