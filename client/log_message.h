@@ -156,7 +156,9 @@ std::string logMessage(LogFormat<Args...> format, const Args&... args) {
 class ClientLog {
  public:
   ClientLog(Log& log, std::string_view pluginIdentifier)
-      : log_(log), prefix_(std::string(pluginIdentifier) + "|") {}
+      : log_(log), prefix_(pluginIdentifier) {
+    prefix_ += '|';
+  }
 
   void write(LogLevel level, std::string_view message) const {
     log_.write(LogChannel::TWLogCategorySyncBundle, level, prefix_ + std::string(message));
