@@ -1,0 +1,179 @@
+// One platform call after another refuses while an install is prepared.
+
+#include "tests/coordination/install_trace.h"
+
+namespace appsync::fakes {
+namespace {
+
+/// Beginning at this line of a run without faults, the whole trace is another.
+struct FaultCase {
+  const char* name;
+  const char* operation;
+  unsigned call;
+  const char* firstLineLost;
+  bool prepared;
+  Trace instead;
+};
+
+void PrintTo(const FaultCase& fault, std::ostream* out) { *out << fault.operation; }
+
+/// The good run's lines from the one that begins so.
+Trace onwards(std::string_view beginning) {
+  Trace tail = preparedInstall();
+  const Trace head = upTo(tail, beginning);
+  tail.erase(tail.begin(), tail.begin() + static_cast<std::ptrdiff_t>(head.size()));
+  return tail;
+}
+
+Trace without(Trace trace, std::string_view beginning, std::size_t count) {
+  const auto first = trace.begin() + static_cast<std::ptrdiff_t>(upTo(trace, beginning).size());
+  trace.erase(first, first + static_cast<std::ptrdiff_t>(count));
+  return trace;
+}
+
+/// The placeholder is handed over; the preparation succeeds although a step left an error.
+Trace handedOver(const std::string& error) {
+  return {"InstallCoordinator.setPlaceholderPromise(com.a, <Placeholder com.a>)",
+          said("added placeholder promise to coordinator for com.a"),
+          said("processing app install for bundle com.a finished with status 1 error " + error),
+          R"(transaction step 1 party 1 phase 2 ok com.a "Install app")"};
+}
+
+const Trace PlaceholderOnwards = onwards("transaction step 4 party 1 phase 1");
+/// The same without the five lines of the icon's promise.
+const Trace PlaceholderWithoutIcon =
+    without(PlaceholderOnwards, "InstallCoordination.createPathTransferPromise", 5);
+
+const FaultCase FaultCases[] = {
+    {"ARefusedCoordinatorEndsItWithNothingToCancel", "InstallCoordination.coordinatorFor", 1,
+     "InstallCoordination.coordinatorFor", false,
+     joined({{"fault InstallCoordination.coordinatorFor(com.a)",
+              R"(transaction step 3 party 1 phase 2 failed com.a "Finished creating coordinator")"},
+             installGivenUp("Error Domain=Fault Code=7")})},
+    {"RefusedInstallOptionsCancelTheCoordinator", "InstallCoordinator.setInstallOptions", 1,
+     "InstallCoordinator.setInstallOptions", false,
+     joined({{"fault InstallCoordinator.setInstallOptions(com.a)",
+              complained("Error Error Domain=Fault Code=7 setting install options on coordinator "
+                         "for 'com.a'")},
+             installGivenUp("Error Domain=Fault Code=7"),
+             installCoordinatorCancelled()})},
+    {"RefusedInitialPromisesCancelTheCoordinator", "InstallCoordinator.setInitialQPKAssetPromises",
+     1, "InstallCoordinator.setInitialQPKAssetPromises", false,
+     joined({{"fault InstallCoordinator.setInitialQPKAssetPromises(com.a)",
+              complained("Error Error Domain=Fault Code=7 setting QPK asset promise for 'com.a'")},
+             installGivenUp("Error Domain=Fault Code=7"),
+             installCoordinatorCancelled()})},
+    {"AMissingAssetPromiseCancelsTheCoordinator", "InstallCoordination.createPathTransferPromise",
+     1, "InstallCoordination.createPathTransferPromise(com.a-Asset", false,
+     joined({{"fault InstallCoordination.createPathTransferPromise(com.a-Asset)",
+              complained("Error creating asset promise for 'com.a'")},
+             installGivenUp("(null)"),
+             installCoordinatorCancelled()})},
+    {"ARefusedAssetPromiseIsCancelledWithTheCoordinator", "InstallCoordinator.setAppAssetPromise",
+     1, "InstallCoordinator.setAppAssetPromise", false,
+     joined({{"fault InstallCoordinator.setAppAssetPromise(com.a)",
+              complained(
+                  "Error Error Domain=Fault Code=7 adding app asset promise at (null) to 'com.a'"),
+              complained("Cancelling asset promise for 'com.a'"),
+              "DataPromise.cancel(com.a-Asset, Error Domain=TWError Code=30, 3)"},
+             installGivenUp("(null)"),
+             installCoordinatorCancelled()})},
+    {"AMissingDirectoryOnlyCostsTheIcon", "FileManager.createDirectory", 1,
+     "FileManager.createDirectory", true,
+     joined({{"fault FileManager.createDirectory(/tmp/com.corvane.twc.Apps/com.a.app)",
+              R"(transaction scenario "Halvo App Restore" failed com.a )"
+              R"("Failed to create app directory")",
+              said("Created app directory for 'com.a' at /tmp/com.corvane.twc.Apps/com.a.app with "
+                   "err=Error Domain=Fault Code=7")},
+             PlaceholderWithoutIcon})},
+    {"AnIconThatCannotBeCopiedIsDoneWithout", "FileManager.copyItem", 1, "FileManager.copyItem",
+     true,
+     joined(
+         {{"fault FileManager.copyItem(/icons/com.a.png)",
+           said("Copied icon from /icons/com.a.png to "
+                "/tmp/com.corvane.twc.Apps/com.a.app/Icon.png with error Error Domain=Fault Code=7"
+                " for 'com.a', sizeOnDisk:0"),
+           R"(transaction step 5 party 1 phase 2 ok com.a "Copying icon")"},
+          PlaceholderWithoutIcon})},
+    {"AnIconOfUnknownSizeIsNotPromised", "FileManager.attributesOfItem", 1,
+     "log default SyncBundle|icon for com.a", true,
+     joined({{"fault FileManager.attributesOfItem(/tmp/com.corvane.twc.Apps/com.a.app/Icon.png)",
+              said("icon for com.a at /tmp/com.corvane.twc.Apps/com.a.app/Icon.png has a size of "
+                   "0"),
+              said("Copied icon from /icons/com.a.png to "
+                   "/tmp/com.corvane.twc.Apps/com.a.app/Icon.png with error (null) for 'com.a', "
+                   "sizeOnDisk:0"),
+              R"(transaction step 5 party 1 phase 2 ok com.a "Copying icon")"},
+             PlaceholderWithoutIcon})},
+    {"WithoutAPlaceholderNoneIsHandedOverAndThatIsRefused",
+     "InstallCoordination.createAppPlaceholder", 1, "InstallCoordination.createAppPlaceholder",
+     false,
+     joined({{"fault InstallCoordination.createAppPlaceholder(com.a)",
+              said("Created placeholder (null) for 'com.a' of type 4"),
+              R"(transaction step 4 party 1 phase 2 failed com.a "Finished creating placeholder")",
+              "InstallCoordinator.setPlaceholderPromise(com.a, none)",
+              complained("Error " + description(Error::posix(22)) +
+                         " adding placeholder promise to coordinator for 'com.a'")},
+             installGivenUp(description(Error::posix(22))),
+             installCoordinatorCancelled()})},
+    {"WithoutAnIconPromiseThePlaceholderGoesUnconfigured",
+     "InstallCoordination.createPathTransferPromise", 2,
+     "InstallCoordination.createPathTransferPromise(com.a-Icon", true,
+     joined({{"fault InstallCoordination.createPathTransferPromise(com.a-Icon)"},
+             handedOver("(null)")})},
+    {"ARefusedIconPromiseIsCancelledAndThePlaceholderGoesUnconfigured",
+     "InstallPlaceholder.setIconPromise", 1, "InstallPlaceholder.setIconPromise", true,
+     joined({{"fault InstallPlaceholder.setIconPromise(com.a)",
+              complained(
+                  "Error Error Domain=Fault Code=7 adding icon promise to placeholder for 'com.a'"),
+              "DataPromise.cancel(com.a-Icon, Error Domain=TWError Code=30, 3)"},
+             handedOver("(null)")})},
+    {"RefusedAttributesLeaveThePlaceholderUnfinished",
+     "InstallPlaceholder.setPlaceholderAttributes", 1,
+     "InstallPlaceholder.setPlaceholderAttributes", true,
+     joined({{"fault InstallPlaceholder.setPlaceholderAttributes(com.a)",
+              complained(
+                  "Error Error Domain=Fault Code=7 setting attributes on placeholder for 'com.a'")},
+             handedOver("Error Domain=Fault Code=7")})},
+    {"RefusedMetadataLeaveThePlaceholderUnfinished", "InstallPlaceholder.setMetadata", 1,
+     "InstallPlaceholder.setMetadata", true,
+     joined({{"fault InstallPlaceholder.setMetadata(com.a)",
+              complained("Error Error Domain=Fault Code=7 setting store metadata on placeholder "
+                         "for 'com.a'")},
+             handedOver("Error Domain=Fault Code=7")})},
+    {"ARefusedCompletionLeavesThePlaceholderUnfinished",
+     "InstallPlaceholder.setConfigurationComplete", 1,
+     "InstallPlaceholder.setConfigurationComplete", true,
+     joined({{"fault InstallPlaceholder.setConfigurationComplete(com.a)",
+              complained("Error Error Domain=Fault Code=7"
+                         " setting placeholder configuration as complete for 'com.a'")},
+             handedOver("Error Domain=Fault Code=7")})},
+    {"ARefusedPlaceholderIsCancelledBeforeTheCoordinator",
+     "InstallCoordinator.setPlaceholderPromise", 1, "InstallCoordinator.setPlaceholderPromise",
+     false,
+     joined({{"fault InstallCoordinator.setPlaceholderPromise(com.a)",
+              complained("Error Error Domain=Fault Code=7 adding placeholder promise to "
+                         "coordinator for 'com.a'")},
+             installGivenUp("Error Domain=Fault Code=7"),
+             {said("Cancelling placeholder for appBundleIdentifier:com.a"),
+              "InstallPlaceholder.cancel(com.a, Error Domain=TWError Code=1, 3)"},
+             installCoordinatorCancelled()})},
+};
+
+class InstallFaultTest : public CoordinationTest, public testing::WithParamInterface<FaultCase> {};
+
+TEST_P(InstallFaultTest, LeavesItsWholeTrace) {
+  const FaultCase& fault = GetParam();
+  const SyncAssetPtr asset = syncedAsset(phone);
+  phone.faults.failCall(fault.operation, fault.call, Refused);
+
+  EXPECT_EQ(client->prepareAppForInstallUsingCoordination(asset, false), fault.prepared);
+
+  EXPECT_EQ(effects(), joined({upTo(preparedInstall(), fault.firstLineLost), fault.instead}));
+}
+
+INSTANTIATE_TEST_SUITE_P(OneRefusal, InstallFaultTest, testing::ValuesIn(FaultCases),
+                         [](const auto& given) { return std::string(given.param.name); });
+
+}  // namespace
+}  // namespace appsync::fakes
