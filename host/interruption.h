@@ -1,0 +1,43 @@
+#pragma once
+
+#include <atomic>
+#include <functional>
+#include <mutex>
+#include <thread>
+
+namespace appsync::host {
+
+/// The person's wish to end early. Asked from any thread.
+class Interruption {
+ public:
+  bool requested() const noexcept { return requested_; }
+  /// Only the first request counts. Runs the listener before it returns.
+  void request();
+
+  /// What is to happen at once when the wish comes; an empty function for nothing. When this
+  /// returns, the old listener is not running and never will.
+  void setListener(std::function<void()> listener);
+
+ private:
+  std::atomic<bool> requested_{false};
+  std::mutex mutex_;
+  std::function<void()> listener_;
+};
+
+/// Turns the first SIGINT or SIGTERM into a request; the second ends the process with code 130 at
+/// once. One at a time in a process. Outside its life the signals do what they did before.
+class SignalWatcher {
+ public:
+  explicit SignalWatcher(Interruption& interruption);
+  ~SignalWatcher();
+  SignalWatcher(const SignalWatcher&) = delete;
+  SignalWatcher& operator=(const SignalWatcher&) = delete;
+
+ private:
+  std::thread thread_;
+};
+
+/// While true, a process that ends at once first makes the terminal's cursor visible again.
+void setCursorHidden(bool hidden) noexcept;
+
+}  // namespace appsync::host

@@ -1,0 +1,32 @@
+#pragma once
+
+#include <mutex>
+#include <string_view>
+
+namespace appsync::host {
+
+/// Standard output or standard error, written without a buffer so that lines of several threads and
+/// of a killed process stay whole. Used from any thread.
+class Output {
+ public:
+  explicit Output(int fd) : fd_(fd) {}
+  Output(const Output&) = delete;
+  Output& operator=(const Output&) = delete;
+
+  /// Writes all of it. After a failure everything is dropped.
+  void write(std::string_view text);
+  void line(std::string_view text);
+
+  /// The errno value of the failure that closed this output; 0 while all is well.
+  int error() const;
+  bool isTerminal() const;
+  /// Columns of the terminal; 80 when it does not say.
+  std::size_t width() const;
+
+ private:
+  const int fd_;
+  mutable std::mutex mutex_;
+  int error_ = 0;
+};
+
+}  // namespace appsync::host

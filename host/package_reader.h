@@ -1,0 +1,56 @@
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+
+#include "platform/bytes.h"
+
+namespace appsync::host {
+
+/// Whether an application of this identifier can be sent: the phone takes it, and it is no hidden
+/// name nor one that the exchange with the phone keeps for itself.
+bool isUsableIdentifier(std::string_view identifier);
+
+/// The endings by which a file counts as a package, in lower case: ".zip", ".tar.gz", ...
+std::span<const std::string_view> packageEndings();
+/// The one of them that a file's name has; empty when it has none.
+std::string_view packageEnding(std::string_view fileName);
+
+/// One application package of a desktop library, as its information dictionary describes it.
+struct LibraryPackage {
+  std::filesystem::path file;
+  std::string identifier;
+  std::string version;  ///< empty when the bundle gives none
+  std::string name;     ///< display name or, failing that, the bundle's own name
+};
+
+/// Why a file cannot be offered to the phone.
+struct UnreadablePackage {
+  std::string file;               ///< its name in the library
+  bool looksLikePackage = false;  ///< by its ending or its contents
+  std::string reason;             ///< for people, one line
+};
+
+/// Reads no further than the information dictionary: what lies behind may be damaged, the phone
+/// judges that. Memory and work are bounded whatever the file holds. nullopt (with the reason) when
+/// this is no package or its beginning cannot be read.
+std::optional<LibraryPackage> readPackage(const std::filesystem::path& path,
+                                          UnreadablePackage& failure);
+
+/// What the phone shows of an application before its package arrives. Absent parts stay empty.
+struct PackageParts {
+  std::optional<Bytes> infoPlist;
+  std::string iconName;
+  std::optional<Bytes> icon;
+  std::optional<Bytes> metadata;  ///< HalvoMetadata.plist
+  std::optional<Bytes> artwork;   ///< HalvoArtwork
+};
+
+/// Collects the parts until the end of the package or the first damage.
+PackageParts readPackageParts(const std::filesystem::path& path);
+
+}  // namespace appsync::host

@@ -1,0 +1,85 @@
+#pragma once
+
+#include <map>
+#include <mutex>
+#include <optional>
+#include <set>
+#include <string>
+
+#include "host/events.h"
+#include "host/interruption.h"
+#include "host/package_sender.h"
+#include "host/phone.h"
+#include "host/settlement.h"
+#include "host/transfer_queue.h"
+#include "platform/sync_client.h"
+
+namespace appsync::host {
+
+struct SyncInput {
+  Library library;
+  SyncPlan plan;
+  std::optional<Bytes> iconLayout;  ///< property list
+  std::string newAnchor;            ///< names this sync in the client's log
+};
+
+struct SyncResult {
+  Summary summary;
+  /// The sync ran to its end, though single applications may have failed.
+  bool completed = false;
+};
+
+/// Remembers why installs on the phone failed, and tells of them. Called from any thread.
+class InstallWatch : public device::DeviceWatcher {
+ public:
+  explicit InstallWatch(Reporter& reporter) : reporter_(reporter) {}
+
+  void assertionDenied(std::string_view bundleId) noexcept override;
+  void installFinished(std::string_view bundleId,
+                       const std::optional<Error>& error) noexcept override;
+  std::map<std::string, std::string> failures() const;
+
+ private:
+  Reporter& reporter_;
+  mutable std::mutex mutex_;
+  std::map<std::string, std::string> failures_;
+};
+
+/// One desktop sync: the client's calls in their order and the desktop's own work between them.
+/// Borrows everything; used once, by one thread.
+class Session {
+ public:
+  Session(SyncClient& client, TransferQueue& queue, Phone phone, Reporter& reporter,
+          Interruption& interruption);
+  ~Session();
+  Session(const Session&) = delete;
+  Session& operator=(const Session&) = delete;
+
+  SyncResult run(const SyncInput& input);
+
+ private:
+  bool callClient(const SyncInput& input, PackageSender& sender);
+  bool isServed();
+  bool reconcile(const SyncInput& input);
+  bool transfer(PackageSender& sender);
+  void waitForCoordinatedInstalls(const std::set<std::string>& identifiers);
+
+  void sweepPlaceholders();
+  void reportDeletions(const PropertyList::Dictionary& inventory);
+  void writeApplicationsPresent();
+  SyncEnd end(const PackageSender& sender) const;
+  /// Always false.
+  bool broken(std::string_view what, const std::optional<Error>& error);
+
+  SyncClient& client_;
+  TransferQueue& queue_;
+  const Phone phone_;
+  Reporter& reporter_;
+  Interruption& interruption_;
+  InstallWatch watch_;
+  bool disabled_ = false;
+  bool reconciled_ = false;
+  std::optional<std::string> broken_;
+};
+
+}  // namespace appsync::host

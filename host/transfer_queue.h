@@ -1,0 +1,46 @@
+#pragma once
+
+#include <deque>
+#include <mutex>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "platform/sync_host.h"
+
+namespace appsync::host {
+
+/// The packages still to be sent, the next chunk always from the first. The sync takes from it; the
+/// client's wishes reorder it, from any thread.
+class TransferQueue : public SyncHostService {
+ public:
+  void add(const std::vector<SyncAssetPtr>& assets);
+
+  struct Next {
+    SyncAssetPtr asset;
+    bool cancelled = false;  ///< report it as failed instead of sending on
+  };
+  /// nullptr as asset when nothing is left.
+  Next next();
+  /// Nothing more is to be sent of it.
+  void finish(const SyncAssetPtr& asset);
+
+  bool supportsPrioritizeAsset() noexcept override { return true; }
+  /// Puts the waiting asset of this identifier at the front, before the one being sent. The
+  /// completion runs before this returns; its error says that no such asset waits.
+  void prioritizeAsset(
+      const SyncAssetPtr& asset,
+      std::function<void(const std::optional<Error>&)> completion) noexcept override;
+
+  bool supportsCancelAssetAsFailed() noexcept override { return true; }
+  void cancelAssetAsFailed(const SyncAssetPtr& asset) noexcept override;
+
+ private:
+  bool moveToFront(const std::string& identifier);
+
+  std::mutex mutex_;
+  std::deque<SyncAssetPtr> waiting_;
+  std::set<std::string> cancelled_;
+};
+
+}  // namespace appsync::host
