@@ -181,8 +181,6 @@ class BinaryCheck {
   bool visitChildren(const Object& object, std::size_t depth, Expansion& sum) {
     if (depth > depthLimit_) return fail("it is nested too deeply");
     const bool dictionary = object.kind == 0xd;
-    if (dictionary && object.count > limits_.dictionaryEntries)
-      return fail("a dictionary has too many entries");
     if (!fits(object, object.count, referenceSize_ * (dictionary ? 2 : 1))) return false;
     const auto keys = static_cast<std::size_t>(dictionary ? object.count : 0);
     const auto references = static_cast<std::size_t>(object.count) + keys;

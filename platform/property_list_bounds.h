@@ -22,8 +22,10 @@ std::optional<std::string> binaryPropertyListProblem(ByteView bytes,
 
 /// The same XML property list without anything that parsers read differently: no comments,
 /// attributes, CDATA, blanks between elements or character references; integers in plain decimal.
-/// nullopt, with `problem` told in one line, when it is malformed or beyond the limits. `document`
-/// has no byte-order mark.
+/// Every container is an array: after `true` come a dictionary's keys and values in turn, after
+/// `false` an array's elements. (The library's own XML dictionaries have a hash table of fixed
+/// size, which many keys, or keys chosen to collide, make take hours.) nullopt, with `problem` told
+/// in one line, when it is malformed or beyond the limits. `document` has no byte-order mark.
 std::optional<std::string> canonicalXmlPropertyList(std::string_view document,
                                                     const PropertyListLimits& limits,
                                                     std::string& problem);

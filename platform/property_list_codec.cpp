@@ -88,6 +88,8 @@ Node nodeOfBinaryObject(unsigned char marker, const std::string& contents) {
 /// Turns the library's tree into ours.
 class TreeReader {
  public:
+  explicit TreeReader(bool dictionariesAreArrays) : dictionariesAreArrays_(dictionariesAreArrays) {}
+
   /// nullopt when the tree holds what no property list has.
   std::optional<PropertyList> read(plist_t node) {
     PropertyList value = valueOf(node);
@@ -109,11 +111,8 @@ class TreeReader {
         plist_get_real_val(node, &value);
         return value;
       }
-      case PLIST_STRING: {
-        std::uint64_t size = 0;
-        const char* text = plist_get_string_ptr(node, &size);
-        return std::string(text, static_cast<std::size_t>(size));
-      }
+      case PLIST_STRING:
+        return textOf(node);
       case PLIST_DATA: {
         std::uint64_t size = 0;
         const auto* bytes = reinterpret_cast<const std::byte*>(plist_get_data_ptr(node, &size));
@@ -129,6 +128,12 @@ class TreeReader {
         complete_ = false;
         return {};
     }
+  }
+
+  static std::string textOf(plist_t node) {
+    std::uint64_t size = 0;
+    const char* text = plist_get_string_ptr(node, &size);
+    return std::string(text, static_cast<std::size_t>(size));
   }
 
   PropertyList integerOf(plist_t node) {
@@ -150,17 +155,26 @@ class TreeReader {
   }
 
   PropertyList arrayOf(plist_t node) {
-    PropertyList::Array array;
-    array.reserve(plist_array_get_size(node));
     plist_array_iter position = nullptr;
     plist_array_new_iter(node, &position);
     const Allocated<void> owned(position);
-    for (;;) {
+    const auto next = [&] {
       plist_t item = nullptr;
       plist_array_next_item(node, position, &item);
-      if (!item) return array;
-      array.push_back(valueOf(item));
-    }
+      return item;
+    };
+    if (dictionariesAreArrays_ && plist_bool_val_is_true(next())) return dictionaryOf(next);
+    PropertyList::Array array;
+    array.reserve(plist_array_get_size(node));
+    while (const plist_t item = next()) array.push_back(valueOf(item));
+    return array;
+  }
+
+  template <class Next>
+  PropertyList dictionaryOf(const Next& next) {
+    PropertyList::Dictionary dictionary;
+    while (const plist_t key = next()) dictionary.insert_or_assign(textOf(key), valueOf(next()));
+    return dictionary;
   }
 
   PropertyList dictionaryOf(plist_t node) {
@@ -178,6 +192,7 @@ class TreeReader {
     }
   }
 
+  const bool dictionariesAreArrays_;
   bool complete_ = true;
 };
 
@@ -276,8 +291,6 @@ class TreeWriter {
   }
 
   Node dictionaryNode(const PropertyList::Dictionary& dictionary, std::size_t depth) {
-    if (dictionary.size() > limits_.dictionaryEntries)
-      return fail("a dictionary has too many entries");
     Node node(plist_new_dict());
     for (const auto& [key, value] : dictionary) {
       Node item = checkText(key) ? nodeOf(value, depth) : nullptr;
@@ -294,13 +307,15 @@ class TreeWriter {
   const char* problem_ = nullptr;
 };
 
+bool isBinary(ByteView bytes) { return asText(bytes).starts_with("bplist00"); }
+
 constexpr std::string_view ByteOrderMark = "\xef\xbb\xbf";
 
 /// The library's tree of bytes that have passed every check; null with `problem` otherwise.
 Node parsedNode(ByteView bytes, const PropertyListLimits& limits, std::string& problem) {
   std::string_view text = asText(bytes);
   plist_t node = nullptr;
-  if (text.starts_with("bplist00")) {
+  if (isBinary(bytes)) {
     if (const auto found = binaryPropertyListProblem(bytes, limits)) {
       problem = *found;
       return nullptr;
@@ -333,7 +348,7 @@ std::optional<PropertyList> parsePropertyList(ByteView bytes, std::optional<Erro
       bytes.size() <= limits.bytes && bytes.size() <= std::numeric_limits<std::uint32_t>::max();
   const PlainLocale locale;
   if (const Node node = fits ? parsedNode(bytes, limits, problem) : nullptr) {
-    if (auto value = TreeReader().read(node.get())) return value;
+    if (auto value = TreeReader(!isBinary(bytes)).read(node.get())) return value;
   }
   setError(error, failure("not a usable property list: " + problem));
   return std::nullopt;

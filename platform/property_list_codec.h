@@ -17,7 +17,6 @@ struct PropertyListLimits {
   std::size_t bytes = std::size_t{64} << 20;
   std::size_t objects = 2'000'000;
   std::size_t depth = 128;  ///< arrays and dictionaries inside each other; never above 512
-  std::size_t dictionaryEntries = 100'000;  ///< in one dictionary
 };
 
 /// Parses an XML or binary property list. Bytes that are neither, exceed the limits, hold a

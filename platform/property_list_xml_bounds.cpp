@@ -13,6 +13,12 @@ namespace {
 
 constexpr std::string_view Blanks = " \t\r\n";
 
+bool isBlank(char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; }
+/// What may stand in text without more ado.
+bool isPlain(char c) {
+  const auto byte = static_cast<unsigned char>(c);
+  return (byte >= 0x20 && c != '<' && c != '>' && c != '&') || (isBlank(c) && c != ' ');
+}
 bool isNameCharacter(char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); }
 
 class XmlReader {
@@ -40,7 +46,6 @@ class XmlReader {
     std::string_view name;
     bool isDictionary = false;
     bool hasKey = false;  ///< a key has been read, its value not yet
-    std::size_t entries = 0;
   };
   struct Tag {
     std::string_view name;
@@ -55,7 +60,9 @@ class XmlReader {
 
   bool startsWith(std::string_view text) const { return document_.substr(at_).starts_with(text); }
 
-  void skipBlanks() { at_ = std::min(document_.find_first_not_of(Blanks, at_), document_.size()); }
+  void skipBlanks() {
+    while (at_ < document_.size() && isBlank(document_[at_])) ++at_;
+  }
 
   /// Moves behind `end`, looked for from `skip` bytes on.
   bool skipPast(std::string_view end, std::size_t skip, const char* problem) {
@@ -181,16 +188,17 @@ class XmlReader {
 
   bool openContainer(const Tag& tag) {
     if (containers_.size() == depthLimit_) return fail("it is nested too deeply");
-    emit("<", tag.name, tag.closesSelf ? "/>" : ">");
-    if (!tag.closesSelf) containers_.push_back({tag.name, tag.name == "dict"});
-    return true;
+    const bool isDictionary = tag.name == "dict";
+    out_ += isDictionary ? "<array><true/>" : "<array><false/>";
+    containers_.push_back({tag.name, isDictionary});
+    return !tag.closesSelf || closeContainer(tag.name);
   }
 
   bool closeContainer(std::string_view name) {
     if (containers_.empty() || containers_.back().name != name)
       return fail("an element is closed that is not open");
     if (containers_.back().hasKey) return fail("a dictionary's key has no value");
-    emit("</", name, ">");
+    out_ += "</array>";
     containers_.pop_back();
     return true;
   }
@@ -200,32 +208,30 @@ class XmlReader {
       return fail("a key stands outside a dictionary");
     Container& container = containers_.back();
     if (container.hasKey) return fail("a dictionary's key has no value");
-    if (++container.entries > limits_.dictionaryEntries)
-      return fail("a dictionary has too many entries");
     container.hasKey = true;
-    return readText(tag) && emitElement("key", text_);
+    return readText(tag) && emitElement("string");
   }
 
   bool readScalar(const Tag& tag) {
     if (!readText(tag)) return false;
-    if (tag.name == "string") return emitElement(tag.name, text_);
+    if (tag.name == "string") return emitElement(tag.name);
     if (tag.name == "true" || tag.name == "false") {
       if (text_.find_first_not_of(Blanks) != text_.npos) return fail("a boolean holds text");
-      emit("<", tag.name, "/>");
+      out_ += tag.name == "true" ? "<true/>" : "<false/>";
       return true;
     }
     if (tag.name == "data")
-      return canonicalXmlData(text_) ? emitElement(tag.name, text_) : fail("data is not Base64");
+      return canonicalXmlData(text_) ? emitElement(tag.name) : fail("data is not Base64");
     const std::size_t start = std::min(text_.find_first_not_of(Blanks), text_.size());
     text_.erase(text_.find_last_not_of(Blanks) + 1).erase(0, std::min(start, text_.size()));
     if (tag.name == "integer")
-      return canonicalXmlInteger(text_) ? emitElement(tag.name, text_)
+      return canonicalXmlInteger(text_) ? emitElement(tag.name)
                                         : fail("an integer is malformed or too large");
     if (tag.name == "real")
-      return canonicalXmlReal(text_) ? emitElement(tag.name, text_)
+      return canonicalXmlReal(text_) ? emitElement(tag.name)
                                      : fail("a real is malformed or too large");
     if (tag.name == "date")
-      return isXmlDate(text_) ? emitElement(tag.name, text_) : fail("a date is malformed");
+      return isXmlDate(text_) ? emitElement(tag.name) : fail("a date is malformed");
     return fail("an element has an unknown name");
   }
 
@@ -235,15 +241,20 @@ class XmlReader {
     text_.clear();
     if (tag.closesSelf) return true;
     for (;;) {
-      const std::size_t end = std::min(document_.find_first_of("<&", at_), document_.size());
-      if (!appendPlain(document_.substr(at_, end - at_))) return false;
-      at_ = end;
+      const std::size_t start = at_;
+      while (at_ < document_.size() && isPlain(document_[at_])) ++at_;
+      text_ += document_.substr(start, at_ - start);
       if (startsWith("&")) {
         if (!readReference()) return false;
       } else if (startsWith("<![CDATA[")) {
         if (!readCharacterData()) return false;
       } else if (startsWith("<!--")) {
         if (!skipPast("-->", 4, "a comment has no end")) return false;
+      } else if (startsWith(">")) {
+        text_ += "&gt;";
+        ++at_;
+      } else if (at_ < document_.size() && !startsWith("<")) {
+        return fail("it holds a control character");
       } else {
         Tag closing;
         if (!readTag(closing, false)) return false;
@@ -251,16 +262,6 @@ class XmlReader {
                fail("an element stands inside a value");
       }
     }
-  }
-
-  bool appendPlain(std::string_view text) {
-    for (std::size_t at = 0; at < text.size();) {
-      const std::size_t end = std::min(text.find('>', at), text.size());
-      text_ += text.substr(at, end - at);
-      if (end < text.size()) text_ += "&gt;";
-      at = end + 1;
-    }
-    return isXmlText(text) || fail("it holds a control character");
   }
 
   bool readCharacterData() {
@@ -298,14 +299,10 @@ class XmlReader {
     }
   }
 
-  void emit(std::string_view before, std::string_view name, std::string_view after) {
-    out_.append(before).append(name).append(after);
-  }
-
-  bool emitElement(std::string_view name, std::string_view text) {
-    emit("<", name, ">");
-    out_ += text;
-    emit("</", name, ">");
+  /// Writes an element that holds `text_`.
+  bool emitElement(std::string_view name) {
+    out_.append("<").append(name).append(">").append(text_);
+    out_.append("</").append(name).append(">");
     return true;
   }
 

@@ -117,13 +117,7 @@ TEST(BinaryInput, RefusesObjectsOutsideTheFile) {
         "\x6f\x13" + std::string(8, '\xff'), "\x6f\x13\x80" + std::string(7, '\0'),
         "\xaf\x13" + std::string(8, '\xff'), "\xdf\x13\x80" + std::string(7, '\0'), "\xa2\x01"s}) {
     SCOPED_TRACE(testing::PrintToString(object));
-    std::optional<Error> error;
-    EXPECT_EQ(parsePropertyList(single(object), &error), std::nullopt);
-    ASSERT_TRUE(error);
-    const std::string text = error->localizedDescription();
-    EXPECT_TRUE(text.ends_with("an object lies outside the file") ||
-                text.ends_with("a dictionary has too many entries"))
-        << text;
+    expectRefused(single(object), "an object lies outside the file");
   }
 }
 
@@ -227,10 +221,6 @@ TEST(BinaryInput, ObeysTheCallersLimits) {
   expectRefused(bytes, "it holds too many objects", {.objects = 3});
   EXPECT_TRUE(parsePropertyList(bytes, nullptr, {.bytes = bytes.size()}));
   expectRefused(bytes, "it is too large", {.bytes = bytes.size() - 1});
-  const auto dictionary =
-      Builder().dictionary({1, 2, 3, 3}).object("\x51k").object("\x51l").object("\x09").build();
-  EXPECT_TRUE(parsePropertyList(dictionary, nullptr, {.dictionaryEntries = 2}));
-  expectRefused(dictionary, "a dictionary has too many entries", {.dictionaryEntries = 1});
 }
 
 TEST(BinaryInput, NeverCrashesOnAFileWithOneByteChanged) {
