@@ -1,0 +1,360 @@
+#include <thread>
+
+#include "client/queues.h"
+#include "tests/client/client_test.h"
+#include "transfer/install_plan.h"
+
+namespace appsync {
+namespace {
+
+using namespace std::chrono_literals;
+using testing::Contains;
+using testing::ElementsAre;
+
+const std::string PackagePath = StagingRootPath + "/a.zip";
+const Error Refused{std::string(InstallerServiceErrorDomain), 2, {}, nullptr};
+const Error Passing{"Passing", 8, {}, nullptr};
+
+class InstallQueue : public ClientTest {
+ protected:
+  void SetUp() override {
+    phone.files.putFile(PackagePath, "package");
+    putTodo({{"com.a", "DOWNLOADED"}});
+  }
+
+  SyncAssetPtr asset(std::string_view identifier = "com.a", const std::string& path = PackagePath) {
+    const SyncAssetPtr made = phone.host.makeDownload(identifier, "Application", std::nullopt);
+    made->path = path;
+    return made;
+  }
+  void prepare() {
+    client();
+    forgetTrace();
+  }
+  /// One whole install, on the install queue.
+  void install(const SyncAssetPtr& made) {
+    prepare();
+    client()._enqueueAssetInstall(made);
+    client().assetTransferEndedWithSuccess(false);
+  }
+  /// The trace up to the end of the install, without the end of the transfers.
+  Lines installTrace() {
+    Lines trace = phone.trace.readable();
+    const auto end =
+        std::ranges::find(trace, "log default SyncBundle|asset transfer ended withsuccess: n");
+    // The end is announced before the wait, at any point of the install.
+    if (end != trace.end()) trace.erase(end);
+    std::erase_if(trace, [](const std::string& line) {
+      return line.find("SystemNotifier.") == 0 || line.find("serverPort") != std::string::npos ||
+             line.find("Notifying DS") != std::string::npos;
+    });
+    return trace;
+  }
+  static Lines begun() {
+    return {"log default SyncBundle|Enqueue install request for com.a",
+            "log default SyncBundle|Performing install for com.a",
+            "log default SyncBundle|Grabbing assertion for com.a",
+            "HomeScreenService.createTerminationAssertion(com.a, 0)"};
+  }
+  static Lines joined(Lines first, const Lines& second) {
+    first.insert(first.end(), second.begin(), second.end());
+    return first;
+  }
+};
+
+const std::string InstallCall = "AppRegistry.installApplication(" + PackagePath +
+                                ", {KBBundleIdentifier = com.a; SWPackageTypeKey = "
+                                "SWPackageTypeCustomer})";
+
+TEST(InstallPlan, decidesByTheOutcomeAlone) {
+  using Next = InstallPlan::Next;
+  EXPECT_EQ(installPlanFor(AssertionOutcome::Success, "com.a").next, Next::Install);
+  EXPECT_EQ(installPlanFor(AssertionOutcome::NotFound, "com.a").next, Next::Install);
+  EXPECT_EQ(installPlanFor(AssertionOutcome::Denied, "com.a").next, Next::Retry);
+  for (const int code : {3, 4, -1, 99}) {
+    const InstallPlan plan = installPlanFor(static_cast<AssertionOutcome>(code), "com.a");
+    EXPECT_EQ(plan.next, Next::Fail);
+    EXPECT_EQ(plan.line, "Unknown error " + std::to_string(code) + " getting assertion for com.a");
+    EXPECT_FALSE(plan.recordSuccess);
+  }
+}
+
+TEST_F(InstallQueue, installsUnderAnAssertionAndRemovesThePackage) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  install(asset());
+  EXPECT_THAT(
+      installTrace(),
+      testing::ElementsAreArray(joined(
+          begun(),
+          {"log default SyncBundle|Assertion succeeded for com.a",
+           "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
+           InstallCall, "log default SyncBundle|com.a install succeeded",
+           "log default SyncBundle|Changing com.a from DOWNLOADED to INSTALLED",
+           "FileManager.writeAtomically(" + TodoListPath + ")",
+           "TerminationAssertion.release(com.a)", "FileManager.removeItem(" + PackagePath + ")",
+           "log default SyncBundle|Finished install for com.a"})));
+  EXPECT_EQ(todoOperation("com.a"), "INSTALLED");
+  EXPECT_FALSE(phone.files.exists(PackagePath));
+  EXPECT_THAT(phone.homeScreen.heldAssertions(), testing::IsEmpty());
+}
+
+TEST_F(InstallQueue, assertionNotFoundInstallsAnyway) {
+  phone.homeScreen.queueOutcomes("com.a", {AssertionOutcome::NotFound});
+  install(asset());
+  EXPECT_THAT(installTrace(),
+              testing::ElementsAreArray(joined(
+                  begun(),
+                  {"log default SyncBundle|Assertion not found for com.a, installing anyway...",
+                   "transaction scenario \"Asset install\" step 0 ok com.a \"assertion not found\"",
+                   InstallCall, "log default SyncBundle|com.a install succeeded",
+                   "log default SyncBundle|Changing com.a from DOWNLOADED to INSTALLED",
+                   "FileManager.writeAtomically(" + TodoListPath + ")",
+                   "FileManager.removeItem(" + PackagePath + ")",
+                   "log default SyncBundle|Finished install for com.a"})));
+}
+
+TEST_F(InstallQueue, assertionDeniedRetriesAfterExactly30SecondsAndKeepsTheFile) {
+  phone.homeScreen.queueOutcomes("com.a", {AssertionOutcome::Denied});
+  phone.homeScreen.setRefusalsCarryAssertion(true);
+  prepare();
+  client()._enqueueAssetInstall(asset());
+  ASSERT_TRUE(phone.backgroundQueue.waitForPending(1));
+  EXPECT_THAT(phone.backgroundQueue.pendingDelays(), ElementsAre(30'000ms));
+  phone.backgroundQueue.advance(29'999ms);
+  EXPECT_FALSE(phone.appRegistry.installed("com.a"));
+  EXPECT_TRUE(phone.files.exists(PackagePath));
+  phone.backgroundQueue.advance(1ms);
+  client().assetTransferEndedWithSuccess(false);
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
+  EXPECT_FALSE(phone.files.exists(PackagePath));
+
+  // The first operation's last line may come before or after the second begins.
+  Lines trace = installTrace();
+  const auto finished =
+      std::ranges::find(trace, "log default SyncBundle|Finished install for com.a");
+  ASSERT_NE(finished, trace.end());
+  trace.erase(finished);
+  std::erase(trace, "BackgroundQueue.after(30000)");
+  EXPECT_THAT(
+      trace,
+      testing::ElementsAreArray(joined(
+          joined(begun(),
+                 {"log error SyncBundle|Assertion denied for com.a",
+                  "transaction scenario \"Asset install\" step 0 ok com.a \"assertion denied\"",
+                  "TerminationAssertion.release(com.a)",
+                  "log error SyncBundle|Will retry installation of com.a in 30 seconds",
+                  "transaction scenario \"Asset install\" step 0 ok com.a \"retrying asset "
+                  "install\"",
+                  "log error SyncBundle|Re-enqueue installation request for com.a"}),
+          joined(
+              begun(),
+              {"log default SyncBundle|Assertion succeeded for com.a",
+               "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
+               InstallCall, "log default SyncBundle|com.a install succeeded",
+               "log default SyncBundle|Changing com.a from DOWNLOADED to INSTALLED",
+               "FileManager.writeAtomically(" + TodoListPath + ")",
+               "TerminationAssertion.release(com.a)", "FileManager.removeItem(" + PackagePath + ")",
+               "log default SyncBundle|Finished install for com.a"}))));
+}
+
+TEST_F(InstallQueue, keepsRetryingForAsLongAsTheHomeScreenRefuses) {
+  phone.homeScreen.launch("com.a");
+  prepare();
+  client()._enqueueAssetInstall(asset());
+  for (int round = 0; round < 5; ++round) {
+    ASSERT_TRUE(phone.backgroundQueue.waitForPending(1)) << round;
+    phone.backgroundQueue.advance(30s);
+  }
+  ASSERT_TRUE(phone.backgroundQueue.waitForPending(1));
+  EXPECT_EQ(phone.trace.count("HomeScreenService.createTerminationAssertion"), 6u);
+  EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 0u);
+  phone.homeScreen.quit("com.a");
+  phone.backgroundQueue.advance(30s);
+  client().assetTransferEndedWithSuccess(false);
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
+}
+
+TEST_F(InstallQueue, endOfTheTransfersWaitsForARetryThatWaits) {
+  phone.homeScreen.queueOutcomes("com.a", {AssertionOutcome::Denied});
+  prepare();
+  client()._enqueueAssetInstall(asset());
+  ASSERT_TRUE(phone.backgroundQueue.waitForPending(1));
+  std::atomic<bool> ended = false;
+  std::thread host([&] {
+    client().assetTransferEndedWithSuccess(true);
+    ended = true;
+  });
+  // It has not ended while the retry is pending: only the clock can let it.
+  EXPECT_FALSE(ended);
+  phone.backgroundQueue.advance(30s);
+  host.join();
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
+  const Lines log = phone.trace.log();
+  const auto done =
+      std::ranges::find(log, "log default SyncBundle|Notifying DS we are done syncing");
+  const auto installed = std::ranges::find(log, "log default SyncBundle|com.a install succeeded");
+  EXPECT_LT(installed, done);
+}
+
+TEST_F(InstallQueue, unknownAssertionErrorFailsWithPosix22AndRemovesTheFile) {
+  phone.host.setRecoverable(POSIXErrorDomain, false);
+  phone.appRegistry.seedPlaceholder("com.a");
+  phone.homeScreen.queueOutcomes("com.a", {static_cast<AssertionOutcome>(3)});
+  phone.homeScreen.setRefusalsCarryAssertion(true);
+  install(asset());
+  EXPECT_THAT(
+      installTrace(),
+      testing::ElementsAreArray(joined(
+          begun(),
+          {"log error SyncBundle|Unknown error 3 getting assertion for com.a",
+           "transaction scenario \"Asset install\" step 0 failed com.a \"unknown error grabbing "
+           "assertion\"",
+           "log default SyncBundle|com.a install failed unrecoverably: Error Domain=POSIX Code=22",
+           "log default SyncBundle|Changing com.a from DOWNLOADED to FAILED",
+           "FileManager.writeAtomically(" + TodoListPath + ")",
+           "AppRegistry.uninstallApplication(com.a, {})",
+           "transaction scenario \"Aerix restore\" step 0 ok com.a \"placeholder removed\"",
+           "TerminationAssertion.release(com.a)", "FileManager.removeItem(" + PackagePath + ")",
+           "log default SyncBundle|Finished install for com.a"})));
+  EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 0u);
+}
+
+TEST_F(InstallQueue, refusedPackageIsFailedForGoodAndItsPlaceholderRemoved) {
+  phone.appRegistry.seedInstalled("com.a", "1.0");
+  phone.appRegistry.seedPlaceholder("com.a");
+  phone.appRegistry.failInstall("com.a", Refused);
+  install(asset());
+  EXPECT_EQ(todoOperation("com.a"), "FAILED");
+  EXPECT_THAT(
+      phone.trace.transactions(),
+      ElementsAre(
+          "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
+          "transaction scenario \"Aerix restore\" step 0 ok com.a \"placeholder removed\""));
+  // A damaged update never costs the working application.
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
+  EXPECT_FALSE(phone.appRegistry.placeholder("com.a"));
+}
+
+TEST_F(InstallQueue, placeholderThatCannotBeRemovedIsLoggedAndRecorded) {
+  phone.appRegistry.failInstall("com.a", Refused);
+  phone.appRegistry.failUninstall("com.a");
+  install(asset());
+  EXPECT_THAT(phone.trace.log(), Contains("log error SyncBundle|Uninstall of com.a failed."));
+  EXPECT_THAT(
+      phone.trace.transactions(),
+      Contains("transaction scenario \"Aerix restore\" step 0 failed com.a \"failed to remove "
+               "placeholder\""));
+}
+
+TEST_F(InstallQueue, recoverableFailureLeavesTheTodoEntryForALaterSync) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  phone.appRegistry.failInstall("com.a", Passing);
+  install(asset());
+  EXPECT_EQ(todoOperation("com.a"), "DOWNLOADED");
+  EXPECT_TRUE(phone.appRegistry.placeholder("com.a"));
+  EXPECT_THAT(phone.trace.log(), Contains("log default SyncBundle|com.a install failed but was "
+                                          "recoverable: Error Domain=Passing Code=8"));
+  EXPECT_THAT(
+      phone.trace.transactions(),
+      Contains("transaction scenario \"Aerix restore\" step 0 failed com.a \"install failed "
+               "recoverably\""));
+}
+
+TEST_F(InstallQueue, failedRestoreCountsAsRecoverableWhateverItsError) {
+  phone.appRegistry.seedPlaceholder("com.a", InstallType::Restore);
+  phone.appRegistry.failInstall("com.a", Refused);
+  const SyncAssetPtr made = asset();
+  made->isRestore = true;
+  install(made);
+  EXPECT_EQ(todoOperation("com.a"), "DOWNLOADED");
+  EXPECT_TRUE(phone.appRegistry.placeholder("com.a"));
+  EXPECT_EQ(phone.trace.count("BackupManager.cancelApplicationRestore"), 0u);
+}
+
+TEST_F(InstallQueue, restoreStateIsClearedWhateverTheOutcome) {
+  for (const bool fails : {false, true}) {
+    phone.files.putPlist(
+        RestoreStatePath,
+        Dictionary{{"com.a", Dictionary{{"1.0", Dictionary{{"path", PackagePath}}}}}});
+    if (fails) phone.appRegistry.failInstall("com.a", Passing);
+    install(asset());
+    EXPECT_FALSE(phone.files.exists(RestoreStatePath)) << fails;
+  }
+}
+
+TEST_F(InstallQueue, countsTheAttemptsThatReachedTheInstaller) {
+  prepare();
+  phone.appRegistry.failInstall("com.b", Refused);
+  phone.homeScreen.queueOutcomes("com.c", {static_cast<AssertionOutcome>(3)});
+  for (const char* identifier : {"com.a", "com.b", "com.c"}) {
+    client()._performAssetInstall(asset(identifier));
+  }
+  EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 2u);
+  EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 0u);
+}
+
+TEST_F(InstallQueue, tenInstallsOverlapAndTheEleventhWaits) {
+  prepare();
+  phone.appRegistry.blockInstalls();
+  for (int index = 0; index < 11; ++index) {
+    const std::string identifier = "com.app" + std::to_string(index);
+    const std::string path = StagingRootPath + "/" + identifier + ".zip";
+    phone.files.putFile(path, "package");
+    client()._enqueueAssetInstall(asset(identifier, path));
+  }
+  ASSERT_TRUE(phone.appRegistry.waitForInstalls(10));
+  EXPECT_EQ(phone.appRegistry.installsStarted(), 10u);
+  phone.appRegistry.releaseInstalls();
+  client().assetTransferEndedWithSuccess(true);
+  EXPECT_EQ(phone.appRegistry.installsStarted(), 11u);
+  EXPECT_EQ(phone.appRegistry.mostInstallsAtOnce(), 10u);
+  EXPECT_EQ(phone.appRegistry.installedIdentifiers().size(), 11u);
+}
+
+TEST_F(InstallQueue, destroyedClientFinishesRunningInstallsAndDropsWaitingRetries) {
+  phone.homeScreen.launch("com.waiting");
+  prepare();
+  client()._enqueueAssetInstall(asset("com.waiting"));
+  ASSERT_TRUE(phone.backgroundQueue.waitForPending(1));
+  phone.appRegistry.blockInstalls();
+  client()._enqueueAssetInstall(asset());
+  ASSERT_TRUE(phone.appRegistry.waitForInstalls(1));
+  std::thread release([&] { phone.appRegistry.releaseInstalls(); });
+  destroyClient();
+  release.join();
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
+  EXPECT_EQ(phone.backgroundQueue.pendingCount(), 0u);
+  phone.backgroundQueue.advance(60s);
+  EXPECT_FALSE(phone.appRegistry.installed("com.waiting"));
+}
+
+TEST_F(InstallQueue, errorsAreSortedByTheHostAndByTwoDomains) {
+  prepare();
+  EXPECT_TRUE(client()._isRecoverableError(Passing));
+  // The host would try these again.
+  EXPECT_FALSE(client()._isRecoverableError(Error{"StartwellError", 1, {}, nullptr}));
+  EXPECT_FALSE(client()._isRecoverableError(Refused));
+  phone.host.setRecoverable("Passing", false);
+  EXPECT_FALSE(client()._isRecoverableError(Passing));
+  EXPECT_FALSE(client()._isRecoverableError(std::nullopt));
+}
+
+TEST_F(InstallQueue, withCoordinationNoErrorIsRecoverable) {
+  phone.installCoordination.setEnabled(true);
+  prepare();
+  EXPECT_FALSE(client()._isRecoverableError(Passing));
+  EXPECT_EQ(phone.trace.log().size(), 1u);
+}
+
+TEST_F(InstallQueue, withCoordinationAFailedInstallIsUninstalledThroughTheService) {
+  phone.installCoordination.setEnabled(true);
+  prepare();
+  client().assetInstallFailed(asset(), Passing);
+  phone.installCoordination.waitForEvents();
+  EXPECT_EQ(phone.trace.count("InstallCoordination.uninstallApp(com.a"), 1u);
+  EXPECT_EQ(phone.trace.count("AppRegistry.uninstallApplication"), 0u);
+  EXPECT_EQ(todoOperation("com.a"), "FAILED");
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,382 @@
+#include "tests/client/client_test.h"
+
+namespace appsync {
+namespace {
+
+using testing::Contains;
+
+class TransferResults : public ClientTest {
+ protected:
+  void SetUp() override {
+    phone.files.putDirectory(WorkAreaPath);
+    phone.files.putFile(StagingRootPath + "/a.zip", "package");
+    phone.files.putFile("/var/mobile/Media/a.zip", "package");
+  }
+
+  SyncAssetPtr asset(std::string_view identifier = "com.a") {
+    const SyncAssetPtr made = phone.host.makeDownload(identifier, "Application", "Alpha");
+    made->variantOptions = {{"Version", "1.0"}};
+    made->shortDescription = std::string(identifier);
+    return made;
+  }
+  SyncAssetPtr received(const std::string& path, std::string_view identifier = "com.a") {
+    const SyncAssetPtr made = asset(identifier);
+    made->path = path;
+    return made;
+  }
+  SyncAssetPtr restored(const std::optional<std::string>& path) {
+    const SyncAssetPtr made = asset();
+    made->isRestore = true;
+    made->path = path;
+    made->completedAssetParts = kTWAssetPartApplication;
+    return made;
+  }
+
+  void succeed(const SyncAssetPtr& made) {
+    client();
+    forgetTrace();
+    client().assetTransferSucceeded(made, true, std::nullopt);
+  }
+  void fail(const SyncAssetPtr& made, const std::optional<Error>& error) {
+    client();
+    forgetTrace();
+    client().assetTransferSucceeded(made, false, error);
+  }
+  /// Ends the transfers, and with them the installs that run on other threads.
+  void settle() { client().assetTransferEndedWithSuccess(true); }
+};
+
+const Error Final{"Final", 7, {}, nullptr};
+const Error Passing{"Passing", 8, {}, nullptr};
+
+TEST_F(TransferResults, progressIsForwardedInThousandthsTruncated) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  const SyncAssetPtr made = asset();
+  client();
+  forgetTrace();
+  client().assetTransferUpdatedProgress(made, 0.4567);
+  EXPECT_EQ(phone.appRegistry.progress("com.a")->completedUnitCount(), 456);
+  EXPECT_EQ(phone.appRegistry.progress("com.a")->totalUnitCount(), 1000);
+  EXPECT_EQ(phone.appRegistry.progress("com.a")->installState(), InstallState::Active);
+  expectTrace({"log default SyncBundle|finished transferring 0.456700 for com.a",
+               "log error SyncBundle|Returning " +
+                   phone.appRegistry.progress("com.a")->description() + " progress for com.a",
+               "InstallProgress.setInstallState(com.a, 1)",
+               "InstallProgress.setTotalUnitCount(com.a, 1000)",
+               "InstallProgress.setCompletedUnitCount(com.a, 456)"});
+}
+
+TEST_F(TransferResults, totalUnitCountIsSetOnlyOnce) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  client().assetTransferUpdatedProgress(asset(), 0.1);
+  client().assetTransferUpdatedProgress(asset(), 1.0);
+  EXPECT_EQ(phone.trace.count("InstallProgress.setTotalUnitCount"), 1u);
+  EXPECT_EQ(phone.appRegistry.progress("com.a")->completedUnitCount(), 1000);
+}
+
+TEST_F(TransferResults, progressWithoutARecordIsOnlyLogged) {
+  const SyncAssetPtr made = asset();
+  client();
+  forgetTrace();
+  client().assetTransferUpdatedProgress(made, 0.5);
+  expectTrace({"log default SyncBundle|finished transferring 0.500000 for com.a",
+               "log error SyncBundle|Returning (null) progress for com.a"});
+}
+
+TEST_F(TransferResults, relativePathIsCompletedUnderTheStagingRoot) {
+  putTodo({{"com.a", "install"}});
+  const SyncAssetPtr made = received("a.zip");
+  succeed(made);
+  settle();
+  EXPECT_EQ(made->path, "/var/mobile/Media/PublicStaging/a.zip");
+}
+
+TEST_F(TransferResults, absolutePathIsKept) {
+  const SyncAssetPtr made = received("/var/mobile/Media/elsewhere/a.zip");
+  succeed(made);
+  settle();
+  EXPECT_EQ(made->path, "/var/mobile/Media/elsewhere/a.zip");
+}
+
+TEST_F(TransferResults, receivedPackageIsMarkedDownloadedAndItsInstallEnqueued) {
+  putTodo({{"com.a", "install"}});
+  phone.appRegistry.seedPlaceholder("com.a");
+  phone.appRegistry.blockInstalls();
+  const std::string progress = phone.appRegistry.progress("com.a")->description();
+  succeed(received("a.zip"));
+  Lines trace = phone.trace.readable();
+  trace.resize(std::min<std::size_t>(trace.size(), 9));
+  EXPECT_THAT(
+      trace,
+      testing::ElementsAre(
+          "log default SyncBundle|transfer for asset com.a ended with success y error (null) "
+          "existingApp:0",
+          "log error SyncBundle|Returning " + progress + " progress for com.a",
+          "log default SyncBundle|asset transfer succeeded for com.a",
+          testing::StartsWith("AppRegistry.installPhaseFinished("),
+          "log default SyncBundle|Received file at /var/mobile/Media/PublicStaging/a.zip",
+          "log default SyncBundle|Changing com.a from install to DOWNLOADED",
+          "FileManager.writeAtomically(" + TodoListPath + ")",
+          "log default SyncBundle|Installing synced asset com.a",
+          "log default SyncBundle|Enqueue install request for com.a"));
+  EXPECT_EQ(todoOperation("com.a"), "DOWNLOADED");
+  phone.appRegistry.releaseInstalls();
+  settle();
+  EXPECT_EQ(todoOperation("com.a"), "INSTALLED");
+}
+
+TEST_F(TransferResults, climbingPathIsIgnored) {
+  putTodo({{"com.a", "install"}});
+  succeed(received("/var/../etc/a.zip"));
+  expectTrace(
+      {"log default SyncBundle|transfer for asset com.a ended with success y error (null) "
+       "existingApp:0",
+       "log error SyncBundle|Returning (null) progress for com.a",
+       "log default SyncBundle|asset transfer succeeded for com.a",
+       "log default SyncBundle|Ignoring invalid path: /var/../etc/a.zip"});
+  EXPECT_EQ(todoOperation("com.a"), "install");
+}
+
+TEST_F(TransferResults, missingPathWithNothingRememberedIsIgnored) {
+  succeed(asset());
+  EXPECT_THAT(phone.trace.log(), Contains("log default SyncBundle|Ignoring invalid path: (null)"));
+}
+
+TEST_F(TransferResults, assetThatIsNoDownloadIsMarkedSentAndInstallsNothing) {
+  putTodo({{"com.a", "install"}});
+  const SyncAssetPtr made = received("a.zip");
+  made->isDownload = false;
+  succeed(made);
+  EXPECT_EQ(todoOperation("com.a"), "SENT");
+  EXPECT_THAT(phone.trace.log(),
+              testing::Not(Contains(testing::HasSubstr("Enqueue install request"))));
+}
+
+TEST_F(TransferResults, restoreWithBackupDataIsRememberedAndNotInstalled) {
+  phone.backup.addRestoreData("com.a");
+  phone.appRegistry.seedPlaceholder("com.a", InstallType::Restore);
+  succeed(restored("/var/mobile/Media/a.zip"));
+  EXPECT_EQ(phone.files.plistAt(RestoreStatePath),
+            PropertyList(Dictionary{
+                {"com.a", Dictionary{{"1.0", Dictionary{{"path", "/var/mobile/Media/a.zip"}}}}}}));
+  EXPECT_EQ(phone.appRegistry.progress("com.a")->installPhase(), InstallPhase::RestoringData);
+  EXPECT_THAT(phone.trace.log(), Contains("log default SyncBundle|Restore data exists for com.a"));
+  EXPECT_FALSE(phone.appRegistry.installed("com.a"));
+}
+
+TEST_F(TransferResults, laterDataOnlyAssetFindsTheRememberedPackageAndInstallsIt) {
+  phone.backup.addRestoreData("com.a");
+  succeed(restored("/var/mobile/Media/a.zip"));
+  const SyncAssetPtr data = restored(std::nullopt);
+  data->completedAssetParts = kTWAssetPartApplicationData;
+  succeed(data);
+  settle();
+  EXPECT_EQ(data->path, "/var/mobile/Media/a.zip");
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
+}
+
+TEST_F(TransferResults, restoreWithoutBackupDataIsInstalledAtOnce) {
+  succeed(restored("/var/mobile/Media/a.zip"));
+  EXPECT_EQ(phone.trace.count("log default SyncBundle|com.corvane.twc.AppsClient|No restore data "
+                              "exists for com.a"),
+            1u);
+  settle();
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
+}
+
+TEST_F(TransferResults, recoverableFailureOnlyMarksTheProgressFailed) {
+  putTodo({{"com.a", "install"}});
+  phone.appRegistry.seedPlaceholder("com.a");
+  const std::string progress = phone.appRegistry.progress("com.a")->description();
+  fail(asset(), Passing);
+  expectTrace(
+      {"log default SyncBundle|transfer for asset com.a ended with success n error Error "
+       "Domain=Passing Code=8 existingApp:0",
+       "log error SyncBundle|Returning " + progress + " progress for com.a",
+       "log default SyncBundle|failed to transfer asset com.a. err=Error Domain=Passing "
+       "Code=8, recoverable=1",
+       "InstallProgress.setInstallState(com.a, 4)"});
+  EXPECT_EQ(todoOperation("com.a"), "install");
+  EXPECT_TRUE(phone.appRegistry.placeholder("com.a"));
+}
+
+TEST_F(TransferResults, finalFailureCancelsTheProgressAndRemovesThePlaceholder) {
+  phone.host.setRecoverable("Final", false);
+  phone.appRegistry.seedInstalled("com.a");
+  phone.appRegistry.seedPlaceholder("com.a");
+  const std::string progress = phone.appRegistry.progress("com.a")->description();
+  fail(asset(), Final);
+  Lines trace = phone.trace.readable();
+  EXPECT_THAT(
+      trace,
+      testing::ElementsAre(
+          "log default SyncBundle|transfer for asset com.a ended with success n error Error "
+          "Domain=Final Code=7 existingApp:0",
+          "log error SyncBundle|Returning " + progress + " progress for com.a",
+          "log default SyncBundle|failed to transfer asset com.a. err=Error Domain=Final "
+          "Code=7, recoverable=0",
+          "InstallProgress.cancel(com.a)", "log default SyncBundle|Uninstalling placeholder com.a",
+          "AppRegistry.uninstallApplication(com.a, {UninstallPlaceholdersOnly = 1})",
+          "log default SyncBundle|Uninstalling app using SW com.a secceeded"));
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
+  EXPECT_FALSE(phone.appRegistry.placeholder("com.a"));
+}
+
+TEST_F(TransferResults, finalFailureLeavesAnEndedProgressAlone) {
+  phone.host.setRecoverable("Final", false);
+  phone.appRegistry.seedPlaceholder("com.a");
+  phone.appRegistry.progress("com.a")->begin(InstallState::Canceled, InstallPhase::Loading);
+  fail(asset(), Final);
+  EXPECT_EQ(phone.trace.count("InstallProgress.cancel"), 0u);
+}
+
+TEST_F(TransferResults, failedRemovalOfThePlaceholderIsLogged) {
+  phone.host.setRecoverable("Final", false);
+  phone.appRegistry.seedPlaceholder("com.a");
+  phone.appRegistry.failUninstall("com.a");
+  fail(asset(), Final);
+  EXPECT_THAT(phone.trace.log(),
+              Contains("log default SyncBundle|Uninstalling app using SW com.a failed"));
+}
+
+TEST_F(TransferResults, finalFailureOfAnUnknownApplicationOrARestoreDoesNothingMore) {
+  phone.host.setRecoverable("Final", false);
+  fail(asset(), Final);
+  EXPECT_EQ(phone.trace.count("AppRegistry.uninstallApplication"), 0u);
+  phone.appRegistry.seedPlaceholder("com.a", InstallType::Restore);
+  fail(restored(std::nullopt), Final);
+  EXPECT_EQ(phone.trace.count("AppRegistry.uninstallApplication"), 0u);
+  EXPECT_EQ(phone.trace.count("BackupManager.cancelApplicationRestore"), 0u);
+}
+
+TEST_F(TransferResults, endWithNothingOutstandingOnlyNotifiesTheHomeScreen) {
+  client();
+  forgetTrace();
+  client().assetTransferEndedWithSuccess(true);
+  expectTrace({"log default SyncBundle|asset transfer ended withsuccess: y",
+               "SystemNotifier.registerCheck(com.corvane.dashel.twc.wsyncnotify)",
+               "log default SyncBundle|Notifying DS we are done syncing",
+               "HomeScreenService.serverPort()",
+               "SystemNotifier.setState(com.corvane.dashel.twc.wsyncnotify, 0)",
+               "SystemNotifier.post(com.corvane.dashel.twc.wsyncnotify)"});
+}
+
+TEST_F(TransferResults, endWithSuccessWhileTransfersAreOutstandingFinishesThemAndLogsAnError) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  client().assetTransferUpdatedProgress(asset(), 0.5);
+  client().assetTransferUpdatedProgress(asset("com.gone"), 0.5);
+  forgetTrace();
+  const std::string progress = phone.appRegistry.progress("com.a")->description();
+  client().assetTransferEndedWithSuccess(true);
+  EXPECT_THAT(
+      phone.trace.readable(),
+      testing::ElementsAre(
+          "log default SyncBundle|asset transfer ended withsuccess: y",
+          "SystemNotifier.registerCheck(com.corvane.dashel.twc.wsyncnotify)",
+          "log default SyncBundle|Notifying DS we are done syncing",
+          "HomeScreenService.serverPort()",
+          "SystemNotifier.setState(com.corvane.dashel.twc.wsyncnotify, 0)",
+          "SystemNotifier.post(com.corvane.dashel.twc.wsyncnotify)",
+          "log default SyncBundle|Setting state for outstanding XFT loading phase of asset com.a "
+          "to "
+          "SWInstallStateFinished",
+          "log error SyncBundle|Returning " + progress + " progress for com.a",
+          "InstallProgress.setInstallState(com.a, 5)",
+          testing::StartsWith("AppRegistry.installPhaseFinished("),
+          "log default SyncBundle|Setting state for outstanding XFT loading phase of asset "
+          "com.gone "
+          "to SWInstallStateFinished",
+          "log error SyncBundle|Returning (null) progress for com.gone",
+          "log error SyncBundle|Called with success == YES but with 2 outstanding XFT transfers!"));
+}
+
+TEST_F(TransferResults, endWithFailureMarksOutstandingTransfersFailedAndLogsNoErrorOfItsOwn) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  client().assetTransferUpdatedProgress(asset(), 0.5);
+  client().assetTransferEndedWithSuccess(false);
+  EXPECT_EQ(phone.appRegistry.progress("com.a")->installState(), InstallState::Failed);
+  EXPECT_EQ(
+      phone.trace.count("log error SyncBundle|com.corvane.twc.AppsClient|Called with success"), 0u);
+  // Settled once: nothing is left for a second end.
+  forgetTrace();
+  client().assetTransferEndedWithSuccess(false);
+  EXPECT_EQ(phone.trace.count("InstallProgress.setInstallState"), 0u);
+}
+
+class CoordinatedResults : public TransferResults {
+ protected:
+  void SetUp() override {
+    TransferResults::SetUp();
+    phone.installCoordination.setEnabled(true);
+    coordinator = phone.installCoordination.seedCoordinator(CoordinatorKind::Initiating, "com.a",
+                                                            SyncHostClientID);
+  }
+  std::shared_ptr<fakes::FakeInstallCoordinator> coordinator;
+};
+
+TEST_F(CoordinatedResults, progressGoesToTheCoordinatorsPackagePromise) {
+  const SyncAssetPtr made = received("/var/mobile/Media/a.zip");
+  made->downloadProgress = 0.25;
+  client().assetTransferUpdatedProgress(made, 0.25);
+  ASSERT_TRUE(phone.installCoordination.pathPromise("com.a-Asset"));
+  EXPECT_EQ(phone.installCoordination.pathPromise("com.a-Asset")->percentComplete(), 0.25);
+  EXPECT_EQ(phone.trace.count("InstallProgress."), 0u);
+}
+
+TEST_F(CoordinatedResults, receivedPackageSatisfiesItsPromise) {
+  putTodo({{"com.a", "install"}});
+  succeed(received("a.zip"));
+  ASSERT_TRUE(phone.installCoordination.pathPromise("com.a-Asset"));
+  EXPECT_TRUE(phone.installCoordination.pathPromise("com.a-Asset")->isComplete());
+  EXPECT_EQ(todoOperation("com.a"), "DOWNLOADED");
+  EXPECT_THAT(phone.trace.log(),
+              testing::Not(Contains(testing::HasSubstr("Enqueue install request"))));
+}
+
+TEST_F(CoordinatedResults, restoreAssetsAreLeftToTheStore) {
+  succeed(restored("/var/mobile/Media/a.zip"));
+  EXPECT_THAT(
+      phone.trace.log(),
+      Contains("log default SyncBundle|Not processing restore asset com.a as coordination is "
+               "enabled"));
+  const SyncAssetPtr data = restored("/var/mobile/Media/a.zip");
+  data->completedAssetParts = kTWAssetPartApplicationData;
+  succeed(data);
+  EXPECT_THAT(
+      phone.trace.log(),
+      Contains("log default SyncBundle|Not processing kTWAssetPartApplicationData for restore "
+               "asset com.a as coordination is enabled"));
+}
+
+TEST_F(CoordinatedResults, failureCancelsTheCoordinatorOfAnInstalledApplication) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  fail(asset(), Passing);
+  EXPECT_TRUE(coordinator->state().cancellation.has_value());
+  EXPECT_EQ(phone.trace.count("AppRegistry.uninstallApplication"), 0u);
+}
+
+TEST_F(CoordinatedResults, failureAfterThePersonCancelledLeavesTheCoordinatorAlone) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  client().coordinatorCanceledWithReason(*coordinator, Passing, KQClientKiosk);
+  fail(asset(), Passing);
+  EXPECT_EQ(phone.trace.count("InstallCoordinator.cancel"), 0u);
+}
+
+TEST_F(CoordinatedResults, failedEndCancelsOutstandingCoordinators) {
+  client().assetTransferUpdatedProgress(asset(), 0.5);
+  client().assetTransferEndedWithSuccess(false);
+  EXPECT_TRUE(coordinator->state().cancellation.has_value());
+}
+
+TEST_F(CoordinatedResults, endWithNothingOutstandingKeepsWhatThePersonCancelled) {
+  client().coordinatorCanceledWithReason(*coordinator, Passing, KQClientKiosk);
+  client().assetTransferEndedWithSuccess(true);
+  forgetTrace();
+  client().coordinatorCanceledWithReason(*coordinator, Passing, KQClientKiosk);
+  expectTrace(
+      {"log error SyncBundle|Cannot cancel com.a as it's already cancelled 1 OR the call is "
+       "not supported"});
+}
+
+}  // namespace
+}  // namespace appsync
