@@ -84,13 +84,16 @@ void FakeHomeScreen::queueOutcomes(std::string_view bundleId,
   queue.insert(queue.end(), outcomes.begin(), outcomes.end());
 }
 
-void FakeHomeScreen::setForeground(std::string_view bundleId, bool foreground) {
+bool FakeHomeScreen::launch(std::string_view bundleId) {
+  if (heldAssertions().contains(std::string(bundleId))) return false;
   const std::scoped_lock lock(mutex_);
-  if (foreground) {
-    foreground_.emplace(bundleId);
-  } else {
-    foreground_.erase(std::string(bundleId));
-  }
+  foreground_.emplace(bundleId);
+  return true;
+}
+
+void FakeHomeScreen::quit(std::string_view bundleId) {
+  const std::scoped_lock lock(mutex_);
+  foreground_.erase(std::string(bundleId));
 }
 
 void FakeHomeScreen::setRefusalsCarryAssertion(bool carry) {

@@ -28,8 +28,10 @@ class FakeHomeScreen : public HomeScreenService {
 
   /// The outcomes of the next assertions for the application, in order; then Success again.
   void queueOutcomes(std::string_view bundleId, const std::vector<AssertionOutcome>& outcomes);
-  /// Assertions for the application are denied until it leaves the foreground.
-  void setForeground(std::string_view bundleId, bool foreground);
+  /// Brings the application to the foreground, where assertions for it are denied. False while an
+  /// assertion keeps it from running.
+  bool launch(std::string_view bundleId);
+  void quit(std::string_view bundleId);
   /// Whether a refusal still comes with an assertion object.
   void setRefusalsCarryAssertion(bool carry);
 
