@@ -61,7 +61,7 @@ std::string ArchiveReader::libraryReason() const {
     return std::generic_category().message(code);
   }
   const char* text = ::archive_error_string(archive_.get());
-  return text ? printable(text) : "damaged";
+  return text ? printable(oneLine(text)) : "damaged";
 }
 
 bool ArchiveReader::next() {

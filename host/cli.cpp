@@ -38,17 +38,10 @@ void addGlobalOptions(CLI::App& app, CommandContext& context) {
   app.set_version_flag("--version", "appsync " APPSYNC_VERSION);
 }
 
-/// The library's texts are lists of causes over several lines.
-std::string oneLine(std::string text) {
-  while (!text.empty() && (text.back() == '\n' || text.back() == ' ')) text.pop_back();
-  std::replace(text.begin(), text.end(), '\n', ' ');
-  return printable(text);
-}
-
 std::string usageMessage(const CLI::App& app, const CLI::ParseError& error) {
   std::string command = "appsync";
   for (const CLI::App* chosen : app.get_subcommands()) command += " " + chosen->get_name();
-  return fmt::format("{}; see {} --help", oneLine(error.what()), command);
+  return fmt::format("{}; see {} --help", printable(oneLine(error.what())), command);
 }
 
 bool asksForJson(int argc, char** argv) {
@@ -62,16 +55,16 @@ ExitCode run(const Command& command, CommandContext& context) {
     context.tellError(error.what());
     return error.code();
   } catch (const std::exception& error) {
-    context.tellError(oneLine(error.what()));
+    context.tellError(printable(oneLine(error.what())));
     return ExitCode::SomeFailed;
   }
 }
 
-/// A reader that closed the pipe has seen enough; every other failure loses what was to be written.
+/// A reader that closed the pipe has seen enough; every other failure loses what was asked for.
 ExitCode withOutputChecked(ExitCode code, CommandContext& context) {
   const int error = context.out.error();
-  if (error == 0) return code;
-  context.err.line("appsync: standard output was closed before everything was written: " +
+  if (error == 0 || error == EPIPE) return code;
+  context.err.line("appsync: cannot write to standard output: " +
                    std::generic_category().message(error));
   return code == ExitCode::Done ? ExitCode::SomeFailed : code;
 }

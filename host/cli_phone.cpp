@@ -20,9 +20,10 @@ void say(CommandContext& context, const Json& object, const std::string& text) {
 
 [[noreturn]] void fail(std::string_view what, const std::string& identifier,
                        const std::optional<Error>& error) {
-  throw CommandError(ExitCode::SomeFailed,
-                     fmt::format("cannot {} {}: {}", what, printable(identifier),
-                                 printable(error ? error->localizedDescription() : "no reason")));
+  throw CommandError(
+      ExitCode::SomeFailed,
+      fmt::format("cannot {} {}: {}", what, printable(identifier),
+                  printable(error ? oneLine(error->localizedDescription()) : "no reason")));
 }
 
 ExitCode runInit(bool coordination, CommandContext& context) {

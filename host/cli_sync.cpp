@@ -1,8 +1,8 @@
 #include <fmt/format.h>
 
 #include <CLI/CLI.hpp>
+#include <cerrno>
 #include <chrono>
-#include <ctime>
 
 #include "host/cli.h"
 #include "host/icon_layout.h"
@@ -94,7 +94,11 @@ ExitCode runSync(const SyncOptions& options, CommandContext& context) {
                     interruption);
     result = session.run(input);
   }
-  return finish(result, interruption.requested(), *reporter);
+  const ExitCode code = finish(result, interruption.requested(), *reporter);
+  if (context.out.error() == EPIPE) {
+    context.err.line("appsync: nobody reads the output any more; the sync ran to its end unseen");
+  }
+  return code;
 }
 
 ExitCode runClear(CommandContext& context) {

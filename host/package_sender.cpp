@@ -3,6 +3,7 @@
 #include <cerrno>
 
 #include "host/staging.h"
+#include "host/text.h"
 
 namespace appsync::host {
 namespace {
@@ -44,7 +45,7 @@ void PackageSender::sendChunk(const SyncAssetPtr& asset) {
   const PackageTransfer::Step step = transfer->sendChunk(phone_, &error);
   if (step == PackageTransfer::Step::Failed) {
     const Error reason = error.value_or(Error::posix(EIO));
-    return fail(asset, reason, "could not be sent: " + reason.localizedDescription());
+    return fail(asset, reason, "could not be sent: " + oneLine(reason.localizedDescription()));
   }
   if (transfer->progressed()) reportProgress(asset, *transfer);
   if (step == PackageTransfer::Step::Done) succeed(asset);

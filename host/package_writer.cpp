@@ -189,7 +189,7 @@ class Packer {
         writer.addFile(member.name, member.source, member.isExecutable);
       }
     }
-    if (!writer.finish()) return fail(printable(writer.problem()));
+    if (!writer.finish()) return fail(printable(oneLine(writer.problem())));
     return ::fsync(fd) == 0 || fail(systemReason(file, errno));
   }
 
@@ -202,7 +202,7 @@ class Packer {
     std::optional<Error> error;
     if (device::extractPackage(package, directory, result_.identifier, {}, &error)) return true;
     return fail("the phone would refuse this package: " +
-                printable(error ? error->localizedDescription() : "unknown reason"));
+                printable(error ? oneLine(error->localizedDescription()) : "unknown reason"));
   }
 
   fs::path folder_;

@@ -7,6 +7,7 @@
 #include <thread>
 
 #include "host/staging.h"
+#include "host/text.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 
@@ -28,7 +29,7 @@ void InstallWatch::installFinished(std::string_view bundleId,
                                    const std::optional<Error>& error) noexcept {
   const std::string identifier(bundleId);
   std::optional<std::string> reason;
-  if (error) reason = error->localizedDescription();
+  if (error) reason = oneLine(error->localizedDescription());
   {
     const std::lock_guard lock(mutex_);
     if (reason) failures_[identifier] = *reason;
@@ -190,7 +191,8 @@ SyncEnd Session::end(const PackageSender& sender) const {
 }
 
 bool Session::broken(std::string_view what, const std::optional<Error>& error) {
-  broken_ = error ? fmt::format("{}: {}", what, error->localizedDescription()) : std::string(what);
+  broken_ = error ? fmt::format("{}: {}", what, oneLine(error->localizedDescription()))
+                  : std::string(what);
   reporter_.report(SyncBroken{*broken_});
   return false;
 }

@@ -2,6 +2,7 @@
 
 #include <fmt/format.h>
 
+#include <algorithm>
 #include <array>
 #include <cmath>
 #include <ctime>
@@ -70,6 +71,14 @@ std::string printable(std::string_view text) {
     }
     text.remove_prefix(c.length);
   }
+  return result;
+}
+
+std::string oneLine(std::string_view text) {
+  constexpr std::string_view Blanks = " \t\r\n";
+  const std::size_t last = text.find_last_not_of(Blanks);
+  std::string result(text.substr(0, last == std::string_view::npos ? 0 : last + 1));
+  std::replace(result.begin(), result.end(), '\n', ' ');
   return result;
 }
 

@@ -10,6 +10,9 @@ namespace appsync::host {
 /// sequences, direction overrides and bytes that are no UTF-8 become U+FFFD.
 std::string printable(std::string_view text);
 
+/// A message without blank space at its end and with its line breaks as blanks.
+std::string oneLine(std::string_view text);
+
 /// Whether the bytes are well-formed UTF-8.
 bool isUtf8(std::string_view text);
 

@@ -1,0 +1,87 @@
+#include "tests/host/host_files.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <fstream>
+#include <iterator>
+#include <random>
+
+#include "host/archive_writer.h"
+#include "host/package_reader.h"
+#include "platform/bundle.h"
+#include "platform/property_list_codec.h"
+
+namespace appsync::host::testing {
+namespace fs = std::filesystem;
+
+Folder::Folder() {
+  std::string name = (fs::temp_directory_path() / "host-test.XXXXXX").string();
+  if (!::mkdtemp(name.data())) throw std::runtime_error("no temporary folder");
+  path_ = name;
+}
+
+Folder::~Folder() {
+  std::error_code ignored;
+  fs::remove_all(path_, ignored);
+}
+
+void putFile(const fs::path& path, std::string_view contents) {
+  fs::create_directories(path.parent_path());
+  std::ofstream(path, std::ios::binary) << contents;
+}
+
+std::string fileText(const fs::path& path) {
+  std::ifstream file(path, std::ios::binary);
+  return {std::istreambuf_iterator<char>(file), {}};
+}
+
+void pack(const fs::path& file, const Entries& entries) {
+  const Folder sources;
+  const int fd = ::open(file.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
+  {
+    ArchiveWriter writer(fd, packageEnding(file.filename().string()));
+    for (const auto& [name, contents] : entries) {
+      putFile(sources / "entry", contents);
+      writer.addFile(name, sources / "entry", false);
+    }
+    EXPECT_TRUE(writer.finish()) << writer.problem();
+  }
+  ::close(fd);
+}
+
+PropertyList::Dictionary appInfo(std::string_view identifier, std::string_view version,
+                                 std::string_view name) {
+  return {{std::string(KBBundleIdentifier), identifier},
+          {std::string(KBBundleVersion), version},
+          {std::string(KBBundleDisplayName), name},
+          {std::string(KBBundleExecutable), "run"},
+          {std::string(KBBundleIconFile), "Icon.png"}};
+}
+
+std::string xmlText(const PropertyList& value) {
+  const auto bytes = serializePropertyList(value, PropertyListFormat::Xml);
+  return bytes ? std::string(asText(*bytes)) : std::string();
+}
+
+Entries sampleEntries(std::string_view identifier, std::string_view version,
+                      std::string_view name) {
+  return {{"Sample.app/Info.plist", xmlText(appInfo(identifier, version, name))},
+          {"Sample.app/Icon.png", "icon of " + std::string(identifier)},
+          {"Sample.app/run", "#!/bin/sh\n"},
+          {"HalvoMetadata.plist", xmlText(PropertyList::Dictionary{{"itemId", 7}})},
+          {"HalvoArtwork", "artwork"}};
+}
+
+void packSample(const fs::path& file, std::string_view identifier, std::string_view version,
+                std::size_t bodySize) {
+  Entries entries = sampleEntries(identifier, version);
+  std::mt19937 random(1);
+  std::string body(bodySize, '\0');
+  for (char& c : body) c = static_cast<char>(random());
+  if (bodySize > 0) entries["Sample.app/body"] = body;
+  pack(file, entries);
+}
+
+}  // namespace appsync::host::testing
