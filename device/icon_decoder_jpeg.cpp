@@ -1,12 +1,14 @@
+// <jpeglib.h> needs what <cstdio> declares, and configures <jerror.h>.
+// clang-format off
+#include <cstdio>
+#include <jpeglib.h>
+#include <jerror.h>
+// clang-format on
+
 #include <algorithm>
 #include <csetjmp>
-#include <cstdio>
 #include <optional>
 #include <vector>
-
-// In this order: the first needs what <cstdio> declares, the second what the first configures.
-#include <jerror.h>
-#include <jpeglib.h>
 
 #include "device/icon_decoder.h"
 #include "device/icon_scaler.h"
