@@ -1,0 +1,218 @@
+// The restored backup's list: which applications are processed, and what becomes of the list.
+
+#include "tests/coordination/restore_list.h"
+
+namespace appsync::fakes {
+namespace {
+
+using testing::Contains;
+using testing::ElementsAre;
+
+class RestoreListTest : public RestoredBackupTest {
+ protected:
+  RestoreListTest() : RestoredBackupTest(false) {}
+};
+
+TEST_F(RestoreListTest, WithoutAListNothingHappens) {
+  phone.files.putFile(KeptCopy, "an earlier list");
+  EXPECT_TRUE(process());
+  EXPECT_THAT(effects(), ElementsAre(said("no halvo restore plist found - skipping processing of "
+                                          "halvo restored apps")));
+  EXPECT_EQ(phone.files.textAt(KeptCopy), "an earlier list");
+}
+
+TEST_F(RestoreListTest, AnUnreadableListIsPutAside) {
+  putList({});
+  phone.faults.failWhere("FileManager.contentsAtPath", RestoreList, Refused);
+  EXPECT_FALSE(process());
+  EXPECT_EQ(effects(),
+            joined({{"fault FileManager.contentsAtPath(" + std::string(RestoreList) + ")",
+                     said("failed to read halvo app restore info. err=Error "
+                          "Domain=Fault Code=7")},
+                    listKept()}));
+  EXPECT_TRUE(listIsKept());
+}
+
+TEST_F(RestoreListTest, AListThatDoesNotParseIsPutAside) {
+  phone.files.putFile(RestoreList, "no property list");
+  std::optional<Error> error;
+  ASSERT_FALSE(parsePropertyList(asBytes("no property list"), &error));
+  EXPECT_FALSE(process());
+  EXPECT_EQ(effects(),
+            joined({{said("processing halvo restore info"),
+                     said("failed to parse halvo app restore info. err=" + description(*error))},
+                    listKept()}));
+  EXPECT_TRUE(listIsKept());
+}
+
+TEST_F(RestoreListTest, AListOfAnotherFormIsPutAside) {
+  phone.files.putPlist(RestoreList, PropertyList::Array{"com.r"});
+  EXPECT_FALSE(process());
+  EXPECT_EQ(effects(),
+            joined({{said("processing halvo restore info"),
+                     said("failed to parse halvo app restore info. err=Error "
+                          "Domain=PropertyListError Code=0 {Description = not a dictionary}")},
+                    listKept()}));
+}
+
+TEST_F(RestoreListTest, AnEmptyFileIsPutAside) {
+  phone.files.putFile(RestoreList, "");
+  EXPECT_FALSE(process());
+  EXPECT_TRUE(listIsKept());
+}
+
+TEST_F(RestoreListTest, AnEmptyListRestoresNothing) {
+  putList({});
+  EXPECT_FALSE(process());
+  EXPECT_EQ(
+      effects(),
+      joined({{said("processing halvo restore info"), "log default Oversize|Demoted Apps: (null)"},
+              listKept()}));
+}
+
+TEST_F(RestoreListTest, TheKeptCopyReplacesAnEarlierOne) {
+  phone.files.putFile(KeptCopy, "an earlier list");
+  putList({});
+  process();
+  EXPECT_TRUE(listIsKept());
+  EXPECT_EQ(phone.files.plistAt(KeptCopy), PropertyList(PropertyList::Dictionary{}));
+}
+
+TEST_F(RestoreListTest, AListThatCannotBePutAsideIsReported) {
+  putList({{"com.r", entryWith(plainMetadata())}});
+  phone.faults.failEvery("FileManager.moveItem", Refused);
+  EXPECT_TRUE(process());
+  EXPECT_EQ(effects().back(), said("failed to copy halvo metadata. err=Error Domain=Fault Code=7"));
+  EXPECT_TRUE(phone.files.exists(RestoreList));
+}
+
+TEST_F(RestoreListTest, ASecondRunFindsNoList) {
+  putList({{"com.r", entryWith({})}});
+  EXPECT_FALSE(process());
+  forget();
+  EXPECT_TRUE(process());
+  EXPECT_EQ(effects().size(), 1u);
+}
+
+TEST_F(RestoreListTest, BrokenEntriesAreSkipped) {
+  putList({{"com.a", "no dictionary"},
+           {"com.b", PropertyList::Dictionary{}},
+           {"com.c", PropertyList::Dictionary{{"HalvoMetadata", "no data"}}},
+           {"com.d", entryWith(plainMetadata())}});
+  phone.appRegistry.seedPlaceholder("com.d");
+  EXPECT_FALSE(process());
+  EXPECT_EQ(effects(), joined({{said("processing halvo restore info"),
+                                "log default Oversize|Demoted Apps: (null)",
+                                said("processing halvo restore info for 'com.a' demotionStatus :0"),
+                                said("no halvo restore info for 'com.a' - skipping"),
+                                said("processing halvo restore info for 'com.b' demotionStatus :0"),
+                                said("no HalvoMetadata for 'com.b' - ignoring"),
+                                said("processing halvo restore info for 'com.c' demotionStatus :0"),
+                                said("no HalvoMetadata for 'com.c' - ignoring"),
+                                said("processing halvo restore info for 'com.d' demotionStatus :0"),
+                                said("Found placeholder for bundle com.d"),
+                                said("placeholder already exists for 'com.d' - skiping'")},
+                               listKept()}));
+}
+
+TEST_F(RestoreListTest, TheLastApplicationProcessedDecides) {
+  const PropertyList good = entryWith(plainMetadata());
+  const PropertyList bad = entryWith({});
+  const PropertyList skipped = PropertyList::Dictionary{};
+  putList({{"com.a", bad}, {"com.b", good}});
+  EXPECT_TRUE(process());
+  putList({{"com.c", good}, {"com.d", bad}});
+  EXPECT_FALSE(process());
+  putList({{"com.e", good}, {"com.f", skipped}});
+  EXPECT_TRUE(process());
+}
+
+TEST_F(RestoreListTest, WithoutCoordinationDemotionsAreOnlyNamed) {
+  phone.files.putPlist(DemotedApps, PropertyList::Dictionary{
+                                        {"IntentionalDowngrades", PropertyList::Array{"com.r"}}});
+  putList({{"com.r", entryWith(plainMetadata())}});
+  EXPECT_TRUE(process());
+  const Trace trace = effects();
+  EXPECT_THAT(trace, Contains("log default Oversize|Demoted Apps: {IntentionalDowngrades = "
+                              "(com.r)}"));
+  EXPECT_THAT(trace, Contains(said("processing halvo restore info for 'com.r' demotionStatus :1")));
+  EXPECT_EQ(phone.appRegistry.placeholder("com.r")->installType, InstallType::Restore);
+}
+
+class CoordinatedRestoreListTest : public RestoredBackupTest {
+ protected:
+  CoordinatedRestoreListTest() : RestoredBackupTest(true) {}
+
+  void putDemoted(PropertyList::Dictionary lists) {
+    phone.files.putPlist(DemotedApps, std::move(lists));
+  }
+  InstallType placeholderType() const {
+    return phone.installCoordination.placeholders().back()->state().installType;
+  }
+};
+
+TEST_F(CoordinatedRestoreListTest, HandsEveryPartOfAnEntryToItsCoordinator) {
+  putList({{"com.r", entryWith(plainMetadata())}});
+  EXPECT_TRUE(process());
+  const auto state = phone.installCoordination.placeholders().front()->state();
+  EXPECT_EQ(state.metadata, StoreMetadata{plainMetadata()});
+  EXPECT_EQ(state.sinfData, toBytes("sinf"));
+  EXPECT_EQ(phone.files.textAt("/tmp/com.corvane.twc.Apps/com.r.app/Icon.png"), "icon");
+  EXPECT_EQ(state.installType, InstallType::Restore);
+  EXPECT_TRUE(listIsKept());
+}
+
+TEST_F(CoordinatedRestoreListTest, BlobAndIconMayBeMissingOrOfAnotherType) {
+  putList({{"com.r", PropertyList::Dictionary{{"HalvoMetadata", plistBytes(plainMetadata())},
+                                              {"ApplicationSINF", "no data"},
+                                              {"PlaceholderIcon", 5}}}});
+  EXPECT_TRUE(process());
+  const auto state = phone.installCoordination.placeholders().front()->state();
+  EXPECT_EQ(state.sinfData, std::nullopt);
+  EXPECT_EQ(state.iconPromise, nullptr);
+}
+
+TEST_F(CoordinatedRestoreListTest, TheAutomaticListWinsOverTheIntentionalOne) {
+  putDemoted({{"AutomaticDowngrades", PropertyList::Array{5, "com.r"}},
+              {"IntentionalDowngrades", PropertyList::Array{"com.r"}}});
+  putList({{"com.r", entryWith(plainMetadata())}});
+  EXPECT_TRUE(process());
+  EXPECT_EQ(placeholderType(), InstallType::Downgrade);
+  EXPECT_THAT(effects(),
+              Contains(said("processing halvo restore info for 'com.r' demotionStatus :2")));
+}
+
+TEST_F(CoordinatedRestoreListTest, AnIntentionalDemotionIsKept) {
+  putDemoted(
+      {{"AutomaticDowngrades", "com.r"}, {"IntentionalDowngrades", PropertyList::Array{"com.r"}}});
+  putList({{"com.r", entryWith(plainMetadata())}});
+  EXPECT_TRUE(process());
+  EXPECT_EQ(placeholderType(), InstallType::IntentionalDowngrade);
+}
+
+TEST_F(CoordinatedRestoreListTest, ADamagedListOfDemotionsDemotesNothing) {
+  phone.files.putFile(DemotedApps, "no property list");
+  putList({{"com.r", entryWith(plainMetadata())}});
+  EXPECT_TRUE(process());
+  EXPECT_EQ(placeholderType(), InstallType::Restore);
+  EXPECT_THAT(effects(), Contains(complained("couldn't parse demoted apps list")));
+}
+
+TEST_F(CoordinatedRestoreListTest, APlaceholderThatStandsIsNoReasonToSkip) {
+  phone.appRegistry.seedPlaceholder("com.r");
+  putList({{"com.r", entryWith(plainMetadata())}});
+  EXPECT_TRUE(process());
+  EXPECT_EQ(phone.installCoordination.placeholders().size(), 1u);
+}
+
+TEST_F(CoordinatedRestoreListTest, TheLastRestoreDecides) {
+  const PropertyList good = entryWith(plainMetadata());
+  const PropertyList bad = PropertyList::Dictionary{{"HalvoMetadata", toBytes("no list")}};
+  putList({{"com.a", good}, {"com.b", bad}});
+  EXPECT_FALSE(process());
+  putList({{"com.a", bad}, {"com.b", good}});
+  EXPECT_TRUE(process());
+}
+
+}  // namespace
+}  // namespace appsync::fakes
