@@ -65,6 +65,16 @@ grep -F "Marking as deleted" log.txt || fail "the inventory did not report Jot a
 grep -q "org.example.jot not installed.*Marking as deleted" log.txt ||
   fail "the inventory did not report Jot as deleted"
 
+title "An installed application runs"
+tally=$("$program" --json apps | python3 -c '
+import json, sys
+print(next(a["path"] for a in map(json.loads, sys.stdin) if a["identifier"] == "org.example.tally"))')
+export APP_DATA=$PWD/data
+rm -rf data
+printf '\n$ Tally add "desktop sync" 3\n'
+"phone/root$tally/Tally" add "desktop sync" 3 | tee output.txt
+grep -q '3  |||' output.txt || fail "Tally does not count"
+
 title "What is on the phone now"
 run 0 apps
 expect_apps "concord 2.3" "ditdah 1.4" "kaleido 1.2" "lune 2.0" "measure 4.1" \
@@ -74,13 +84,5 @@ title "What happened"
 run 0 history
 "$program" --json history | grep -q "Uninstall succeeded" ||
   fail "the history does not tell that Lantern was removed"
-
-title "An installed application runs"
-tally=$("$program" --json apps | python3 -c '
-import json, sys
-print(next(a["path"] for a in map(json.loads, sys.stdin) if a["identifier"] == "org.example.tally"))')
-export APP_DATA=$PWD/data
-rm -rf data
-"phone/root$tally/Tally" add "desktop sync" 3
 
 printf '\nAll is as it should be. The device is %s\n' "$APPSYNC_DEVICE"

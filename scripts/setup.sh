@@ -34,7 +34,8 @@ install_packages() {
     root=(sudo)
   fi
   step "Installing ${*%%=*}"
+  mkdir -p build
   local apt=("${root[@]}" env DEBIAN_FRONTEND=noninteractive apt-get -q -o Dpkg::Use-Pty=0)
-  "${apt[@]}" update
-  "${apt[@]}" install -y --no-install-recommends "$@" || die "the packages could not be installed"
+  { "${apt[@]}" update && "${apt[@]}" install -y --no-install-recommends "$@"; } >build/setup.log 2>&1 ||
+    { cat build/setup.log >&2 && die "the packages could not be installed"; }
 }
