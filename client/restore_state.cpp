@@ -56,10 +56,12 @@ void AppsClient::_setRestoreStatePropertyValue(const PropertyList& value, std::s
 
 void AppsClient::cleanRestoreStateForIdentifier(std::string_view identifier) {
   const std::lock_guard lock(_stateFileMutex);
-  if (!_platform.files.fileExists(paths::RestoreState)) return;
-  // A damaged file counts as empty, so that it goes away here.
-  PropertyList::Dictionary state =
-      loadDictionary(_platform.files, paths::RestoreState).value_or(PropertyList::Dictionary{});
+  const std::optional<Bytes> bytes = _platform.files.contentsAtPath(paths::RestoreState);
+  if (!bytes) return;
+  // A damaged file counts as empty, so that it goes away here; one that cannot be read stays.
+  std::optional<PropertyList> parsed = parsePropertyList(*bytes);
+  PropertyList::Dictionary* entries = parsed ? parsed->asDictionary() : nullptr;
+  PropertyList::Dictionary state = entries ? std::move(*entries) : PropertyList::Dictionary{};
   state.erase(std::string(identifier));
   if (state.empty()) {
     _platform.files.removeItem(paths::RestoreState);
