@@ -5,6 +5,7 @@
 
 #include <initializer_list>
 #include <optional>
+#include <ostream>
 #include <source_location>
 #include <string>
 #include <utility>
@@ -14,6 +15,9 @@
 #include "tests/fakes/fake_platform.h"
 
 namespace appsync {
+
+inline void PrintTo(const PropertyList& value, std::ostream* out) { *out << description(value); }
+inline void PrintTo(const Error& error, std::ostream* out) { *out << description(error); }
 
 // Places as the rest of the phone knows them.
 inline const std::string SyncRootPath = "/var/mobile/Library/ApplicationSync";
