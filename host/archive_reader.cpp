@@ -39,7 +39,7 @@ ArchiveReader::ArchiveReader(const std::filesystem::path& file)
   ::archive_read_support_format_zip(archive_.get());
   ::archive_read_support_format_tar(archive_.get());
   if (::archive_read_open_filename(archive_.get(), file.c_str(), BlockSize) < ARCHIVE_WARN) {
-    end(libraryReason());
+    end(openingReason());
   }
 }
 
@@ -56,12 +56,17 @@ bool ArchiveReader::end(std::string reason) {
 }
 
 std::string ArchiveReader::libraryReason() const {
-  const int code = ::archive_errno(archive_.get());
-  if (code == ENOENT || code == EACCES || code == EISDIR) {
-    return std::generic_category().message(code);
-  }
   const char* text = ::archive_error_string(archive_.get());
-  return text ? printable(oneLine(text)) : "damaged";
+  return text ? printable(oneLine(text)) : "no reason given";
+}
+
+/// Why not even the first entry could be had.
+std::string ArchiveReader::openingReason() const {
+  const int code = ::archive_errno(archive_.get());
+  // The library takes this value for "not a format that I know".
+  if (code == EILSEQ) return "it is neither a zip nor a tar archive";
+  if (code > 0) return std::generic_category().message(code);
+  return "damaged: " + libraryReason();
 }
 
 bool ArchiveReader::next() {
@@ -73,8 +78,7 @@ bool ArchiveReader::next() {
     return false;
   }
   if (status < ARCHIVE_WARN) {
-    if (recognised_) return end("damaged: " + libraryReason());
-    return end("not an application package: " + libraryReason());
+    return end(recognised_ ? "damaged: " + libraryReason() : openingReason());
   }
   recognised_ = true;
   if (++entries_ > MaximumEntries) return end("too many entries");

@@ -39,6 +39,7 @@ class ArchiveReader {
   bool end(std::string reason);
   void note(std::string reason);
   std::string libraryReason() const;
+  std::string openingReason() const;
 
   std::unique_ptr<archive, int (*)(archive*)> archive_;
   archive_entry* entry_ = nullptr;

@@ -1,0 +1,195 @@
+#include <cerrno>
+#include <thread>
+
+#include "tests/host/session_fixture.h"
+
+namespace appsync::host {
+namespace {
+
+using namespace testing;
+using ::testing::Contains;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+TEST_F(SessionTest, RunsTheWholeSyncInOrder) {
+  packSample(folder / "a.zip", "com.a");
+  packSample(folder / "b.tar.gz", "com.b", "2.0");
+  phone.appRegistry.seedInstalled("com.b", "1.0");
+  phone.appRegistry.seedInstalled("com.c", "1.0");
+  phone.appRegistry.seedPlaceholder("com.left", InstallType::Sync);
+  options.remove = {"com.c"};
+  iconLayout = toBytes("layout");
+  client.deleted = {"com.gone"};
+
+  const SyncResult result = sync();
+
+  EXPECT_THAT(
+      trace(),
+      ElementsAre(
+          "AppRegistry.uninstallApplication(com.left, {UninstallPlaceholdersOnly = 1})",
+          "client.supportedDataclasses", "client.currentSyncAnchor", "client.disabledAssetTypes",
+          "client.prepareForSyncWithHostAnchor(ANCHOR)", "client.installedAssets",
+          "FileManager.removeItem(STAGING/ApplicationSync)",
+          "FileManager.createDirectory(STAGING/ApplicationSync, true, -:-)",
+          "FileManager.createDirectory(STAGING/ApplicationSync/com.a, true, -:-)",
+          "FileManager.createFile(STAGING/ApplicationSync/com.a/Info.plist, -:-)",
+          "FileManager.createFile(STAGING/ApplicationSync/com.a/Icon.png, -:-)",
+          "FileManager.createFile(STAGING/ApplicationSync/com.a/HalvoMetadata.plist, -:-)",
+          "FileManager.createFile(STAGING/ApplicationSync/com.a/HalvoArtwork, -:-)",
+          "FileManager.createDirectory(STAGING/ApplicationSync/com.b, true, -:-)",
+          "FileManager.createFile(STAGING/ApplicationSync/com.b/Info.plist, -:-)",
+          "FileManager.createFile(STAGING/ApplicationSync/com.b/Icon.png, -:-)",
+          "FileManager.createFile(STAGING/ApplicationSync/com.b/HalvoMetadata.plist, -:-)",
+          "FileManager.createFile(STAGING/ApplicationSync/com.b/HalvoArtwork, -:-)",
+          "FileManager.createFile(STAGING/ApplicationSync/DashelIconState.plist, -:-)",
+          "FileManager.createFile(STAGING/ApplicationSync/ApplicationsSync.plist, -:-)",
+          "client.reconcileSync(NEW)", "AppRegistry.uninstallApplication(com.c, {})",
+          "client.outstandingAssetTransfers", "phone.receive(STAGING/com.a.zip)",
+          "phone.received(STAGING/com.a.zip)", "client.assetTransferUpdatedProgress(com.a, 1.00)",
+          "client.assetTransferSucceeded(com.a, com.a.zip, none)",
+          "phone.receive(STAGING/com.b.tar.gz)", "phone.received(STAGING/com.b.tar.gz)",
+          "client.assetTransferUpdatedProgress(com.b, 1.00)",
+          "client.assetTransferSucceeded(com.b, com.b.tar.gz, none)",
+          "client.assetTransferEndedWithSuccess(true)", "FileManager.removeItem(STAGING/com.a.zip)",
+          "FileManager.removeItem(STAGING/com.b.tar.gz)", "client.syncEndedWithSuccess(true)",
+          "FileManager.writeAtomically(/var/mobile/Library/ApplicationSync/"
+          "LastSyncAppState.plist)"));
+  EXPECT_THAT(reporter.lines(), ElementsAre("swept com.left", "deleted-on-phone com.gone",
+                                            "progress com.a", "sent com.a", "install com.a",
+                                            "progress com.b", "sent com.b", "install com.b"));
+  EXPECT_TRUE(result.completed);
+  EXPECT_EQ(text(result.summary), "installed: com.a; updated: com.b; deleted: com.c");
+}
+
+TEST_F(SessionTest, StagesWhatTheClientTakesOver) {
+  packSample(folder / "a.zip", "com.a", "1.5");
+  iconLayout = toBytes("layout");
+  sync();
+
+  const std::string area = std::string(exchange::WorkArea) + "/";
+  EXPECT_EQ(phone.files.textAt(area + "com.a/Icon.png"), "icon of com.a");
+  EXPECT_EQ(phone.files.textAt(area + "com.a/HalvoArtwork"), "artwork");
+  EXPECT_EQ(phone.files.textAt(area + "com.a/Info.plist"),
+            xmlText(appInfo("com.a", "1.5", "Sample")));
+  EXPECT_EQ(phone.files.textAt(area + "DashelIconState.plist"), "layout");
+  const PropertyList::Dictionary entry{
+      {"identifier", "com.a"}, {"operation", "INSTALLED"}, {"version", "1.5"}, {"name", "Sample"}};
+  EXPECT_EQ(phone.files.plistAt(area + "ApplicationsSync.plist"),
+            PropertyList(PropertyList::Array{entry}));
+}
+
+TEST_F(SessionTest, ReplacesAStaleStagingArea) {
+  offer("com.a");
+  phone.files.putFile(std::string(exchange::StagingArea) + "/com.stale/Info.plist", "old");
+  sync();
+  EXPECT_FALSE(phone.files.exists(std::string(exchange::WorkArea) + "/com.stale"));
+}
+
+TEST_F(SessionTest, WritesTheApplicationsPresentAfterTheEnd) {
+  offer("com.a");
+  phone.appRegistry.seedInstalled("com.b", "1.0");
+  phone.appRegistry.seedPlaceholder("com.restoring", InstallType::Restore);
+  AppRecord system;
+  system.applicationIdentifier = "com.system";
+  system.applicationType = ApplicationTypeSystem;
+  phone.appRegistry.seedInstalled(system);
+  sync();
+  EXPECT_EQ(phone.files.plistAt(exchange::LastSyncState),
+            PropertyList(PropertyList::Array{"com.a", "com.b"}));
+}
+
+TEST_F(SessionTest, RemovesPackagesThatABrokenOffSyncLeft) {
+  phone.files.putPlist(
+      std::string(exchange::WorkArea) + "/ApplicationsSync.plist",
+      PropertyList::Array{
+          PropertyList::Dictionary{{"identifier", "com.left"}, {"operation", "DOWNLOADED"}},
+          PropertyList::Dictionary{{"identifier", "com.done"}, {"operation", "INSTALLED"}},
+          PropertyList::Dictionary{{"identifier", "../evil"}, {"operation", "install"}}});
+  for (const char* name : {"com.left.zip", "com.done.zip", "foreign.zip", "../evil.zip"}) {
+    phone.files.putFile(std::string(Root) + name, "package");
+  }
+  sync();
+  EXPECT_FALSE(phone.files.exists(std::string(Root) + "com.left.zip"));
+  EXPECT_TRUE(phone.files.exists(std::string(Root) + "com.done.zip"));
+  EXPECT_TRUE(phone.files.exists(std::string(Root) + "foreign.zip"));
+  EXPECT_TRUE(phone.files.exists("/var/mobile/Media/evil.zip"));
+}
+
+TEST_F(SessionTest, LeavesAPlaceholderWhosePackageIsBeingInstalled) {
+  phone.appRegistry.seedPlaceholder("com.coming", InstallType::Sync);
+  phone.appRegistry.seedPlaceholder("com.restoring", InstallType::Restore);
+  const auto progress = phone.appRegistry.progress("com.coming");
+  progress->begin(InstallState::Active, InstallPhase::Installing);
+  sync();
+  EXPECT_THAT(phone.appRegistry.placeholderIdentifiers(),
+              ElementsAre("com.coming", "com.restoring"));
+}
+
+TEST_F(SessionTest, SendsNothingWhenRestrictionsSwitchTheSyncOff) {
+  offer("com.a");
+  client.disabled = {"Application"};
+  const SyncResult result = sync();
+  EXPECT_TRUE(result.completed);
+  EXPECT_EQ(text(result.summary),
+            "skipped: com.a (the phone's restrictions forbid installing and removing)");
+  EXPECT_THAT(trace("client."),
+              ElementsAre("client.supportedDataclasses", "client.currentSyncAnchor",
+                          "client.disabledAssetTypes"));
+}
+
+TEST_F(SessionTest, SkipsWhatThePhoneDoesNotAskFor) {
+  offer("com.a");
+  offer("com.b");
+  client.notAskedFor = {"com.a"};
+  const SyncResult result = sync();
+  EXPECT_EQ(text(result.summary),
+            "installed: com.b; skipped: com.a (the phone did not ask for its package)");
+}
+
+TEST_F(SessionTest, FailsAnAssetThatTheLibraryLacks) {
+  client.alsoAskedFor = {"com.unknown"};
+  sync();
+  EXPECT_THAT(trace("client.assetTransferSucceeded"),
+              ElementsAre("client.assetTransferSucceeded(com.unknown, failed, POSIX 2)"));
+}
+
+TEST_F(SessionTest, ReportsARefusedPackageAndInstallsTheRest) {
+  offer("com.a");
+  offer("com.b");
+  client.refusedPackages = {{"com.a", Error::withDescription("I", 2, "damaged: bad block\n")}};
+  const SyncResult result = sync();
+  EXPECT_TRUE(result.completed);
+  EXPECT_EQ(text(result.summary), "installed: com.b; failed: com.a (damaged: bad block)");
+  EXPECT_THAT(reporter.lines(), Contains("install com.a failed: damaged: bad block"));
+}
+
+TEST_F(SessionTest, ReportsFilesOfTheLibraryThatAreNoPackages) {
+  putFile(folder / "broken.zip", "garbage");
+  putFile(folder / "notes.txt", "buy milk");
+  const SyncResult result = sync();
+  EXPECT_EQ(text(result.summary),
+            "failed: broken.zip (it is neither a zip nor a tar archive); "
+            "skipped: notes.txt (it is neither a zip nor a tar archive)");
+}
+
+TEST_F(SessionTest, WaitsForCoordinatedInstalls) {
+  offer("com.a");
+  coordination = true;
+  client.installsAtOnce = false;
+  std::thread coordinator;
+  const auto set = [this](const char* operation) {
+    phone.files.putPlist(std::string(exchange::WorkArea) + "/ApplicationsSync.plist",
+                         PropertyList::Array{PropertyList::Dictionary{{"identifier", "com.a"},
+                                                                      {"operation", operation}}});
+  };
+  client.onSent = [&](const SyncAssetPtr&) {
+    set("DOWNLOADED");
+    coordinator = std::thread([&] { set("INSTALLED"); });
+  };
+  const SyncResult result = sync();
+  coordinator.join();
+  EXPECT_EQ(text(result.summary), "installed: com.a");
+}
+
+}  // namespace
+}  // namespace appsync::host
