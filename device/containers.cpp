@@ -115,6 +115,14 @@ bool Containers::makeData(std::string_view identifier, std::optional<Error>* err
   return files_.createDirectory(dataPath(identifier), true, {}, error);
 }
 
+std::vector<std::string> Containers::emptyData() {
+  std::vector<std::string> identifiers = namesIn(DataDirectory);
+  std::erase_if(identifiers, [&](const std::string& identifier) {
+    return !namesIn(dataPath(identifier)).empty();
+  });
+  return identifiers;
+}
+
 bool Containers::removeData(std::string_view identifier) {
   return removeIfThere(dataPath(identifier));
 }

@@ -36,6 +36,8 @@ class Containers {
   bool adoptWaitingData(std::string_view identifier, std::optional<Error>* error);
   bool removeWaitingData(std::string_view identifier);
   bool makeData(std::string_view identifier, std::optional<Error>* error);
+  /// The applications that have a data directory with nothing in it.
+  std::vector<std::string> emptyData();
   /// True when the application has no data any more.
   bool removeData(std::string_view identifier);
 

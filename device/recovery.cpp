@@ -68,6 +68,14 @@ void removeAllAbandonedData(DeviceCore& core) {
   for (const std::string& identifier : identifiers) removeAbandonedData(core, identifier, nullptr);
 }
 
+/// What a first install left that did not come to its end. Data with something in it is never
+/// removed without an order to do so.
+void removeUnusedData(DeviceCore& core, const std::set<std::string>& installed) {
+  for (const std::string& identifier : core.containers.emptyData()) {
+    if (!installed.contains(identifier)) core.containers.removeData(identifier);
+  }
+}
+
 void pauseInstalls(DeviceCore& core) {
   core.database.change("the installs under way could not be paused", Database::Commit::Ordinary,
                        [](SQLite::Database& database) {
@@ -81,12 +89,16 @@ void pauseInstalls(DeviceCore& core) {
                        });
 }
 
-void clearForeground(const Foreground& foreground, const std::vector<ApplicationRow>& rows) {
-  foreground.sweep();
-  std::set<std::string_view> installed;
+std::set<std::string> installedAmong(const std::vector<ApplicationRow>& rows) {
+  std::set<std::string> installed;
   for (const ApplicationRow& row : rows) {
     if (!row.placeholder) installed.insert(row.identifier);
   }
+  return installed;
+}
+
+void clearForeground(const Foreground& foreground, const std::set<std::string>& installed) {
+  foreground.sweep();
   for (const std::string& identifier : foreground.running()) {
     if (!installed.contains(identifier)) foreground.quit(identifier, nullptr);
   }
@@ -100,9 +112,11 @@ void finishInterruptedWork(DeviceCore& core, Foreground& foreground) {
   if (!read) return;  // nothing is removed on the word of a registry that cannot be read
   rows = dropRowsWithoutBundle(core, std::move(rows));
   removeUnnamedContainers(core, rows);
+  const std::set<std::string> installed = installedAmong(rows);
   removeAllAbandonedData(core);
+  removeUnusedData(core, installed);
   pauseInstalls(core);
-  clearForeground(foreground, rows);
+  clearForeground(foreground, installed);
 }
 
 }  // namespace appsync::device

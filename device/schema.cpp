@@ -96,17 +96,12 @@ std::string uri(const std::filesystem::path& file, std::string_view parameters) 
 }
 
 SQLite::Database connectForReading(const std::filesystem::path& file) {
-  const int flags = SQLite::OPEN_READONLY | SQLite::OPEN_URI;
-  try {
-    SQLite::Database database(uri(file, "mode=ro&readonly_shm=1"), flags, BusyTimeout);
-    database.execAndGet("PRAGMA user_version");
-    return database;
-  } catch (const SQLite::Exception& exception) {
-    if (exception.getErrorCode() != SQLITE_CANTOPEN) throw;
-  }
-  // A copy of a device may lack the log files. Nobody has opened it for writing since, and a reader
-  // makes no files: the database file alone is the whole state.
-  return {uri(file, "immutable=1"), flags, BusyTimeout};
+  // A copy of a device may lack the log files, and a reader makes none. Whoever opens it for
+  // writing makes them first: until then the database file alone is the whole state.
+  const bool hasLog = std::filesystem::exists(file.native() + "-wal") &&
+                      std::filesystem::exists(file.native() + "-shm");
+  return {uri(file, hasLog ? "mode=ro&readonly_shm=1" : "immutable=1"),
+          SQLite::OPEN_READONLY | SQLite::OPEN_URI, BusyTimeout};
 }
 
 SQLite::Database connect(const std::filesystem::path& file, Access access) {

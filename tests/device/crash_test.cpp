@@ -1,0 +1,250 @@
+#include <sqlite3.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <set>
+
+#include "device/app_registry.h"
+#include "device/device_folder.h"
+#include "device/installs.h"
+#include "device/log_files.h"
+#include "device/schema.h"
+#include "platform/bundle.h"
+#include "tests/device/device_test.h"
+
+namespace appsync::device {
+namespace {
+
+namespace fs = std::filesystem;
+using Lines = std::vector<std::string>;
+using Snapshot = std::map<std::string, std::string>;
+
+/// Ends the process, as a kill would, when it comes to the given step.
+class Fuse {
+ public:
+  explicit Fuse(int steps) : left_(steps) {}
+  void burn() {
+    if (left_-- == 0) _exit(Died);
+  }
+  static constexpr int Died = 77;
+
+ private:
+  int left_;
+};
+
+/// Passes every call on; each change is a step.
+class FusedFiles final : public FileManager {
+ public:
+  FusedFiles(FileManager& files, Fuse& fuse) : files_(files), fuse_(fuse) {}
+
+  std::optional<Bytes> contentsAtPath(std::string_view path,
+                                      std::optional<Error>* error) noexcept override {
+    return files_.contentsAtPath(path, error);
+  }
+  bool writeAtomically(std::string_view path, ByteView bytes,
+                       std::optional<Error>* error) noexcept override {
+    fuse_.burn();
+    return files_.writeAtomically(path, bytes, error);
+  }
+  bool createFile(std::string_view path, ByteView bytes,
+                  const FileAttributes& attributes) noexcept override {
+    fuse_.burn();
+    return files_.createFile(path, bytes, attributes);
+  }
+  bool createDirectory(std::string_view path, bool withIntermediates,
+                       const FileAttributes& attributes,
+                       std::optional<Error>* error) noexcept override {
+    fuse_.burn();
+    return files_.createDirectory(path, withIntermediates, attributes, error);
+  }
+  bool removeItem(std::string_view path, std::optional<Error>* error) noexcept override {
+    fuse_.burn();
+    return files_.removeItem(path, error);
+  }
+  bool moveItem(std::string_view from, std::string_view to,
+                std::optional<Error>* error) noexcept override {
+    fuse_.burn();
+    return files_.moveItem(from, to, error);
+  }
+  bool copyItem(std::string_view from, std::string_view to,
+                std::optional<Error>* error) noexcept override {
+    fuse_.burn();
+    return files_.copyItem(from, to, error);
+  }
+  bool fileExists(std::string_view path) noexcept override { return files_.fileExists(path); }
+  bool directoryExists(std::string_view path) noexcept override {
+    return files_.directoryExists(path);
+  }
+  std::optional<ItemAttributes> attributesOfItem(std::string_view path,
+                                                 std::optional<Error>* error) noexcept override {
+    return files_.attributesOfItem(path, error);
+  }
+  bool touch(std::string_view path, std::optional<Error>* error) noexcept override {
+    return files_.touch(path, error);
+  }
+  std::string temporaryDirectory() noexcept override { return files_.temporaryDirectory(); }
+
+ private:
+  FileManager& files_;
+  Fuse& fuse_;
+};
+
+/// The registry of a device whose process dies at a step: a change of a file, or a commit (before
+/// it is made).
+class FusedDevice {
+ public:
+  FusedDevice(const fs::path& folder, int steps) : fuse_(steps), paths_(folder) {
+    DeviceError problem;
+    database_ = openDatabase(paths_.folder, paths_.database, Access::Write, log_, problem);
+    if (!database_) _exit(1);
+    database_->read("", [&](SQLite::Database& connection) {
+      sqlite3_commit_hook(
+          connection.getHandle(),
+          [](void* fuse) {
+            static_cast<Fuse*>(fuse)->burn();
+            return 0;
+          },
+          &fuse_);
+    });
+    core_.emplace(
+        DeviceCore{*database_, files_, handles_, containers_, log_, observers_, watcher_, locks_});
+    registry_.emplace(*core_);
+  }
+  DeviceAppRegistry& registry() { return *registry_; }
+
+ private:
+  Fuse fuse_;
+  DevicePaths paths_;
+  LogFiles log_{paths_.log, true};
+  std::unique_ptr<Database> database_;
+  ConfinedFileManager handles_{paths_.root};
+  FusedFiles files_{handles_, fuse_};
+  Containers containers_{files_, handles_, log_};
+  RegistryObservers observers_{[this] { return reportInstalls(*database_); }};
+  WatcherSlot watcher_;
+  KeyedMutex locks_;
+  std::optional<DeviceCore> core_;
+  std::optional<DeviceAppRegistry> registry_;
+};
+
+class CrashTest : public DeviceTest {
+ protected:
+  using Change = std::function<bool(DeviceAppRegistry&)>;
+
+  /// What a person would find: the registry and all files that belong to it.
+  Snapshot picture() {
+    Snapshot found;
+    for (const AppRecord& each : device->applications()) {
+      const std::string name = description(each) + " ";
+      for (const auto& [file, contents] : testing::snapshot(onDisk(*each.bundleContainerPath))) {
+        found[name + file] = contents;
+      }
+    }
+    for (const auto& [file, contents] : testing::snapshot(onDisk("/var/mobile/Containers/Data"))) {
+      found["data " + file] = contents;
+    }
+    return found;
+  }
+
+  /// Lets a process die at every step of a change that begins with the present device. Whatever
+  /// the step, the device that is opened afterwards has the `before` picture or the `after` one.
+  void expectOldOrNew(const Change& change) {
+    const Snapshot before = picture();
+    device.reset();
+    const fs::path origin = temporary.path() / "origin";
+    fs::rename(folder, origin);
+    std::vector<Snapshot> pictures;
+    int status = Fuse::Died;
+    for (int step = 0; status == Fuse::Died; ++step) {
+      fs::remove_all(folder);
+      fs::copy(origin, folder, fs::copy_options::recursive);
+      status = inOtherProcess([&] { return change(FusedDevice(folder, step).registry()) ? 0 : 1; });
+      reopen();
+      EXPECT_EQ(containerCount(), registry().size()) << "after step " << step;
+      pictures.push_back(picture());
+    }
+    ASSERT_EQ(status, 0) << "the change fails of itself";
+    ASSERT_GT(pictures.size(), 3U);
+    const Snapshot& after = pictures.back();
+    EXPECT_TRUE(before != after);
+    std::size_t step = 0;
+    while (step < pictures.size() && pictures[step] == before) ++step;
+    EXPECT_GT(step, 0U);
+    for (; step < pictures.size(); ++step) EXPECT_TRUE(pictures[step] == after) << "step " << step;
+  }
+
+  Change install(std::string_view identifier, std::string_view version) {
+    const FileLocation package =
+        stage(PackageArchive().addApplication(identifier, version).add("HalvoArtwork", "picture"));
+    return [package, id = std::string(identifier)](DeviceAppRegistry& target) {
+      return target.installApplication(package,
+                                       {{std::string(SWPackageTypeKey), SWPackageTypeCustomer},
+                                        {std::string(KBBundleIdentifier), id}},
+                                       nullptr);
+    };
+  }
+};
+
+TEST_F(CrashTest, AFirstInstall) { expectOldOrNew(install("com.example.a", "1.0")); }
+
+TEST_F(CrashTest, AnUpdateWithAPlaceholderLaidOver) {
+  ASSERT_TRUE(installPackage("com.example.a", "1.0"));
+  putFile("/var/mobile/Containers/Data/com.example.a/notes", "mine");
+  ASSERT_TRUE(installPlaceholder("com.example.a", "2.0",
+                                 {{std::string(SWHalvoMetadataKey), toBytes("metadata")}}));
+  expectOldOrNew(install("com.example.a", "2.0"));
+}
+
+TEST_F(CrashTest, APlaceholderThatReplacesAnother) {
+  ASSERT_TRUE(installPlaceholder("com.example.a", "2.0"));
+  ASSERT_TRUE(installPlaceholder("com.example.a", "1.0"));
+  const std::string bundle = "/tmp/com.corvane.twc.Apps/com.example.a.app";
+  putFile(bundle + "/Info.plist", xml(infoOf("com.example.a", "3.0")));
+  expectOldOrNew([&](DeviceAppRegistry& target) {
+    return target.installApplication(FileLocation::directory(bundle),
+                                     {{std::string(SWPackageTypeKey), SWPackageTypePlaceholder},
+                                      {std::string(KBBundleIdentifier), "com.example.a"},
+                                      {std::string(SWHalvoMetadataKey), toBytes("metadata")}},
+                                     nullptr);
+  });
+}
+
+TEST_F(CrashTest, AnUninstallOfAnApplicationWithData) {
+  ASSERT_TRUE(installPackage("com.example.a", "1.0"));
+  putFile("/var/mobile/Containers/Data/com.example.a/notes", "mine");
+  expectOldOrNew(
+      [](DeviceAppRegistry& target) { return target.uninstallApplication("com.example.a", {}); });
+}
+
+TEST_F(CrashTest, APersonsUninstallDuringAnUpdate) {
+  ASSERT_TRUE(installPackage("com.example.a", "1.0"));
+  ASSERT_TRUE(installPlaceholder("com.example.a", "2.0"));
+  expectOldOrNew(
+      [](DeviceAppRegistry& target) { return target.removeApplication("com.example.a", nullptr); });
+}
+
+TEST_F(CrashTest, ARestoreNeverLosesItsData) {
+  const std::string waiting = "/var/mobile/Media/HalvoRestore/Data/com.example.a";
+  ASSERT_TRUE(installRestorePlaceholder("com.example.a"));
+  putFile(waiting + "/notes", "from the backup");
+  const Change change = install("com.example.a", "1.0");
+  device.reset();
+  const fs::path origin = temporary.path() / "origin";
+  fs::rename(folder, origin);
+  int status = Fuse::Died;
+  for (int step = 0; status == Fuse::Died; ++step) {
+    fs::remove_all(folder);
+    fs::copy(origin, folder, fs::copy_options::recursive);
+    status = inOtherProcess([&] { return change(FusedDevice(folder, step).registry()) ? 0 : 1; });
+    reopen();
+    if (version("com.example.a") != "1.0") {
+      ASSERT_TRUE(change(static_cast<DeviceAppRegistry&>(device->appRegistry())));
+    }
+    EXPECT_EQ(textAt("/var/mobile/Containers/Data/com.example.a/notes"), "from the backup")
+        << "after step " << step;
+  }
+  EXPECT_EQ(status, 0);
+}
+
+}  // namespace
+}  // namespace appsync::device

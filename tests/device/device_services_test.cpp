@@ -1,0 +1,100 @@
+#include <future>
+
+#include "tests/device/device_test.h"
+
+namespace appsync::device {
+namespace {
+
+class DeviceServicesTest : public DeviceTest {};
+
+TEST_F(DeviceServicesTest, PoliciesAreNotSetAtFirstAndSurviveClosing) {
+  EXPECT_EQ(device->policy(PolicySetting::AppInstallationAllowed), PolicyValue::NotSet);
+  EXPECT_EQ(device->policy(PolicySetting::AppRemovalAllowed), PolicyValue::NotSet);
+  ASSERT_TRUE(
+      device->setPolicy(PolicySetting::AppRemovalAllowed, PolicyValue::ExplicitlyNo, &error));
+  reopen();
+  EXPECT_EQ(platform().devicePolicy.effectiveBoolValue(PolicySetting::AppInstallationAllowed),
+            PolicyValue::NotSet);
+  EXPECT_EQ(platform().devicePolicy.effectiveBoolValue(PolicySetting::AppRemovalAllowed),
+            PolicyValue::ExplicitlyNo);
+}
+
+TEST_F(DeviceServicesTest, TransactionRecordsKeepTheirOrderAndAllTheirParts) {
+  TransactionLog& log = platform().transactionLog;
+  log.initializeWithLog({"com.corvane.appinstallation", "twc.appsync"});
+  log.logScenario("Asset install", 0, true, "com.example.a", "assertion succeeded");
+  log.logScenario("Install placeholder", std::nullopt, false, "com.example.b", "failed");
+  log.logStep(4, 1, 2, true, "com.example.c", "done");
+  reopen();
+  const auto records = device->transactions();
+  ASSERT_EQ(records.size(), 3U);
+  EXPECT_EQ(records[0].number, 1);
+  EXPECT_EQ(records[0].scenario, "Asset install");
+  EXPECT_EQ(records[0].step, 0U);
+  EXPECT_TRUE(records[0].success);
+  EXPECT_EQ(records[0].bundleId, "com.example.a");
+  EXPECT_EQ(records[0].description, "assertion succeeded");
+  EXPECT_EQ(records[1].step, std::nullopt);
+  EXPECT_FALSE(records[1].success);
+  EXPECT_EQ(records[2].scenario, "");
+  EXPECT_EQ(records[2].step, 4U);
+  EXPECT_EQ(records[2].party, 1U);
+  EXPECT_EQ(records[2].phase, 2U);
+  EXPECT_GT(records[2].time, 1.7e9);
+  EXPECT_GE(records[2].time, records[0].time);
+  EXPECT_EQ(device->transactions(2).size(), 1U);
+}
+
+TEST_F(DeviceServicesTest, RestoreDataExistsWhileADirectoryWithSomethingInItWaits) {
+  BackupManager& backup = platform().backupManager;
+  const std::string waiting = "/var/mobile/Media/HalvoRestore/Data/com.example.a";
+  EXPECT_FALSE(backup.restoreDataExists("com.example.a"));
+  std::filesystem::create_directories(onDisk(waiting));
+  EXPECT_FALSE(backup.restoreDataExists("com.example.a"));
+  putFile(waiting + "/notes", "from the backup");
+  EXPECT_TRUE(backup.restoreDataExists("com.example.a"));
+  EXPECT_FALSE(backup.restoreDataExists("com.example.b"));
+  backup.cancelApplicationRestore("com.example.b");
+  backup.cancelApplicationRestore("com.example.a");
+  EXPECT_FALSE(backup.restoreDataExists("com.example.a"));
+  EXPECT_FALSE(device->files().fileExists(waiting));
+}
+
+TEST_F(DeviceServicesTest, CoordinationIsOffAndRefusesWithAReason) {
+  InstallCoordination& coordination = platform().installCoordination;
+  EXPECT_FALSE(coordination.coordinationIsEnabled());
+  bool created = true;
+  EXPECT_EQ(coordination.coordinatorFor(CoordinatorKind::Initiating, "com.example.a",
+                                        SyncHostClientID, true, &created, &error),
+            nullptr);
+  EXPECT_FALSE(created);
+  EXPECT_TRUE(error);
+  EXPECT_EQ(
+      coordination.createAppPlaceholder("A", "com.example.a", InstallType::Sync, SyncHostClientID),
+      nullptr);
+  std::promise<std::optional<Error>> completed;
+  coordination.uninstallApp("com.example.a", false, [&](const std::optional<Error>& reason) {
+    completed.set_value(reason);
+  });
+  EXPECT_TRUE(completed.get_future().get());
+  const Error cause = Error::posix(ENOSPC);
+  const Error shown = coordination.createUserPresentableError(3, 0, cause);
+  EXPECT_EQ(shown.code, 3);
+  ASSERT_TRUE(shown.underlying);
+  EXPECT_EQ(*shown.underlying, cause);
+}
+
+TEST_F(DeviceServicesTest, AReceivedFileArrivesInsideThePhone) {
+  auto receiver = device->receiveFile("/var/mobile/Media/PublicStaging/../new/a.pkg", &error);
+  ASSERT_TRUE(receiver) << error->localizedDescription();
+  ASSERT_TRUE(receiver->append(asBytes("one "), &error));
+  ASSERT_TRUE(receiver->append(asBytes("two"), &error));
+  ASSERT_TRUE(receiver->finish(&error));
+  EXPECT_EQ(textAt("/var/mobile/Media/new/a.pkg"), "one two");
+  std::filesystem::create_directory_symlink(temporary.path(), onDisk("/tmp/out"));
+  receiver = device->receiveFile("/tmp/out/a.pkg", &error);
+  EXPECT_FALSE(std::filesystem::exists(temporary.path() / "a.pkg"));
+}
+
+}  // namespace
+}  // namespace appsync::device

@@ -1,0 +1,110 @@
+#include <SQLiteCpp/SQLiteCpp.h>
+
+#include <algorithm>
+
+#include "tests/device/device_test.h"
+
+namespace appsync::device {
+namespace {
+
+using Lines = std::vector<std::string>;
+constexpr std::string_view Id = "com.example.a";
+
+class RecoveryTest : public DeviceTest {
+ protected:
+  bool logMentions(std::string_view text) {
+    return std::ranges::any_of(
+        logTexts(), [&](const std::string& line) { return line.find(text) != std::string::npos; });
+  }
+};
+
+TEST_F(RecoveryTest, AHalfExtractedContainerIsSweptWhenTheDeviceIsOpened) {
+  ASSERT_TRUE(installPackage(Id));
+  const std::string half = "/var/mobile/Containers/Applications/HALF";
+  putFile(half + "/Sample.app/Info.plist", "not complete");
+  reopen(Access::ReadOnly);
+  EXPECT_TRUE(device->files().directoryExists(half)) << "a reader changes nothing";
+  reopen();
+  EXPECT_FALSE(device->files().fileExists(half));
+  EXPECT_EQ(containerCount(), 1U);
+  EXPECT_EQ(registry(), Lines{"com.example.a 1.0"});
+  EXPECT_TRUE(logMentions(half));
+}
+
+TEST_F(RecoveryTest, ARowWhoseBundleIsGoneIsDroppedAndNoted) {
+  ASSERT_TRUE(installPackage(Id, "1.0"));
+  ASSERT_TRUE(installPlaceholder(Id, "2.0"));
+  ASSERT_TRUE(installPackage("com.example.b"));
+  std::filesystem::remove_all(onDisk(*record(Id)->bundleContainerPath));
+  reopen();
+  EXPECT_EQ(registry(), (Lines{"com.example.a 2.0 (placeholder)", "com.example.b 1.0"}));
+  EXPECT_TRUE(logMentions("com.example.a is dropped"));
+}
+
+TEST_F(RecoveryTest, ALinkInThePlaceOfAContainerIsRemovedAndNotFollowed) {
+  const auto outside = temporary.path() / "outside";
+  testing::putFile(outside / "precious", "kept");
+  std::filesystem::create_directory_symlink(outside,
+                                            onDisk("/var/mobile/Containers/Applications/LINK"));
+  reopen();
+  EXPECT_EQ(containerCount(), 0U);
+  EXPECT_EQ(testing::fileContents(outside / "precious"), "kept");
+}
+
+TEST_F(RecoveryTest, InstallsThatNobodyCarriesOnArePausedAndCanBeTakenUpAgain) {
+  ASSERT_TRUE(installRestorePlaceholder(Id));
+  const auto progress = device->appRegistry().installProgressSync(*record(Id, true));
+  progress->setInstallState(InstallState::Active);
+  progress->setTotalUnitCount(1000);
+  progress->setCompletedUnitCount(456);
+  reopen();
+  const auto again = device->appRegistry().installProgressSync(*record(Id, true));
+  ASSERT_TRUE(again);
+  EXPECT_EQ(again->installState(), InstallState::Paused);
+  EXPECT_EQ(again->completedUnitCount(), 456);
+  EXPECT_EQ(again->totalUnitCount(), 1000);
+  again->setInstallState(InstallState::Active);
+  EXPECT_EQ(again->installState(), InstallState::Active);
+}
+
+TEST_F(RecoveryTest, AFailedOrCancelledInstallStaysSo) {
+  ASSERT_TRUE(installPlaceholder("com.example.failed"));
+  ASSERT_TRUE(installPlaceholder("com.example.cancelled"));
+  auto& apps = device->appRegistry();
+  apps.installProgressSync(*record("com.example.failed", true))
+      ->setInstallState(InstallState::Failed);
+  apps.installProgressSync(*record("com.example.cancelled", true))->cancel();
+  reopen();
+  auto& reopened = device->appRegistry();
+  EXPECT_EQ(reopened.installProgressSync(*record("com.example.failed", true))->installState(),
+            InstallState::Failed);
+  EXPECT_EQ(reopened.installProgressSync(*record("com.example.cancelled", true))->installState(),
+            InstallState::Canceled);
+}
+
+TEST_F(RecoveryTest, DataOfAnApplicationWhoseRemovalBrokeOffIsRemoved) {
+  putFile("/var/mobile/Containers/Data/com.example.gone/notes", "old");
+  putFile("/var/mobile/Containers/Data/com.example.other/notes", "not named");
+  device.reset();
+  SQLite::Database((folder / "device.db").string(), SQLite::OPEN_READWRITE)
+      .exec("INSERT INTO abandoned_data VALUES ('com.example.gone')");
+  reopen();
+  EXPECT_FALSE(device->files().fileExists("/var/mobile/Containers/Data/com.example.gone"));
+  EXPECT_TRUE(device->files().fileExists("/var/mobile/Containers/Data/com.example.other"));
+}
+
+TEST_F(RecoveryTest, TheTransactionLogKeepsItsNewestRecords) {
+  device.reset();
+  SQLite::Database((folder / "device.db").string(), SQLite::OPEN_READWRITE)
+      .exec(
+          "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 20005) "
+          "INSERT INTO transactions SELECT i, 0, '', '', 's', NULL, 0, 0, 1, 'a', 'b' FROM n");
+  reopen();
+  const auto records = device->transactions();
+  ASSERT_EQ(records.size(), 20'000U);
+  EXPECT_EQ(records.front().number, 6);
+  EXPECT_EQ(records.back().number, 20'005);
+}
+
+}  // namespace
+}  // namespace appsync::device
