@@ -4,6 +4,7 @@
 
 #include "device/package_names.h"
 #include "platform/installer_service.h"
+#include "platform/utf8.h"
 
 namespace appsync::device {
 

@@ -4,6 +4,8 @@
 #include <cstdio>
 #include <optional>
 
+#include "platform/utf8.h"
+
 namespace appsync::device {
 
 namespace {
@@ -29,26 +31,6 @@ std::optional<char32_t> takeCharacter(std::string_view& text) {
   if (overlong || surrogate || value > 0x10ffff) return std::nullopt;
   text.remove_prefix(length);
   return value;
-}
-
-void appendCharacter(std::string& text, char32_t value) {
-  const auto append = [&](char32_t byte) { text += static_cast<char>(byte); };
-  const auto continuation = [&](int shift) { append(0x80 | (value >> shift & 0x3f)); };
-  if (value < 0x80) {
-    append(value);
-  } else if (value < 0x800) {
-    append(0xc0 | value >> 6);
-    continuation(0);
-  } else if (value < 0x10000) {
-    append(0xe0 | value >> 12);
-    continuation(6);
-    continuation(0);
-  } else {
-    append(0xf0 | value >> 18);
-    continuation(12);
-    continuation(6);
-    continuation(0);
-  }
 }
 
 bool isInvisibleControl(char32_t c) {
@@ -97,12 +79,6 @@ char32_t folded(char32_t c) {
 
 }  // namespace
 
-bool isUtf8(std::string_view text) {
-  while (!text.empty())
-    if (!takeCharacter(text)) return false;
-  return true;
-}
-
 bool holdsInvisibleControls(std::string_view name) {
   while (!name.empty()) {
     const std::optional<char32_t> c = takeCharacter(name);
@@ -117,7 +93,7 @@ std::string foldCase(std::string_view name) {
   while (!name.empty()) {
     const std::optional<char32_t> c = takeCharacter(name);
     if (!c) return result.append(name);
-    appendCharacter(result, folded(*c));
+    appendUtf8(result, folded(*c));
   }
   return result;
 }

@@ -5,9 +5,6 @@
 
 namespace appsync::device {
 
-/// Well-formed UTF-8, without overlong forms and surrogates.
-bool isUtf8(std::string_view text);
-
 /// Whether people could not see what the name really is: a control character (C0, DEL, C1), a line
 /// or paragraph separator, or a mark that turns the reading direction of what follows. `name` is
 /// UTF-8.

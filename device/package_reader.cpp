@@ -105,13 +105,14 @@ void PackageReader::openTar() {
 
 std::int64_t PackageReader::readStream(archive* a, void* self, const void** block) {
   auto& reader = *static_cast<PackageReader*>(self);
-  ByteView bytes;
+  ByteView& bytes = reader.block_;
   if (!reader.streamError_) reader.streamError_ = reader.stream_->next(bytes);
   if (!reader.streamError_) reader.streamError_ = reader.rules_.admitStreamBytes(bytes.size());
   if (reader.streamError_) {
     ::archive_set_error(a, EIO, "the stream failed");
     return ARCHIVE_FATAL;
   }
+  reader.handed_ += bytes.size();
   *block = bytes.data();
   return static_cast<std::int64_t>(bytes.size());
 }
@@ -120,6 +121,10 @@ bool PackageReader::next(PackageItem& item, std::optional<Error>& error) {
   const Utf8Thread utf8;
   if (!opened_) {
     opened_ = true;
+    if (fileSize(fd_) == 0) {
+      error = refusalError(PackageRefusal::NotAnArchive, "it is empty");
+      return false;
+    }
     if (!looksLikeZip(fd_)) {
       openTar();
     } else if ((error = openZip())) {
@@ -183,13 +188,14 @@ std::optional<Error> PackageReader::finish() {
 
 std::optional<Error> PackageReader::drain() {
   // Only at the very end does the compression's checksum show whether all bytes were right.
+  const auto used = static_cast<std::uint64_t>(::archive_filter_bytes(archive_.get(), 0));
+  ByteView bytes = block_.last(std::min<std::size_t>(handed_ - used, block_.size()));
   while (true) {
-    ByteView bytes;
+    if (std::ranges::any_of(bytes, [](std::byte b) { return b != std::byte{0}; }))
+      return refusalError(PackageRefusal::Damaged, "something follows the end of the archive");
     if (auto error = stream_->next(bytes)) return error;
     if (bytes.empty()) return std::nullopt;
     if (auto error = rules_.admitStreamBytes(bytes.size())) return error;
-    if (std::ranges::any_of(bytes, [](std::byte b) { return b != std::byte{0}; }))
-      return refusalError(PackageRefusal::Damaged, "something follows the end of the archive");
   }
 }
 

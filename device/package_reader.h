@@ -56,6 +56,8 @@ class PackageReader {
   std::unique_ptr<PackageStream> stream_;  ///< of a tar archive
   std::unique_ptr<archive, Free> archive_;
   archive_entry* entry_ = nullptr;
+  ByteView block_;                    ///< of the stream, the one that the archive library got last
+  std::uint64_t handed_ = 0;          ///< bytes of the stream that it got
   std::optional<Error> streamError_;  ///< what went wrong below the archive library
   std::uint64_t entryEnd_ = 0;        ///< in the stream, of the entry before the current one
   bool opened_ = false;

@@ -66,6 +66,7 @@ class ZipFile {
       if (auto error = checkEntry(directory.end, at)) return error;
     }
     if (entries != directory.entries) return damaged("the table of contents is cut off");
+    if (entries == 0) return refusalError(PackageRefusal::NoApplication, "the archive is empty");
     return std::nullopt;
   }
 

@@ -1,0 +1,32 @@
+#pragma once
+
+#include <filesystem>
+#include <map>
+#include <string>
+#include <string_view>
+
+namespace appsync::device::testing {
+
+/// A new empty folder that disappears with the object.
+class TemporaryFolder {
+ public:
+  TemporaryFolder();
+  ~TemporaryFolder();
+  TemporaryFolder(const TemporaryFolder&) = delete;
+  TemporaryFolder& operator=(const TemporaryFolder&) = delete;
+
+  const std::filesystem::path& path() const { return path_; }
+  std::filesystem::path operator/(std::string_view name) const { return path_ / name; }
+
+ private:
+  std::filesystem::path path_;
+};
+
+/// Makes missing folders on the way.
+void putFile(const std::filesystem::path& path, std::string_view contents);
+std::string fileContents(const std::filesystem::path& path);
+
+/// Everything below a folder: relative path to "<type><permissions> <contents or link target>".
+std::map<std::string, std::string> snapshot(const std::filesystem::path& folder);
+
+}  // namespace appsync::device::testing
