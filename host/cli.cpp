@@ -23,7 +23,8 @@ constexpr const char* Examples = R"(Examples:
   appsync --device phone --json apps
 
 Exit codes: 0 all done, 1 some application failed, 2 wrong usage, 3 device missing, busy or damaged,
-130 interrupted. APPSYNC_DEVICE and APPSYNC_PLUGIN stand for --device and --plugin.)";
+130 interrupted. APPSYNC_DEVICE and APPSYNC_PLUGIN stand for --device and --plugin.
+)";
 
 void addGlobalOptions(CLI::App& app, CommandContext& context) {
   app.add_option("-d,--device", context.device, "Folder of the phone")
@@ -40,6 +41,9 @@ void addGlobalOptions(CLI::App& app, CommandContext& context) {
 
 std::string usageMessage(const CLI::App& app, const CLI::ParseError& error) {
   std::string command = "appsync";
+  if (const auto unknown = app.remaining(); app.get_subcommands().empty() && !unknown.empty()) {
+    return fmt::format("unknown command \"{}\"; see appsync --help", printable(unknown.front()));
+  }
   for (const CLI::App* chosen : app.get_subcommands()) command += " " + chosen->get_name();
   return fmt::format("{}; see {} --help", printable(oneLine(error.what())), command);
 }

@@ -1,0 +1,158 @@
+"""Wrong usage and unusable devices and plug-ins: the exit code, and one line that helps."""
+
+import json
+import os
+import plistlib
+import shutil
+import sqlite3
+
+import support
+
+
+class Usage(support.Case):
+    def one_line(self, *arguments, code):
+        out, err = self.run_appsync(*arguments, code=code)
+        self.assertEqual(out, "")
+        self.assertTrue(err.startswith("appsync: "), err)
+        self.assertEqual(err.count("\n"), 1, err)
+        return err[len("appsync: "):-1]
+
+    def test_help_and_version(self):
+        out, _ = self.run_appsync("--help")
+        for word in ("sync", "init", "package", "Examples:", "Exit codes:"):
+            self.assertIn(word, out)
+        out, _ = self.run_appsync("sync", "--help")
+        self.assertIn("--icon-layout", out)
+        out, _ = self.run_appsync("--version")
+        self.assertRegex(out, r"^appsync \d+\.\d+\.\d+\n$")
+
+    def test_bad_arguments(self):
+        self.assertIn('unknown command "dance"', self.one_line("dance", code=2))
+        self.assertIn("see appsync --help", self.one_line(code=2))
+        self.assertIn("see appsync sync --help", self.one_line("sync", code=2))
+        self.one_line("--frobnicate", "apps", code=2)
+        self.one_line("apps", "extra", code=2)
+        self.one_line("sync", self.library, "--install", code=2)
+        self.one_line("policy", "--installing", "maybe", code=2)
+        self.one_line("init", "--coordination", "sometimes", code=2)
+        self.one_line("history", "--limit", "many", code=2)
+        self.one_line("log", "--level", "loud", code=2)
+
+    def test_errors_are_objects_with_json(self):
+        self.assertIn("unknown command", self.json_lines("dance", code=2)[0]["message"])
+        self.assertEqual(self.json_lines("apps", code=3)[0]["event"], "error")
+
+    def test_no_device_named(self):
+        del self.environment["APPSYNC_DEVICE"]
+        self.assertIn("--device", self.one_line("apps", code=2))
+
+    def test_options_may_stand_behind_the_command(self):
+        del self.environment["APPSYNC_DEVICE"]
+        self.run_appsync("init", "--device", self.phone)
+        out, _ = self.run_appsync("policy", "--json", "-d", self.phone)
+        self.assertEqual(json.loads(out)["installing"], "allow")
+
+    def test_missing_device(self):
+        self.assertIn(str(self.phone), self.one_line("apps", code=3))
+        self.assertIn(str(self.phone), self.one_line("sync", self.library, code=3))
+        self.assertIn(str(self.phone), self.one_line("launch", "com.a", code=3))
+        self.assertFalse(self.phone.exists())
+
+    def test_foreign_folder(self):
+        self.phone.mkdir()
+        (self.phone / "thesis.txt").write_text("years of work")
+        self.one_line("apps", code=3)
+        self.one_line("sync", self.library, code=3)
+        self.one_line("init", code=3)
+        self.assertEqual([path.name for path in self.phone.iterdir()], ["thesis.txt"])
+
+    def test_foreign_database(self):
+        self.init()
+        (self.phone / "device.db").unlink()
+        database = sqlite3.connect(self.phone / "device.db")
+        database.execute("CREATE TABLE recipes (name)")
+        database.commit()
+        database.close()
+        self.one_line("sync", self.library, code=3)
+
+    def test_damaged_device(self):
+        self.init()
+        for name in ("device.db-wal", "device.db-shm"):
+            (self.phone / name).unlink(missing_ok=True)
+        (self.phone / "device.db").write_bytes(b"garbage" * 1000)
+        self.one_line("apps", code=3)
+        self.one_line("sync", self.library, code=3)
+
+    def test_a_device_is_not_made_twice(self):
+        self.init()
+        self.one_line("init", code=3)
+
+    def test_library_that_cannot_be_read(self):
+        self.init()
+        self.assertIn("nowhere", self.one_line("sync", self.folder / "nowhere", code=2))
+        self.assertIn("no package for com.a in", self.one_line("sync", self.library, "--install",
+                                                               "com.a", code=2))
+        self.assertIn("--mirror", self.one_line("sync", self.library, "--mirror", code=2))
+
+    def test_bad_icon_layout(self):
+        self.init()
+        layout = self.folder / "layout"
+        self.one_line("sync", self.library, "--icon-layout", layout, code=2)
+        layout.write_text("<what> is {this}")
+        self.one_line("sync", self.library, "--icon-layout", layout, code=2)
+
+    def test_applications_that_are_not_there(self):
+        self.init()
+        for command in ("uninstall", "launch"):
+            self.assertIn("com.absent", self.one_line(command, "com.absent", code=1))
+        self.run_appsync("quit", "com.absent")
+
+    def test_output_that_cannot_be_written(self):
+        self.init()
+        with open("/dev/full", "w") as full:
+            process = support.subprocess.run([support.APPSYNC, "policy"], stdout=full,
+                                             stderr=support.subprocess.PIPE, text=True,
+                                             env=self.environment)
+        self.assertEqual(process.returncode, 1)
+        self.assertIn("cannot write to standard output", process.stderr)
+
+
+class Plugins(support.Case):
+    def setUp(self):
+        super().setUp()
+        self.init()
+        self.plugin = self.folder / "Copy.syncplugin"
+        shutil.copytree(os.path.join(os.path.dirname(support.APPSYNC), "AppsClient.syncplugin"),
+                        self.plugin)
+        self.environment["APPSYNC_PLUGIN"] = str(self.plugin)
+
+    def refusal(self):
+        message = self.json_lines("sync", self.library, code=2)[0]["message"]
+        self.assertIn(str(self.plugin), message)
+        return message
+
+    def test_a_copy_works(self):
+        self.sync()
+
+    def test_missing(self):
+        shutil.rmtree(self.plugin)
+        self.assertIn("--plugin", self.refusal())
+
+    def test_other_version_in_the_description(self):
+        path = self.plugin / "Info.plist"
+        description = plistlib.loads(path.read_bytes())
+        description["PluginInterfaceVersion"] = 7
+        path.write_bytes(plistlib.dumps(description))
+        self.assertIn("interface version 7", self.refusal())
+
+    def test_other_version_in_the_code(self):
+        shutil.copy(os.environ["OTHER_VERSION_PLUGIN"], self.plugin / "AppsClient.so")
+        self.assertIn("interface version 2", self.refusal())
+
+    def test_code_that_cannot_be_loaded(self):
+        (self.plugin / "AppsClient.so").write_bytes(b"\x7fELF but not really")
+        self.assertIn("cannot be loaded", self.refusal())
+
+
+if __name__ == "__main__":
+    support.main()
