@@ -33,52 +33,52 @@ class Layers(unittest.TestCase):
         code, output = self.check(path, text)
         self.assertEqual(code, 0, output)
 
-    def testTheSourcesKeepTheRule(self):
+    def test_the_sources_keep_the_rule(self):
         code, output = run(ROOT)
         self.assertEqual(code, 0, output)
 
-    def testPluginMustNotKnowDeviceOrHost(self):
+    def test_plugin_must_not_know_device_or_host(self):
         for header in ("device/registry.h", "host/session.h"):
             self.assertRefused("sync/a.cpp", f'#include "{header}"\n', "sync/a.cpp:1")
 
-    def testPluginUsesNoSystemHeader(self):
+    def test_plugin_uses_no_system_header(self):
         for header in ("unistd.h", "sys/stat.h", "sqlite3.h", "archive.h", "fmt/core.h", "linux/fs.h"):
             self.assertRefused("client/a.cpp", f"#include <{header}>\n", "standard library")
 
-    def testPlatformKnowsNobody(self):
+    def test_platform_knows_nobody(self):
         self.assertRefused("platform/a.h", '#include "client/apps_client.h"\n', "must not know")
         self.assertRefused("platform/a.h", "#include <fcntl.h>\n", "standard library")
 
-    def testDeviceAndPluginDoNotKnowEachOther(self):
+    def test_device_and_plugin_do_not_know_each_other(self):
         self.assertRefused("device/a.h", '#include "transfer/queue.h"\n', "must not know transfer/")
         self.assertRefused("device/a.h", '#include "host/loader.h"\n', "must not know host/")
 
-    def testHostMeetsThePluginOnlyThroughThePlatform(self):
+    def test_host_meets_the_plugin_only_through_the_platform(self):
         for folder in ("client", "sync", "transfer", "coordination", "restore"):
             self.assertRefused("host/a.cpp", f'#include "{folder}/x.h"\n', "must not know")
 
-    def testOnlyTheCodecUsesThePropertyListLibrary(self):
+    def test_only_the_codec_uses_the_property_list_library(self):
         self.assertAllowed("platform/property_list_codec.cpp", "#include <plist/plist.h>\n")
         for path in ("platform/other.cpp", "client/a.cpp", "device/a.cpp", "host/a.cpp"):
             self.assertRefused(path, "#include <plist/plist.h>\n", "libplist")
 
-    def testDisguisedIncludesAreSeen(self):
+    def test_disguised_includes_are_seen(self):
         self.assertRefused("sync/a.cpp", '  #  include "host/a.h"\n', "must not know host/")
         self.assertRefused("sync/a.cpp", '/* why */ #include "host/a.h"\n', "must not know host/")
         self.assertRefused("sync/a.cpp", '#include "../host/a.h"\n', "root of the repository")
         self.assertRefused("sync/a.cpp", "#include <host/a.h>\n", "must not know host/")
         self.assertRefused("sync/a.cpp", "#include SOME_HEADER\n", "standard library")
 
-    def testCommentedIncludesAreNotSeen(self):
+    def test_commented_includes_are_not_seen(self):
         self.assertAllowed("sync/a.cpp", '// #include "host/a.h"\n/*\n#include "host/b.h"\n*/\n')
 
-    def testWhatTheLayersAllow(self):
+    def test_what_the_layers_allow(self):
         self.assertAllowed("sync/a.cpp", '#include "transfer/b.h"\n#include "platform/log.h"\n')
         self.assertAllowed("host/a.cpp", '#include "device/b.h"\n#include <unistd.h>\n')
         self.assertAllowed("device/a.cpp", '#include "platform/log.h"\n#include <sqlite3.h>\n')
         self.assertAllowed("client/a.cpp", "#include <vector>\n#include <cstdint>\n")
 
-    def testAnEmptyTreeIsNoSuccess(self):
+    def test_an_empty_tree_is_no_success(self):
         with tempfile.TemporaryDirectory() as folder:
             code, output = run(folder)
             self.assertEqual(code, 1)

@@ -39,7 +39,7 @@ class Sample(unittest.TestCase):
 
 
 class Bundles(unittest.TestCase):
-    def testEachDescribesItselfAlike(self):
+    def test_each_describes_itself_alike(self):
         identifiers = set()
         for source in sorted(SOURCES.iterdir()):
             app = bundle(source.name)
@@ -57,13 +57,13 @@ class Bundles(unittest.TestCase):
                 identifiers.add(info["KBBundleIdentifier"])
         self.assertGreaterEqual(len(identifiers), 8)
 
-    def testIconDrawingsAreWellFormed(self):
+    def test_icon_drawings_are_well_formed(self):
         for icon in (SOURCES.parent / "icons").glob("*.svg"):
             self.assertEqual(ET.parse(icon).getroot().get("viewBox"), "0 0 512 512", icon)
 
 
 class Tally(Sample):
-    def testCountsAndTakesBack(self):
+    def test_counts_and_takes_back(self):
         for version in ("Tally-1.0", "Tally-1.1"):
             self.run_app(version, "--date", "2024-03-01", "add", "water", "7")
             shown = self.run_app(version, "--date", "2024-03-01", "undo", "water")
@@ -71,7 +71,7 @@ class Tally(Sample):
             self.run_app(version, "forget", "water")
             self.assertIn("nothing is counted", self.run_app(version, "undo", "water", code=1))
 
-    def testNewVersionShowsTheWeekAndReadsTheOldData(self):
+    def test_new_version_shows_the_week_and_reads_the_old_data(self):
         for day in ("01", "02", "03"):
             self.run_app("Tally-1.0", "--date", f"2024-03-{day}", "add", "run")
         self.assertIn("usage", self.run_app("Tally-1.0", "week", code=1))
@@ -82,13 +82,13 @@ class Tally(Sample):
 
 
 class Concord(Sample):
-    def testNamesPitches(self):
+    def test_names_pitches(self):
         self.assertIn("A4", self.run_app("Concord", "441.5"))
         self.assertIn("6 cents sharp", self.run_app("Concord", "441.5"))
         self.assertIn("in tune", self.run_app("Concord", "442", "--a4", "442"))
         self.assertIn("no note", self.run_app("Concord", "banjo", code=1))
 
-    def testSoundsTheStringsOfAnInstrument(self):
+    def test_sounds_the_strings_of_an_instrument(self):
         shown = self.run_app("Concord", "violin", "-o", "v.wav", "--seconds", "0.1")
         self.assertIn("A4     440.00 Hz", shown)
         rate, samples = self.read_wave("v.wav")
@@ -97,17 +97,17 @@ class Concord(Sample):
 
 
 class Ditdah(Sample):
-    def testWritesAndReadsMorse(self):
+    def test_writes_and_reads_morse(self):
         code = self.run_app("Ditdah", "encode", "SOS", "now!").strip()
         self.assertEqual(code, "... --- ... / -. --- .-- -.-.--")
         self.assertEqual(self.run_app("Ditdah", "decode", code).strip(), "SOS NOW!")
 
-    def testSoundsIt(self):
+    def test_sounds_it(self):
         self.run_app("Ditdah", "sound", "ET", "-o", "et.wav", "--wpm", "20")
         rate, samples = self.read_wave("et.wav")
         self.assertAlmostEqual(len(samples) / rate, (1 + 1 + 2 + 3 + 1) * 0.06, places=2)
 
-    def testDrills(self):
+    def test_drills(self):
         shown = self.run_app("Ditdah", "drill", "--seed", "3", "--rounds", "2", stdin="u\nq\n")
         self.assertIn("right", shown)
         self.assertIn("no, P", shown)
@@ -115,7 +115,7 @@ class Ditdah(Sample):
 
 
 class Jot(Sample):
-    def testKeepsAList(self):
+    def test_keeps_a_list(self):
         self.run_app("Jot", "add", "buy bread")
         self.run_app("Jot", "add", "call & ask / why")
         self.assertIn("1 of 2 to be done", self.run_app("Jot", "done", "1"))
@@ -126,7 +126,7 @@ class Jot(Sample):
 
 
 class Kaleido(Sample):
-    def testDrawsTheSamePictureForTheSameSeed(self):
+    def test_draws_the_same_picture_for_the_same_seed(self):
         for name in ("a.svg", "b.svg"):
             self.run_app("Kaleido", "--seed", "7", "--folds", "9", "-o", name)
         self.assertEqual((self.folder / "a.svg").read_text(), (self.folder / "b.svg").read_text())
@@ -135,14 +135,14 @@ class Kaleido(Sample):
 
 
 class Lantern(Sample):
-    def testCanBeWon(self):
+    def test_can_be_won(self):
         moves = ("e, take lamp, take matches, light lamp, w, n, n, w, d, take key, u, e, use key, n, "
                  "d, take oil, u, u, light lantern")
         shown = self.run_app("Lantern", stdin=moves.replace(", ", "\n") + "\n")
         self.assertIn("The door is locked.", shown)
         self.assertIn("The end, in 19 moves.", shown)
 
-    def testIsLostInTheDarkWithoutALamp(self):
+    def test_is_lost_in_the_dark_without_a_lamp(self):
         shown = self.run_app("Lantern", stdin="n\nw\nd\ntake key\n")
         self.assertIn("pitch dark", shown)
         self.assertIn("no such thing", shown)
@@ -150,7 +150,7 @@ class Lantern(Sample):
 
 
 class Lune(Sample):
-    def testKnowsTheMoon(self):
+    def test_knows_the_moon(self):
         shown = self.run_app("Lune", "2024-04-08")
         self.assertIn("new moon, 0% lit", shown)
         self.assertIn("next full moon: 23 April 2024", shown)
@@ -159,7 +159,7 @@ class Lune(Sample):
 
 
 class Measure(Sample):
-    def testConverts(self):
+    def test_converts(self):
         self.assertEqual(self.run_app("Measure", "26.2", "mi", "km"), "26.2 mi = 42.1648 km\n")
         self.assertEqual(self.run_app("Measure", "-40", "F", "C"), "-40 F = -40 C\n")
         self.assertIn("measures mass", self.run_app("Measure", "5", "km", "kg", code=1))
@@ -168,7 +168,7 @@ class Measure(Sample):
 
 
 class Meridian(Sample):
-    def testShowsCitiesInWinterAndSummer(self):
+    def test_shows_cities_in_winter_and_summer(self):
         for day, paris in (("2024-01-01", "13:00  Mon  1 Jan"), ("2024-07-01", "14:00  Mon  1 Jul")):
             shown = self.run_app("Meridian", "--at", f"{day} 12:00 UTC", "paris", "Tokyo")
             self.assertIn(f"Paris      o {paris}", shown)
@@ -177,7 +177,7 @@ class Meridian(Sample):
 
 
 class Nine(Sample):
-    def testMakesPuzzlesWithTheirSolution(self):
+    def test_makes_puzzles_with_their_solution(self):
         self.run_app("Nine", "--day", "2024-05-11", "--level", "hard", "-o", "page.html")
         page = (self.folder / "page.html").read_text()
         puzzle = re.search('puzzle = "([1-9.]{81})"', page)[1]
@@ -194,13 +194,13 @@ class Nine(Sample):
 
 
 class Seahorse(Sample):
-    def testDrawsInTheTerminal(self):
+    def test_draws_in_the_terminal(self):
         lines = self.run_app("Seahorse", "--text").splitlines()
         self.assertEqual(len(lines), 21)
         self.assertIn("###", lines[10])
         self.assertNotIn("###", lines[0])
 
-    def testItsPageIsWhole(self):
+    def test_its_page_is_whole(self):
         page = pathlib.Path(self.run_app("Seahorse", "--page").strip())
         open_tags = []
 
@@ -217,7 +217,7 @@ class Seahorse(Sample):
 
 
 class Stillwater(Sample):
-    def testMixesItsLoops(self):
+    def test_mixes_its_loops(self):
         app = self.folder / "Stillwater"
         app.write_text((bundle("Stillwater") / "Stillwater").read_text())
         (self.folder / "loops").mkdir()

@@ -49,24 +49,24 @@ Codec/0.  # TypeParam = int
         table = f"| Behaviour | Tests |\n|---|---|\n{row}\n"
         return self.script.problems(table, self.tests)[1]
 
-    def testInstancesCountAsOneTest(self):
+    def test_instances_count_as_one_test(self):
         self.assertEqual(self.tests, {"Client.KeepsItsAnchor", "Client.TakesAnyName",
                                       "FileManager.WritesAtomically", "Codec.RoundTrip"})
 
-    def testNamedTestsMustExist(self):
+    def test_named_tests_must_exist(self):
         self.assertEqual(self.problems("| It keeps its anchor. | `Client.KeepsItsAnchor` |"), [])
         self.assertEqual(self.problems("| It flies. | `Client.KeepsItsAnchor`, `Client.Flies` |"),
                          ["line 3: there is no test Client.Flies"])
 
-    def testEachBehaviourNeedsATest(self):
+    def test_each_behaviour_needs_a_test(self):
         self.assertIn("without a test", self.problems("| It flies. | |")[0])
 
-    def testAnEmptyDocumentIsNoSuccess(self):
+    def test_an_empty_document_is_no_success(self):
         self.assertEqual(self.problems("no table"), ["it names no behaviour"])
 
-    def testPythonTestsAreFound(self):
+    def test_python_tests_are_found(self):
         names = set(self.script.python_tests(pathlib.Path(__file__)))
-        self.assertIn("test_scripts.py::Behaviours.testPythonTestsAreFound", names)
+        self.assertIn("test_scripts.py::Behaviours.test_python_tests_are_found", names)
 
 
 class BenchTable(unittest.TestCase):
@@ -75,7 +75,7 @@ class BenchTable(unittest.TestCase):
             {"name": name, "run_name": name, "real_time": time, "time_unit": unit, **more}
             for name, time, unit, more in runs]})
 
-    def testShowsEachBenchmarkBesideItsFloor(self):
+    def test_shows_each_benchmark_beside_its_floor(self):
         table = run("bench_table", self.report(
             ("change/100/real_time", 15, "us", {}), ("change_floor/100/real_time", 10000, "ns", {}),
             ("change/1000", 99, "us", {}), ("alone", 4, "ms", {"floor_ratio": 2.0})))
@@ -85,7 +85,7 @@ class BenchTable(unittest.TestCase):
                                 ["change/1000", "99", "us"],
                                 ["alone", "4", "ms", "2", "ms", "2.00"]])
 
-    def testTakesTheMedianOfRepetitions(self):
+    def test_takes_the_median_of_repetitions(self):
         table = run("bench_table", self.report(
             ("x", 1, "ns", {}), ("x", 9, "ns", {}),
             ("x", 5, "ns", {"aggregate_name": "median"}), ("x", 3, "ns", {"aggregate_name": "stddev"})))
@@ -93,12 +93,12 @@ class BenchTable(unittest.TestCase):
 
 
 class Totals(unittest.TestCase):
-    def testAddsUpReports(self):
+    def test_adds_up_reports(self):
         one = '<testsuite tests="7" failures="2" disabled="1" skipped="1"/>'
         two = '<testsuite tests="5" failures="0" disabled="0" skipped="0"/>'
         self.assertEqual(run("test_totals", one, two), "8 passed, 2 failed\n")
 
-    def testNoReportIsNothingPassed(self):
+    def test_no_report_is_nothing_passed(self):
         self.assertEqual(run("test_totals"), "0 passed, 0 failed\n")
 
 
