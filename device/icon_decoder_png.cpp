@@ -49,6 +49,9 @@ class PngDecoder {
     if (setjmp(png_jmpbuf(png_))) return false;
     png_set_read_fn(png_, this, readBytes);
     png_set_user_limits(png_, MaximumIconSide, MaximumIconSide);
+    // Only the chunks that make the picture are read. The library takes memory for others as they
+    // ask for it, also beyond the limit that it has for that.
+    png_set_keep_unknown_chunks(png_, PNG_HANDLE_CHUNK_NEVER, nullptr, -1);
     png_set_chunk_malloc_max(png_, MaximumChunkBytes);
     png_set_chunk_cache_max(png_, MaximumChunks);
     png_read_info(png_, info_);

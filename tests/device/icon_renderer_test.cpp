@@ -235,6 +235,14 @@ TEST_F(IconRendererTest, PassesOverTextThatWouldUnpackToFarMore) {
   EXPECT_EQ(pixelAt(*icon, 4, 4), Red);
 }
 
+TEST_F(IconRendererTest, RefusesAChunkThatSaysItIsLargerThanTheFile) {
+  Bytes file = pngFile(4, 4, plain(Red), PngForm::Rgba, false, 100);
+  const std::size_t text = asText(file).find("zTXt");
+  ASSERT_NE(text, std::string_view::npos);
+  file[text - 4] = std::byte{0x35};  // the highest byte of its length
+  EXPECT_EQ(renderFile(std::move(file), 8), std::nullopt);
+}
+
 class DamagedIcon : public IconRendererTest {
  protected:
   static Bytes picture(int kind) {

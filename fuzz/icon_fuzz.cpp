@@ -1,0 +1,56 @@
+// Decodes arbitrary bytes as each kind of icon. Checksums of PNG chunks are mended first, or hardly
+// any input would get past them.
+
+#include <cstdint>
+#include <cstdlib>
+
+#include "device/icon_decoder.h"
+
+namespace {
+
+using appsync::Bytes;
+
+std::uint32_t bigEndianAt(const Bytes& bytes, std::size_t at) {
+  std::uint32_t value = 0;
+  for (std::size_t i = 0; i < 4; ++i)
+    value = value << 8 | std::to_integer<std::uint32_t>(bytes[at + i]);
+  return value;
+}
+
+std::uint32_t checksum(const std::byte* bytes, std::size_t size) {
+  std::uint32_t crc = ~0u;
+  for (std::size_t i = 0; i < size; ++i) {
+    crc ^= std::to_integer<std::uint32_t>(bytes[i]);
+    for (int bit = 0; bit < 8; ++bit) crc = crc >> 1 ^ (crc & 1 ? 0xedb88320u : 0);
+  }
+  return ~crc;
+}
+
+void mendChecksums(Bytes& file) {
+  constexpr std::size_t signature = 8, frame = 12;
+  for (std::size_t at = signature; file.size() >= at + frame;) {
+    const std::size_t length = bigEndianAt(file, at);
+    if (length > file.size() - at - frame) return;
+    const std::uint32_t crc = checksum(&file[at + 4], length + 4);
+    for (std::size_t i = 0; i < 4; ++i)
+      file[at + 8 + length + i] = static_cast<std::byte>(crc >> (24 - 8 * i) & 0xff);
+    at += frame + length;
+  }
+}
+
+void check(const std::optional<appsync::Image>& image, std::uint32_t side) {
+  if (image && (image->width != side || image->pixels.size() != std::size_t{side} * side * 4))
+    std::abort();
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+  constexpr std::uint32_t side = 16;
+  const auto* begin = reinterpret_cast<const std::byte*>(data);
+  Bytes file(begin, begin + size);
+  check(appsync::device::decodeJpegIcon(file, side), side);
+  mendChecksums(file);
+  check(appsync::device::decodePngIcon(file, side), side);
+  return 0;
+}
