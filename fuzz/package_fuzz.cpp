@@ -1,0 +1,99 @@
+// Unpacks arbitrary bytes as an application package. Whatever they are, only files and folders may
+// come of them, and only in the folder meant for them.
+//
+// With APPSYNC_FUZZ_MAIN this is a program that runs the files given to it once.
+
+#include <fcntl.h>
+#include <stdlib.h>
+#include <sys/mman.h>
+
+#include <cstdint>
+#include <cstdlib>
+#include <filesystem>
+
+#include "device/directory_tree.h"
+#include "device/file_descriptor.h"
+#include "device/identifiers.h"
+#include "device/package_extractor.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using namespace appsync::device;
+
+void require(bool condition) {
+  if (!condition) std::abort();
+}
+
+/// A folder of this process, removed at its end.
+class Arena {
+ public:
+  Arena() {
+    std::string pattern = (fs::temp_directory_path() / "package-fuzz-XXXXXX").string();
+    require(::mkdtemp(pattern.data()) != nullptr);
+    path_ = pattern;
+    folder_.reset(::open(pattern.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  }
+  ~Arena() {
+    std::error_code ignored;
+    fs::remove_all(path_, ignored);
+  }
+  Arena(const Arena&) = delete;
+  Arena& operator=(const Arena&) = delete;
+
+  const fs::path& path() const { return path_; }
+  int fd() const { return folder_.get(); }
+
+ private:
+  fs::path path_;
+  FileDescriptor folder_;
+};
+
+void checkItems(const fs::path& target, const std::optional<ExtractedPackage>& package) {
+  std::uint64_t bytes = 0;
+  for (const fs::directory_entry& entry : fs::recursive_directory_iterator(target)) {
+    const fs::file_status status = entry.symlink_status();
+    require(fs::is_regular_file(status) || fs::is_directory(status));
+    require((status.permissions() & fs::perms(07022)) == fs::perms::none);
+    if (fs::is_regular_file(status)) bytes += entry.file_size();
+  }
+  if (!package) return;
+  require(bytes == package->bytes);
+  require(isUsableIdentifier(package->identifier));
+  require(fs::is_regular_file(target / package->bundleName / "Info.plist"));
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+  static const Arena arena;
+  FileDescriptor package(::memfd_create("package", MFD_CLOEXEC));
+  require(writeAll(package.get(), std::as_bytes(std::span(data, size))));
+
+  fs::create_directory(arena.path() / "target");
+  const FileDescriptor target(::openat(arena.fd(), "target", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const PackageLimits limits{300, std::uint64_t{4} << 20, 200};
+  std::optional<appsync::Error> error;
+  const auto unpacked = extractPackage(package.get(), target.get(), std::nullopt, limits, &error);
+  require(unpacked.has_value() != error.has_value());
+  checkItems(arena.path() / "target", unpacked);
+  require(removeTree(arena.fd(), "target"));
+  require(fs::is_empty(arena.path()));
+  return 0;
+}
+
+#ifdef APPSYNC_FUZZ_MAIN
+#include <fstream>
+#include <iostream>
+#include <iterator>
+
+int main(int count, char** files) {
+  for (int i = 1; i < count; ++i) {
+    std::ifstream in(files[i], std::ios::binary);
+    if (!in) return std::cerr << files[i] << ": cannot be read\n", 1;
+    const std::string bytes((std::istreambuf_iterator<char>(in)), {});
+    LLVMFuzzerTestOneInput(reinterpret_cast<const std::uint8_t*>(bytes.data()), bytes.size());
+  }
+  std::cout << count - 1 << " files\n";
+}
+#endif
