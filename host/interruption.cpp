@@ -55,6 +55,7 @@ void Interruption::request() {
 void Interruption::setListener(std::function<void()> listener) {
   const std::lock_guard lock(mutex_);
   listener_ = std::move(listener);
+  if (requested_ && listener_) listener_();
 }
 
 SignalWatcher::SignalWatcher(Interruption& interruption) {

@@ -14,8 +14,8 @@ class Interruption {
   /// Only the first request counts. Runs the listener before it returns.
   void request();
 
-  /// What is to happen at once when the wish comes; an empty function for nothing. When this
-  /// returns, the old listener is not running and never will.
+  /// What is to happen at once when the wish comes, now if it has come already; an empty function
+  /// for nothing. When this returns, the old listener is not running and never will.
   void setListener(std::function<void()> listener);
 
  private:

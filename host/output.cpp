@@ -1,5 +1,6 @@
 #include "host/output.h"
 
+#include <poll.h>
 #include <sys/ioctl.h>
 #include <unistd.h>
 
@@ -14,6 +15,10 @@ void Output::write(std::string_view text) {
     const ssize_t written = ::write(fd_, text.data(), text.size());
     if (written >= 0) {
       text.remove_prefix(static_cast<std::size_t>(written));
+    } else if (errno == EAGAIN) {
+      // Whoever shares this end may have made it non-blocking.
+      pollfd ready{fd_, POLLOUT, 0};
+      ::poll(&ready, 1, -1);
     } else if (errno != EINTR) {
       error_ = errno;
     }

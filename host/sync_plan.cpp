@@ -44,7 +44,7 @@ class Planner {
         const std::size_t unread = library_.unreadable.size();
         return fmt::format("no package for {} in {}{}", printable(identifier),
                            printable(library_.folder.string()),
-                           unread == 0 ? "" : fmt::format(" ({} files could not be read)", unread));
+                           unread == 0 ? "" : fmt::format(" (unreadable files: {})", unread));
       }
     }
     if (options_.mirror && library_.packages.empty()) {

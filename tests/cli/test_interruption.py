@@ -26,6 +26,11 @@ class Interruption(support.Case):
                 return event
         self.fail("the sync ended without the event: " + process.stderr.read())
 
+    def staged(self):
+        """Packages that lie on the phone."""
+        staging = self.phone / "root/var/mobile/Media/PublicStaging"
+        return [path.name for path in staging.iterdir() if not path.name.startswith(".")]
+
     def rest(self, process):
         out, err = process.communicate(timeout=60)
         return [json.loads(line) for line in out.splitlines()], err
@@ -98,8 +103,7 @@ class Interruption(support.Case):
         self.assertIn("interrupted", [event["event"] for event in events])
         self.assertEqual({entry["identifier"] for entry in events[-1]["failed"]},
                          {"com.big", "com.small"})
-        staging = self.phone / "root/var/mobile/Media/PublicStaging"
-        self.assertEqual([path.name for path in staging.iterdir()], [])
+        self.assertEqual(self.staged(), [])
         self.assertEqual(self.sync()["installed"], ["com.big", "com.small"])
 
     def test_a_second_interrupt_ends_at_once(self):
@@ -123,8 +127,7 @@ class Interruption(support.Case):
             self.assertNotIn("com.big", self.apps())
         self.assertEqual(self.sync()["installed"], ["com.big", "com.small"])
         self.assertEqual(self.apps(), {"com.big": "1.0", "com.small": "1.0"})
-        staging = self.phone / "root/var/mobile/Media/PublicStaging"
-        self.assertEqual([path.name for path in staging.iterdir()], [])
+        self.assertEqual(self.staged(), [])
 
     def test_killed_at_any_time(self):
         for number in range(6):

@@ -73,5 +73,13 @@ TEST(Interruptions, RunTheListenerOnceAndOnlyWhileItIsSet) {
   EXPECT_EQ(runs, 1);
 }
 
+TEST(Interruptions, ReachAListenerThatComesLate) {
+  Interruption interruption;
+  interruption.request();
+  int runs = 0;
+  interruption.setListener([&] { ++runs; });
+  EXPECT_EQ(runs, 1);
+}
+
 }  // namespace
 }  // namespace appsync::host

@@ -79,7 +79,7 @@ TEST_F(Planning, RefusesAnIdentifierWithoutPackage) {
   EXPECT_EQ(problem, "no package for com.unknown in lib");
   library.unreadable.push_back({"broken.zip", true, "damaged"});
   plan();
-  EXPECT_EQ(problem, "no package for com.unknown in lib (1 files could not be read)");
+  EXPECT_EQ(problem, "no package for com.unknown in lib (unreadable files: 1)");
 }
 
 TEST_F(Planning, RefusesToInstallAndRemoveTheSame) {
