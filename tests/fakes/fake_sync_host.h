@@ -48,7 +48,7 @@ class FakeSyncHost : public SyncHost {
   std::string pluginBundleIdentifier() noexcept override;
   SyncAssetPtr makeDownload(std::string_view identifier, std::string_view dataclass,
                             const std::optional<std::string>& prettyName) noexcept override;
-  /// True unless the error's domain was declared final.
+  /// True unless setRecoverable said otherwise of the domain.
   bool TWIsRecoverableError(const Error& error) noexcept override;
   FakeSyncHostService& service() noexcept override { return service_; }
 
