@@ -82,7 +82,7 @@ void ThreadBackgroundQueue::run() {
     node.mapped()();
     node = {};  // what the task holds goes before anybody is told that it has ended
     lock.lock();
-    running_ = 0;
+    running_.reset();
     finished_.notify_all();
   }
 }

@@ -3,6 +3,7 @@
 #include <condition_variable>
 #include <map>
 #include <mutex>
+#include <optional>
 #include <thread>
 #include <utility>
 
@@ -38,7 +39,7 @@ class ThreadBackgroundQueue final : public BackgroundQueue {
   Tasks pending_;
   std::map<Token, Clock::time_point> due_;  ///< of what is pending
   Token lastToken_ = 0;
-  Token running_ = 0;  ///< 0 for none
+  std::optional<Token> running_;
   bool expedited_ = false;
   bool stopping_ = false;
 
