@@ -135,7 +135,9 @@ TEST_F(InstallPreparationTest, TheIconOfAnEarlierAttemptIsReplaced) {
   phone.files.putFile(icon, "an old icon");
   EXPECT_TRUE(prepare());
   EXPECT_EQ(phone.files.textAt(icon), "12345");
-  const PromiseState promise = phone.installCoordination.pathPromise("com.a-Icon")->state();
+  const auto made = phone.installCoordination.pathPromise("com.a-Icon");
+  ASSERT_NE(made, nullptr);
+  const PromiseState promise = made->state();
   EXPECT_EQ(promise.transferPath, FileLocation::file(icon));
   EXPECT_EQ(promise.diskSpaceNeeded, 5u);
   EXPECT_TRUE(promise.complete);
