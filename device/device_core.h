@@ -2,6 +2,7 @@
 
 #include "device/containers.h"
 #include "device/database.h"
+#include "device/foreground.h"
 #include "device/keyed_mutex.h"
 #include "device/registry_observers.h"
 #include "device/watcher_slot.h"
@@ -17,6 +18,7 @@ struct DeviceCore {
   Log& log;
   RegistryObservers& observers;
   WatcherSlot& watcher;
+  Foreground& foreground;
   KeyedMutex& applicationLocks;  ///< held by what installs or removes an application
 };
 

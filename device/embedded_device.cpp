@@ -11,9 +11,10 @@
 #include "device/device_folder.h"
 #include "device/device_policy.h"
 #include "device/file_receiver.h"
-#include "device/foreground.h"
 #include "device/home_screen.h"
+#include "device/icon_renderer.h"
 #include "device/identifiers.h"
+#include "device/image_encoder.h"
 #include "device/installer_service.h"
 #include "device/installs.h"
 #include "device/log_files.h"
@@ -22,23 +23,6 @@
 #include "device/schema.h"
 #include "device/system_notifier.h"
 #include "device/transaction_log.h"
-
-#if __has_include("device/icon_renderer.h") && __has_include("device/image_encoder.h")
-#include "device/icon_renderer.h"
-#include "device/image_encoder.h"
-#else  // until the renderer is in the tree
-namespace appsync::device {
-struct DeviceIconRenderer final : IconRenderer {
-  explicit DeviceIconRenderer(FileManager&) {}
-  std::optional<Image> renderHomeScreenIcon(const Bundle&) noexcept override { return {}; }
-};
-struct PngEncoderService final : ImageEncoderService {
-  std::unique_ptr<ImageEncoder> create(Bytes&, std::string_view, std::size_t) noexcept override {
-    return nullptr;
-  }
-};
-}  // namespace appsync::device
-#endif
 
 namespace appsync::device {
 namespace {
@@ -79,7 +63,7 @@ class FolderDevice final : public EmbeddedDevice {
         database_(std::move(opened.database)),
         files_(paths_.root),
         foreground_(paths_.foreground) {
-    if (database_->writable()) finishInterruptedWork(core_, foreground_);
+    if (database_->writable()) finishInterruptedWork(core_);
   }
 
   bool isUsable() const { return files_.isOpen(); }
@@ -111,8 +95,7 @@ class FolderDevice final : public EmbeddedDevice {
   }
 
   bool uninstall(std::string_view bundleId, std::optional<Error>* error) noexcept override {
-    if (!registry_.removeApplication(bundleId, error)) return false;
-    return foreground_.quit(std::string(bundleId), error);
+    return registry_.removeApplication(bundleId, error);
   }
 
   bool setPolicy(PolicySetting setting, PolicyValue value,
@@ -175,14 +158,14 @@ class FolderDevice final : public EmbeddedDevice {
   WatcherSlot watcher_;
   KeyedMutex applicationLocks_;
   RegistryObservers observers_{[this] { return reportInstalls(*database_); }};
-  DeviceCore core_{*database_, files_,     files_,   containers_,
-                   *log_,      observers_, watcher_, applicationLocks_};
+  DeviceCore core_{*database_, files_,   files_,      containers_,      *log_,
+                   observers_, watcher_, foreground_, applicationLocks_};
   DeviceAppRegistry registry_{core_};
   DeviceInstallerService installerService_{*database_};
   DeviceBackupManager backupManager_{core_};
   StoredDevicePolicy policy_{*database_};
   StoredTransactionLog transactions_{*database_};
-  DeviceHomeScreen homeScreen_{core_, foreground_};
+  DeviceHomeScreen homeScreen_{core_};
   DeviceIconRenderer iconRenderer_{files_};
   PngEncoderService imageEncoders_;
   LocalNotifier notifier_;

@@ -75,7 +75,7 @@ HomeScreenService::AssertionResult DeviceHomeScreen::createTerminationAssertion(
       });
   if (!read) return {nullptr, UnknownError};
   if (!installed) return {nullptr, AssertionOutcome::NotFound};
-  Foreground::HoldResult result = foreground_.hold(std::string(bundleId));
+  Foreground::HoldResult result = core_.foreground.hold(std::string(bundleId));
   if (result.isRunning) {
     core_.watcher.assertionDenied(bundleId);
     return {nullptr, AssertionOutcome::Denied};

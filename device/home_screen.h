@@ -6,17 +6,15 @@
 #include <vector>
 
 #include "device/device_core.h"
-#include "device/foreground.h"
 #include "platform/home_screen_service.h"
 #include "platform/property_list.h"
 
 namespace appsync::device {
 
-/// The home screen: its icon layout is kept in the device's database, what runs in a Foreground.
+/// The home screen: its icon layout is kept in the device's database.
 class DeviceHomeScreen final : public HomeScreenService {
  public:
-  DeviceHomeScreen(DeviceCore& core, Foreground& foreground)
-      : core_(core), foreground_(foreground) {}
+  explicit DeviceHomeScreen(DeviceCore& core) : core_(core) {}
 
   Port serverPort() noexcept override;
   /// Takes an array, or a dictionary with "iconLists", of identifiers, pages (arrays) and folders
@@ -33,7 +31,6 @@ class DeviceHomeScreen final : public HomeScreenService {
 
  private:
   DeviceCore& core_;
-  Foreground& foreground_;
   std::atomic<bool> refusing_ = false;
 };
 

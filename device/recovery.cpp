@@ -12,6 +12,10 @@
 namespace appsync::device {
 namespace {
 
+/// Where files are written piece by piece; what lies in containers goes with them.
+constexpr std::string_view WrittenDirectories[] = {"/tmp", "/var/mobile/Library",
+                                                   "/var/mobile/Media"};
+
 void note(DeviceCore& core, std::string_view text) {
   core.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default, text);
 }
@@ -106,7 +110,7 @@ void clearForeground(const Foreground& foreground, const std::set<std::string>& 
 
 }  // namespace
 
-void finishInterruptedWork(DeviceCore& core, Foreground& foreground) {
+void finishInterruptedWork(DeviceCore& core) {
   bool read = false;
   std::vector<ApplicationRow> rows = readRows(core, read);
   if (!read) return;  // nothing is removed on the word of a registry that cannot be read
@@ -116,7 +120,10 @@ void finishInterruptedWork(DeviceCore& core, Foreground& foreground) {
   removeAllAbandonedData(core);
   removeUnusedData(core, installed);
   pauseInstalls(core);
-  clearForeground(foreground, installed);
+  clearForeground(core.foreground, installed);
+  for (const std::string_view directory : WrittenDirectories) {
+    core.handles.removeTemporaries(directory);
+  }
 }
 
 }  // namespace appsync::device

@@ -1,7 +1,6 @@
 #pragma once
 
 #include "device/device_core.h"
-#include "device/foreground.h"
 
 namespace appsync::device {
 
@@ -10,7 +9,7 @@ namespace appsync::device {
 /// - containers that no row names are removed, and data of applications that were being removed,
 /// - installs under way are paused, since nobody carries them on: their placeholders stand and
 ///   whoever brings the package sets them going again; those without a placeholder are forgotten,
-/// - what killed processes held or left in the foreground is released.
-void finishInterruptedWork(DeviceCore& core, Foreground& foreground);
+/// - half-written files, and what killed processes held or left in the foreground, go.
+void finishInterruptedWork(DeviceCore& core);
 
 }  // namespace appsync::device

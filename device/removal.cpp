@@ -43,7 +43,10 @@ void erasePlaceholder(SQLite::Database& database, const ApplicationRow& placehol
 
 void removeFiles(DeviceCore& core, const std::string& identifier, const ApplicationRows& removed) {
   if (removed.placeholder) core.containers.remove(removed.placeholder->container);
-  if (removed.installed) core.containers.remove(removed.installed->container);
+  if (removed.installed) {
+    core.foreground.quit(identifier, nullptr);
+    core.containers.remove(removed.installed->container);
+  }
   removeAbandonedData(core, identifier, nullptr);
 }
 

@@ -106,8 +106,8 @@ class FusedDevice {
           },
           &fuse_);
     });
-    core_.emplace(
-        DeviceCore{*database_, files_, handles_, containers_, log_, observers_, watcher_, locks_});
+    core_.emplace(DeviceCore{*database_, files_, handles_, containers_, log_, observers_, watcher_,
+                             foreground_, locks_});
     registry_.emplace(*core_);
   }
   DeviceAppRegistry& registry() { return *registry_; }
@@ -122,6 +122,7 @@ class FusedDevice {
   Containers containers_{files_, handles_, log_};
   RegistryObservers observers_{[this] { return reportInstalls(*database_); }};
   WatcherSlot watcher_;
+  Foreground foreground_{paths_.foreground};
   KeyedMutex locks_;
   std::optional<DeviceCore> core_;
   std::optional<DeviceAppRegistry> registry_;

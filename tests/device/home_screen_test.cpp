@@ -189,6 +189,10 @@ TEST_F(HomeScreenTest, AnUninstalledApplicationIsNotInTheForegroundAnyMore) {
   ASSERT_TRUE(launch("com.example.a"));
   ASSERT_TRUE(device->uninstall("com.example.a", &error));
   EXPECT_TRUE(device->foregroundApplications().empty());
+  ASSERT_TRUE(installPackage("com.example.b"));
+  ASSERT_TRUE(launch("com.example.b"));
+  ASSERT_TRUE(device->appRegistry().uninstallApplication("com.example.b", {}));
+  EXPECT_TRUE(device->foregroundApplications().empty());
 }
 
 TEST_F(HomeScreenTest, InAHurryAssertionsAreRefusedAndDelaysRunAtOnce) {

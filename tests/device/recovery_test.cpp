@@ -41,6 +41,15 @@ TEST_F(RecoveryTest, ARowWhoseBundleIsGoneIsDroppedAndNoted) {
   EXPECT_TRUE(logMentions("com.example.a is dropped"));
 }
 
+TEST_F(RecoveryTest, AFileThatWasBeingReceivedIsRemoved) {
+  const auto receiver = device->receiveFile("/var/mobile/Media/PublicStaging/a.pkg", &error);
+  ASSERT_TRUE(receiver && receiver->append(asBytes("half"), &error));
+  const auto staging = onDisk("/var/mobile/Media/PublicStaging");
+  ASSERT_FALSE(std::filesystem::is_empty(staging));
+  reopen();
+  EXPECT_TRUE(std::filesystem::is_empty(staging));
+}
+
 TEST_F(RecoveryTest, ALinkInThePlaceOfAContainerIsRemovedAndNotFollowed) {
   const auto outside = temporary.path() / "outside";
   testing::putFile(outside / "precious", "kept");
