@@ -89,12 +89,12 @@ inline constexpr LogConversion LogConversions[] = {
     {"%s", [](LogArgumentKind kind) { return kind == LogArgumentKind::Text; }},
 };
 
-/// The conversion at the start of `rest`, or nullptr.
-constexpr const LogConversion* conversionAt(std::string_view rest) {
+/// The conversion at the start of `rest`, if there is one.
+constexpr std::optional<LogConversion> conversionAt(std::string_view rest) {
   for (const LogConversion& conversion : LogConversions) {
-    if (rest.starts_with(conversion.spelling)) return &conversion;
+    if (rest.starts_with(conversion.spelling)) return conversion;
   }
-  return nullptr;
+  return std::nullopt;
 }
 
 /// A message format whose conversions are checked against the arguments when it is compiled.
@@ -107,7 +107,7 @@ class CheckedLogFormat {
     const LogArgumentKind kinds[] = {logArgumentKind<Args>()..., none};
     std::size_t used = 0;
     for (std::size_t at = text_.find('%'); at != std::string_view::npos; at = text_.find('%', at)) {
-      const LogConversion* conversion = conversionAt(text_.substr(at));
+      const std::optional<LogConversion> conversion = conversionAt(text_.substr(at));
       if (!conversion) throw "unknown conversion in a log format";
       if (used == sizeof...(Args)) throw "more conversions than arguments in a log format";
       if (!conversion->takes(kinds[used++])) throw "argument of the wrong kind for its conversion";
@@ -155,8 +155,7 @@ std::string logMessage(LogFormat<Args...> format, const Args&... args) {
 /// The client's voice: puts the plug-in's identifier and "|" before every message.
 class ClientLog {
  public:
-  ClientLog(Log& log, std::string_view pluginIdentifier)
-      : log_(log), prefix_(pluginIdentifier) {
+  ClientLog(Log& log, std::string_view pluginIdentifier) : log_(log), prefix_(pluginIdentifier) {
     prefix_ += '|';
   }
 
