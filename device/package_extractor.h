@@ -59,7 +59,9 @@ struct ExtractedPackage {
 /// directory. `packageFd` is an open regular file; `targetDirectoryFd` an empty directory of the
 /// caller's. Nothing outside the target is ever written, whatever the package holds; on failure the
 /// caller removes what lies in it. `expectedIdentifier`, when given, must be the bundle's
-/// identifier. Reads both descriptors only for the call. Thread-safe.
+/// identifier. Borrows both descriptors for the call and moves the package's offset. Files become
+/// 0644, or 0755 where their owner may run them or KBBundleExecutable names them; nothing is put on
+/// disk yet. Besides refusals, the error may be one of POSIXErrorDomain. Thread-safe.
 std::optional<ExtractedPackage> extractPackage(int packageFd, int targetDirectoryFd,
                                                std::optional<std::string_view> expectedIdentifier,
                                                const PackageLimits& limits,

@@ -110,12 +110,6 @@ TEST_F(FileManagerTest, FilesPastTheLimitAreNotRead) {
   EXPECT_EQ(code(), EFBIG);
 }
 
-TEST_F(FileManagerTest, ReadsFilesThatReportNoSize) {
-  // As those of /proc do; here one that grows between the look at its size and the reading.
-  putFile(onDisk("/a"), std::string(1 << 20, 'x'));
-  EXPECT_EQ(files_.contentsAtPath("/a")->size(), std::size_t{1} << 20);
-}
-
 TEST_F(FileManagerTest, OwnerOfTheFolderIsMobile) {
   ASSERT_TRUE(files_.createFile("/a", asBytes("x"), {"mobile", "mobile"}));
   ASSERT_TRUE(files_.createDirectory("/d/e", true, {"mobile", std::nullopt}));
