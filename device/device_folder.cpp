@@ -20,7 +20,7 @@ constexpr std::string_view PhoneDirectories[] = {
     "tmp",
     "var/mobile/Containers/Applications",
     "var/mobile/Containers/Data",
-    "var/mobile/Library/Logs",
+    "var/mobile/Library/Logs/Vellum",
     "var/mobile/Library/Preferences",
     "var/mobile/Media/PublicStaging",
 };

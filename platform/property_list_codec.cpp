@@ -52,7 +52,6 @@ Error failure(std::string_view text) {
 // of a date beyond 32-bit seconds. The binary form of the single value keeps both, so such values
 // cross the border as a file of one object: header, marker and contents, offset table, trailer.
 
-constexpr unsigned char IntegerMarker = 0x13;
 constexpr unsigned char UnsignedMarker = 0x14;
 constexpr unsigned char DateMarker = 0x33;
 constexpr std::size_t MarkerAt = 8;
