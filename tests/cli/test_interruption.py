@@ -27,9 +27,9 @@ class Interruption(support.Case):
         self.fail("the sync ended without the event: " + process.stderr.read())
 
     def staged(self):
-        """Packages that lie on the phone."""
+        """What lies where packages arrive."""
         staging = self.phone / "root/var/mobile/Media/PublicStaging"
-        return [path.name for path in staging.iterdir() if not path.name.startswith(".")]
+        return [path.name for path in staging.iterdir()]
 
     def rest(self, process):
         out, err = process.communicate(timeout=60)

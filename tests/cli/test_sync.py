@@ -260,7 +260,7 @@ class OtherArchivers(support.Case):
         self.check("a.zip", "zip", "-qr", "OUT", ".")
 
     def test_seven_zip(self):
-        self.check("a.zip", "7z", "a", "-tzip", "-bso0", "OUT", "Packed.app", "HalvoMetadata.plist")
+        self.check("a.zip", "7zz" if shutil.which("7zz") else "7z", "a", "-tzip", "-bso0", "OUT", "Packed.app", "HalvoMetadata.plist")
 
     def test_python_zipfile(self):
         self.check("a.zip", "python3", "-m", "zipfile", "-c", "OUT", "Packed.app",
