@@ -1,3 +1,5 @@
+#include <SQLiteCpp/SQLiteCpp.h>
+
 #include <future>
 
 #include "tests/device/device_test.h"
@@ -82,6 +84,24 @@ TEST_F(DeviceServicesTest, CoordinationIsOffAndRefusesWithAReason) {
   EXPECT_EQ(shown.code, 3);
   ASSERT_TRUE(shown.underlying);
   EXPECT_EQ(*shown.underlying, cause);
+}
+
+TEST_F(DeviceServicesTest, ADatabaseThatFailsGivesTheDocumentedFailureAndALogLine) {
+  ASSERT_TRUE(installPackage("com.example.a"));
+  SQLite::Database((folder / "device.db").string(), SQLite::OPEN_READWRITE)
+      .exec("DROP TABLE policies; DROP TABLE uninstalled; DROP TABLE applications");
+  EXPECT_EQ(device->policy(PolicySetting::AppInstallationAllowed), PolicyValue::NotSet);
+  EXPECT_FALSE(device->setPolicy(PolicySetting::AppInstallationAllowed, PolicyValue::Yes, &error));
+  EXPECT_EQ(error->code, EIO);
+  EXPECT_FALSE(platform().installerService.lookupUninstalled());
+  EXPECT_NE(platform().installerService.clearUninstalled({"com.example.a"}), 0);
+  EXPECT_FALSE(record("com.example.a"));
+  EXPECT_FALSE(installPackage("com.example.b"));
+  EXPECT_FALSE(device->uninstall("com.example.a", &error));
+  EXPECT_EQ(static_cast<int>(device->homeScreen().createTerminationAssertion("a", 0).outcome), 3);
+  EXPECT_EQ(containerCount(), 1U) << "nothing is removed on the word of a broken registry";
+  EXPECT_GE(logTexts().size(), 7U);
+  EXPECT_NE(logTexts().front().find("the policies could not be read"), std::string::npos);
 }
 
 TEST_F(DeviceServicesTest, AReceivedFileArrivesInsideThePhone) {
