@@ -1,0 +1,121 @@
+// What the client's own operations cost on an embedded device.
+
+#include <benchmark/benchmark.h>
+
+#include "bench/bench_phone.h"
+#include "platform/property_list_codec.h"
+
+namespace appsync::bench {
+namespace {
+
+void changeAssetID(benchmark::State& state) {
+  BenchPhone phone;
+  const auto entries = static_cast<std::size_t>(state.range(0));
+  phone.putTodoList(entries, false);
+  const std::string identifier = identifierOf(entries - 1);
+  bool sent = false;
+  for (auto _ : state) {
+    sent = !sent;
+    phone.client().changeAssetID(identifier, sent ? "DOWNLOADED" : "INSTALLED");
+  }
+}
+
+/// Reading the file and replacing it atomically with the same bytes.
+void changeAssetID_floor(benchmark::State& state) {
+  BenchPhone phone;
+  phone.putTodoList(static_cast<std::size_t>(state.range(0)), false);
+  for (auto _ : state) {
+    const std::optional<Bytes> bytes = phone.files().contentsAtPath(TodoList);
+    phone.files().writeAtomically(TodoList, *bytes);
+  }
+}
+
+void outstandingAssetTransfers(benchmark::State& state) {
+  const auto entries = static_cast<std::size_t>(state.range(0));
+  for (auto _ : state) {
+    state.PauseTiming();
+    auto phone = std::make_unique<BenchPhone>();
+    phone->putTodoList(entries, true);
+    state.ResumeTiming();
+    if (phone->client().outstandingAssetTransfers().size() != entries) {
+      state.SkipWithError("packages are missing");
+    }
+    state.PauseTiming();
+    phone.reset();
+    state.ResumeTiming();
+  }
+  state.counters["per_entry"] = benchmark::Counter(
+      static_cast<double>(entries),
+      benchmark::Counter::kIsIterationInvariantRate | benchmark::Counter::kInvert);
+}
+
+/// What each entry needs of the phone whoever asks: its icon drawn and saved, its bundle directory
+/// and Info.plist written, and its placeholder installed.
+void outstandingAssetTransfers_floor(benchmark::State& state) {
+  const auto entries = static_cast<std::size_t>(state.range(0));
+  for (auto _ : state) {
+    state.PauseTiming();
+    auto phone = std::make_unique<BenchPhone>();
+    phone->putTodoList(entries, true);
+    const Platform& platform = phone->platform();
+    const Bytes info =
+        *platform.files.contentsAtPath(WorkArea + "/" + identifierOf(0) + "/Info.plist");
+    state.ResumeTiming();
+    for (std::size_t index = 0; index < entries; ++index) {
+      const std::string identifier = identifierOf(index);
+      const std::string path = "/tmp/" + identifier + ".app";
+      const auto bundle =
+          Bundle::open(platform.files, FileLocation::directory(WorkArea + "/" + identifier));
+      const std::optional<Image> icon = platform.iconRenderer.renderHomeScreenIcon(*bundle);
+      Bytes png;
+      const auto encoder = platform.imageEncoders.create(png, "public.png", 1);
+      encoder->addImage(*icon);
+      encoder->finalize();
+      platform.files.createDirectory(path, true, {});
+      platform.files.writeAtomically(path + "/Icon.png", png);
+      platform.files.writeAtomically(path + "/Info.plist", info);
+      const bool installed = platform.appRegistry.installApplication(
+          FileLocation::directory(path),
+          {{std::string(SWPackageTypeKey), SWPackageTypePlaceholder},
+           {std::string(KBBundleIdentifier), identifier},
+           {std::string(SWInstallTypeKey), 4}},
+          nullptr);
+      if (!installed) state.SkipWithError("a placeholder was refused");
+    }
+    state.PauseTiming();
+    phone.reset();
+    state.ResumeTiming();
+  }
+}
+
+BENCHMARK(changeAssetID)
+    ->Arg(100)
+    ->Arg(1000)
+    ->Arg(10000)
+    ->Unit(benchmark::kMicrosecond)
+    ->UseRealTime();
+BENCHMARK(changeAssetID_floor)
+    ->Arg(100)
+    ->Arg(1000)
+    ->Arg(10000)
+    ->Unit(benchmark::kMicrosecond)
+    ->UseRealTime();
+BENCHMARK(outstandingAssetTransfers)
+    ->Arg(100)
+    ->Arg(1000)
+    ->Arg(10000)
+    ->Iterations(1)
+    ->Repetitions(1)
+    ->Unit(benchmark::kMillisecond)
+    ->UseRealTime();
+BENCHMARK(outstandingAssetTransfers_floor)
+    ->Arg(100)
+    ->Arg(1000)
+    ->Arg(10000)
+    ->Iterations(1)
+    ->Repetitions(1)
+    ->Unit(benchmark::kMillisecond)
+    ->UseRealTime();
+
+}  // namespace
+}  // namespace appsync::bench
