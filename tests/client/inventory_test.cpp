@@ -233,5 +233,25 @@ TEST_F(Metrics, SumUpTheUsersApplicationsAndNothingIsPurgeable) {
   expectTrace({"log default SyncBundle|found 3 apps using 1099511628800 bytes (0 purgeable)"});
 }
 
+/// A registry whose enumerations visit every record, whatever the kind.
+class GenerousRegistry : public fakes::FaultyAppRegistry {
+ public:
+  using FaultyAppRegistry::FaultyAppRegistry;
+  void enumerateBundles(BundleKind, const Visitor& visitor) noexcept override {
+    FaultyAppRegistry::enumerateBundles(BundleKind::All, visitor);
+  }
+};
+
+TEST_F(Metrics, CountRecordsOfTypeUserOnlyWhateverTheRegistryVisits) {
+  AppRecord system = application("com.system", 5000);
+  system.applicationType = ApplicationTypeSystem;
+  phone.appRegistry.seedInstalled(system);
+  phone.appRegistry.seedInstalled(application("com.a", 1000));
+  GenerousRegistry registry(phone.appRegistry, phone.faults);
+  AppsClient counting(with(phone.platform(), registry));
+  EXPECT_EQ(counting.installedAssetMetrics(),
+            (Dictionary{{"_Count", 1}, {"_PhysicalSize", 1000}, {"_PurgeableSize", 0}}));
+}
+
 }  // namespace
 }  // namespace appsync

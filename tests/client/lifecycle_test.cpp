@@ -94,6 +94,29 @@ TEST_F(Lifecycle, TeardownEndsTheCoordinatorEventListener) {
   EXPECT_EQ(phone.installCoordination.listenerCount(), 0u);
 }
 
+/// Sees how many listeners there still are when the client leaves the coordinators.
+class WatchfulCoordination : public fakes::FakeInstallCoordination {
+ public:
+  using FakeInstallCoordination::FakeInstallCoordination;
+  void removeObserver(CoordinatorObserver* observer) noexcept override {
+    listenersLeft = listenerCount();
+    FakeInstallCoordination::removeObserver(observer);
+  }
+
+  std::optional<std::size_t> listenersLeft;
+};
+
+TEST_F(Lifecycle, TeardownEndsTheListenerBeforeItLeavesTheCoordinators) {
+  WatchfulCoordination coordination(phone.trace, phone.faults, phone.appRegistry);
+  coordination.setEnabled(true);
+  {
+    const AppsClient made(with(phone.platform(), coordination));
+    phone.notifier.post(Startup);
+    EXPECT_EQ(coordination.listenerCount(), 1u);
+  }
+  EXPECT_EQ(coordination.listenersLeft, 0u);
+}
+
 /// Keeps the callback that it is given.
 class RememberingNotifier : public SystemNotifier {
  public:
@@ -107,23 +130,8 @@ class RememberingNotifier : public SystemNotifier {
 };
 
 TEST_F(Lifecycle, TheStartUpHandlerToleratesAMissingObserver) {
-  const Platform all = phone.platform();
   RememberingNotifier notifier;
-  const Platform platform{all.log,
-                          all.files,
-                          all.appRegistry,
-                          all.installCoordination,
-                          all.installerService,
-                          all.backupManager,
-                          all.devicePolicy,
-                          all.homeScreen,
-                          all.iconRenderer,
-                          all.imageEncoders,
-                          all.transactionLog,
-                          notifier,
-                          all.syncHost,
-                          all.backgroundQueue};
-  const AppsClient made(platform);
+  const AppsClient made(with(phone.platform(), notifier));
   ASSERT_NE(notifier.callback, nullptr);
   notifier.callback(nullptr);
   EXPECT_EQ(phone.installCoordination.listenerCount(), 0u);

@@ -49,6 +49,15 @@ TEST_F(PlaceholderQueries, ARecordWithoutABundleIdentifierIsNotFound) {
   EXPECT_TRUE(client()._placeholderExistsForApplication("com.other"));
 }
 
+TEST_F(PlaceholderQueries, TheSearchEndsAtTheFirstRecordThatFits) {
+  AppRecord twin = record("com.a.twin");
+  twin.bundleIdentifier = "com.a";
+  phone.appRegistry.seedPlaceholder(twin);
+  phone.appRegistry.seedPlaceholder("com.a");
+  EXPECT_TRUE(client()._placeholderExistsForApplication("com.a"));
+  expectTrace({"log default SyncBundle|Found placeholder for bundle com.a"});
+}
+
 TEST_F(PlaceholderQueries, WithCoordinationOnNoPlaceholderExistsAndTheRegistryIsNotAsked) {
   phone.installCoordination.setEnabled(true);
   phone.appRegistry.seedPlaceholder("com.a");

@@ -86,8 +86,11 @@ TEST_F(Teardown, DropsARetryThatWaits) {
 
   destroyClient();
   EXPECT_EQ(phone.backgroundQueue.pendingCount(), 0u);
-  EXPECT_EQ(phone.trace.count("BackgroundQueue.cancel"), 1u);
-  forgetTrace();
+  expectTrace(
+      {"HomeScreenService.createTerminationAssertion(com.a, 0)", "BackgroundQueue.after(30000)",
+       "BackgroundQueue.cancel()", "AppRegistry.removeObserver()",
+       "SystemNotifier.removeObserver(com.corvane.twc.TWStartupCompleteNotification)"},
+      fakes::TraceCall);
   phone.backgroundQueue.advance(60s);
   expectTrace({}, fakes::TraceAll);
   EXPECT_TRUE(phone.files.exists(StagingRootPath + "/com.a.zip"));
