@@ -75,6 +75,11 @@ bool fail(std::optional<Error>* error, int reason, std::string_view path) {
   return false;
 }
 
+/// Nobody looks for a temporary file after a power failure, so none waits for the disk.
+bool isTemporary(std::string_view path) {
+  return path.starts_with("/tmp/") && path.find("/..") == std::string_view::npos;
+}
+
 }  // namespace
 
 ConfinedFileManager::ConfinedFileManager(const std::filesystem::path& root) noexcept
@@ -109,7 +114,7 @@ std::optional<Bytes> ConfinedFileManager::contentsAtPath(std::string_view path,
 
 bool ConfinedFileManager::writeAtomically(std::string_view path, ByteView bytes,
                                           std::optional<Error>* error) noexcept {
-  return replaceFile(path, bytes, {}, true, error);
+  return replaceFile(path, bytes, {}, !isTemporary(path), error);
 }
 
 bool ConfinedFileManager::createFile(std::string_view path, ByteView bytes,

@@ -52,12 +52,16 @@ bool fill(DeviceCore& core, const std::string& source, const PlaceholderOptions&
   return core.files.writeAtomically(metadata, *options.metadata, error);
 }
 
+/// A sync's placeholder that a power failure takes is made anew by the next sync; any other is all
+/// that is left of its application.
+bool mustLast(const ApplicationRow& row) { return row.installType != InstallType::Sync; }
+
 /// Enters the placeholder; `replaced` is the one it takes the place of.
 bool enter(DeviceCore& core, ApplicationRow& row, std::optional<ApplicationRow>& replaced,
            std::optional<Error>* error) {
   return core.database.change(
       fmt::format("the placeholder of {} could not be entered in the registry", row.identifier),
-      Database::Commit::OnDisk,
+      mustLast(row) ? Database::Commit::OnDisk : Database::Commit::Ordinary,
       [&](SQLite::Database& database) {
         ApplicationRows before = findApplication(database, row.identifier);
         row.type = before.type();
@@ -87,8 +91,8 @@ bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
   row.sinf = options.sinf;
   describe(row, *info);
   std::optional<ApplicationRow> replaced;
-  if (!fill(core, bundleDirectory, options, row, error) || !core.containers.flush(error) ||
-      !enter(core, row, replaced, error)) {
+  if (!fill(core, bundleDirectory, options, row, error) ||
+      (mustLast(row) && !core.containers.flush(error)) || !enter(core, row, replaced, error)) {
     return false;
   }
   staged.keep();

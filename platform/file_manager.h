@@ -50,7 +50,8 @@ class FileManager {
                                               std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// Replaces the file in one step: a reader sees the old bytes or the new ones, also after a
-  /// crash, and when this returns true they are on disk. The directory must exist.
+  /// crash, and when this returns true they are on disk. The directory must exist. Files below the
+  /// temporary directory need not survive a power failure.
   virtual bool writeAtomically(std::string_view path, ByteView bytes,
                                std::optional<Error>* error = nullptr) noexcept = 0;
 
@@ -78,6 +79,7 @@ class FileManager {
   virtual bool copyItem(std::string_view from, std::string_view to,
                         std::optional<Error>* error = nullptr) noexcept = 0;
 
+  /// True for an existing file or directory.
   virtual bool fileExists(std::string_view path) noexcept = 0;
   /// True for an existing directory.
   virtual bool directoryExists(std::string_view path) noexcept = 0;
