@@ -8,6 +8,7 @@
 #include "device/application_rows.h"
 #include "device/background_queue.h"
 #include "device/backup_manager.h"
+#include "device/coordination/install_coordination_service.h"
 #include "device/device_folder.h"
 #include "device/device_policy.h"
 #include "device/file_receiver.h"
@@ -63,13 +64,17 @@ class FolderDevice final : public EmbeddedDevice {
         database_(std::move(opened.database)),
         files_(paths_.root),
         foreground_(paths_.foreground) {
-    if (database_->writable()) finishInterruptedWork(core_);
+    if (!database_->writable()) return;
+    finishInterruptedWork(core_);
+    if (options().coordination) coordination_.emplace(core_, registry_);
   }
 
   bool isUsable() const { return files_.isOpen(); }
 
   Platform platform(SyncHost& host) noexcept override {
-    return {*log_,          files_,    registry_,   coordination_, installerService_,
+    InstallCoordination& coordination =
+        coordination_ ? static_cast<InstallCoordination&>(*coordination_) : noCoordination_;
+    return {*log_,          files_,    registry_,   coordination,  installerService_,
             backupManager_, policy_,   homeScreen_, iconRenderer_, imageEncoders_,
             transactions_,  notifier_, host,        queue_};
   }
@@ -92,10 +97,13 @@ class FolderDevice final : public EmbeddedDevice {
   void hurry() noexcept override {
     homeScreen_.refuseAssertions();
     queue_.expedite();
+    if (coordination_) coordination_->hurry();
   }
 
   bool uninstall(std::string_view bundleId, std::optional<Error>* error) noexcept override {
-    return registry_.removeApplication(bundleId, error);
+    const bool removed = registry_.removeApplication(bundleId, error);
+    if (removed && coordination_) coordination_->cancelInstall(bundleId);
+    return removed;
   }
 
   bool setPolicy(PolicySetting setting, PolicyValue value,
@@ -170,7 +178,8 @@ class FolderDevice final : public EmbeddedDevice {
   PngEncoderService imageEncoders_;
   LocalNotifier notifier_;
   ThreadBackgroundQueue queue_;
-  NoCoordination coordination_{queue_};
+  NoCoordination noCoordination_{queue_};
+  std::optional<DeviceInstallCoordination> coordination_;
 };
 
 DeviceError unusable(const std::filesystem::path& folder, std::string_view reason) {

@@ -5,6 +5,7 @@
 
 #include <cctype>
 
+#include "device/coordination/coordination_schema.h"
 #include "device/device_folder.h"
 
 namespace appsync::device {
@@ -178,6 +179,7 @@ void createDatabase(const std::filesystem::path& file, const DeviceOptions& opti
   database.exec("PRAGMA journal_mode=WAL");
   SQLite::Transaction transaction(database);
   database.exec(Schema);
+  makeCoordinationTables(database);
   Query(database, "INSERT INTO settings VALUES ('coordination', ?)", options.coordination).run();
   database.exec(fmt::format("PRAGMA application_id={}; PRAGMA user_version={}", ApplicationId,
                             FormatVersion));
@@ -191,6 +193,7 @@ std::unique_ptr<Database> openDatabase(const std::filesystem::path& folder,
     SQLite::Database connection = connect(file, access);
     if (!isCurrentDevice(connection, folder, error)) return nullptr;
     if (access == Access::Write) prune(connection);
+    if (access == Access::Write) makeCoordinationTables(connection);  // missing in older devices
     return std::make_unique<Database>(std::move(connection), access == Access::Write, log);
   } catch (const SQLite::Exception& exception) {
     error = problemOf(exception, folder);

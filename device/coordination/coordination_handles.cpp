@@ -1,0 +1,233 @@
+#include "device/coordination/coordination_handles.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <cerrno>
+
+#include "device/coordination/coordination_values.h"
+
+namespace appsync::device {
+namespace {
+
+Error refusedWith(int code, std::string_view reason) {
+  return Error::withDescription(POSIXErrorDomain, code, reason);
+}
+
+/// What an object of a client stands for. Throws Refused for none and for one of another service.
+template <typename Object>
+std::int64_t numberOf(const std::shared_ptr<Object>& object, const ServiceObject& owner,
+                      std::string_view what) {
+  const auto* const known = dynamic_cast<const ServiceObject*>(object.get());
+  if (known && known->belongsWith(owner)) return known->number();
+  throw Refused{refusedWith(
+      EINVAL, fmt::format("the {} is {}", what, object ? "none of this service's" : "missing"))};
+}
+
+/// Throws Refused for a promise that cannot be kept any more or is another coordinator's package.
+void checkPromise(SQLite::Database& database, std::int64_t number, std::int64_t coordinator = 0) {
+  const auto promise = findPromise(database, number);
+  if (!promise || promise->over) {
+    throw Refused{refusedWith(ECANCELED, "the promise has been cancelled or is settled")};
+  }
+  for (const CoordinatorRow& user : coordinatorsUsingPromise(database, number)) {
+    if (user.number != coordinator) {
+      throw Refused{
+          refusedWith(EBUSY, fmt::format("the promise is made to {} already", user.identifier))};
+    }
+  }
+}
+
+}  // namespace
+
+template <typename Promise>
+void PromiseHandle<Promise>::setPercentComplete(double fraction) noexcept {
+  const double percent = fraction > 0 ? std::min(fraction, 1.0) : 0;  // also for what is no number
+  change([&](PromiseRow& row) { row.percent = percent; });
+}
+template class PromiseHandle<PathTransferPromise>;
+template class PromiseHandle<OutOfBandTransferPromise>;
+
+std::optional<FileLocation> PathPromiseHandle::transferPath() const {
+  const PromiseRow present = row();
+  if (!present.path) return std::nullopt;
+  return FileLocation{*present.path, present.pathIsDirectory};
+}
+
+void PathPromiseHandle::setTransferPath(const FileLocation& location) noexcept {
+  change([&](PromiseRow& row) {
+    row.path = location.path;
+    row.pathIsDirectory = location.isDirectory;
+  });
+}
+
+bool PlaceholderHandle::change(const CoordinationCore::PlaceholderChange& change,
+                               std::optional<Error>* error) {
+  return with(true, [&](CoordinationCore& core) {
+    return core.changePlaceholder(number(), change, error);
+  });
+}
+
+bool PlaceholderHandle::setIconPromise(const std::shared_ptr<PathTransferPromise>& promise,
+                                       std::optional<Error>* error) noexcept {
+  return change(
+      [&](SQLite::Database& database, PlaceholderRow& row) {
+        row.icon = numberOf(promise, *this, "icon promise");
+        const auto coordinator = coordinatorWithPlaceholder(database, row.number);
+        checkPromise(database, *row.icon, coordinator ? coordinator->number : 0);
+      },
+      error);
+}
+
+bool PlaceholderHandle::setPlaceholderAttributes(const PlaceholderAttributes& attributes,
+                                                 std::optional<Error>* error) noexcept {
+  const auto bytes = bytesOf(attributes, error);
+  return bytes &&
+         change([&](SQLite::Database&, PlaceholderRow& row) { row.attributes = bytes; }, error);
+}
+
+bool PlaceholderHandle::setMetadata(const StoreMetadata& metadata,
+                                    std::optional<Error>* error) noexcept {
+  const auto bytes = bytesOf(metadata, error);
+  return bytes &&
+         change([&](SQLite::Database&, PlaceholderRow& row) { row.metadata = bytes; }, error);
+}
+
+bool PlaceholderHandle::setSinfData(ByteView sinf, std::optional<Error>* error) noexcept {
+  const Bytes bytes(sinf.begin(), sinf.end());
+  return change([&](SQLite::Database&, PlaceholderRow& row) { row.sinf = bytes; }, error);
+}
+
+bool PlaceholderHandle::setConfigurationComplete(std::optional<Error>* error) noexcept {
+  return change([](SQLite::Database&, PlaceholderRow& row) { row.configured = true; }, error);
+}
+
+bool PlaceholderHandle::cancel(const Error& reason, CoordinationClientId client) noexcept {
+  return with(true, [&](CoordinationCore& core) {
+    return core.cancelPlaceholder(number(), reason, client);
+  });
+}
+
+CoordinatorRow CoordinatorHandle::row() const {
+  return with(CoordinatorRow(), [&](CoordinationCore& core) {
+    return core.coordinator(number()).value_or(CoordinatorRow());
+  });
+}
+
+bool CoordinatorHandle::change(const CoordinationCore::CoordinatorChange& change,
+                               std::optional<Error>* error) {
+  return with(true, [&](CoordinationCore& core) {
+    return core.changeCoordinator(number(), change, error);
+  });
+}
+
+std::optional<Error> CoordinatorHandle::error() const {
+  const std::optional<Bytes> bytes = row().error;
+  if (!bytes) return std::nullopt;
+  // One that cannot be read is an error all the same.
+  return errorFrom(*bytes).value_or(Error::posix(EIO));
+}
+
+void CoordinatorHandle::setObserver(CoordinatorObserver* observer) noexcept {
+  with(false, [&](CoordinationCore& core) {
+    core.events().setObserver(number(), observer);
+    return true;
+  });
+}
+
+bool CoordinatorHandle::setInstallOptions(const InstallOptions& options,
+                                          std::optional<Error>* error) noexcept {
+  const auto bytes = bytesOf(options, error);
+  return bytes &&
+         change([&](SQLite::Database&, CoordinatorRow& row) { row.options = bytes; }, error);
+}
+
+bool CoordinatorHandle::setInitialQPKAssetPromises(
+    const std::vector<std::shared_ptr<DataPromise>>& promises,
+    std::optional<Error>* error) noexcept {
+  return change(
+      [&](SQLite::Database& database, CoordinatorRow& row) {
+        std::vector<std::int64_t> numbers;
+        for (const auto& promise : promises) {
+          numbers.push_back(numberOf(promise, *this, "initial promise"));
+          checkPromise(database, numbers.back(), row.number);
+        }
+        row.initialPromises = bytesOf(numbers);
+      },
+      error);
+}
+
+std::shared_ptr<PathTransferPromise> CoordinatorHandle::appAssetPromise(
+    std::optional<Error>* error) noexcept {
+  using Promise = std::shared_ptr<PathTransferPromise>;
+  return with(Promise(), [&](CoordinationCore& core) -> Promise {
+    std::optional<PromiseRow> promise;
+    core.read(
+        [&](SQLite::Database& database) {
+          const auto row = findCoordinator(database, number());
+          if (row) promise = findPromise(database, row->package);
+        },
+        error);
+    return promise ? core.handleOf(*promise) : nullptr;
+  });
+}
+
+bool CoordinatorHandle::setAppAssetPromise(const std::shared_ptr<PathTransferPromise>& promise,
+                                           std::optional<Error>* error) noexcept {
+  return change(
+      [&](SQLite::Database& database, CoordinatorRow& row) {
+        row.package = numberOf(promise, *this, "package promise");
+        checkPromise(database, *row.package, row.number);
+      },
+      error);
+}
+
+bool CoordinatorHandle::setAppAssetPromiseResponsibleClient(CoordinationClientId client,
+                                                            std::optional<Error>* error) noexcept {
+  return change([&](SQLite::Database&, CoordinatorRow& row) { row.responsible = client; }, error);
+}
+
+bool CoordinatorHandle::setUserDataPromise(const std::shared_ptr<OutOfBandTransferPromise>& promise,
+                                           std::optional<Error>* error) noexcept {
+  return change(
+      [&](SQLite::Database& database, CoordinatorRow& row) {
+        row.userData = numberOf(promise, *this, "user data promise");
+        checkPromise(database, *row.userData, row.number);
+      },
+      error);
+}
+
+bool CoordinatorHandle::setPlaceholderPromise(
+    const std::shared_ptr<InstallPlaceholder>& placeholder, std::optional<Error>* error) noexcept {
+  if (!placeholder) {
+    setError(error, refusedWith(EINVAL, "there is no placeholder"));
+    return false;
+  }
+  return change(
+      [&](SQLite::Database& database, CoordinatorRow& row) {
+        const auto present = findPlaceholder(database, row.placeholder);
+        row.placeholder = numberOf(placeholder, *this, "placeholder");
+        const auto promised = findPlaceholder(database, row.placeholder);
+        if (!promised || promised->over) {
+          throw Refused{refusedWith(ECANCELED, "the placeholder has been cancelled")};
+        }
+        if (promised->identifier != row.identifier) {
+          throw Refused{refusedWith(EINVAL, fmt::format("the placeholder is one of {}, not of {}",
+                                                        promised->identifier, row.identifier))};
+        }
+        if (present && present->number != promised->number && present->presence != Presence::None) {
+          throw Refused{
+              refusedWith(EEXIST, fmt::format("{} has its placeholder already", row.identifier))};
+        }
+        if (promised->icon) checkPromise(database, *promised->icon, row.number);
+      },
+      error);
+}
+
+bool CoordinatorHandle::cancel(const Error& reason, CoordinationClientId client) noexcept {
+  return with(true, [&](CoordinationCore& core) {
+    return core.cancelCoordinator(number(), reason, client);
+  });
+}
+
+}  // namespace appsync::device

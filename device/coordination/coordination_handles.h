@@ -1,0 +1,142 @@
+#pragma once
+
+#include "device/coordination/coordination_core.h"
+
+namespace appsync::device {
+
+/// What every object of the service has. It stays usable when the service is gone.
+class ServiceObject {
+ public:
+  ServiceObject(std::shared_ptr<CoordinationGate> gate, std::int64_t number)
+      : gate_(std::move(gate)), number_(number) {}
+  virtual ~ServiceObject() = default;
+
+  std::int64_t number() const { return number_; }
+  /// Whether both are of one service.
+  bool belongsWith(const ServiceObject& other) const { return gate_ == other.gate_; }
+
+ protected:
+  template <typename Result, typename Use>
+  Result with(Result otherwise, const Use& use) const {
+    return gate_->with(std::move(otherwise), use);
+  }
+
+ private:
+  const std::shared_ptr<CoordinationGate> gate_;
+  const std::int64_t number_;
+};
+
+template <typename Promise>
+class PromiseHandle : public Promise, public ServiceObject {
+ public:
+  PromiseHandle(std::shared_ptr<CoordinationGate> gate, const PromiseRow& row)
+      : ServiceObject(std::move(gate), row.number), name_(row.name) {}
+
+  std::string name() const override { return name_; }
+  std::uint64_t identifier() const noexcept override {
+    return static_cast<std::uint64_t>(number());
+  }
+  double percentComplete() const noexcept override { return row().percent; }
+  void setPercentComplete(double fraction) noexcept override;
+  bool isComplete() const noexcept override { return row().complete; }
+  void setComplete(bool complete) noexcept override {
+    change([&](PromiseRow& row) { row.complete = complete; });
+  }
+  void cancel(const Error& reason, CoordinationClientId client) noexcept override {
+    with(false,
+         [&](CoordinationCore& core) { return core.cancelPromise(number(), reason, client); });
+  }
+  std::string description() const override { return "<Promise " + name_ + ">"; }
+
+ protected:
+  PromiseRow row() const {
+    return with(PromiseRow(), [&](CoordinationCore& core) {
+      return core.promise(number()).value_or(PromiseRow());
+    });
+  }
+  void change(const CoordinationCore::PromiseChange& change) {
+    with(false, [&](CoordinationCore& core) { return core.changePromise(number(), change); });
+  }
+
+ private:
+  const std::string name_;
+};
+
+class PathPromiseHandle final : public PromiseHandle<PathTransferPromise> {
+ public:
+  using PromiseHandle::PromiseHandle;
+  std::optional<FileLocation> transferPath() const override;
+  void setTransferPath(const FileLocation& location) noexcept override;
+};
+
+using OutOfBandPromiseHandle = PromiseHandle<OutOfBandTransferPromise>;
+
+class PlaceholderHandle final : public InstallPlaceholder, public ServiceObject {
+ public:
+  PlaceholderHandle(std::shared_ptr<CoordinationGate> gate, const PlaceholderRow& row)
+      : ServiceObject(std::move(gate), row.number), identifier_(row.identifier) {}
+
+  std::string bundleIdentifier() const override { return identifier_; }
+  bool setIconPromise(const std::shared_ptr<PathTransferPromise>& promise,
+                      std::optional<Error>* error) noexcept override;
+  bool setPlaceholderAttributes(const PlaceholderAttributes& attributes,
+                                std::optional<Error>* error) noexcept override;
+  bool setMetadata(const StoreMetadata& metadata, std::optional<Error>* error) noexcept override;
+  bool setSinfData(ByteView sinf, std::optional<Error>* error) noexcept override;
+  bool setConfigurationComplete(std::optional<Error>* error) noexcept override;
+  bool cancel(const Error& reason, CoordinationClientId client) noexcept override;
+  std::string description() const override { return "<Placeholder " + identifier_ + ">"; }
+
+ private:
+  bool change(const CoordinationCore::PlaceholderChange& change, std::optional<Error>* error);
+
+  const std::string identifier_;
+};
+
+class CoordinatorHandle final : public InstallCoordinator, public ServiceObject {
+ public:
+  CoordinatorHandle(std::shared_ptr<CoordinationGate> gate, const CoordinatorRow& row)
+      : ServiceObject(std::move(gate), row.number),
+        identifier_(row.identifier),
+        creator_(row.creator) {}
+
+  std::optional<std::string> bundleIdentifier() const override { return identifier_; }
+  CoordinationClientId creatorIdentifier() const noexcept override { return creator_; }
+  std::optional<Error> error() const override;
+  void setObserver(CoordinatorObserver* observer) noexcept override;
+  bool hasInstallOptions() const noexcept override { return row().options.has_value(); }
+  bool setInstallOptions(const InstallOptions& options,
+                         std::optional<Error>* error) noexcept override;
+  bool hasInitialQPKAssetPromises() const noexcept override {
+    return row().initialPromises.has_value();
+  }
+  bool setInitialQPKAssetPromises(const std::vector<std::shared_ptr<DataPromise>>& promises,
+                                  std::optional<Error>* error) noexcept override;
+  bool hasAppAssetPromise() const noexcept override { return row().package.has_value(); }
+  std::shared_ptr<PathTransferPromise> appAssetPromise(
+      std::optional<Error>* error) noexcept override;
+  bool setAppAssetPromise(const std::shared_ptr<PathTransferPromise>& promise,
+                          std::optional<Error>* error) noexcept override;
+  CoordinationClientId appAssetPromiseResponsibleClient() const noexcept override {
+    return row().responsible;
+  }
+  bool setAppAssetPromiseResponsibleClient(CoordinationClientId client,
+                                           std::optional<Error>* error) noexcept override;
+  bool hasUserDataPromise() const noexcept override { return row().userData.has_value(); }
+  bool setUserDataPromise(const std::shared_ptr<OutOfBandTransferPromise>& promise,
+                          std::optional<Error>* error) noexcept override;
+  bool hasPlaceholderPromise() const noexcept override { return row().placeholder.has_value(); }
+  bool setPlaceholderPromise(const std::shared_ptr<InstallPlaceholder>& placeholder,
+                             std::optional<Error>* error) noexcept override;
+  bool cancel(const Error& reason, CoordinationClientId client) noexcept override;
+  std::string description() const override { return "<Coordinator " + identifier_ + ">"; }
+
+ private:
+  CoordinatorRow row() const;
+  bool change(const CoordinationCore::CoordinatorChange& change, std::optional<Error>* error);
+
+  const std::string identifier_;
+  const CoordinationClientId creator_;
+};
+
+}  // namespace appsync::device

@@ -1,0 +1,180 @@
+#include "device/coordination/coordination_recovery.h"
+
+#include <fmt/format.h>
+
+#include <cerrno>
+
+#include "device/application_rows.h"
+#include "device/coordination/coordinated_installs.h"
+#include "device/coordination/coordination_values.h"
+#include "device/identifiers.h"
+
+namespace appsync::device {
+namespace {
+
+constexpr std::int64_t EventsKept = 1'000;
+/// Longer ones are cut, since they come from a store that cannot be trusted.
+constexpr std::size_t LongestShown = 200;
+
+/// Looks through one coordinator at a time.
+class Repair {
+ public:
+  Repair(DeviceCore& device, SQLite::Database& database, Consequences& consequences,
+         std::vector<std::string>& notes)
+      : device_(device), database_(database), consequences_(consequences), notes_(notes) {}
+
+  void run(CoordinatorRow row) {
+    const bool isOver = row.stage == Stage::Completed || row.stage == Stage::Cancelled;
+    if (isOver) {
+      consequences_.over.insert(row.identifier);
+      return;
+    }
+    if (const auto reason = damage(row)) {
+      giveUp(std::move(row), *reason);
+      return;
+    }
+    // An install that was broken off has left the old state whole.
+    row.stage = Stage::Waiting;
+    detachMissing(row);
+    noticeMissingPlaceholder(row);
+    put(database_, row);
+    if (packageIsGone(row)) {
+      giveUp(std::move(row), "its package is gone");
+    } else {
+      follow(database_, row, consequences_);
+    }
+  }
+
+ private:
+  /// Why the coordinator cannot be carried on; none if it can.
+  std::optional<std::string> damage(const CoordinatorRow& row) {
+    if (!row.isLive()) return "its stage is unknown";
+    if (!isUsableIdentifier(row.identifier)) return "no application can have its identifier";
+    if (row.kind < CoordinatorKind::Initiating || row.kind > CoordinatorKind::RestoringDemoted) {
+      return "its kind is unknown";
+    }
+    if (row.options && !optionsFrom(*row.options)) return "its options cannot be read";
+    const auto placeholder = findPlaceholder(database_, row.placeholder);
+    if (!placeholder) return std::nullopt;
+    if (placeholder->identifier != row.identifier || placeholder->over ||
+        (placeholder->attributes && !attributesFrom(*placeholder->attributes)) ||
+        (placeholder->metadata && !metadataFrom(*placeholder->metadata))) {
+      return "its placeholder cannot be read";
+    }
+    return std::nullopt;
+  }
+
+  void detachMissing(CoordinatorRow& row) {
+    const auto detach = [&](std::optional<std::int64_t>& number, bool isThere,
+                            std::string_view what) {
+      if (!number || isThere) return;
+      number.reset();
+      note(row, fmt::format("has lost its {} and can be given another", what));
+    };
+    const auto isKept = [&](const std::optional<std::int64_t>& number) {
+      const auto promise = findPromise(database_, number);
+      return promise && !promise->over;
+    };
+    detach(row.package, isKept(row.package), "package promise");
+    detach(row.userData, isKept(row.userData), "user data promise");
+    detach(row.placeholder, findPlaceholder(database_, row.placeholder).has_value(), "placeholder");
+    if (row.initialPromises && !numbersFrom(*row.initialPromises)) {
+      row.initialPromises.reset();
+      note(row, "has lost its initial promises and can be given others");
+    }
+  }
+
+  void noticeMissingPlaceholder(const CoordinatorRow& row) {
+    const auto placeholder = findPlaceholder(database_, row.placeholder);
+    if (!placeholder || placeholder->presence != Presence::Installed ||
+        findApplication(database_, row.identifier).placeholder) {
+      return;
+    }
+    setPresence(database_, *placeholder, Presence::None);
+    note(row, "gets its placeholder anew");
+  }
+
+  /// Only what is known to be missing counts.
+  bool packageIsGone(const CoordinatorRow& row) {
+    const auto package = findPromise(database_, row.package);
+    if (!package || !package->complete || !package->path) return false;
+    std::optional<Error> error;
+    return !device_.files.attributesOfItem(*package->path, &error) && error &&
+           error->domain == POSIXErrorDomain && error->code == ENOENT;
+  }
+
+  void giveUp(CoordinatorRow row, std::string_view why) {
+    row.stage = Stage::Waiting;
+    const std::string reason =
+        fmt::format("the install of {} was given up: {}", shown(row.identifier), why);
+    cancel(database_, row, Error::withDescription(POSIXErrorDomain, ECANCELED, reason),
+           DeviceClientID, consequences_);
+    note(row, fmt::format("is cancelled: {}", why));
+  }
+
+  void note(const CoordinatorRow& row, std::string_view text) {
+    notes_.push_back(fmt::format("The install coordinator of {} {}", shown(row.identifier), text));
+  }
+
+  static std::string shown(const std::string& identifier) {
+    return identifier.substr(0, LongestShown);
+  }
+
+  DeviceCore& device_;
+  SQLite::Database& database_;
+  Consequences& consequences_;
+  std::vector<std::string>& notes_;
+};
+
+}  // namespace
+
+Consequences repairCoordination(DeviceCore& device) {
+  // Bundles that were being built.
+  if (device.files.fileExists(PlaceholderBundles)) device.files.removeItem(PlaceholderBundles);
+  Consequences consequences;
+  std::vector<std::string> notes;
+  const bool repaired =
+      device.database.change("the install coordinators could not be looked through",
+                             Database::Commit::OnDisk, [&](SQLite::Database& database) {
+                               Repair repair(device, database, consequences, notes);
+                               for (CoordinatorRow& row : allCoordinators(database))
+                                 repair.run(std::move(row));
+                             });
+  if (!repaired) return {};
+  for (const std::string& text : notes) {
+    device.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default, text);
+  }
+  return consequences;
+}
+
+void sweepCoordination(DeviceCore& device) {
+  device.database.change(
+      "what install coordinators left could not be swept", Database::Commit::Ordinary,
+      [](SQLite::Database& database) {
+        Query(database,
+              "DELETE FROM coordinator_events WHERE kind NOT BETWEEN ?1 AND ?2 OR "
+              "coordinator NOT IN (SELECT number FROM install_coordinators) OR "
+              "number <= (SELECT max(number) FROM coordinator_events) - ?3",
+              EventKind::PromiseBegan, EventKind::Cancelled, EventsKept)
+            .run();
+        Query(database,
+              "DELETE FROM install_coordinators WHERE stage NOT IN (0, 1) "
+              "AND number NOT IN (SELECT coordinator FROM coordinator_events)")
+            .run();
+        Query(database,
+              "DELETE FROM install_placeholders WHERE number NOT IN (SELECT placeholder "
+              "FROM install_coordinators WHERE stage IN (0, 1) AND placeholder IS NOT NULL)")
+            .run();
+        // The initial promises' numbers are in a property list; those that are over are not needed.
+        Query(database,
+              "DELETE FROM data_promises WHERE over OR number NOT IN ("
+              "SELECT package_promise FROM install_coordinators WHERE package_promise IS NOT NULL "
+              "UNION SELECT user_data_promise FROM install_coordinators "
+              "WHERE user_data_promise IS NOT NULL "
+              "UNION SELECT icon_promise FROM install_placeholders "
+              "WHERE icon_promise IS NOT NULL)")
+            .run();
+      });
+}
+
+}  // namespace appsync::device

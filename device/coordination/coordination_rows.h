@@ -1,0 +1,124 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "device/database.h"
+#include "platform/install_coordination.h"
+
+namespace appsync::device {
+
+/// How far a coordinator has come. Stored: values do not change.
+enum class Stage {
+  Waiting = 0,     ///< for something from its clients, or for its turn
+  Installing = 1,  ///< its package; past cancelling
+  Completed = 2,   ///< with an error if the install failed
+  Cancelled = 3,
+};
+
+struct CoordinatorRow {
+  std::int64_t number = 0;  ///< 0: not entered yet
+  std::string identifier;
+  CoordinatorKind kind = CoordinatorKind::Initiating;
+  CoordinationClientId creator = 0;
+  Stage stage = Stage::Waiting;
+  std::optional<Bytes> options;
+  std::optional<Bytes> initialPromises;
+  std::optional<std::int64_t> package;
+  CoordinationClientId responsible = 0;
+  std::optional<std::int64_t> userData;
+  std::optional<std::int64_t> placeholder;
+  std::optional<Bytes> error;
+
+  bool isLive() const { return stage == Stage::Waiting || stage == Stage::Installing; }
+};
+
+/// Stored: values do not change.
+enum class PromiseSort { Path = 0, OutOfBand = 1 };
+
+struct PromiseRow {
+  std::int64_t number = 0;  ///< 0: not entered yet
+  PromiseSort sort = PromiseSort::Path;
+  std::string name;
+  CoordinationClientId client = 0;
+  std::uint64_t diskSpace = 0;  ///< bytes
+  std::optional<std::string> path;
+  bool pathIsDirectory = false;
+  double percent = 0;
+  bool complete = false;
+  bool began = false;
+  bool over = false;
+};
+
+/// What a placeholder has in the registry. Stored: values do not change.
+enum class Presence {
+  None = 0,
+  Begun = 1,  ///< perhaps there, perhaps not
+  Installed = 2,
+};
+
+struct PlaceholderRow {
+  std::int64_t number = 0;  ///< 0: not entered yet
+  std::string identifier;
+  std::string name;
+  InstallType installType = InstallType::None;
+  CoordinationClientId client = 0;
+  std::optional<std::int64_t> icon;
+  std::optional<Bytes> attributes;
+  std::optional<Bytes> metadata;
+  std::optional<Bytes> sinf;
+  bool configured = false;
+  Presence presence = Presence::None;
+  bool over = false;
+};
+
+/// Stored: values do not change.
+enum class EventKind {
+  PromiseBegan = 0,
+  PlaceholderInstalled = 1,
+  Completed = 2,
+  Prioritize = 3,
+  Cancelled = 4,
+};
+
+struct EventRow {
+  std::int64_t number = 0;
+  CoordinatorRow coordinator;
+  EventKind kind = EventKind::Completed;
+  std::uint64_t promise = 0;
+  std::optional<Bytes> reason;
+  CoordinationClientId client = 0;
+};
+
+// These throw SQLite::Exception and are used within Database's work. "put" enters a row that has no
+// number yet and gives it one.
+
+std::optional<CoordinatorRow> findCoordinator(SQLite::Database& database, std::int64_t number);
+std::optional<CoordinatorRow> findLiveCoordinator(SQLite::Database& database,
+                                                  std::string_view identifier);
+std::vector<CoordinatorRow> allCoordinators(SQLite::Database& database);
+/// The live coordinators that use a promise for their package or their placeholder's icon.
+std::vector<CoordinatorRow> coordinatorsUsingPromise(SQLite::Database& database,
+                                                     std::int64_t promise);
+std::optional<CoordinatorRow> coordinatorWithPlaceholder(SQLite::Database& database,
+                                                         std::int64_t placeholder);
+void put(SQLite::Database& database, CoordinatorRow& row);
+
+std::optional<PromiseRow> findPromise(SQLite::Database& database,
+                                      std::optional<std::int64_t> number);
+void put(SQLite::Database& database, PromiseRow& row);
+
+std::optional<PlaceholderRow> findPlaceholder(SQLite::Database& database,
+                                              std::optional<std::int64_t> number);
+void put(SQLite::Database& database, PlaceholderRow& row);
+
+void addEvent(SQLite::Database& database, const CoordinatorRow& coordinator, EventKind kind,
+              std::uint64_t promise = 0, const std::optional<Bytes>& reason = std::nullopt,
+              CoordinationClientId client = 0);
+/// In the order in which they came about.
+std::vector<EventRow> pendingEvents(SQLite::Database& database);
+void removeEvent(SQLite::Database& database, std::int64_t number);
+
+}  // namespace appsync::device

@@ -1,0 +1,64 @@
+#pragma once
+
+#include <set>
+
+#include "device/coordination/coordination_rows.h"
+
+namespace appsync::device {
+
+/// Clients beside those that the platform names.
+inline constexpr CoordinationClientId PersonClientID = 15;  ///< the person, on the home screen
+inline constexpr CoordinationClientId DeviceClientID = 16;  ///< the coordination service itself
+
+/// A coordinator with what decides on its next step.
+struct CoordinatorState {
+  CoordinatorRow coordinator;
+  std::optional<PlaceholderRow> placeholder;
+  std::optional<PromiseRow> icon;
+  std::optional<PromiseRow> package;
+};
+
+/// What the service can do for a coordinator by itself.
+enum class Step {
+  None,
+  InstallPlaceholder,
+  InstallPackage,
+  Complete,  ///< nothing is to follow the placeholder
+};
+Step nextStep(const CoordinatorState& state);
+
+/// What is to be done when a change has been committed.
+struct Consequences {
+  std::set<std::string> ready;  ///< applications with a next step
+  std::set<std::string> over;   ///< applications with something to tidy up
+  bool events = false;
+};
+
+// Changes of state. These throw SQLite::Exception and are used within Database's work.
+
+CoordinatorState loadState(SQLite::Database& database, const CoordinatorRow& coordinator);
+
+/// To be called when anything has changed that a live coordinator depends on: enters the events
+/// that this brings about.
+void follow(SQLite::Database& database, const CoordinatorRow& coordinator,
+            Consequences& consequences);
+
+/// False when the coordinator is past cancelling.
+bool cancel(SQLite::Database& database, CoordinatorRow coordinator, const Error& reason,
+            CoordinationClientId client, Consequences& consequences);
+
+/// The coordinator has come to its end, with an error if it failed.
+void complete(SQLite::Database& database, CoordinatorRow coordinator,
+              const std::optional<Error>& error, Consequences& consequences);
+
+/// Changes a placeholder's presence.
+void setPresence(SQLite::Database& database, PlaceholderRow placeholder, Presence presence);
+
+/// What coordinators that are over leave behind.
+struct Leftovers {
+  std::vector<PlaceholderRow> placeholders;  ///< that nobody wants; perhaps in the registry
+  std::vector<PromiseRow> packages;          ///< with a path to a file that is the service's
+};
+Leftovers findLeftovers(SQLite::Database& database, std::string_view identifier);
+
+}  // namespace appsync::device

@@ -1,0 +1,195 @@
+#include "device/coordination/event_delivery.h"
+
+#include <algorithm>
+#include <cerrno>
+
+#include "device/coordination/coordination_values.h"
+
+namespace appsync::device {
+
+EventDelivery::EventDelivery(Database& database, Coordinators coordinators)
+    : database_(database), coordinators_(std::move(coordinators)) {}
+
+void EventDelivery::start() {
+  const std::lock_guard lock(mutex_);
+  thread_ = std::thread([this] { run(); });
+  threadId_ = thread_.get_id();
+}
+
+void EventDelivery::stop() {
+  {
+    const std::lock_guard lock(mutex_);
+    stopping_ = true;
+    changed_.notify_all();
+  }
+  if (thread_.joinable()) thread_.join();
+}
+
+void EventDelivery::check() {
+  const std::lock_guard lock(mutex_);
+  checkDue_ = true;
+  changed_.notify_all();
+}
+
+void EventDelivery::post(std::function<void()> task) {
+  const std::lock_guard lock(mutex_);
+  tasks_.push_back(std::move(task));
+  changed_.notify_all();
+}
+
+void EventDelivery::setObserver(std::int64_t coordinator, CoordinatorObserver* observer) {
+  Lock lock(mutex_);
+  CoordinatorObserver* replaced = nullptr;
+  if (const auto found = observers_.find(coordinator); found != observers_.end()) {
+    replaced = found->second;
+  }
+  if (observer) {
+    observers_[coordinator] = observer;
+  } else {
+    observers_.erase(coordinator);
+  }
+  checkDue_ = true;
+  changed_.notify_all();
+  if (replaced && replaced != observer) waitUntilReturned(replaced, lock);
+}
+
+void EventDelivery::removeObserver(const CoordinatorObserver* observer) {
+  Lock lock(mutex_);
+  std::erase_if(observers_, [&](const auto& item) { return item.second == observer; });
+  // A listener may be there for what the observer would have had.
+  checkDue_ = true;
+  changed_.notify_all();
+  waitUntilReturned(observer, lock);
+}
+
+std::uint64_t EventDelivery::addListener(std::set<CoordinationClientId> clients,
+                                         CoordinatorObserver& delegate) {
+  const std::lock_guard lock(mutex_);
+  listeners_.emplace(++lastListener_, Listener{std::move(clients), &delegate});
+  checkDue_ = true;
+  changed_.notify_all();
+  return lastListener_;
+}
+
+void EventDelivery::removeListener(std::uint64_t listener) {
+  Lock lock(mutex_);
+  const auto found = listeners_.find(listener);
+  if (found == listeners_.end()) return;
+  const CoordinatorObserver* const delegate = found->second.delegate;
+  listeners_.erase(found);
+  waitUntilReturned(delegate, lock);
+}
+
+bool EventDelivery::isBusy(std::string_view identifier) {
+  const std::vector<EventRow> events = pending();
+  const std::lock_guard lock(mutex_);
+  return std::ranges::any_of(events, [&](const EventRow& event) {
+    return event.coordinator.identifier == identifier && receiver(event.coordinator);
+  });
+}
+
+CoordinatorObserver* EventDelivery::receiver(const CoordinatorRow& coordinator) const {
+  const auto observer = observers_.find(coordinator.number);
+  if (observer != observers_.end()) return observer->second;
+  for (const auto& [number, listener] : listeners_) {
+    if (listener.clients.contains(coordinator.creator)) return listener.delegate;
+  }
+  return nullptr;
+}
+
+void EventDelivery::waitUntilReturned(const CoordinatorObserver* observer, Lock& lock) {
+  if (std::this_thread::get_id() == threadId_) return;
+  returned_.wait(lock, [&] { return delivering_ != observer; });
+}
+
+void EventDelivery::run() {
+  Lock lock(mutex_);
+  while (true) {
+    if (!tasks_.empty()) {
+      std::function<void()> task = std::move(tasks_.front());
+      tasks_.pop_front();
+      lock.unlock();
+      task();
+      task = nullptr;  // what it holds goes outside the lock too
+      lock.lock();
+    } else if (stopping_) {
+      return;
+    } else if (checkDue_) {
+      checkDue_ = false;
+      lock.unlock();
+      deliverAll();
+      lock.lock();
+    } else {
+      changed_.wait(lock);
+    }
+  }
+}
+
+void EventDelivery::deliverAll() {
+  std::set<std::int64_t> passedOver;  // so that a coordinator's events stay in their order
+  for (const EventRow& event : pending()) {
+    const std::int64_t coordinator = event.coordinator.number;
+    if (!passedOver.contains(coordinator) && deliver(event)) {
+      remove(event);
+    } else {
+      passedOver.insert(coordinator);
+    }
+  }
+}
+
+std::vector<EventRow> EventDelivery::pending() {
+  std::vector<EventRow> events;
+  database_.read("the events of install coordinators could not be read",
+                 [&](SQLite::Database& database) { events = pendingEvents(database); });
+  const std::lock_guard lock(mutex_);
+  std::erase_if(events, [&](const EventRow& event) { return delivered_.contains(event.number); });
+  return events;
+}
+
+bool EventDelivery::deliver(const EventRow& event) {
+  Lock lock(mutex_);
+  CoordinatorObserver* const observer = stopping_ ? nullptr : receiver(event.coordinator);
+  if (!observer) return false;
+  delivering_ = observer;
+  lock.unlock();
+  send(event, *observer);
+  lock.lock();
+  delivering_ = nullptr;
+  returned_.notify_all();
+  return true;
+}
+
+void EventDelivery::send(const EventRow& event, CoordinatorObserver& observer) {
+  const std::shared_ptr<InstallCoordinator> coordinator = coordinators_(event.coordinator);
+  switch (event.kind) {
+    case EventKind::PromiseBegan:
+      observer.promiseDidBeginFulfillmentWithIdentifier(event.promise);
+      break;
+    case EventKind::PlaceholderInstalled:
+      observer.coordinatorDidInstallPlaceholder(*coordinator);
+      break;
+    case EventKind::Completed:
+      observer.coordinatorDidCompleteSuccessfully(*coordinator);
+      break;
+    case EventKind::Prioritize:
+      // Nothing can be sent any more of what is over.
+      if (event.coordinator.isLive()) observer.coordinatorShouldPrioritize(*coordinator);
+      break;
+    case EventKind::Cancelled:
+      observer.coordinatorCanceledWithReason(
+          *coordinator, errorFrom(event.reason.value_or(Bytes{})).value_or(Error::posix(ECANCELED)),
+          event.client);
+      break;
+  }
+}
+
+void EventDelivery::remove(const EventRow& event) {
+  const bool removed = database_.change(
+      "an event that was delivered could not be taken out", Database::Commit::Ordinary,
+      [&](SQLite::Database& database) { removeEvent(database, event.number); });
+  if (removed) return;
+  const std::lock_guard lock(mutex_);
+  delivered_.insert(event.number);
+}
+
+}  // namespace appsync::device

@@ -1,0 +1,229 @@
+#include "device/coordination/install_coordination_service.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <cerrno>
+
+#include "device/application_rows.h"
+#include "device/coordination/coordination_handles.h"
+#include "device/identifiers.h"
+#include "device/removal.h"
+
+namespace appsync::device {
+namespace {
+
+class Listener final : public CoordinatorEventListener {
+ public:
+  Listener(std::shared_ptr<CoordinationGate> gate, std::uint64_t number)
+      : gate_(std::move(gate)), number_(number) {}
+  ~Listener() override {
+    gate_->with(false, [&](CoordinationCore& core) {
+      core.events().removeListener(number_);
+      return true;
+    });
+  }
+
+ private:
+  const std::shared_ptr<CoordinationGate> gate_;
+  const std::uint64_t number_;
+};
+
+Error unusable() {
+  return Error::withDescription(POSIXErrorDomain, EINVAL,
+                                "no application can have this identifier");
+}
+
+/// The placeholder of a coordinator that somebody takes up again may have been removed meanwhile.
+void restorePlaceholder(SQLite::Database& database, const CoordinatorRow& row,
+                        Consequences& consequences) {
+  const auto placeholder = findPlaceholder(database, row.placeholder);
+  if (row.stage != Stage::Waiting || !placeholder || placeholder->presence != Presence::Installed ||
+      findApplication(database, row.identifier).placeholder) {
+    return;
+  }
+  setPresence(database, *placeholder, Presence::None);
+  follow(database, row, consequences);
+}
+
+}  // namespace
+
+DeviceInstallCoordination::DeviceInstallCoordination(DeviceCore& device,
+                                                     DeviceAppRegistry& registry)
+    : core_(device, registry) {
+  core_.start();
+}
+
+std::shared_ptr<InstallCoordinator> DeviceInstallCoordination::coordinatorFor(
+    CoordinatorKind kind, std::string_view bundleId, CoordinationClientId client,
+    bool createIfNotExisting, bool* created, std::optional<Error>* error) noexcept {
+  if (created) *created = false;
+  const bool create = createIfNotExisting && kind != CoordinatorKind::Any;
+  if (!isUsableIdentifier(bundleId)) {
+    if (create) setError(error, unusable());
+    return nullptr;
+  }
+  std::optional<CoordinatorRow> found;
+  if (!create) {
+    core_.read([&](SQLite::Database& database) { found = findLiveCoordinator(database, bundleId); },
+               error);
+    return found ? core_.handleOf(*found) : nullptr;
+  }
+  bool made = false;
+  const bool changed = core_.change(
+      [&](SQLite::Database& database, Consequences& consequences) {
+        found = findLiveCoordinator(database, bundleId);
+        made = !found;
+        if (made) {
+          found.emplace();
+          found->identifier = bundleId;
+          found->kind = kind;
+          found->creator = client;
+          put(database, *found);
+        } else {
+          restorePlaceholder(database, *found, consequences);
+        }
+      },
+      error);
+  if (!changed) return nullptr;
+  if (created) *created = made;
+  return core_.handleOf(*found);
+}
+
+void DeviceInstallCoordination::removeObserver(CoordinatorObserver* observer) noexcept {
+  core_.events().removeObserver(observer);
+}
+
+std::int64_t DeviceInstallCoordination::enterPromise(PromiseRow& row) {
+  core_.change([&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
+  return row.number;
+}
+
+std::shared_ptr<PathTransferPromise> DeviceInstallCoordination::createPathTransferPromise(
+    std::string_view name, CoordinationClientId client,
+    const std::optional<FileLocation>& transferPath, std::uint64_t diskSpaceNeeded) noexcept {
+  PromiseRow row;
+  row.name = name;
+  row.client = client;
+  row.diskSpace = diskSpaceNeeded;
+  if (transferPath) {
+    row.path = transferPath->path;
+    row.pathIsDirectory = transferPath->isDirectory;
+  }
+  return enterPromise(row) ? core_.handleOf(row) : nullptr;
+}
+
+std::shared_ptr<OutOfBandTransferPromise> DeviceInstallCoordination::createOutOfBandTransferPromise(
+    std::string_view name, CoordinationClientId client, std::uint64_t diskSpaceNeeded) noexcept {
+  PromiseRow row;
+  row.sort = PromiseSort::OutOfBand;
+  row.name = name;
+  row.client = client;
+  row.diskSpace = diskSpaceNeeded;
+  return enterPromise(row) ? std::make_shared<OutOfBandPromiseHandle>(core_.gate(), row) : nullptr;
+}
+
+std::shared_ptr<InstallPlaceholder> DeviceInstallCoordination::createAppPlaceholder(
+    std::string_view appName, std::string_view bundleId, InstallType installType,
+    CoordinationClientId client) noexcept {
+  if (!isUsableIdentifier(bundleId)) return nullptr;
+  PlaceholderRow row;
+  row.identifier = bundleId;
+  row.name = appName;
+  row.installType = installType;
+  row.client = client;
+  const bool entered =
+      core_.change([&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
+  return entered ? std::make_shared<PlaceholderHandle>(core_.gate(), row) : nullptr;
+}
+
+void DeviceInstallCoordination::uninstallApp(
+    std::string_view bundleId, bool,
+    std::function<void(const std::optional<Error>&)> completion) noexcept {
+  if (!isUsableIdentifier(bundleId)) {
+    core_.events().post([completion = std::move(completion)] { completion(unusable()); });
+    return;
+  }
+  const auto work = [this, identifier = std::string(bundleId), completion = std::move(completion)] {
+    const Error reason = Error::withDescription(POSIXErrorDomain, ECANCELED,
+                                                fmt::format("{} was uninstalled", identifier));
+    bool ended = false;
+    bool placeholderOnly = false;
+    core_.change(
+        [&](SQLite::Database& database, Consequences& consequences) {
+          placeholderOnly = findApplication(database, identifier).placeholder.has_value();
+          const auto live = findLiveCoordinator(database, identifier);
+          ended = live && cancel(database, *live, reason, DeviceClientID, consequences);
+        },
+        nullptr);
+    // What a coordinator brought went with it; an installed version below it stays.
+    std::optional<Error> error;
+    {
+      const KeyedMutex::Guard guard(core_.device().applicationLocks, identifier);
+      removeForClient(core_.device(), identifier, placeholderOnly, &error);
+    }
+    if (ended && error && error->code == ENOENT) error.reset();
+    core_.events().post([completion, error] { completion(error); });
+  };
+  core_.workers().add(bundleId, work);
+}
+
+Error DeviceInstallCoordination::createUserPresentableError(
+    std::int64_t code, std::uint64_t flag, const std::optional<Error>& underlying) noexcept {
+  Error error = Error::withDescription(
+      TWErrorDomain, code,
+      underlying ? underlying->localizedDescription() : "The application could not be installed.");
+  error.userInfo.emplace("Flag", flag);
+  if (underlying) error.underlying = std::make_shared<const Error>(*underlying);
+  return error;
+}
+
+std::unique_ptr<CoordinatorEventListener> DeviceInstallCoordination::createEventListener(
+    std::string_view, const std::set<CoordinationClientId>& clients,
+    CoordinatorObserver& delegate) noexcept {
+  return std::make_unique<Listener>(core_.gate(), core_.events().addListener(clients, delegate));
+}
+
+bool DeviceInstallCoordination::tap(std::string_view bundleId) noexcept {
+  bool live = false;
+  const bool noted = core_.change(
+      [&](SQLite::Database& database, Consequences& consequences) {
+        const auto row = findLiveCoordinator(database, bundleId);
+        live = row.has_value();
+        if (!live) return;
+        addEvent(database, *row, EventKind::Prioritize);
+        consequences.events = true;
+      },
+      nullptr);
+  return noted && live;
+}
+
+bool DeviceInstallCoordination::cancelInstall(std::string_view bundleId) noexcept {
+  std::optional<CoordinatorRow> live;
+  core_.read([&](SQLite::Database& database) { live = findLiveCoordinator(database, bundleId); });
+  if (!live) return false;
+  const Error reason =
+      Error::withDescription(POSIXErrorDomain, ECANCELED,
+                             fmt::format("the install of {} was cancelled on the phone", bundleId));
+  return core_.cancelCoordinator(live->number, reason, PersonClientID);
+}
+
+bool DeviceInstallCoordination::isBusy(std::string_view bundleId) noexcept {
+  return core_.workers().isBusy(bundleId) || core_.events().isBusy(bundleId);
+}
+
+std::vector<std::string> DeviceInstallCoordination::packagesOwedBy(
+    CoordinationClientId client) noexcept {
+  std::vector<std::string> identifiers;
+  core_.read([&](SQLite::Database& database) {
+    for (const CoordinatorRow& row : allCoordinators(database)) {
+      if (!row.isLive() || row.responsible != client) continue;
+      const auto package = findPromise(database, row.package);
+      if (!package || !package->complete) identifiers.push_back(row.identifier);
+    }
+  });
+  std::ranges::sort(identifiers);
+  return identifiers;
+}
+
+}  // namespace appsync::device

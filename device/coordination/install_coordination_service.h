@@ -1,0 +1,79 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "device/coordination/coordination_core.h"
+#include "platform/install_coordination.h"
+
+namespace appsync::device {
+
+/// The install coordination service of a device that is open for writing. Coordinators, promises,
+/// placeholders and undelivered events live in the device's database and are carried on when the
+/// device is opened anew.
+///
+/// An application has at most one live coordinator. Its placeholder is installed as soon as it is
+/// promised and configured and its icon has come; its package, a complete path promise, as soon as
+/// the placeholder stands and there are options. An application in the foreground keeps its
+/// package waiting until it is closed. A demoted restore ends with its placeholder. A coordinator
+/// that fails keeps its error, loses its placeholder and leaves an installed version alone; until
+/// its package is being installed it can be cancelled, with the same effect.
+///
+/// The service takes a package away when its coordinator is over. Events come from one thread; one
+/// that nobody is there for is kept until an observer or listener appears, at the latest when the
+/// device is next opened. Objects may outlive the service. Destroying the service lets a running
+/// install end; it must not be done from an event.
+class DeviceInstallCoordination final : public InstallCoordination {
+ public:
+  /// Carries on what was left from before.
+  DeviceInstallCoordination(DeviceCore& device, DeviceAppRegistry& registry);
+
+  bool coordinationIsEnabled() noexcept override { return true; }
+  /// With `createIfNotExisting`, a placeholder that somebody else took off the device comes back.
+  std::shared_ptr<InstallCoordinator> coordinatorFor(CoordinatorKind kind,
+                                                     std::string_view bundleId,
+                                                     CoordinationClientId client,
+                                                     bool createIfNotExisting, bool* created,
+                                                     std::optional<Error>* error) noexcept override;
+  void removeObserver(CoordinatorObserver* observer) noexcept override;
+  std::shared_ptr<PathTransferPromise> createPathTransferPromise(
+      std::string_view name, CoordinationClientId client,
+      const std::optional<FileLocation>& transferPath,
+      std::uint64_t diskSpaceNeeded) noexcept override;
+  std::shared_ptr<OutOfBandTransferPromise> createOutOfBandTransferPromise(
+      std::string_view name, CoordinationClientId client,
+      std::uint64_t diskSpaceNeeded) noexcept override;
+  /// nullptr for an identifier that no application can have.
+  std::shared_ptr<InstallPlaceholder> createAppPlaceholder(
+      std::string_view appName, std::string_view bundleId, InstallType installType,
+      CoordinationClientId client) noexcept override;
+  /// Takes what the registry's uninstallApplication would and ends a live coordinator.
+  void uninstallApp(std::string_view bundleId, bool requestUserConfirmation,
+                    std::function<void(const std::optional<Error>&)> completion) noexcept override;
+  /// Of TWErrorDomain, with the cause's text and a "Flag".
+  Error createUserPresentableError(std::int64_t code, std::uint64_t flag,
+                                   const std::optional<Error>& underlying) noexcept override;
+  std::unique_ptr<CoordinatorEventListener> createEventListener(
+      std::string_view serviceName, const std::set<CoordinationClientId>& clients,
+      CoordinatorObserver& delegate) noexcept override;
+
+  // What a person does on the home screen. False when no install of the application is live, or
+  // when it is past cancelling.
+  bool tap(std::string_view bundleId) noexcept;
+  bool cancelInstall(std::string_view bundleId) noexcept;
+
+  /// Whether the service has something left to do for the application by itself: to install, to
+  /// remove, or to tell somebody who is there. False for an install that waits for its client.
+  bool isBusy(std::string_view bundleId) noexcept;
+  /// The applications whose package this client was named to bring and has not brought, sorted.
+  std::vector<std::string> packagesOwedBy(CoordinationClientId client) noexcept;
+  /// Installs that wait for an application to be closed fail, now and from now on.
+  void hurry() noexcept { core_.hurry(); }
+
+ private:
+  std::int64_t enterPromise(PromiseRow& row);
+
+  CoordinationCore core_;
+};
+
+}  // namespace appsync::device

@@ -1,0 +1,101 @@
+#include "device/coordination/keyed_workers.h"
+
+#include <algorithm>
+
+namespace appsync::device {
+
+KeyedWorkers::KeyedWorkers(std::size_t threads) {
+  while (threads_.size() < threads) threads_.emplace_back([this] { run(); });
+}
+
+void KeyedWorkers::add(std::string_view key, Job job, std::chrono::milliseconds delay) {
+  const std::lock_guard lock(mutex_);
+  if (stopping_) return;
+  const auto due = Clock::now() + (expedited_ ? std::chrono::milliseconds(0) : delay);
+  pending_.push_back({std::string(key), std::move(job), due});
+  changed_.notify_all();
+}
+
+void KeyedWorkers::exclusively(std::string_view key, const Job& job) {
+  Lock lock(mutex_);
+  const auto runner = running_.find(key);
+  if (runner != running_.end() && runner->second == std::this_thread::get_id()) {
+    lock.unlock();
+    job();
+    return;
+  }
+  changed_.wait(lock, [&] { return !running_.contains(key); });
+  perform(std::string(key), job, lock);
+}
+
+bool KeyedWorkers::isBusy(std::string_view key) {
+  const std::lock_guard lock(mutex_);
+  return running_.contains(key) ||
+         std::ranges::any_of(pending_, [&](const Pending& each) { return each.key == key; });
+}
+
+void KeyedWorkers::expedite() {
+  const std::lock_guard lock(mutex_);
+  expedited_ = true;
+  const auto now = Clock::now();
+  for (Pending& each : pending_) each.due = std::min(each.due, now);
+  changed_.notify_all();
+}
+
+void KeyedWorkers::stop() {
+  {
+    const std::lock_guard lock(mutex_);
+    stopping_ = true;
+    changed_.notify_all();
+  }
+  for (std::thread& thread : threads_) thread.join();
+  threads_.clear();
+}
+
+std::deque<KeyedWorkers::Pending>::iterator KeyedWorkers::next() {
+  const auto now = Clock::now();
+  return std::ranges::find_if(pending_, [&](const Pending& each) {
+    return (stopping_ || each.due <= now) && !running_.contains(each.key);
+  });
+}
+
+void KeyedWorkers::waitForChange(Lock& lock) {
+  // A job that is due already waits for its key, whose end is a change.
+  const auto now = Clock::now();
+  auto wake = Clock::time_point::max();
+  for (const Pending& each : pending_) {
+    if (each.due > now) wake = std::min(wake, each.due);
+  }
+  if (wake == Clock::time_point::max()) {
+    changed_.wait(lock);
+  } else {
+    changed_.wait_until(lock, wake);
+  }
+}
+
+void KeyedWorkers::perform(const std::string& key, const Job& job, Lock& lock) {
+  running_.emplace(key, std::this_thread::get_id());
+  lock.unlock();
+  job();
+  lock.lock();
+  running_.erase(key);
+  changed_.notify_all();
+}
+
+void KeyedWorkers::run() {
+  Lock lock(mutex_);
+  while (true) {
+    const auto found = next();
+    if (found != pending_.end()) {
+      const Pending taken = std::move(*found);
+      pending_.erase(found);
+      perform(taken.key, taken.job, lock);
+    } else if (stopping_ && pending_.empty()) {
+      return;
+    } else {
+      waitForChange(lock);
+    }
+  }
+}
+
+}  // namespace appsync::device

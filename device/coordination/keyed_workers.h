@@ -1,0 +1,67 @@
+#pragma once
+
+#include <chrono>
+#include <condition_variable>
+#include <deque>
+#include <functional>
+#include <map>
+#include <mutex>
+#include <string>
+#include <string_view>
+#include <thread>
+#include <vector>
+
+namespace appsync::device {
+
+/// Threads that do jobs: those of one key one after another, those of different keys beside one
+/// another. Thread-safe.
+class KeyedWorkers {
+ public:
+  using Job = std::function<void()>;
+
+  explicit KeyedWorkers(std::size_t threads);
+  ~KeyedWorkers() { stop(); }
+
+  /// After stop, the job is dropped.
+  void add(std::string_view key, Job job,
+           std::chrono::milliseconds delay = std::chrono::milliseconds(0));
+  /// Does the job on the calling thread while none of the same key runs; at once if this is itself
+  /// called from a job of the key.
+  void exclusively(std::string_view key, const Job& job);
+
+  /// Whether a job of the key runs or is due, now or later.
+  bool isBusy(std::string_view key);
+
+  /// Does delayed jobs at once, and later ones without delay.
+  void expedite();
+  /// Does all that was added, without delay, and ends the threads. Not to be called from a job.
+  void stop();
+
+ private:
+  using Clock = std::chrono::steady_clock;
+  struct Pending {
+    std::string key;
+    Job job;
+    Clock::time_point due;
+  };
+  using Lock = std::unique_lock<std::mutex>;
+
+  void run();
+  /// The first job that may run now; end() when there is none.
+  std::deque<Pending>::iterator next();
+  /// Until something changes or the next job falls due.
+  void waitForChange(Lock& lock);
+  void perform(const std::string& key, const Job& job, Lock& lock);
+
+  std::mutex mutex_;
+  std::condition_variable changed_;
+  // Guarded by mutex_.
+  std::deque<Pending> pending_;
+  std::map<std::string, std::thread::id, std::less<>> running_;
+  bool expedited_ = false;
+  bool stopping_ = false;
+
+  std::vector<std::thread> threads_;
+};
+
+}  // namespace appsync::device
