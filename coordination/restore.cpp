@@ -116,7 +116,7 @@ std::shared_ptr<InstallPlaceholder> AppsClient::_placeHolderForBundleIdentifier(
   writeIconData(iconData, iconPath, &iconSize, bundleId, placeholderFileAttributes());
 
   const std::string name = metadataName(halvoMetadata).value_or(std::string(bundleId));
-  const std::shared_ptr<InstallPlaceholder> placeholder =
+  std::shared_ptr<InstallPlaceholder> placeholder =
       _placeHolderForBundleIdentifier(bundleId, name, installTypeFor(demotionStatus));
   if (!placeholder) return nullptr;
   const RestoredPlaceholder restored{_log, bundleId, *placeholder};

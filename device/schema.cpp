@@ -119,7 +119,7 @@ std::int64_t pragma(SQLite::Database& database, const char* name) {
 
 /// Empty when the database is whole.
 std::string damage(SQLite::Database& database) {
-  const std::string found = database.execAndGet("PRAGMA quick_check(1)").getString();
+  std::string found = database.execAndGet("PRAGMA quick_check(1)").getString();
   if (found != "ok") return found;
   const auto tables = database.execAndGet(
       "SELECT count(*) FROM sqlite_schema WHERE type = 'table' AND name IN ('settings', "
