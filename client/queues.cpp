@@ -1,5 +1,6 @@
 #include "client/queues.h"
 
+#include <system_error>
 #include <utility>
 
 namespace appsync {
@@ -34,11 +35,18 @@ void OperationQueue::add(std::function<void()> operation) {
   {
     const std::lock_guard lock(mutex_);
     waiting_.push_back(std::move(operation));
-    if (waiting_.size() > idle_ && threads_.size() < maximum_) {
-      threads_.emplace_back([this] { work(); });
-    }
+    if (waiting_.size() > idle_ && threads_.size() < maximum_) addThread();
   }
   changed_.notify_all();
+}
+
+void OperationQueue::addThread() {
+  try {
+    threads_.emplace_back([this] { work(); });
+  } catch (const std::system_error&) {
+    // The system has no thread to spare: those that are there do the work, only later.
+    if (threads_.empty()) throw;
+  }
 }
 
 void OperationQueue::waitUntilAllOperationsAreFinished() {

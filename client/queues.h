@@ -64,6 +64,7 @@ class OperationQueue {
   void waitUntilAllOperationsAreFinished();
 
  private:
+  void addThread();
   void work();
 
   const std::size_t maximum_;

@@ -343,7 +343,9 @@ TEST_F(InstallQueue, withCoordinationNoErrorIsRecoverable) {
   phone.installCoordination.setEnabled(true);
   prepare();
   EXPECT_FALSE(client()._isRecoverableError(Passing));
-  EXPECT_EQ(phone.trace.log().size(), 1u);
+  expectTrace(
+      {"log default SyncBundle|Treating error Error Domain=Passing Code=8 as non recoverable "
+       "as install coordination is enabled"});
 }
 
 TEST_F(InstallQueue, withCoordinationAFailedInstallIsUninstalledThroughTheService) {

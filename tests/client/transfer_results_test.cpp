@@ -323,6 +323,16 @@ TEST_F(CoordinatedResults, progressGoesToTheCoordinatorsPackagePromise) {
   EXPECT_EQ(phone.trace.count("InstallProgress."), 0u);
 }
 
+TEST_F(CoordinatedResults, noProgressRecordIsLookedUp) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  client();
+  forgetTrace();
+  EXPECT_EQ(client()._progressForAssetIdentifier("com.a"), nullptr);
+  expectTrace({"log default SyncBundle|Not returning progress for com.a as install coordination is "
+               "enabled"},
+              fakes::TraceAll);
+}
+
 TEST_F(CoordinatedResults, receivedPackageSatisfiesItsPromise) {
   putTodo({{"com.a", "install"}});
   succeed(received("a.zip"));
