@@ -175,7 +175,6 @@ TEST_F(CoordinationEventsTest, AListenerCanGoFromItsOwnEventAndNothingComesAfter
 }
 
 TEST_F(CoordinationEventsTest, AnEventMayCallTheServiceBack) {
-  const auto coordinator = prepare(Id);
   recorder.during = [&](const std::string& event) {
     if (event.starts_with("placeholder")) {
       service().cancelInstall(Id);
@@ -183,6 +182,7 @@ TEST_F(CoordinationEventsTest, AnEventMayCallTheServiceBack) {
       service().tap("com.example.b");
     }
   };
+  prepare(Id);
   EXPECT_TRUE(recorder.waitFor("prioritize com.example.b"));
   EXPECT_TRUE(recorder.waitFor("canceled com.example.a by 15"));
   EXPECT_TRUE(registry().empty());

@@ -206,7 +206,6 @@ TEST_F(CoordinationRecoveryTest, WhatACoordinatorHasLostCanBeGivenAgain) {
   };
   for (const auto& [sql, what] : losses) {
     SCOPED_TRACE(sql);
-    recorder.during = nullptr;
     EventRecorder events;
     prepare(Id)->setObserver(&events);
     ASSERT_TRUE(events.waitFor("placeholder"));
