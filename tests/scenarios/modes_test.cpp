@@ -4,6 +4,8 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
+#include <random>
 
 #include "client/apps_client.h"
 #include "device/embedded_device.h"
@@ -231,6 +233,44 @@ TEST_F(ModesTest, PackageOfAnotherApplicationIsRefused) {
   sync({{{A}, {B, Wish::InstallStranger}}});
   sync({{{A, Wish::InstallStranger, "2.0"}, {B}}});
 }
+
+TEST_F(ModesTest, RestrictionsKeepThePhoneAsItIs) {
+  sync({{{A}, {B}}});
+  sync({{{A, Wish::Install, "2.0"}, {B, Wish::Remove}, {C}}, false, true});
+  sync({{{A, Wish::Remove}, {B}}, true, false});
+  sync({{{A, Wish::Remove}, {C}}, false, false});
+  sync({{{A, Wish::Remove}, {C}}});
+}
+
+/// A todo list that touches each of seven applications with some probability, in any way.
+Round randomRound(std::mt19937& random) {
+  const auto oneIn = [&](unsigned n) { return random() % n == 0; };
+  constexpr std::array Wishes = {Wish::Install,        Wish::Install, Wish::Install,
+                                 Wish::Remove,         Wish::Remove,  Wish::InstallTruncated,
+                                 Wish::InstallStranger};
+  Round round;
+  for (char letter = 'a'; letter < 'h'; ++letter) {
+    if (oneIn(4)) continue;
+    round.tasks.push_back({std::string("org.example.") + letter, Wishes[random() % Wishes.size()],
+                           oneIn(2) ? "2.0" : "1.0"});
+  }
+  round.installingAllowed = !oneIn(8);
+  round.removingAllowed = !oneIn(8);
+  return round;
+}
+
+class RandomModesTest : public ModesTest, public ::testing::WithParamInterface<unsigned> {};
+
+TEST_P(RandomModesTest, AnyThreeSyncsEndAlike) {
+  SCOPED_TRACE("seed " + std::to_string(GetParam()));
+  std::mt19937 random(GetParam());
+  for (int number = 1; number <= 3 && !HasFailure(); ++number) {
+    SCOPED_TRACE("sync " + std::to_string(number));
+    sync(randomRound(random));
+  }
+}
+
+INSTANTIATE_TEST_SUITE_P(Seeds, RandomModesTest, ::testing::Range(1U, 21U));
 
 }  // namespace
 }  // namespace appsync::host
