@@ -7,7 +7,6 @@
 #include "device/embedded_device.h"
 #include "platform/app_registry.h"
 #include "platform/file_manager.h"
-#include "platform/install_coordination.h"
 
 namespace appsync::host {
 
@@ -21,8 +20,7 @@ struct Phone {
       receiveFile;
   std::function<void(device::DeviceWatcher*)> setWatcher;
   std::function<void()> hurry;
-  /// nullptr when installs are not driven through coordinators.
-  InstallCoordination* coordination = nullptr;
+  bool coordination = false;  ///< installs are driven through install coordinators
 };
 
 /// Borrows the device.
