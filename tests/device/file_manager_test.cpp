@@ -197,11 +197,11 @@ TEST_F(FileManagerTest, ManyThreadsMayMakeTheSameFolders) {
 }
 
 TEST_F(FileManagerTest, TemporaryFilesOfKilledProcessesCanBeSwept) {
-  putFile(onDisk("/work/.appsync-0123456789abcdef"), "left over");
-  putFile(onDisk("/work/inner/.appsync-fedcba9876543210"), "left over");
-  putFile(onDisk("/work/.appsync-notes"), "kept");
-  files_.removeTemporaries("/work");
-  EXPECT_EQ(snapshot(onDisk("/work")),
+  putFile(onDisk("/box/.appsync-0123456789abcdef"), "left over");
+  putFile(onDisk("/box/inner/.appsync-fedcba9876543210"), "left over");
+  putFile(onDisk("/box/.appsync-notes"), "kept");
+  files_.removeTemporaries("/box");
+  EXPECT_EQ(snapshot(onDisk("/box")),
             (std::map<std::string, std::string>{{".appsync-notes", "file 0644 kept"},
                                                 {"inner", "folder 0755"}}));
 }
