@@ -38,7 +38,7 @@ void outstandingAssetTransfers(benchmark::State& state) {
     phone->putTodoList(entries, true);
     state.ResumeTiming();
     if (phone->client().outstandingAssetTransfers().size() != entries) {
-      state.SkipWithError("packages are missing");
+      return state.SkipWithError("packages are missing");
     }
     state.PauseTiming();
     phone.reset();
@@ -58,8 +58,6 @@ void outstandingAssetTransfers_floor(benchmark::State& state) {
     auto phone = std::make_unique<BenchPhone>();
     phone->putTodoList(entries, true);
     const Platform& platform = phone->platform();
-    const Bytes info =
-        *platform.files.contentsAtPath(WorkArea + "/" + identifierOf(0) + "/Info.plist");
     state.ResumeTiming();
     for (std::size_t index = 0; index < entries; ++index) {
       const std::string identifier = identifierOf(index);
@@ -73,14 +71,15 @@ void outstandingAssetTransfers_floor(benchmark::State& state) {
       encoder->finalize();
       platform.files.createDirectory(path, true, {});
       platform.files.writeAtomically(path + "/Icon.png", png);
-      platform.files.writeAtomically(path + "/Info.plist", info);
+      platform.files.writeAtomically(
+          path + "/Info.plist", *platform.files.contentsAtPath(bundle->path() + "/Info.plist"));
       const bool installed = platform.appRegistry.installApplication(
           FileLocation::directory(path),
           {{std::string(SWPackageTypeKey), SWPackageTypePlaceholder},
            {std::string(KBBundleIdentifier), identifier},
            {std::string(SWInstallTypeKey), 4}},
           nullptr);
-      if (!installed) state.SkipWithError("a placeholder was refused");
+      if (!installed) return state.SkipWithError("a placeholder was refused");
     }
     state.PauseTiming();
     phone.reset();
