@@ -20,6 +20,7 @@
 #include "device/installs.h"
 #include "device/log_files.h"
 #include "device/no_coordination.h"
+#include "device/person_socket.h"
 #include "device/recovery.h"
 #include "device/schema.h"
 #include "device/system_notifier.h"
@@ -55,6 +56,20 @@ std::optional<OpenFolder> openFolder(const std::filesystem::path& folder, Access
   return opened;
 }
 
+Error notInstalling(std::string_view bundleId) {
+  return Error::withDescription(POSIXErrorDomain, ENOENT,
+                                fmt::format("{} is not being installed", bundleId));
+}
+
+bool readsCoordination(Database& database) {
+  bool coordination = false;
+  database.read("the device's options could not be read", [&](SQLite::Database& connection) {
+    Query query(connection, "SELECT value FROM settings WHERE key = 'coordination'");
+    coordination = query.next() && query.boolean(0);
+  });
+  return coordination;
+}
+
 class FolderDevice final : public EmbeddedDevice {
  public:
   explicit FolderDevice(OpenFolder opened)
@@ -66,23 +81,49 @@ class FolderDevice final : public EmbeddedDevice {
         foreground_(paths_.foreground) {
     if (!database_->writable()) return;
     finishInterruptedWork(core_);
-    if (options().coordination) coordination_.emplace(core_, registry_);
+    if (!options().coordination) return;
+    coordination_.emplace(core_, registry_);
+    personSocket_ = PersonSocket::open(paths_, [this](PersonWish wish, std::string_view bundleId) {
+      return carryOut(wish, bundleId);
+    });
+    if (personSocket_) return;
+    log_->write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
+                fmt::format("nobody can tap or cancel an install meanwhile: {}",
+                            Error::posix(errno).localizedDescription()));
   }
 
   bool isUsable() const { return files_.isOpen(); }
 
   Platform platform(SyncHost& host) noexcept override {
-    InstallCoordination& coordination =
-        coordination_ ? static_cast<InstallCoordination&>(*coordination_) : noCoordination_;
+    InstallCoordination& coordination = installCoordination();
     return {*log_,          files_,    registry_,   coordination,  installerService_,
             backupManager_, policy_,   homeScreen_, iconRenderer_, imageEncoders_,
             transactions_,  notifier_, host,        queue_};
+  }
+
+  /// Why a wish cannot be carried out.
+  std::optional<Error> carryOut(PersonWish wish, std::string_view bundleId) {
+    if (!coordination_) return notInstalling(bundleId);
+    if (wish == PersonWish::Tap) {
+      return coordination_->tap(bundleId) ? std::nullopt : std::optional(notInstalling(bundleId));
+    }
+    const bool live =
+        coordination_->coordinatorFor(CoordinatorKind::Any, bundleId, SyncHostClientID, false,
+                                      nullptr, nullptr) != nullptr;
+    if (coordination_->cancelInstall(bundleId)) return std::nullopt;
+    return live ? Error::withDescription(
+                      POSIXErrorDomain, EBUSY,
+                      fmt::format("{} is just being installed, too late to cancel", bundleId))
+                : notInstalling(bundleId);
   }
 
   FileManager& files() noexcept override { return files_; }
   AppRegistry& appRegistry() noexcept override { return registry_; }
   SystemNotifier& systemNotifier() noexcept override { return notifier_; }
   HomeScreenService& homeScreen() noexcept override { return homeScreen_; }
+  InstallCoordination& installCoordination() noexcept override {
+    return coordination_ ? static_cast<InstallCoordination&>(*coordination_) : noCoordination_;
+  }
   Log& log() noexcept override { return *log_; }
 
   std::unique_ptr<FileReceiver> receiveFile(std::string_view path,
@@ -117,14 +158,7 @@ class FolderDevice final : public EmbeddedDevice {
     return registry_.addSystemApplication(bundleId, displayName, version, error);
   }
 
-  DeviceOptions options() noexcept override {
-    DeviceOptions options;
-    database_->read("the device's options could not be read", [&](SQLite::Database& database) {
-      Query query(database, "SELECT value FROM settings WHERE key = 'coordination'");
-      options.coordination = query.next() && query.boolean(0);
-    });
-    return options;
-  }
+  DeviceOptions options() noexcept override { return {readsCoordination(*database_)}; }
 
   std::vector<AppRecord> applications() noexcept override { return registry_.records(); }
 
@@ -180,6 +214,7 @@ class FolderDevice final : public EmbeddedDevice {
   ThreadBackgroundQueue queue_;
   NoCoordination noCoordination_{queue_};
   std::optional<DeviceInstallCoordination> coordination_;
+  std::unique_ptr<PersonSocket> personSocket_;
 };
 
 DeviceError unusable(const std::filesystem::path& folder, std::string_view reason) {
@@ -204,6 +239,52 @@ std::optional<Error> objectionToLaunch(Database& database, std::string_view bund
   return std::nullopt;
 }
 
+std::unique_ptr<FolderDevice> openDevice(const std::filesystem::path& folder, Access access,
+                                         DeviceError& error) noexcept {
+  try {
+    std::optional<OpenFolder> opened = openFolder(folder, access, error);
+    if (!opened) return nullptr;
+    auto device = std::make_unique<FolderDevice>(std::move(*opened));
+    if (device->isUsable()) return device;
+    error = unusable(folder, "its files cannot be opened");
+  } catch (const std::exception& failure) {
+    error = unusable(folder, failure.what());
+  }
+  return nullptr;
+}
+
+/// By the process that writes the device, or here when there is none.
+bool fulfil(PersonWish wish, const std::filesystem::path& folder, std::string_view bundleId,
+            DeviceError& deviceError, std::optional<Error>* error) {
+  {
+    const std::optional<OpenFolder> opened = openFolder(folder, Access::ReadOnly, deviceError);
+    if (!opened) return false;
+    if (!isUsableIdentifier(bundleId) || !readsCoordination(*opened->database)) {
+      setError(error, notInstalling(bundleId));
+      return false;
+    }
+  }
+  std::optional<Error> refusal;
+  switch (askWriter(DevicePaths(folder), wish, bundleId, &refusal)) {
+    case WishOutcome::Done:
+      return true;
+    case WishOutcome::Failed:
+      deviceError = device::deviceError(
+          DeviceProblem::Unusable, DevicePaths(folder).folder,
+          refusal ? refusal->localizedDescription() : "its socket cannot be used", "try again");
+      return false;
+    case WishOutcome::Refused:
+      break;
+    case WishOutcome::NobodyThere:
+      const auto device = openDevice(folder, Access::Write, deviceError);
+      if (!device) return false;
+      refusal = device->carryOut(wish, bundleId);
+  }
+  if (!refusal) return true;
+  setError(error, *refusal);
+  return false;
+}
+
 }  // namespace
 
 bool EmbeddedDevice::initialize(const std::filesystem::path& folder, const DeviceOptions& options,
@@ -218,16 +299,7 @@ bool EmbeddedDevice::initialize(const std::filesystem::path& folder, const Devic
 
 std::unique_ptr<EmbeddedDevice> EmbeddedDevice::open(const std::filesystem::path& folder,
                                                      Access access, DeviceError& error) noexcept {
-  try {
-    std::optional<OpenFolder> opened = openFolder(folder, access, error);
-    if (!opened) return nullptr;
-    auto device = std::make_unique<FolderDevice>(std::move(*opened));
-    if (device->isUsable()) return device;
-    error = unusable(folder, "its files cannot be opened");
-  } catch (const std::exception& failure) {
-    error = unusable(folder, failure.what());
-  }
-  return nullptr;
+  return openDevice(folder, access, error);
 }
 
 bool EmbeddedDevice::launch(const std::filesystem::path& folder, std::string_view bundleId,
@@ -254,6 +326,26 @@ bool EmbeddedDevice::quit(const std::filesystem::path& folder, std::string_view 
     // What no application can be called does not run.
     return !isUsableIdentifier(bundleId) ||
            Foreground(opened->paths.foreground).quit(std::string(bundleId), error);
+  } catch (const std::exception& failure) {
+    deviceError = unusable(folder, failure.what());
+  }
+  return false;
+}
+
+bool EmbeddedDevice::tap(const std::filesystem::path& folder, std::string_view bundleId,
+                         DeviceError& deviceError, std::optional<Error>* error) noexcept {
+  try {
+    return fulfil(PersonWish::Tap, folder, bundleId, deviceError, error);
+  } catch (const std::exception& failure) {
+    deviceError = unusable(folder, failure.what());
+  }
+  return false;
+}
+
+bool EmbeddedDevice::cancel(const std::filesystem::path& folder, std::string_view bundleId,
+                            DeviceError& deviceError, std::optional<Error>* error) noexcept {
+  try {
+    return fulfil(PersonWish::Cancel, folder, bundleId, deviceError, error);
   } catch (const std::exception& failure) {
     deviceError = unusable(folder, failure.what());
   }

@@ -107,6 +107,7 @@ class EmbeddedDevice {
   virtual AppRegistry& appRegistry() noexcept = 0;
   virtual SystemNotifier& systemNotifier() noexcept = 0;
   virtual HomeScreenService& homeScreen() noexcept = 0;
+  virtual InstallCoordination& installCoordination() noexcept = 0;
   virtual Log& log() noexcept = 0;
 
   /// Begins to receive a file at a path of the phone; parents are made, an existing file is
@@ -146,6 +147,17 @@ class EmbeddedDevice {
   /// Ending an application that does not run is no failure.
   static bool quit(const std::filesystem::path& folder, std::string_view bundleId,
                    DeviceError& deviceError, std::optional<Error>* error) noexcept;
+
+  // Tapping the placeholder of an application that is being installed, and cancelling its install,
+  // reach the process that writes the device; without one they are done here. False (with a
+  // reason) when the device does not coordinate installs, no install of the application is on its
+  // way, or it is past cancelling.
+
+  /// The install's client is asked to bring this application first.
+  static bool tap(const std::filesystem::path& folder, std::string_view bundleId,
+                  DeviceError& deviceError, std::optional<Error>* error) noexcept;
+  static bool cancel(const std::filesystem::path& folder, std::string_view bundleId,
+                     DeviceError& deviceError, std::optional<Error>* error) noexcept;
 
   // What people look at.
 

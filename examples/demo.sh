@@ -1,5 +1,6 @@
 #!/usr/bin/env bash
 # Takes the sample library through three desktop syncs of a new device, and checks what comes out.
+# Then a second device, which installs through coordinators, goes through the same.
 #
 # usage: examples/demo.sh APPSYNC [FOLDER]      FOLDER: where it works, build/demo by default
 set -euo pipefail
@@ -22,15 +23,20 @@ run() { # EXPECTED_EXIT ARGUMENT...
   ((status == expected)) || fail "\"appsync $*\" gave exit code $status, not $expected"
 }
 
-# Insists on the applications that are installed now: "name version" each, in order.
-expect_apps() {
-  local have
-  have=$("$program" --json apps | python3 -c '
+# The applications of a device, a line "name version" each, in order.
+apps_of() { # DEVICE
+  "$program" --device "$1" --json apps | python3 -c '
 import json, sys
 for line in sys.stdin:
     app = json.loads(line)
     kind = " (placeholder)" if app["placeholder"] else ""
-    print(app["identifier"].removeprefix("org.example."), app["version"] + kind)')
+    print(app["identifier"].removeprefix("org.example."), app["version"] + kind)'
+}
+
+# Insists on the applications that are installed now.
+expect_apps() { # "NAME VERSION"...
+  local have
+  have=$(apps_of "$APPSYNC_DEVICE")
   diff <(printf '%s\n' "$@") <(printf '%s\n' "$have") >difference ||
     fail "these applications were expected (<) and found (>):"$'\n'"$(cat difference)"
 }
@@ -58,8 +64,10 @@ title "On the phone, the person deletes Jot"
 run 0 uninstall org.example.jot
 
 title "Third sync: the phone reports what is gone; the desktop gives up Jot too"
-rm library/second/Jot.zip library/second/Lantern.tar.xz
-run 0 sync library/second
+rm -rf library/third
+cp -r library/second library/third
+rm library/third/Jot.zip library/third/Lantern.tar.xz
+run 0 sync library/third
 "$program" log >log.txt
 grep -F "Marking as deleted" log.txt || fail "the inventory did not report Jot as deleted"
 grep -q "org.example.jot not installed.*Marking as deleted" log.txt ||
@@ -85,4 +93,20 @@ run 0 history
 "$program" --json history | grep -q "Uninstall succeeded" ||
   fail "the history does not tell that Lantern was removed"
 
-printf '\nAll is as it should be. The device is %s\n' "$APPSYNC_DEVICE"
+title "The same on a second device, which installs through coordinators"
+rm -rf coordinated
+export APPSYNC_DEVICE=$PWD/coordinated
+run 0 init --coordination on
+run 1 --quiet sync library/first
+run 0 --quiet sync library/second --remove org.example.lantern
+run 0 --quiet uninstall org.example.jot
+run 0 --quiet sync library/third
+"$program" status | grep "coordination *on" >/dev/null || fail "the second device does not coordinate"
+
+title "Both devices side by side: without coordinators, and with them"
+apps_of phone >without.txt
+apps_of coordinated >with.txt
+paste without.txt with.txt | expand -t 24
+cmp without.txt with.txt || fail "the two devices hold different applications"
+
+printf '\nAll is as it should be. The devices are %s and %s\n' "$PWD/phone" "$PWD/coordinated"

@@ -48,30 +48,44 @@ ExitCode runUninstall(const std::string& identifier, CommandContext& context) {
   return ExitCode::Done;
 }
 
-/// EmbeddedDevice::launch or quit.
-using Foreground = bool (*)(const std::filesystem::path&, std::string_view, device::DeviceError&,
-                            std::optional<Error>*);
+/// What a person can do while another process writes the device: EmbeddedDevice::launch and others.
+using Gesture = bool (*)(const std::filesystem::path&, std::string_view, device::DeviceError&,
+                         std::optional<Error>*);
 
-void changeForeground(Foreground change, std::string_view what, const std::string& identifier,
-                      const CommandContext& context) {
+void make(Gesture gesture, std::string_view what, const std::string& identifier,
+          const CommandContext& context) {
   device::DeviceError deviceError;
   std::optional<Error> error;
-  if (change(context.deviceFolder(), identifier, deviceError, &error)) return;
+  if (gesture(context.deviceFolder(), identifier, deviceError, &error)) return;
   if (error) fail(what, identifier, error);
   throw CommandError(ExitCode::DeviceUnusable, printable(deviceError.message));
 }
 
 ExitCode runLaunch(const std::string& identifier, CommandContext& context) {
-  changeForeground(&device::EmbeddedDevice::launch, "launch", identifier, context);
+  make(&device::EmbeddedDevice::launch, "launch", identifier, context);
   say(context, {{"event", "launched"}, {"identifier", identifier}},
       fmt::format("{} is open now.", printable(identifier)));
   return ExitCode::Done;
 }
 
 ExitCode runQuit(const std::string& identifier, CommandContext& context) {
-  changeForeground(&device::EmbeddedDevice::quit, "quit", identifier, context);
+  make(&device::EmbeddedDevice::quit, "quit", identifier, context);
   say(context, {{"event", "quit"}, {"identifier", identifier}},
       fmt::format("{} is closed.", printable(identifier)));
+  return ExitCode::Done;
+}
+
+ExitCode runTap(const std::string& identifier, CommandContext& context) {
+  make(&device::EmbeddedDevice::tap, "tap", identifier, context);
+  say(context, {{"event", "tapped"}, {"identifier", identifier}},
+      fmt::format("{} comes first now.", printable(identifier)));
+  return ExitCode::Done;
+}
+
+ExitCode runCancel(const std::string& identifier, CommandContext& context) {
+  make(&device::EmbeddedDevice::cancel, "cancel", identifier, context);
+  say(context, {{"event", "cancelled"}, {"identifier", identifier}},
+      fmt::format("The install of {} is cancelled.", printable(identifier)));
   return ExitCode::Done;
 }
 
@@ -133,6 +147,10 @@ void addPhoneCommands(CLI::App& app, Command& chosen) {
                        &runUninstall);
   addIdentifierCommand(app, chosen, "launch", "Open an application on the phone", &runLaunch);
   addIdentifierCommand(app, chosen, "quit", "Close an application on the phone", &runQuit);
+  addIdentifierCommand(app, chosen, "tap", "Have an application that is being installed come first",
+                       &runTap);
+  addIdentifierCommand(app, chosen, "cancel", "Cancel the install of an application on the phone",
+                       &runCancel);
 
   CLI::App* policy = app.add_subcommand("policy", "Show or set the phone's restrictions");
   auto wishes = std::make_shared<PolicyOptions>();

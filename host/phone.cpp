@@ -12,7 +12,7 @@ Phone phoneOf(device::EmbeddedDevice& device) {
           },
           [&device](device::DeviceWatcher* watcher) { device.setWatcher(watcher); },
           [&device] { device.hurry(); },
-          device.options().coordination};
+          device.options().coordination ? &device.installCoordination() : nullptr};
 }
 
 std::vector<TodoEntry> readTodoList(FileManager& files, std::string_view directory) {

@@ -7,6 +7,7 @@
 #include "device/embedded_device.h"
 #include "platform/app_registry.h"
 #include "platform/file_manager.h"
+#include "platform/install_coordination.h"
 
 namespace appsync::host {
 
@@ -20,7 +21,8 @@ struct Phone {
       receiveFile;
   std::function<void(device::DeviceWatcher*)> setWatcher;
   std::function<void()> hurry;
-  bool coordination = false;  ///< installs are driven through install coordinators
+  /// nullptr when installs are not driven through coordinators.
+  InstallCoordination* coordination = nullptr;
 };
 
 /// Borrows the device.

@@ -15,6 +15,7 @@ namespace appsync::host {
 namespace {
 
 constexpr std::string_view Dataclass = "Application";
+constexpr const char* CancelledOnPhone = "cancelled on the phone";
 constexpr std::chrono::milliseconds InstallPoll{50};
 
 void ignoreProgress(double) {}
@@ -111,7 +112,11 @@ bool Session::reconcile(const SyncInput& input) {
 }
 
 bool Session::transfer(PackageSender& sender) {
-  if (!interruption_.requested()) sender.send(client_.outstandingAssetTransfers());
+  if (!interruption_.requested()) {
+    const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
+    if (phone_.coordination) findCoordinators(assets);
+    sender.send(assets);
+  }
   if (phone_.coordination) waitForCoordinatedInstalls(sender.outcome().sent);
   client_.assetTransferEndedWithSuccess(!interruption_.requested());
   // A coordinated install takes its package away itself, perhaps later.
@@ -119,14 +124,34 @@ bool Session::transfer(PackageSender& sender) {
   return !interruption_.requested();
 }
 
+/// Before anything is sent, so that an install that is over by then can only have been cancelled.
+void Session::findCoordinators(const std::vector<SyncAssetPtr>& assets) {
+  for (const SyncAssetPtr& asset : assets) {
+    coordinators_[asset->identifier] = phone_.coordination->coordinatorFor(
+        CoordinatorKind::Any, asset->identifier, SyncHostClientID, false, nullptr, nullptr);
+  }
+}
+
+/// A completed install shows in the todo list; a cancelled one leaves no trace there.
+bool Session::isSettled(const std::string& identifier, const std::vector<TodoEntry>& todo) {
+  const auto& coordinator = coordinators_.at(identifier);
+  const std::optional<Error> error = coordinator ? coordinator->error() : std::nullopt;
+  if (!coordinator || error) {
+    cancelled_[identifier] = error ? oneLine(error->localizedDescription()) : CancelledOnPhone;
+    return true;
+  }
+  return std::none_of(todo.begin(), todo.end(), [&](const TodoEntry& entry) {
+    return entry.identifier == identifier && entry.operation == "DOWNLOADED";
+  });
+}
+
 /// Coordinators settle after the client's transfers have ended, which would be too late for this
-/// sync's result; their only trace that the desktop can see is the todo list.
+/// sync's result.
 void Session::waitForCoordinatedInstalls(const std::set<std::string>& identifiers) {
   const auto settled = [&] {
     const auto todo = readTodoList(phone_.files, exchange::WorkArea);
-    return std::none_of(todo.begin(), todo.end(), [&](const TodoEntry& entry) {
-      return identifiers.count(entry.identifier) > 0 && entry.operation == "DOWNLOADED";
-    });
+    return std::all_of(identifiers.begin(), identifiers.end(),
+                       [&](const std::string& identifier) { return isSettled(identifier, todo); });
   };
   while (!interruption_.requested() && !settled()) std::this_thread::sleep_for(InstallPoll);
 }
@@ -184,6 +209,7 @@ SyncEnd Session::end(const PackageSender& sender) const {
   });
   end.transfers = sender.outcome();
   end.installFailures = watch_.failures();
+  end.installFailures.insert(cancelled_.begin(), cancelled_.end());
   end.disabled = disabled_;
   end.interrupted = interruption_.requested();
   end.broken = broken_;

@@ -1,10 +1,12 @@
 #pragma once
 
 #include <map>
+#include <memory>
 #include <mutex>
 #include <optional>
 #include <set>
 #include <string>
+#include <vector>
 
 #include "host/events.h"
 #include "host/interruption.h"
@@ -62,6 +64,8 @@ class Session {
   bool isServed();
   bool reconcile(const SyncInput& input);
   bool transfer(PackageSender& sender);
+  void findCoordinators(const std::vector<SyncAssetPtr>& assets);
+  bool isSettled(const std::string& identifier, const std::vector<TodoEntry>& todo);
   void waitForCoordinatedInstalls(const std::set<std::string>& identifiers);
 
   void sweepPlaceholders();
@@ -77,6 +81,8 @@ class Session {
   Reporter& reporter_;
   Interruption& interruption_;
   InstallWatch watch_;
+  std::map<std::string, std::shared_ptr<InstallCoordinator>> coordinators_;  ///< by identifier
+  std::map<std::string, std::string> cancelled_;  ///< reason by identifier, of those sent
   bool disabled_ = false;
   bool reconciled_ = false;
   std::optional<std::string> broken_;

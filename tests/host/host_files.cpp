@@ -16,8 +16,8 @@
 namespace appsync::host::testing {
 namespace fs = std::filesystem;
 
-Folder::Folder() {
-  std::string name = (fs::temp_directory_path() / "host-test.XXXXXX").string();
+Folder::Folder(const fs::path& parent) {
+  std::string name = (parent / "host-test.XXXXXX").string();
   if (!::mkdtemp(name.data())) throw std::runtime_error("no temporary folder");
   path_ = name;
 }
@@ -45,6 +45,7 @@ void pack(const fs::path& file, const Entries& entries) {
     for (const auto& [name, contents] : entries) {
       putFile(sources / "entry", contents);
       writer.addFile(name, sources / "entry", false);
+      fs::remove(sources / "entry");  // written over, it would wait for the disk
     }
     EXPECT_TRUE(writer.finish()) << writer.problem();
   }

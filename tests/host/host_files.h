@@ -12,7 +12,7 @@ namespace appsync::host::testing {
 /// A new empty folder that disappears with the object.
 class Folder {
  public:
-  Folder();
+  explicit Folder(const std::filesystem::path& parent = std::filesystem::temp_directory_path());
   ~Folder();
   Folder(const Folder&) = delete;
   Folder& operator=(const Folder&) = delete;

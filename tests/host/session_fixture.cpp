@@ -206,7 +206,7 @@ Phone SessionTest::phoneForHost() {
           },
           [this](device::DeviceWatcher* watcher) { client.watcher = watcher; },
           [this] { phone.trace.add(fakes::TraceCall, "phone.hurry"); },
-          coordination};
+          coordination ? &phone.installCoordination : nullptr};
 }
 
 SyncResult SessionTest::sync() {
@@ -221,6 +221,20 @@ SyncResult SessionTest::sync() {
 void SessionTest::offer(const std::string& identifier, const std::string& version,
                         std::size_t bodySize) {
   packSample(folder / (identifier + ".tar"), identifier, version, bodySize);
+}
+
+void SessionTest::putTodo(const std::vector<TodoEntry>& entries) {
+  PropertyList::Array list;
+  for (const TodoEntry& entry : entries) {
+    list.emplace_back(
+        PropertyList::Dictionary{{"identifier", entry.identifier}, {"operation", entry.operation}});
+  }
+  phone.files.putPlist(joinPath(exchange::WorkArea, exchange::TodoName), list);
+}
+
+std::shared_ptr<InstallCoordinator> SessionTest::makeCoordinator(std::string_view identifier) {
+  return phone.installCoordination.coordinatorFor(CoordinatorKind::Initiating, identifier,
+                                                  SyncHostClientID, true, nullptr, nullptr);
 }
 
 std::vector<std::string> SessionTest::trace() const {

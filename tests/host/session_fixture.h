@@ -112,6 +112,9 @@ class SessionTest : public ::testing::Test {
   SyncResult sync();
   void offer(const std::string& identifier, const std::string& version = "1.0",
              std::size_t bodySize = 0);
+  /// As the client would leave the todo list.
+  void putTodo(const std::vector<TodoEntry>& entries);
+  std::shared_ptr<InstallCoordinator> makeCoordinator(std::string_view identifier);
 
   Phone phoneForHost();
   /// Calls of all services, "STAGING" for the staging root.

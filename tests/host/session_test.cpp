@@ -177,18 +177,29 @@ TEST_F(SessionTest, WaitsForCoordinatedInstalls) {
   coordination = true;
   client.installsAtOnce = false;
   std::thread coordinator;
-  const auto set = [this](const char* operation) {
-    phone.files.putPlist(std::string(exchange::WorkArea) + "/ApplicationsSync.plist",
-                         PropertyList::Array{PropertyList::Dictionary{{"identifier", "com.a"},
-                                                                      {"operation", operation}}});
-  };
+  const auto set = [this](const char* operation) { putTodo({{"com.a", operation}}); };
   client.onSent = [&](const SyncAssetPtr&) {
     set("DOWNLOADED");
     coordinator = std::thread([&] { set("INSTALLED"); });
   };
+  makeCoordinator("com.a");
   const SyncResult result = sync();
   coordinator.join();
   EXPECT_EQ(text(result.summary), "installed: com.a");
+}
+
+TEST_F(SessionTest, ACoordinatedInstallThatWasCancelledIsNotWaitedFor) {
+  coordination = true;
+  client.installsAtOnce = false;
+  for (const char* identifier : {"com.before", "com.meanwhile"}) offer(identifier);
+  const auto coordinator = makeCoordinator("com.meanwhile");
+  client.onSent = [&](const SyncAssetPtr& asset) {
+    putTodo({{"com.before", "DOWNLOADED"}, {"com.meanwhile", "DOWNLOADED"}});
+    if (asset->identifier != "com.meanwhile") return;
+    coordinator->cancel(Error::withDescription(POSIXErrorDomain, ECANCELED, "not wanted"), 15);
+  };
+  EXPECT_EQ(text(sync().summary),
+            "failed: com.before (cancelled on the phone) com.meanwhile (not wanted)");
 }
 
 }  // namespace

@@ -1,0 +1,118 @@
+"""A person who taps or cancels what a sync in another process is installing."""
+
+import json
+
+import support
+
+BIG = 80_000_000
+
+
+class TapAndCancel(support.Case):
+    def setUp(self):
+        super().setUp()
+        self.init("--coordination", "on")
+        self.offer("com.a-big", body=support.noise(BIG), ending=".tar")
+        for name in ("com.b", "com.c", "com.d"):
+            self.offer(name)
+
+    def sync_until_sending(self):
+        """A sync that has begun to send the big package."""
+        process = self.start("--json", "sync", self.library)
+        for line in process.stdout:
+            event = json.loads(line)
+            if event["event"] == "transfer":
+                self.assertEqual(event["identifier"], "com.a-big")
+                self.assertLess(event["sent"], event["total"])
+                return process
+        self.fail("the sync sent nothing: " + process.stderr.read())
+
+    def rest(self, process, code):
+        out, err = process.communicate(timeout=100)
+        self.assertEqual((process.returncode, err), (code, ""), out)
+        return [json.loads(line) for line in out.splitlines()]
+
+    def test_a_cancelled_application_is_not_installed_and_harms_no_other(self):
+        process = self.sync_until_sending()
+        self.assertEqual(self.json_lines("cancel", "com.a-big"),
+                         [{"event": "cancelled", "identifier": "com.a-big"}])
+        events = self.rest(process, 1)
+        summary = events[-1]
+        self.assertEqual(summary["failed"],
+                         [{"identifier": "com.a-big", "reason": "cancelled on the phone"}])
+        self.assertEqual(summary["installed"], ["com.b", "com.c", "com.d"])
+        self.assertEqual(sum(event["event"] == "transfer-ended" and
+                             event["identifier"] == "com.a-big" for event in events), 1)
+        self.assertEqual(self.apps(), {"com.b": "1.0", "com.c": "1.0", "com.d": "1.0"})
+        self.assertEqual(self.sync()["installed"], ["com.a-big"])
+
+    def test_a_cancelled_application_that_waits_is_never_sent(self):
+        process = self.sync_until_sending()
+        self.run_appsync("cancel", "com.c")
+        events = self.rest(process, 1)
+        self.assertEqual([entry["identifier"] for entry in events[-1]["failed"]], ["com.c"])
+        self.assertEqual(events[-1]["installed"], ["com.a-big", "com.b", "com.d"])
+        self.assertNotIn("com.c", [event["identifier"] for event in events
+                                   if event["event"] == "transfer"])
+
+    def test_a_tapped_application_is_sent_next(self):
+        process = self.sync_until_sending()
+        self.assertEqual(self.json_lines("tap", "com.d"),
+                         [{"event": "tapped", "identifier": "com.d"}])
+        events = self.rest(process, 0)
+        ended = [event["identifier"] for event in events if event["event"] == "transfer-ended"]
+        self.assertEqual(ended, ["com.d", "com.a-big", "com.b", "com.c"])
+        self.assertEqual(len(self.apps()), 4)
+
+    def test_a_package_that_waits_for_its_application_to_be_closed_can_be_cancelled(self):
+        self.sync()
+        self.run_appsync("launch", "com.b")
+        self.offer("com.b", "2.0")
+        process = self.start("--json", "sync", self.library)
+        for line in process.stdout:
+            if json.loads(line)["event"] == "waiting":
+                break
+        self.run_appsync("cancel", "com.b")
+        summary = self.rest(process, 1)[-1]
+        self.assertEqual(summary["failed"], [{
+            "identifier": "com.b", "reason": "the install of com.b was cancelled on the phone"}])
+        self.assertEqual((summary["installed"], summary["updated"]), ([], []))
+        self.assertEqual(len(self.apps()), 4)
+        self.assertEqual(self.apps()["com.b"], "1.0")
+
+    def test_what_a_killed_sync_left_can_be_cancelled(self):
+        process = self.sync_until_sending()
+        process.kill()
+        process.communicate()
+        self.run_appsync("cancel", "com.a-big")
+        self.assertNotIn("com.a-big?", self.apps())
+        self.assertIn("com.a-big is not being installed",
+                      self.run_appsync("cancel", "com.a-big", code=1)[1])
+
+
+class Refusals(support.Case):
+    def check_refused(self, identifier):
+        for command in ("tap", "cancel"):
+            [error] = self.json_lines(command, identifier, code=1)
+            self.assertEqual(error["event"], "error")
+            self.assertIn(f"cannot {command} {identifier}: {identifier} is not being installed",
+                          error["message"])
+
+    def test_what_is_not_being_installed(self):
+        self.init("--coordination", "on")
+        self.offer("com.a")
+        self.sync()
+        for identifier in ("com.a", "com.absent", "../../etc"):
+            self.check_refused(identifier)
+
+    def test_a_phone_that_does_not_coordinate(self):
+        self.init()
+        self.check_refused("com.a")
+
+    def test_usage_and_phone(self):
+        for command in ("tap", "cancel"):
+            self.run_appsync(command, code=2)
+            self.run_appsync(command, "com.a", code=3)
+
+
+if __name__ == "__main__":
+    support.main()
