@@ -5,6 +5,7 @@
 #include <cerrno>
 
 #include "device/app_registry.h"
+#include "device/application_data.h"
 #include "device/application_rows.h"
 #include "device/background_queue.h"
 #include "device/backup_manager.h"
@@ -156,6 +157,35 @@ class FolderDevice final : public EmbeddedDevice {
                             std::string_view version,
                             std::optional<Error>* error) noexcept override {
     return registry_.addSystemApplication(bundleId, displayName, version, error);
+  }
+
+  std::optional<Bytes> opaqueBlob(std::string_view bundleId) noexcept override {
+    std::optional<Bytes> blob;
+    database_->read("the registry could not be read", [&](SQLite::Database& connection) {
+      const ApplicationRows rows = findApplication(connection, bundleId);
+      if (rows.installed) {
+        blob = rows.installed->sinf;
+      } else if (rows.placeholder) {
+        blob = rows.placeholder->sinf;
+      }
+    });
+    return blob;
+  }
+
+  bool saveData(std::string_view bundleId, const DataSink& sink,
+                std::optional<Error>* error) noexcept override {
+    if (isUsableIdentifier(bundleId)) return saveApplicationData(core_, bundleId, sink, error);
+    setError(error, Error::posix(EINVAL, bundleId));
+    return false;
+  }
+
+  bool restoreData(std::string_view bundleId, const DataSource& source,
+                   std::optional<Error>* error) noexcept override {
+    if (isUsableIdentifier(bundleId) && database_->writable()) {
+      return restoreApplicationData(core_, bundleId, source, error);
+    }
+    setError(error, Error::posix(database_->writable() ? EINVAL : EROFS, bundleId));
+    return false;
   }
 
   DeviceOptions options() noexcept override { return {readsCoordination(*database_)}; }

@@ -137,6 +137,28 @@ class EmbeddedDevice {
                                     std::string_view version,
                                     std::optional<Error>* error) noexcept = 0;
 
+  // What a backup saves of an application beside its files, and a restore gives back.
+
+  /// The opaque blob that came with the application or its placeholder; nullopt for none.
+  virtual std::optional<Bytes> opaqueBlob(std::string_view bundleId) noexcept = 0;
+
+  /// Takes the next bytes; false to end with the sink's own reason.
+  using DataSink = std::function<bool(ByteView bytes)>;
+  /// Gives an application's own data, or for a placeholder what a restore has still to give back to
+  /// it, as a tar archive whose bytes depend only on the data. Empty data gives no bytes at all.
+  /// False (with an error) when it could not be read or the sink ended it (POSIX 125).
+  virtual bool saveData(std::string_view bundleId, const DataSink& sink,
+                        std::optional<Error>* error) noexcept = 0;
+
+  /// Fills in the next bytes and gives their number; 0 at the end, -1 when there is no going on.
+  using DataSource = std::function<std::int64_t(std::uint8_t* bytes, std::size_t size)>;
+  /// Takes such an archive and lays the data out where it waits for the application, in one step
+  /// and on the disk; what waited there before is gone. False (with an error, POSIX 125 for the
+  /// source's own failure) when it is no archive, holds what no data may hold, or cannot be stored;
+  /// nothing has changed then.
+  virtual bool restoreData(std::string_view bundleId, const DataSource& source,
+                           std::optional<Error>* error) noexcept = 0;
+
   // Bringing an application to the foreground and ending it need no device lock, so that a person
   // can do both while a sync runs in another process.
 

@@ -30,9 +30,11 @@ bool carryOver(DeviceCore& core, std::string_view file, const ApplicationRows& b
 bool prepareData(DeviceCore& core, const std::string& identifier, const ApplicationRows& before,
                  std::optional<Error>* error) {
   if (!removeAbandonedData(core, identifier, error)) return false;
-  const bool restore =
-      before.placeholder && before.placeholder->installType == InstallType::Restore;
-  return restore && core.containers.dataWaits(identifier)
+  // What the person has made with an installed version since is worth more than old data.
+  const bool comesBack =
+      !before.installed ||
+      (before.placeholder && before.placeholder->installType == InstallType::Restore);
+  return comesBack && core.containers.dataWaits(identifier)
              ? core.containers.adoptWaitingData(identifier, error)
              : core.containers.makeData(identifier, error);
 }

@@ -148,12 +148,21 @@ TEST_F(PackageInstallTest, RestoredDataIsGivenBackWithThePackage) {
   EXPECT_FALSE(platform().backupManager.restoreDataExists(Id));
 }
 
-TEST_F(PackageInstallTest, WaitingDataIsLeftAloneByAnInstallThatIsNoRestore) {
+TEST_F(PackageInstallTest, WaitingDataIsLeftAloneByAnUpdateThatIsNoRestore) {
+  ASSERT_TRUE(installPackage(Id));
   const std::string waiting = "/var/mobile/Media/HalvoRestore/Data/com.example.a/notes";
   putFile(waiting, "from the backup");
   ASSERT_TRUE(installPlaceholder(Id));
   ASSERT_TRUE(installPackage(Id));
   EXPECT_EQ(textAt(waiting), "from the backup");
+}
+
+TEST_F(PackageInstallTest, AFirstInstallTakesTheWaitingDataWhateverItsPlaceholderIsFor) {
+  putFile("/var/mobile/Media/HalvoRestore/Data/com.example.a/notes", "from the backup");
+  ASSERT_TRUE(installPlaceholder(Id));
+  ASSERT_TRUE(installPackage(Id));
+  EXPECT_EQ(textAt("/var/mobile/Containers/Data/com.example.a/notes"), "from the backup");
+  EXPECT_FALSE(platform().backupManager.restoreDataExists(Id));
 }
 
 TEST_F(PackageInstallTest, ARefusedPackageLeavesTheRestoredDataWaiting) {

@@ -1,0 +1,93 @@
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/bytes.h"
+
+namespace appsync::host {
+
+// A backup is a folder. Nothing in it depends on when or where it was made.
+//
+//   Manifest.plist              format version; size and SHA-256 of every other file
+//   RestoreApplications.plist   what each application is restored from, by identifier
+//   DemotedApps.plist           which applications are to stay placeholders, and why
+//   IconState.plist             the order of the home screen
+//   Data/<identifier>.tar       an application's own data; absent when there is none
+
+inline constexpr std::string_view BackupApplicationsFile = "RestoreApplications.plist";
+inline constexpr std::string_view BackupDemotionsFile = "DemotedApps.plist";
+inline constexpr std::string_view BackupIconLayoutFile = "IconState.plist";
+
+/// A file of a backup, as the manifest describes it.
+struct BackupFile {
+  std::filesystem::path path;
+  std::uint64_t size = 0;  ///< bytes
+  std::string digest;      ///< SHA-256, lower-case hexadecimal
+};
+
+/// A backup that has been read. The property lists have been checked against their digests; the
+/// archives of data, which may be large, are checked while they are read.
+struct Backup {
+  Bytes applications;
+  Bytes demotions;
+  Bytes iconLayout;
+  std::map<std::string, BackupFile, std::less<>> data;  ///< by identifier
+};
+
+/// nullopt, with one line for people, for what is no backup, lacks a file or does not match its
+/// digests.
+std::optional<Backup> readBackup(const std::filesystem::path& folder, std::string& problem);
+
+/// Reads a file of a backup a piece at a time and checks it on the way. Used by one thread.
+class BackupFileReader {
+ public:
+  explicit BackupFileReader(const BackupFile& file);
+  ~BackupFileReader();
+  BackupFileReader(const BackupFileReader&) = delete;
+  BackupFileReader& operator=(const BackupFileReader&) = delete;
+
+  /// The next bytes, at most as many as fit; 0 at the end. -1, with a problem, when the file cannot
+  /// be read or turns out, at its end, not to match its digest.
+  std::int64_t read(std::uint8_t* bytes, std::size_t size);
+  std::uint64_t position() const;  ///< bytes read so far
+  const std::string& problem() const;
+
+ private:
+  struct State;
+  const std::unique_ptr<State> state_;
+};
+
+/// Makes a backup beside where it is to be and moves it there when it is whole, in the place of an
+/// older backup; until then, and when it is destroyed before, the older one stays. What a killed
+/// process left beside the folder is removed. Used by one thread.
+class BackupWriter {
+ public:
+  /// nullptr, with one line for people, when the folder cannot be made or holds something that is
+  /// no backup.
+  static std::unique_ptr<BackupWriter> open(const std::filesystem::path& folder,
+                                            std::string& problem);
+  virtual ~BackupWriter() = default;
+
+  // False when the file could not be written; problem() then tells why, and nothing more succeeds.
+
+  virtual bool addFile(std::string_view name, ByteView contents) = 0;
+  /// Begins, goes on with and ends an application's archive of data.
+  virtual bool beginData(std::string_view identifier) = 0;
+  virtual bool append(ByteView contents) = 0;
+  virtual bool endData() = 0;
+  /// Takes back the archive that was begun: the application has no data, or not all of it came.
+  virtual void dropData() = 0;
+
+  /// The backup is whole and on the disk.
+  virtual bool finish() = 0;
+  virtual const std::string& problem() const = 0;
+};
+
+}  // namespace appsync::host
