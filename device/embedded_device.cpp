@@ -142,6 +142,14 @@ class FolderDevice final : public EmbeddedDevice {
     if (coordination_) coordination_->hurry();
   }
 
+  bool isBusyWith(std::string_view bundleId) noexcept override {
+    return coordination_ && coordination_->isBusy(bundleId);
+  }
+
+  std::vector<std::string> packagesOwedBy(CoordinationClientId client) noexcept override {
+    return coordination_ ? coordination_->packagesOwedBy(client) : std::vector<std::string>{};
+  }
+
   bool uninstall(std::string_view bundleId, std::optional<Error>* error) noexcept override {
     const bool removed = registry_.removeApplication(bundleId, error);
     if (removed && coordination_) coordination_->cancelInstall(bundleId);

@@ -123,6 +123,14 @@ class EmbeddedDevice {
   /// an end.
   virtual void hurry() noexcept = 0;
 
+  /// Whether the device has something left to do for the application by itself: an install or a
+  /// removal through coordination, or telling a client that is there. False for an install that
+  /// waits for its client; always false without coordination, where calls return when all is done.
+  virtual bool isBusyWith(std::string_view bundleId) noexcept = 0;
+  /// The applications whose coordinators named this client to bring the package, and still wait for
+  /// it; sorted.
+  virtual std::vector<std::string> packagesOwedBy(CoordinationClientId client) noexcept = 0;
+
   // What a person does on the phone.
 
   /// Removes an application with its placeholder and data. False (with a reason) when there is

@@ -12,6 +12,7 @@ Phone phoneOf(device::EmbeddedDevice& device) {
           },
           [&device](device::DeviceWatcher* watcher) { device.setWatcher(watcher); },
           [&device] { device.hurry(); },
+          [&device](std::string_view bundleId) { return device.isBusyWith(bundleId); },
           device.options().coordination ? &device.installCoordination() : nullptr};
 }
 

@@ -21,6 +21,7 @@ struct Phone {
       receiveFile;
   std::function<void(device::DeviceWatcher*)> setWatcher;
   std::function<void()> hurry;
+  std::function<bool(std::string_view bundleId)> isBusyWith;
   /// nullptr when installs are not driven through coordinators.
   InstallCoordination* coordination = nullptr;
 };

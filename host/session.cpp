@@ -76,7 +76,7 @@ SyncResult Session::run(const SyncInput& input) {
 bool Session::callClient(const SyncInput& input, PackageSender& sender) {
   if (!isServed()) return !broken_;
   bool success = reconcile(input);
-  if (reconciled_) success = transfer(sender);
+  if (reconciled_) success = transfer(input.plan, sender);
   client_.syncEndedWithSuccess(success);
   if (success) writeApplicationsPresent();
   return success;
@@ -111,13 +111,13 @@ bool Session::reconcile(const SyncInput& input) {
   return reconciled_;
 }
 
-bool Session::transfer(PackageSender& sender) {
+bool Session::transfer(const SyncPlan& plan, PackageSender& sender) {
   if (!interruption_.requested()) {
     const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
     if (phone_.coordination) findCoordinators(assets);
     sender.send(assets);
   }
-  if (phone_.coordination) waitForCoordinatedInstalls(sender.outcome().sent);
+  if (phone_.coordination) waitForCoordination(plan, sender.outcome().sent);
   client_.assetTransferEndedWithSuccess(!interruption_.requested());
   // A coordinated install takes its package away itself, perhaps later.
   if (!phone_.coordination) sender.removeSentPackages();
@@ -145,15 +145,21 @@ bool Session::isSettled(const std::string& identifier, const std::vector<TodoEnt
   });
 }
 
-/// Coordinators settle after the client's transfers have ended, which would be too late for this
-/// sync's result.
-void Session::waitForCoordinatedInstalls(const std::set<std::string>& identifiers) {
-  const auto settled = [&] {
+/// Coordinators settle, and the phone removes and tidies up, after the client's calls have
+/// returned, which would be too late for this sync's result.
+void Session::waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent) {
+  const auto installsSettled = [&] {
+    if (interruption_.requested()) return true;
     const auto todo = readTodoList(phone_.files, exchange::WorkArea);
-    return std::all_of(identifiers.begin(), identifiers.end(),
+    return std::all_of(sent.begin(), sent.end(),
                        [&](const std::string& identifier) { return isSettled(identifier, todo); });
   };
-  while (!interruption_.requested() && !settled()) std::this_thread::sleep_for(InstallPoll);
+  const auto phoneIsBusy = [&] {
+    return std::any_of(plan.entries.begin(), plan.entries.end(), [&](const PlannedEntry& entry) {
+      return phone_.isBusyWith(entry.identifier);
+    });
+  };
+  while (phoneIsBusy() || !installsSettled()) std::this_thread::sleep_for(InstallPoll);
 }
 
 /// The client never asks for a package whose placeholder stands already.

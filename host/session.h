@@ -63,10 +63,10 @@ class Session {
   bool callClient(const SyncInput& input, PackageSender& sender);
   bool isServed();
   bool reconcile(const SyncInput& input);
-  bool transfer(PackageSender& sender);
+  bool transfer(const SyncPlan& plan, PackageSender& sender);
   void findCoordinators(const std::vector<SyncAssetPtr>& assets);
   bool isSettled(const std::string& identifier, const std::vector<TodoEntry>& todo);
-  void waitForCoordinatedInstalls(const std::set<std::string>& identifiers);
+  void waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent);
 
   void sweepPlaceholders();
   void reportDeletions(const PropertyList::Dictionary& inventory);

@@ -8,6 +8,7 @@ namespace appsync::host {
 void TransferQueue::add(const std::vector<SyncAssetPtr>& assets) {
   const std::lock_guard lock(mutex_);
   waiting_.insert(waiting_.end(), assets.begin(), assets.end());
+  for (const SyncAssetPtr& asset : assets) finished_.erase(asset->identifier);
 }
 
 TransferQueue::Next TransferQueue::next() {
@@ -21,11 +22,11 @@ void TransferQueue::finish(const SyncAssetPtr& asset) {
   const std::lock_guard lock(mutex_);
   waiting_.erase(std::remove(waiting_.begin(), waiting_.end(), asset), waiting_.end());
   cancelled_.erase(asset->identifier);
+  finished_.insert(asset->identifier);
 }
 
 // The client names an asset by a record of its own, so only identifiers are compared.
 bool TransferQueue::moveToFront(const std::string& identifier) {
-  const std::lock_guard lock(mutex_);
   const auto found = std::find_if(waiting_.begin(), waiting_.end(), [&](const SyncAssetPtr& asset) {
     return asset->identifier == identifier;
   });
@@ -37,7 +38,11 @@ bool TransferQueue::moveToFront(const std::string& identifier) {
 void TransferQueue::prioritizeAsset(
     const SyncAssetPtr& asset,
     std::function<void(const std::optional<Error>&)> completion) noexcept {
-  const bool found = asset && moveToFront(asset->identifier);
+  bool found = false;
+  if (asset) {
+    const std::lock_guard lock(mutex_);
+    found = moveToFront(asset->identifier);
+  }
   if (!completion) return;
   if (found) {
     completion(std::nullopt);
@@ -48,8 +53,10 @@ void TransferQueue::prioritizeAsset(
 }
 
 void TransferQueue::cancelAssetAsFailed(const SyncAssetPtr& asset) noexcept {
-  if (!asset || !moveToFront(asset->identifier)) return;
+  if (!asset) return;
   const std::lock_guard lock(mutex_);
+  if (finished_.contains(asset->identifier)) return;
+  moveToFront(asset->identifier);
   cancelled_.insert(asset->identifier);
 }
 

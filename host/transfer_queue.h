@@ -33,14 +33,18 @@ class TransferQueue : public SyncHostService {
       std::function<void(const std::optional<Error>&)> completion) noexcept override;
 
   bool supportsCancelAssetAsFailed() noexcept override { return true; }
+  /// Brings the asset of this identifier to the front, to be reported as failed. One that has not
+  /// been added yet is treated so when it is; one that is finished is left alone.
   void cancelAssetAsFailed(const SyncAssetPtr& asset) noexcept override;
 
  private:
+  /// Under mutex_.
   bool moveToFront(const std::string& identifier);
 
   std::mutex mutex_;
   std::deque<SyncAssetPtr> waiting_;
   std::set<std::string> cancelled_;
+  std::set<std::string> finished_;
 };
 
 }  // namespace appsync::host

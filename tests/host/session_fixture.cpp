@@ -83,7 +83,8 @@ bool RecordingClient::reconcileSync(const PropertyList&, std::string_view newAnc
   phone_.files.putCopy(exchange::StagingArea, exchange::WorkArea);
   phone_.files.erase(exchange::StagingArea);
   for (const TodoEntry& entry : readTodoList(phone_.files, exchange::WorkArea)) {
-    if (entry.operation == "remove") phone_.appRegistry.uninstallApplication(entry.identifier, {});
+    if (entry.operation == "remove" && removes)
+      phone_.appRegistry.uninstallApplication(entry.identifier, {});
   }
   return true;
 }
@@ -206,6 +207,7 @@ Phone SessionTest::phoneForHost() {
           },
           [this](device::DeviceWatcher* watcher) { client.watcher = watcher; },
           [this] { phone.trace.add(fakes::TraceCall, "phone.hurry"); },
+          [this](std::string_view bundleId) { return isBusyWith && isBusyWith(bundleId); },
           coordination ? &phone.installCoordination : nullptr};
 }
 

@@ -62,6 +62,7 @@ class RecordingClient : public SyncClient {
   std::function<void(const SyncAssetPtr&)> onSent;
   std::function<void()> onTransfersEnd;
   bool installsAtOnce = true;
+  bool removes = true;
   device::DeviceWatcher* watcher = nullptr;
 
  private:
@@ -130,6 +131,8 @@ class SessionTest : public ::testing::Test {
   PlanOptions options;
   std::optional<Bytes> iconLayout;
   bool coordination = false;
+  /// none: the phone never is.
+  std::function<bool(std::string_view)> isBusyWith;
 };
 
 }  // namespace appsync::host::testing

@@ -188,6 +188,20 @@ TEST_F(SessionTest, WaitsForCoordinatedInstalls) {
   EXPECT_EQ(text(result.summary), "installed: com.a");
 }
 
+TEST_F(SessionTest, WaitsForAPhoneThatRemovesByAndBy) {
+  phone.appRegistry.seedInstalled("com.old", "1.0");
+  options.remove = {"com.old"};
+  coordination = true;
+  client.removes = false;
+  int looks = 0;
+  isBusyWith = [&](std::string_view identifier) {
+    EXPECT_EQ(identifier, "com.old");
+    if (++looks == 3) phone.appRegistry.uninstallApplication("com.old", {});
+    return looks < 3;
+  };
+  EXPECT_EQ(text(sync().summary), "deleted: com.old");
+}
+
 TEST_F(SessionTest, ACoordinatedInstallThatWasCancelledIsNotWaitedFor) {
   coordination = true;
   client.installsAtOnce = false;

@@ -94,6 +94,25 @@ TEST_F(SessionTest, StopsAPackageThatIsCancelledOnThePhone) {
   EXPECT_EQ(text(result.summary), "installed: com.b; failed: com.a (cancelled on the phone)");
 }
 
+TEST_F(SessionTest, APackageThatIsCancelledBeforeItIsQueuedIsNotSent) {
+  offer("com.a");
+  offer("com.b");
+  client.onOutstanding = [&] {
+    host.service().cancelAssetAsFailed(host.makeDownload("com.a", "Application", std::nullopt));
+  };
+  EXPECT_EQ(text(sync().summary), "installed: com.b; failed: com.a (cancelled on the phone)");
+  EXPECT_THAT(identifiersOf(trace("client.assetTransferUpdatedProgress")), ElementsAre("com.b"));
+}
+
+TEST_F(SessionTest, APackageThatIsCancelledWhenItHasBeenSentCanBeSentAgain) {
+  const auto asset = host.makeDownload("com.a", "Application", std::nullopt);
+  host.transfers().add({asset});
+  host.transfers().finish(asset);
+  host.service().cancelAssetAsFailed(asset);
+  host.transfers().add({asset});
+  EXPECT_FALSE(host.transfers().next().cancelled);
+}
+
 TEST_F(SessionTest, FailsAPackageThatVanishes) {
   offer("com.a", "1.0", ThreeChunks);
   offer("com.b", "1.0", ThreeChunks);

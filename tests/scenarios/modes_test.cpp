@@ -107,11 +107,7 @@ class ModePhone {
     const SyncInput input = prepare(round, shelf);
     restrict(PolicySetting::AppInstallationAllowed, round.installingAllowed);
     restrict(PolicySetting::AppRemovalAllowed, round.removingAllowed);
-    std::string summary = run(input);
-    // A failed coordinator's placeholder goes just after its failure was told, at the latest by the
-    // time the device is open again; without coordination it goes before.
-    open();
-    return summary;
+    return run(input);
   }
 
   /// "identifier version" of each, sorted, and whether it is only a placeholder.
