@@ -12,8 +12,8 @@
 
 namespace appsync::host {
 
-// What happens during a sync. Identifiers, names and reasons may hold any bytes that a package
-// held; a reporter makes them safe for where it writes.
+// What happens during a sync, a backup or a restore. Identifiers, names and reasons may hold any
+// bytes that a package held; a reporter makes them safe for where it writes.
 
 /// A file of the library that cannot be offered.
 using PackageProblem = UnreadablePackage;
@@ -39,6 +39,31 @@ struct TransferEnded {
   std::string identifier;
   std::string name;
   std::optional<std::string> failure;  ///< reason
+};
+
+/// How far an application's own data has come on its way into a backup or back.
+struct DataProgress {
+  std::string identifier;
+  std::string name;
+  std::uint64_t done = 0;   ///< bytes
+  std::uint64_t total = 0;  ///< bytes
+};
+
+struct DataEnded {
+  std::string identifier;
+  std::optional<std::string> failure;  ///< reason
+};
+
+/// A restored application has its place on the home screen, without its package.
+struct PlaceholderStands {
+  std::string identifier;
+  std::string name;
+  bool demoted = false;  ///< and is to stay so until the person asks for it
+};
+
+/// One line that people should know of.
+struct Notice {
+  std::string text;
 };
 
 /// The application is open on the phone, so its install waits.
@@ -81,9 +106,10 @@ struct Summary {
   std::vector<SkippedEntry> skipped;
 };
 
-using Event = std::variant<PackageProblem, PlannedEntry, PlaceholderSwept, DeletedOnPhone,
-                           TransferProgress, TransferEnded, InstallWaiting, InstallEnded,
-                           ClientLogLine, Interrupted, SyncBroken, Summary>;
+using Event =
+    std::variant<PackageProblem, PlannedEntry, PlaceholderSwept, DeletedOnPhone, TransferProgress,
+                 TransferEnded, DataProgress, DataEnded, PlaceholderStands, Notice, InstallWaiting,
+                 InstallEnded, ClientLogLine, Interrupted, SyncBroken, Summary>;
 
 /// Tells people or programs what happens. Called from any thread.
 class Reporter {

@@ -47,6 +47,27 @@ Json jsonOf(const TransferEnded& event) {
                      event.failure);
 }
 
+Json jsonOf(const DataProgress& event) {
+  return {{"event", "data"},
+          {"identifier", event.identifier},
+          {"name", event.name},
+          {"done", event.done},
+          {"total", event.total}};
+}
+
+Json jsonOf(const DataEnded& event) {
+  return withFailure({{"event", "data-ended"}, {"identifier", event.identifier}}, event.failure);
+}
+
+Json jsonOf(const PlaceholderStands& event) {
+  return {{"event", "placeholder"},
+          {"identifier", event.identifier},
+          {"name", event.name},
+          {"demoted", event.demoted}};
+}
+
+Json jsonOf(const Notice& event) { return {{"event", "notice"}, {"message", event.text}}; }
+
 Json jsonOf(const InstallWaiting& event) {
   return {{"event", "waiting"},
           {"identifier", event.identifier},

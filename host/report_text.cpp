@@ -106,6 +106,28 @@ void TextReporter::tell(const TransferEnded& event) {
   if (options_.verbose) print(Style::Dim, "sent", subject(event.identifier));
 }
 
+void TextReporter::tell(const DataProgress& event) {
+  if (event.total == 0) return;
+  status_.showBar("Data of " + event.name,
+                  static_cast<double>(event.done) / static_cast<double>(event.total),
+                  fmt::format("{} of {}", byteCount(event.done), byteCount(event.total)));
+}
+
+void TextReporter::tell(const DataEnded& event) {
+  status_.clear();
+  if (options_.verbose && !event.failure) print(Style::Dim, "data", subject(event.identifier));
+}
+
+void TextReporter::tell(const PlaceholderStands& event) {
+  print(Style::Plain, "restored",
+        fmt::format("{} as a {}placeholder", subject(event.identifier),
+                    event.demoted ? "demoted " : ""));
+}
+
+void TextReporter::tell(const Notice& event) {
+  print(Style::Warning, "note", printable(event.text));
+}
+
 void TextReporter::tell(const InstallWaiting& event) {
   const std::string identifier = printable(event.identifier);
   print(Style::Warning, "waiting",

@@ -26,6 +26,10 @@ class TextReporter : public Reporter {
   void tell(const DeletedOnPhone& event);
   void tell(const TransferProgress& event);
   void tell(const TransferEnded& event);
+  void tell(const DataProgress& event);
+  void tell(const DataEnded& event);
+  void tell(const PlaceholderStands& event);
+  void tell(const Notice& event);
   void tell(const InstallWaiting& event);
   void tell(const InstallEnded& event);
   void tell(const ClientLogLine& event);

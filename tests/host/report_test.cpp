@@ -94,6 +94,32 @@ TEST_F(Reporting, GivesOneJsonObjectPerEvent) {
           R"({"event":"interrupted"})", R"({"event":"error","message":"why"})"));
 }
 
+TEST_F(Reporting, TellsARestoreInJson) {
+  EXPECT_THAT(
+      json({DataProgress{"a", "A", 5, 10}, DataEnded{"a", {}}, DataEnded{"a", "damaged"},
+            PlaceholderStands{"a", "A", true}, Notice{"by the way"}}),
+      ElementsAre(R"({"event":"data","identifier":"a","name":"A","done":5,"total":10})",
+                  R"({"event":"data-ended","identifier":"a","success":true})",
+                  R"({"event":"data-ended","identifier":"a","success":false,"reason":"damaged"})",
+                  R"({"event":"placeholder","identifier":"a","name":"A","demoted":true})",
+                  R"({"event":"notice","message":"by the way"})"));
+}
+
+TEST_F(Reporting, TellsARestoreInPlainLines) {
+  const PlannedEntry planned{Action::Install, "com.a", "1.0", "", "A"};
+  EXPECT_THAT(told({}, {planned, DataProgress{"com.a", "A", 5, 10}, DataEnded{"com.a", {}},
+                        PlaceholderStands{"com.a", "A", false},
+                        PlaceholderStands{"com.b", "B", true}, Notice{"by the way"}}),
+              ElementsAre("restored   A 1.0 (com.a) as a placeholder",
+                          "restored   com.b as a demoted placeholder", "note       by the way"));
+  EXPECT_THAT(told({.verbose = true}, {DataEnded{"com.a", {}}, DataEnded{"com.b", "damaged"}}),
+              ElementsAre("data       com.a"));
+  const std::string text = onTerminal({DataProgress{"a", "A\x1b[2J", 5, 10}}, false);
+  EXPECT_THAT(text, HasSubstr("Data of A"));
+  EXPECT_THAT(text, HasSubstr(" 50%  5 B of 10 B"));
+  EXPECT_THAT(text, Not(HasSubstr("\x1b[2J")));
+}
+
 TEST_F(Reporting, GivesTheSummaryAsPromised) {
   EXPECT_THAT(
       json({Mixed, Summary{}}),

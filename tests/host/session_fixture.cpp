@@ -22,6 +22,12 @@ std::string lineOf(const Event& event) {
           [](const DeletedOnPhone& e) { return "deleted-on-phone " + e.identifier; },
           [](const TransferProgress& e) { return "progress " + e.identifier; },
           [](const TransferEnded& e) { return "sent " + e.identifier + reasonText(e.failure); },
+          [](const DataProgress& e) { return "data " + e.identifier; },
+          [](const DataEnded& e) { return "data-ended " + e.identifier + reasonText(e.failure); },
+          [](const PlaceholderStands& e) {
+            return (e.demoted ? "demoted " : "placeholder ") + e.identifier + " " + e.name;
+          },
+          [](const Notice& e) { return "notice " + e.text; },
           [](const InstallWaiting& e) { return "waiting " + e.identifier; },
           [](const InstallEnded& e) { return "install " + e.identifier + reasonText(e.failure); },
           [](const ClientLogLine& e) { return "log " + e.text; },
