@@ -120,6 +120,7 @@ int runCommandLine(int argc, char** argv) {
   addGlobalOptions(app, context);
   addSyncCommands(app, chosen);
   addLookCommands(app, chosen);
+  addHomeScreenCommand(app, chosen);
   addPhoneCommands(app, chosen);
   addPackageCommand(app, chosen);
   try {

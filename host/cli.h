@@ -67,6 +67,7 @@ void addSyncCommands(CLI::App& app, Command& chosen);
 void addPhoneCommands(CLI::App& app, Command& chosen);
 void addLookCommands(CLI::App& app, Command& chosen);
 void addPackageCommand(CLI::App& app, Command& chosen);
+void addHomeScreenCommand(CLI::App& app, Command& chosen);
 
 /// The whole program `appsync`.
 int runCommandLine(int argc, char** argv);
