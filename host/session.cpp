@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::string_view Dataclass = "Application";
 constexpr const char* CancelledOnPhone = "cancelled on the phone";
-constexpr std::chrono::milliseconds InstallPoll{50};
+constexpr std::chrono::milliseconds InstallPoll{10};
 
 void ignoreProgress(double) {}
 
@@ -65,6 +65,10 @@ Session::~Session() {
 
 SyncResult Session::run(const SyncInput& input) {
   PackageSender sender(client_, queue_, phone_, reporter_, interruption_, input.library);
+  // What the client hears late of a killed sync must not reach this sync's todo list.
+  while (!interruption_.requested() && phoneIsBusy(input.plan)) {
+    std::this_thread::sleep_for(InstallPoll);
+  }
   sweepPlaceholders();
   removeLeftOverPackages(phone_.files);
   SyncResult result;
@@ -145,6 +149,12 @@ bool Session::isSettled(const std::string& identifier, const std::vector<TodoEnt
   });
 }
 
+bool Session::phoneIsBusy(const SyncPlan& plan) {
+  return std::any_of(plan.entries.begin(), plan.entries.end(), [&](const PlannedEntry& entry) {
+    return phone_.isBusyWith(entry.identifier);
+  });
+}
+
 /// Coordinators settle, and the phone removes and tidies up, after the client's calls have
 /// returned, which would be too late for this sync's result.
 void Session::waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent) {
@@ -154,12 +164,7 @@ void Session::waitForCoordination(const SyncPlan& plan, const std::set<std::stri
     return std::all_of(sent.begin(), sent.end(),
                        [&](const std::string& identifier) { return isSettled(identifier, todo); });
   };
-  const auto phoneIsBusy = [&] {
-    return std::any_of(plan.entries.begin(), plan.entries.end(), [&](const PlannedEntry& entry) {
-      return phone_.isBusyWith(entry.identifier);
-    });
-  };
-  while (phoneIsBusy() || !installsSettled()) std::this_thread::sleep_for(InstallPoll);
+  while (phoneIsBusy(plan) || !installsSettled()) std::this_thread::sleep_for(InstallPoll);
 }
 
 /// The client never asks for a package whose placeholder stands already.

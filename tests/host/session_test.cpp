@@ -194,12 +194,27 @@ TEST_F(SessionTest, WaitsForAPhoneThatRemovesByAndBy) {
   coordination = true;
   client.removes = false;
   int looks = 0;
+  client.onOutstanding = [&] { looks = 3; };
   isBusyWith = [&](std::string_view identifier) {
     EXPECT_EQ(identifier, "com.old");
-    if (++looks == 3) phone.appRegistry.uninstallApplication("com.old", {});
-    return looks < 3;
+    if (looks == 1) phone.appRegistry.uninstallApplication("com.old", {});
+    return looks > 0 && --looks > 0;
   };
   EXPECT_EQ(text(sync().summary), "deleted: com.old");
+}
+
+TEST_F(SessionTest, BeginsOnlyWhenThePhoneHasDoneWhatAKilledSyncLeft) {
+  offer("com.a");
+  int looks = 3;
+  isBusyWith = [&](std::string_view) {
+    if (looks > 0) {
+      EXPECT_THAT(trace("client."), ::testing::IsEmpty());
+      --looks;
+    }
+    return looks > 0;
+  };
+  EXPECT_EQ(text(sync().summary), "installed: com.a");
+  EXPECT_EQ(looks, 0);
 }
 
 TEST_F(SessionTest, ACoordinatedInstallThatWasCancelledIsNotWaitedFor) {

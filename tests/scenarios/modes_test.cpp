@@ -23,6 +23,7 @@ enum class Wish {
   Install,
   InstallTruncated,  ///< the package breaks off in its body
   InstallStranger,   ///< the file holds another application than the library says
+  InstallCancelled,  ///< the person cancels it while its package is being sent
   Remove
 };
 
@@ -58,17 +59,29 @@ class Shelf {
  private:
   static void make(const std::filesystem::path& file, const Task& task) {
     const bool strange = task.wish == Wish::InstallStranger;
+    const std::size_t size =
+        task.wish == Wish::InstallCancelled ? 2 * PackageTransfer::ChunkSize : 4000;
     testing::packSample(file, strange ? "org.example.stranger" : task.identifier, task.version,
-                        4000);
+                        size);
     if (task.wish == Wish::InstallTruncated) std::filesystem::resize_file(file, 2000);
   }
 
   const Folder folder_{memoryFolder()};
 };
 
-class SilentReporter : public Reporter {
+/// Calls with the identifier of each package that has been sent in part.
+class PartReporter : public Reporter {
  public:
-  void report(const Event&) override {}
+  explicit PartReporter(std::function<void(const std::string&)> onPart)
+      : onPart_(std::move(onPart)) {}
+
+  void report(const Event& event) override {
+    const auto* progress = std::get_if<TransferProgress>(&event);
+    if (progress && progress->sent < progress->total) onPart_(progress->identifier);
+  }
+
+ private:
+  const std::function<void(const std::string&)> onPart_;
 };
 
 /// Each list on its line, sorted; failures and skipped entries with their reasons.
@@ -107,6 +120,10 @@ class ModePhone {
     const SyncInput input = prepare(round, shelf);
     restrict(PolicySetting::AppInstallationAllowed, round.installingAllowed);
     restrict(PolicySetting::AppRemovalAllowed, round.removingAllowed);
+    cancelled_.clear();
+    for (const Task& task : round.tasks) {
+      if (task.wish == Wish::InstallCancelled) cancelled_.insert(task.identifier);
+    }
     return run(input);
   }
 
@@ -133,11 +150,25 @@ class ModePhone {
     HostProcess host(SyncHostBundleIdentifier, "com.corvane.twc.AppsClient", interruption);
     AppsClient client(device_->platform(host));
     device_->systemNotifier().post(TWStartupCompleteNotification);
-    SilentReporter reporter;
+    PartReporter reporter([&](const std::string& identifier) {
+      if (cancelled_.erase(identifier) > 0) cancel(identifier, host);
+    });
     Session session(client, host.transfers(), phoneOf(*device_), reporter, interruption);
     const SyncResult result = session.run(input);
     EXPECT_TRUE(result.completed);
     return text(result.summary);
+  }
+
+  /// Returns when the client knows. Without coordinators only the host can give an install up.
+  void cancel(const std::string& identifier, HostProcess& host) {
+    if (!device_->options().coordination) {
+      host.service().cancelAssetAsFailed(
+          host.makeDownload(identifier, "Application", std::nullopt));
+      return;
+    }
+    device::DeviceError problem;
+    EXPECT_TRUE(device::EmbeddedDevice::cancel(folder_ / "phone", identifier, problem, nullptr));
+    while (device_->isBusyWith(identifier)) std::this_thread::yield();
   }
 
   /// The restrictions change after the plan is made, so that the phone must keep to them itself.
@@ -167,6 +198,7 @@ class ModePhone {
 
   const Folder folder_{memoryFolder()};
   std::unique_ptr<device::EmbeddedDevice> device_;
+  std::set<std::string> cancelled_;  ///< that are still to be cancelled in this sync
 };
 
 class ModesTest : public ::testing::Test {
@@ -230,6 +262,15 @@ TEST_F(ModesTest, PackageOfAnotherApplicationIsRefused) {
   sync({{{A, Wish::InstallStranger, "2.0"}, {B}}});
 }
 
+TEST_F(ModesTest, ACancelledInstallIsNotThereAndACancelledUpdateKeepsTheOldVersion) {
+  sync({{{A}, {B, Wish::InstallCancelled}}});
+  EXPECT_EQ(summary(),
+            "installed org.example.a\nupdated\ndeleted\n"
+            "failed org.example.b (cancelled on the phone)\nskipped\n");
+  sync({{{A, Wish::InstallCancelled, "2.0"}, {B}}});
+  sync({{{A, Wish::Install, "2.0"}, {B, Wish::InstallCancelled}}});
+}
+
 TEST_F(ModesTest, RestrictionsKeepThePhoneAsItIs) {
   sync({{{A}, {B}}});
   sync({{{A, Wish::Install, "2.0"}, {B, Wish::Remove}, {C}}, false, true});
@@ -241,9 +282,9 @@ TEST_F(ModesTest, RestrictionsKeepThePhoneAsItIs) {
 /// A todo list that touches each of seven applications with some probability, in any way.
 Round randomRound(std::mt19937& random) {
   const auto oneIn = [&](unsigned n) { return random() % n == 0; };
-  constexpr std::array Wishes = {Wish::Install,        Wish::Install, Wish::Install,
-                                 Wish::Remove,         Wish::Remove,  Wish::InstallTruncated,
-                                 Wish::InstallStranger};
+  constexpr std::array Wishes = {
+      Wish::Install, Wish::Install,          Wish::Install,         Wish::Remove,
+      Wish::Remove,  Wish::InstallTruncated, Wish::InstallStranger, Wish::InstallCancelled};
   Round round;
   for (char letter = 'a'; letter < 'h'; ++letter) {
     if (oneIn(4)) continue;
@@ -266,7 +307,7 @@ TEST_P(RandomModesTest, AnyThreeSyncsEndAlike) {
   }
 }
 
-INSTANTIATE_TEST_SUITE_P(Seeds, RandomModesTest, ::testing::Range(1U, 21U));
+INSTANTIATE_TEST_SUITE_P(Seeds, RandomModesTest, ::testing::Range(1U, 31U));
 
 }  // namespace
 }  // namespace appsync::host
