@@ -2,7 +2,6 @@
 
 #include <cstdint>
 #include <filesystem>
-#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -33,7 +32,8 @@ struct BackupFile {
 };
 
 /// A backup that has been read. The property lists have been checked against their digests; the
-/// archives of data, which may be large, are checked while they are read.
+/// archives of data, which may be large, are looked at only when they are read, so that one that is
+/// missing or damaged spoils nothing but itself.
 struct Backup {
   Bytes applications;
   Bytes demotions;
@@ -41,8 +41,8 @@ struct Backup {
   std::map<std::string, BackupFile, std::less<>> data;  ///< by identifier
 };
 
-/// nullopt, with one line for people, for what is no backup, lacks a file or does not match its
-/// digests.
+/// nullopt, with one line for people, for what is no backup, and where a property list is missing
+/// or does not match its digest.
 std::optional<Backup> readBackup(const std::filesystem::path& folder, std::string& problem);
 
 /// Reads a file of a backup a piece at a time and checks it on the way. Used by one thread.
@@ -54,7 +54,8 @@ class BackupFileReader {
   BackupFileReader& operator=(const BackupFileReader&) = delete;
 
   /// The next bytes, at most as many as fit; 0 at the end. -1, with a problem, when the file cannot
-  /// be read or turns out, at its end, not to match its digest.
+  /// be read, is longer or shorter than it should be, or turns out, at its end, not to match its
+  /// digest: only a 0 tells that what came was right.
   std::int64_t read(std::uint8_t* bytes, std::size_t size);
   std::uint64_t position() const;  ///< bytes read so far
   const std::string& problem() const;
@@ -70,7 +71,7 @@ class BackupFileReader {
 class BackupWriter {
  public:
   /// nullptr, with one line for people, when the folder cannot be made or holds something that is
-  /// no backup.
+  /// no backup. The folder that is to hold it must exist.
   static std::unique_ptr<BackupWriter> open(const std::filesystem::path& folder,
                                             std::string& problem);
   virtual ~BackupWriter() = default;
