@@ -43,6 +43,13 @@ std::optional<Bytes> dataOption(const PropertyList::Dictionary& options, std::st
   return data ? std::optional(*data) : std::nullopt;
 }
 
+/// Demoted, or asked for before.
+bool canBeAskedFor(InstallType placeholder) {
+  return placeholder == InstallType::Downgrade ||
+         placeholder == InstallType::IntentionalDowngrade ||
+         placeholder == InstallType::StoreDownload;
+}
+
 PlaceholderOptions placeholderOptions(const PropertyList::Dictionary& options) {
   const PropertyList* type = find(options, SWInstallTypeKey);
   return {static_cast<InstallType>(type ? type->asUnsigned().value_or(0) : 0),
@@ -161,6 +168,23 @@ bool DeviceAppRegistry::removeApplication(std::string_view bundleId,
     return removeForPerson(core_, identifier, reason);
   };
   return changeApplication(bundleId, remove, error);
+}
+
+bool DeviceAppRegistry::askForDemoted(std::string_view bundleId) noexcept {
+  bool asked = false;
+  const auto ask = [&](const std::string& identifier, std::optional<Error>* error) {
+    return core_.database.change(
+        "the application could not be asked for", Database::Commit::OnDisk,
+        [&](SQLite::Database& database) {
+          std::optional<ApplicationRow> row = findApplication(database, identifier).placeholder;
+          asked = row && canBeAskedFor(row->installType);
+          if (!asked) return;
+          row->installType = InstallType::StoreDownload;
+          putApplication(database, *row);
+        },
+        error);
+  };
+  return changeApplication(bundleId, ask, nullptr) && asked;
 }
 
 bool DeviceAppRegistry::addSystemApplication(std::string_view bundleId,

@@ -82,8 +82,7 @@ class FolderDevice final : public EmbeddedDevice {
         foreground_(paths_.foreground) {
     if (!database_->writable()) return;
     finishInterruptedWork(core_);
-    if (!options().coordination) return;
-    coordination_.emplace(core_, registry_);
+    if (options().coordination) coordination_.emplace(core_, registry_);
     personSocket_ = PersonSocket::open(paths_, [this](PersonWish wish, std::string_view bundleId) {
       return carryOut(wish, bundleId);
     });
@@ -104,10 +103,12 @@ class FolderDevice final : public EmbeddedDevice {
 
   /// Why a wish cannot be carried out.
   std::optional<Error> carryOut(PersonWish wish, std::string_view bundleId) {
-    if (!coordination_) return notInstalling(bundleId);
     if (wish == PersonWish::Tap) {
-      return coordination_->tap(bundleId) ? std::nullopt : std::optional(notInstalling(bundleId));
+      const bool heard =
+          (coordination_ && coordination_->tap(bundleId)) || registry_.askForDemoted(bundleId);
+      return heard ? std::nullopt : std::optional(notInstalling(bundleId));
     }
+    if (!coordination_) return notInstalling(bundleId);
     const bool live =
         coordination_->coordinatorFor(CoordinatorKind::Any, bundleId, SyncHostClientID, false,
                                       nullptr, nullptr) != nullptr;
@@ -297,7 +298,7 @@ bool fulfil(PersonWish wish, const std::filesystem::path& folder, std::string_vi
   {
     const std::optional<OpenFolder> opened = openFolder(folder, Access::ReadOnly, deviceError);
     if (!opened) return false;
-    if (!isUsableIdentifier(bundleId) || !readsCoordination(*opened->database)) {
+    if (!isUsableIdentifier(bundleId)) {
       setError(error, notInstalling(bundleId));
       return false;
     }

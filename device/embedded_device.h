@@ -178,12 +178,13 @@ class EmbeddedDevice {
   static bool quit(const std::filesystem::path& folder, std::string_view bundleId,
                    DeviceError& deviceError, std::optional<Error>* error) noexcept;
 
-  // Tapping the placeholder of an application that is being installed, and cancelling its install,
-  // reach the process that writes the device; without one they are done here. False (with a
-  // reason) when the device does not coordinate installs, no install of the application is on its
-  // way, or it is past cancelling.
+  // Tapping the placeholder of an application, and cancelling its install, reach the process that
+  // writes the device; without one they are done here. False (with a reason) when no coordinated
+  // install of the application is on its way, or it is past cancelling.
 
-  /// The install's client is asked to bring this application first.
+  /// The install's client is asked to bring this application first. A demoted application is asked
+  /// for: its placeholder's install type becomes InstallType::StoreDownload, also without
+  /// coordination.
   static bool tap(const std::filesystem::path& folder, std::string_view bundleId,
                   DeviceError& deviceError, std::optional<Error>* error) noexcept;
   static bool cancel(const std::filesystem::path& folder, std::string_view bundleId,

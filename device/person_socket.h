@@ -12,7 +12,7 @@
 
 namespace appsync::device {
 
-/// What a person does on the home screen to an application that is being installed.
+/// What a person does on the home screen to the placeholder of an application.
 enum class PersonWish { Tap, Cancel };
 
 /// Carries a wish out; gives the reason when it cannot be. The identifier is a usable one.

@@ -78,7 +78,7 @@ ExitCode runQuit(const std::string& identifier, CommandContext& context) {
 ExitCode runTap(const std::string& identifier, CommandContext& context) {
   make(&device::EmbeddedDevice::tap, "tap", identifier, context);
   say(context, {{"event", "tapped"}, {"identifier", identifier}},
-      fmt::format("{} comes first now.", printable(identifier)));
+      fmt::format("{} is asked for now.", printable(identifier)));
   return ExitCode::Done;
 }
 
@@ -147,7 +147,7 @@ void addPhoneCommands(CLI::App& app, Command& chosen) {
                        &runUninstall);
   addIdentifierCommand(app, chosen, "launch", "Open an application on the phone", &runLaunch);
   addIdentifierCommand(app, chosen, "quit", "Close an application on the phone", &runQuit);
-  addIdentifierCommand(app, chosen, "tap", "Have an application that is being installed come first",
+  addIdentifierCommand(app, chosen, "tap", "Tap a placeholder: have its application come next",
                        &runTap);
   addIdentifierCommand(app, chosen, "cancel", "Cancel the install of an application on the phone",
                        &runCancel);

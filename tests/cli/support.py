@@ -65,9 +65,10 @@ class Case(unittest.TestCase):
         return done.stdout, done.stderr
 
     def start(self, *arguments, **options):
+        """The command, running. It gets no further ahead of whoever reads than a page of output."""
         process = subprocess.Popen([APPSYNC, *map(str, arguments)], stdout=subprocess.PIPE,
                                    stderr=subprocess.PIPE, text=True, env=self.environment,
-                                   **options)
+                                   pipesize=4096, **options)
         self.addCleanup(self.stop, process)
         return process
 
@@ -116,10 +117,10 @@ class Case(unittest.TestCase):
             (bundle / "body").write_bytes(body)
         return bundle
 
-    def offer(self, identifier, version="1.0", body=b"", ending=".zip"):
+    def offer(self, identifier, version="1.0", body=b"", ending=".zip", name=None):
         """A package in the library."""
         package = self.library / f"{identifier}{ending}"
-        self.run_appsync("package", self.bundle(identifier, version, body), "-o", package)
+        self.run_appsync("package", self.bundle(identifier, version, body, name), "-o", package)
         return package
 
     def offer_raw(self, name, entries):

@@ -4,14 +4,16 @@ import json
 
 import support
 
-BIG = 80_000_000
+BIG = 30_000_000
+# Makes each of its events long, so that its sending waits for whoever reads them.
+LONG_NAME = "Big" * 60
 
 
 class TapAndCancel(support.Case):
     def setUp(self):
         super().setUp()
         self.init("--coordination", "on")
-        self.offer("com.a-big", body=support.noise(BIG), ending=".tar")
+        self.offer("com.a-big", body=support.noise(BIG), ending=".tar", name=LONG_NAME)
         for name in ("com.b", "com.c", "com.d"):
             self.offer(name)
 

@@ -167,10 +167,19 @@ TEST_F(PersonSocketTest, SomethingElseOfItsNameIsLeftAloneAndTheDeviceOpensAllTh
   EXPECT_EQ(outcomeOf(&EmbeddedDevice::tap, Id), 2);
 }
 
-class UncoordinatedTest : public DeviceTest {};
+class UncoordinatedTest : public DeviceTest {
+ protected:
+  bool demote(InstallType demotion) {
+    return installPlaceholder(
+        Id, "1.0", {{std::string(SWInstallTypeKey), static_cast<std::uint64_t>(demotion)}});
+  }
+  InstallType placeholderType() {
+    const auto placeholder = record(Id, true);
+    return placeholder ? placeholder->installType : InstallType::None;
+  }
+};
 
-TEST_F(UncoordinatedTest, NothingCanBeTappedOrCancelledAndThereIsNoSocket) {
-  EXPECT_FALSE(std::filesystem::exists(folder / "person"));
+TEST_F(UncoordinatedTest, NoInstallCanBeTappedOrCancelled) {
   ASSERT_TRUE(installPlaceholder("com.example.a"));
   DeviceError problem;
   EXPECT_FALSE(EmbeddedDevice::tap(folder, Id, problem, &error));
@@ -180,6 +189,26 @@ TEST_F(UncoordinatedTest, NothingCanBeTappedOrCancelledAndThereIsNoSocket) {
   EXPECT_TRUE(error);
   EXPECT_FALSE(EmbeddedDevice::tap(folder / "nowhere", Id, problem, nullptr));
   EXPECT_EQ(problem.problem, DeviceProblem::Missing);
+}
+
+TEST_F(UncoordinatedTest, ADemotedApplicationThatIsTappedIsAskedForOnceAndForAll) {
+  for (const InstallType demotion : {InstallType::Downgrade, InstallType::IntentionalDowngrade}) {
+    ASSERT_TRUE(demote(demotion));
+    DeviceError problem;
+    for (int tap = 0; tap < 2; ++tap) {
+      EXPECT_TRUE(EmbeddedDevice::tap(folder, Id, problem, nullptr));
+      EXPECT_EQ(placeholderType(), InstallType::StoreDownload);
+    }
+  }
+}
+
+TEST_F(UncoordinatedTest, ATapWithoutAWriterStaysOnTheDevice) {
+  ASSERT_TRUE(demote(InstallType::IntentionalDowngrade));
+  device.reset();
+  DeviceError problem;
+  EXPECT_TRUE(EmbeddedDevice::tap(folder, Id, problem, nullptr));
+  reopen();
+  EXPECT_EQ(placeholderType(), InstallType::StoreDownload);
 }
 
 }  // namespace
