@@ -25,23 +25,6 @@ FileDescriptor openChild(int directory, const std::string& name) {
       ::openat(directory, name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
 }
 
-bool listNames(int directory, std::vector<std::string>& names) {
-  // The stream takes its descriptor over and moves its offset: it gets one of its own.
-  FileDescriptor own(::openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  DIR* stream = own ? ::fdopendir(own.get()) : nullptr;
-  if (!stream) return false;
-  own.release();
-  errno = 0;
-  while (const dirent* entry = ::readdir(stream)) {  // NOLINT(concurrency-mt-unsafe)
-    const std::string name = entry->d_name;
-    if (name != "." && name != "..") names.push_back(name);
-  }
-  const int failure = errno;
-  ::closedir(stream);
-  errno = failure;
-  return failure == 0;
-}
-
 bool failWith(int reason) {
   errno = reason;
   return false;
@@ -139,6 +122,23 @@ void removeTemporariesBelow(int directory, int depth) {
 }
 
 }  // namespace
+
+bool listNames(int directory, std::vector<std::string>& names) {
+  // The stream takes its descriptor over and moves its offset: it gets one of its own.
+  FileDescriptor own(::openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  DIR* stream = own ? ::fdopendir(own.get()) : nullptr;
+  if (!stream) return false;
+  own.release();
+  errno = 0;
+  while (const dirent* entry = ::readdir(stream)) {  // NOLINT(concurrency-mt-unsafe)
+    const std::string name = entry->d_name;
+    if (name != "." && name != "..") names.push_back(name);
+  }
+  const int failure = errno;
+  ::closedir(stream);
+  errno = failure;
+  return failure == 0;
+}
 
 bool removeTree(int directory, const std::string& name) noexcept {
   return removeLevel(directory, name, 0);

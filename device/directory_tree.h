@@ -1,8 +1,12 @@
 #pragma once
 
 #include <string>
+#include <vector>
 
 namespace appsync::device {
+
+/// The names in an open directory, in any order. False with errno set.
+bool listNames(int directory, std::vector<std::string>& names);
 
 // Both work on handles all the way, so that nothing moved or linked about meanwhile leads them out
 // of the tree, and follow no link. False with errno set; ENAMETOOLONG for a tree nested deeper than
