@@ -1,8 +1,16 @@
 #include "host/phone.h"
 
+#include <chrono>
+#include <thread>
+
 #include "platform/property_list_codec.h"
 
 namespace appsync::host {
+namespace {
+
+constexpr std::chrono::milliseconds IdlePoll{10};
+
+}  // namespace
 
 Phone phoneOf(device::EmbeddedDevice& device) {
   return {device.files(),
@@ -14,6 +22,36 @@ Phone phoneOf(device::EmbeddedDevice& device) {
           [&device] { device.hurry(); },
           [&device](std::string_view bundleId) { return device.isBusyWith(bundleId); },
           device.options().coordination ? &device.installCoordination() : nullptr};
+}
+
+RestorePhone restorePhoneOf(device::EmbeddedDevice& device) {
+  return {phoneOf(device), device.homeScreen(),
+          [&device](std::string_view bundleId, const device::EmbeddedDevice::DataSink& sink,
+                    std::optional<Error>* error) { return device.saveData(bundleId, sink, error); },
+          [&device](std::string_view bundleId, const device::EmbeddedDevice::DataSource& source,
+                    std::optional<Error>* error) {
+            return device.restoreData(bundleId, source, error);
+          },
+          [&device](CoordinationClientId client) { return device.packagesOwedBy(client); }};
+}
+
+void waitUntilIdle(const Phone& phone, const std::set<std::string>& identifiers) {
+  for (const std::string& identifier : identifiers) {
+    while (phone.isBusyWith(identifier)) std::this_thread::sleep_for(IdlePoll);
+  }
+}
+
+ApplicationsPresent applicationsPresent(AppRegistry& registry) {
+  ApplicationsPresent present;
+  registry.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
+    if (!record.isApplication) return;
+    if (record.isPlaceholder) {
+      present.placeholders.insert_or_assign(record.applicationIdentifier, record);
+    } else {
+      present.installed.insert(record.applicationIdentifier);
+    }
+  });
+  return present;
 }
 
 std::vector<TodoEntry> readTodoList(FileManager& files, std::string_view directory) {

@@ -1,8 +1,12 @@
 #pragma once
 
 #include <functional>
+#include <map>
 #include <memory>
+#include <set>
+#include <string>
 #include <string_view>
+#include <vector>
 
 #include "device/embedded_device.h"
 #include "platform/app_registry.h"
@@ -29,6 +33,31 @@ struct Phone {
 /// Borrows the device.
 Phone phoneOf(device::EmbeddedDevice& device);
 
+/// What a restore needs of a phone beside that. See EmbeddedDevice.
+struct RestorePhone : Phone {
+  HomeScreenService& homeScreen;
+  std::function<bool(std::string_view bundleId, const device::EmbeddedDevice::DataSink& sink,
+                     std::optional<Error>* error)>
+      saveData;
+  std::function<bool(std::string_view bundleId, const device::EmbeddedDevice::DataSource& source,
+                     std::optional<Error>* error)>
+      restoreData;
+  std::function<std::vector<std::string>(CoordinationClientId client)> packagesOwedBy;
+};
+
+/// Borrows the device.
+RestorePhone restorePhoneOf(device::EmbeddedDevice& device);
+
+/// Waits until the phone has nothing left to do for these applications by itself.
+void waitUntilIdle(const Phone& phone, const std::set<std::string>& identifiers);
+
+/// The applications that the registry knows.
+struct ApplicationsPresent {
+  std::set<std::string, std::less<>> installed;
+  std::map<std::string, AppRecord, std::less<>> placeholders;
+};
+ApplicationsPresent applicationsPresent(AppRegistry& registry);
+
 // Where host and client exchange files on the phone.
 namespace exchange {
 inline constexpr std::string_view StagingRoot = "/var/mobile/Media/PublicStaging";
@@ -39,6 +68,11 @@ inline constexpr std::string_view LastSyncState =
     "/var/mobile/Library/ApplicationSync/LastSyncAppState.plist";
 inline constexpr std::string_view RestoreState =
     "/var/mobile/Library/ApplicationSync/RestoreState.plist";
+inline constexpr std::string_view RestoreList =
+    "/var/mobile/Media/HalvoRestore/RestoreApplications.plist";
+inline constexpr std::string_view DemotedApplications =
+    "/var/mobile/Library/Preferences/com.corvane.Safekeep.DemotedApps.plist";
+inline constexpr std::string_view Downloads = "/var/mobile/Media/Downloads";
 inline constexpr std::string_view TodoName = "ApplicationsSync.plist";
 inline constexpr std::string_view IconLayoutName = "DashelIconState.plist";
 }  // namespace exchange
