@@ -1,0 +1,24 @@
+#pragma once
+
+#include <set>
+#include <string>
+
+#include "platform/app_registry.h"
+#include "platform/file_manager.h"
+
+namespace appsync::host {
+
+/// The applications of a phone that are to stay placeholders until a person asks for them.
+class Demotions {
+ public:
+  /// As the phone's own file lists them; none when there is no such file.
+  explicit Demotions(FileManager& files);
+
+  /// A placeholder that was asked for has another install type than a restore's.
+  bool holdBack(const AppRecord& placeholder) const;
+
+ private:
+  std::set<std::string, std::less<>> named_;
+};
+
+}  // namespace appsync::host
