@@ -119,6 +119,7 @@ int runCommandLine(int argc, char** argv) {
   Command chosen;
   addGlobalOptions(app, context);
   addSyncCommands(app, chosen);
+  addRestoreCommand(app, chosen);
   addLookCommands(app, chosen);
   addHomeScreenCommand(app, chosen);
   addPhoneCommands(app, chosen);
