@@ -64,13 +64,13 @@ void writeFile(const fs::path& path, const Bytes& bytes) {
 
 ExitCode runHomeScreen(const HomeScreenOptions& options, CommandContext& context) {
   const auto device = context.openDevice(device::Access::ReadOnly);
-  const auto applications = shownApplications(*device);
-  const ScreenView view = viewOf(pagesFor(applications.size()), options.page);
+  const auto order = device->homeScreenOrder();
+  const ScreenView view = viewOf(pagesFor(order.size()), options.page);
   std::vector<ScreenIcon> icons;
   const std::size_t first = view.firstPage * IconsPerPage;
-  const std::size_t last = first + view.pagesShown * IconsPerPage;
-  for (std::size_t i = first; i < std::min(last, applications.size()); ++i) {
-    icons.push_back(iconOf(*device, applications[i], view.iconSide()));
+  const std::size_t end = std::min(first + view.pagesShown * IconsPerPage, order.size());
+  for (std::size_t i = first; i < end; ++i) {
+    if (auto icon = iconOf(*device, order[i], view.iconSide())) icons.push_back(std::move(*icon));
   }
   writeFile(fs::absolute(options.output), encode(drawHomeScreen(view, icons)));
   if (context.quiet && !context.json) return ExitCode::Done;

@@ -1,13 +1,29 @@
 #include "host/home_screen_icons.h"
 
-#include <map>
-
 #include "device/icon_decoder.h"
 #include "device/icon_renderer.h"
 #include "platform/bundle.h"
 
 namespace appsync::host {
 namespace {
+
+/// One of them at least, if the application is on the device.
+struct Records {
+  std::optional<AppRecord> installed;
+  std::optional<AppRecord> placeholder;
+};
+
+Records recordsOf(AppRegistry& registry, std::string_view identifier) {
+  Records records;
+  records.installed = registry.recordForIdentifier(identifier, false);
+  records.placeholder = registry.recordForIdentifier(identifier, true);
+  if (records.installed && records.installed->isPlaceholder) records.installed.reset();
+  return records;
+}
+
+bool isSame(const std::optional<AppRecord>& a, const std::optional<AppRecord>& b) {
+  return a.has_value() == b.has_value() && (!a || a->bundlePath == b->bundlePath);
+}
 
 constexpr std::string_view Artwork = "HalvoArtwork";
 
@@ -34,6 +50,7 @@ std::optional<Image> picture(device::EmbeddedDevice& device, const AppRecord& re
   return icon ? icon : artwork(files, record, side);
 }
 
+/// A demoted application stays as it is until somebody asks for it.
 bool isDemoted(const AppRecord& record) {
   return record.installType == InstallType::Downgrade ||
          record.installType == InstallType::IntentionalDowngrade;
@@ -47,57 +64,59 @@ double shareOf(const InstallProgress& progress) {
   return total > 0 ? static_cast<double>(progress.completedUnitCount()) / total : 0;
 }
 
-void showProgress(AppRegistry& registry, const AppRecord& placeholder, ScreenIcon& icon) {
-  icon.state = ScreenIcon::State::Away;
-  const auto progress = registry.installProgressSync(placeholder);
-  if (!progress) return;
-  switch (progress->installState()) {
+ScreenIcon::State stateOf(InstallState state, bool demoted) {
+  using State = ScreenIcon::State;
+  switch (state) {
     case InstallState::Waiting:
-      if (!isDemoted(placeholder)) icon.state = ScreenIcon::State::Waiting;
-      break;
+      return demoted ? State::Away : State::Waiting;
     case InstallState::Active:
-      icon.state = ScreenIcon::State::Loading;
-      icon.progress = shareOf(*progress);
-      break;
+      return State::Loading;
     case InstallState::Paused:
-      icon.state = ScreenIcon::State::Paused;
-      break;
+      return demoted ? State::Away : State::Paused;
     case InstallState::Canceled:
     case InstallState::Failed:
     case InstallState::Finished:
       break;
   }
+  return State::Away;
 }
 
-}  // namespace
-
-std::vector<ShownApplication> shownApplications(device::EmbeddedDevice& device) {
-  std::map<std::string, ShownApplication> present;
-  for (AppRecord& record : device.applications()) {
-    ShownApplication& application = present[record.applicationIdentifier];
-    (record.isPlaceholder ? application.placeholder : application.installed) = std::move(record);
-  }
-  std::vector<ShownApplication> shown;
-  for (const std::string& identifier : device.homeScreenOrder()) {
-    // What another process has put on the device since then comes with the next picture.
-    const auto found = present.find(identifier);
-    if (found != present.end()) shown.push_back(std::move(found->second));
-  }
-  return shown;
+void showProgress(AppRegistry& registry, const AppRecord& placeholder, ScreenIcon& icon) {
+  const auto progress = registry.installProgressSync(placeholder);
+  icon.state = progress ? stateOf(progress->installState(), isDemoted(placeholder))
+                        : ScreenIcon::State::Away;
+  if (icon.state == ScreenIcon::State::Loading) icon.progress = shareOf(*progress);
 }
 
-ScreenIcon iconOf(device::EmbeddedDevice& device, const ShownApplication& application,
-                  std::uint32_t side) {
+ScreenIcon describe(device::EmbeddedDevice& device, const Records& records, std::uint32_t side) {
   ScreenIcon icon;
-  for (const auto* record : {&application.placeholder, &application.installed}) {
+  for (const auto* record : {&records.placeholder, &records.installed}) {
     if (!*record) continue;
     if (icon.name.empty()) icon.name = (*record)->displayName;
     if (!icon.picture) icon.picture = picture(device, **record, side);
   }
-  const auto& any = application.placeholder ? application.placeholder : application.installed;
-  if (icon.name.empty() && any) icon.name = any->applicationIdentifier;
-  if (application.placeholder) {
-    showProgress(device.appRegistry(), *application.placeholder, icon);
+  if (records.placeholder) showProgress(device.appRegistry(), *records.placeholder, icon);
+  return icon;
+}
+
+}  // namespace
+
+std::optional<ScreenIcon> iconOf(device::EmbeddedDevice& device, std::string_view identifier,
+                                 std::uint32_t side) {
+  constexpr int Attempts = 3;
+  AppRegistry& registry = device.appRegistry();
+  Records records = recordsOf(registry, identifier);
+  std::optional<ScreenIcon> icon;
+  for (int i = 0; i < Attempts; ++i) {
+    if (!records.installed && !records.placeholder) return std::nullopt;
+    icon = describe(device, records, side);
+    if (icon->name.empty()) icon->name = identifier;
+    // An install that has just ended has taken the files away that were looked for.
+    Records now = recordsOf(registry, identifier);
+    if (isSame(records.installed, now.installed) && isSame(records.placeholder, now.placeholder)) {
+      break;
+    }
+    records = std::move(now);
   }
   return icon;
 }

@@ -120,6 +120,7 @@ void HomeScreenText::write(std::string_view text, double centre, double baseline
 
 void HomeScreenText::writeLetter(std::string_view letter, double x, double y, double size) {
   const auto layout = fonts_->lay(letter, size);
+  if (pango_layout_get_unknown_glyphs_count(layout.get()) > 0) return;
   PangoRectangle ink;
   pango_layout_get_extents(layout.get(), &ink, nullptr);
   cairo_move_to(fonts_->drawing, x - (ink.x + ink.width / 2.0) / PANGO_SCALE,

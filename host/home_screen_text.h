@@ -26,7 +26,7 @@ class HomeScreenText {
   /// its characters, it stays in a line's height.
   void write(std::string_view text, double centre, double baseline, const Style& style);
 
-  /// A letter of this size, centred in both directions.
+  /// A letter of this size, centred in both directions; nothing if no font has it.
   void writeLetter(std::string_view letter, double x, double y, double size);
 
  private:
