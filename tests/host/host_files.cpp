@@ -27,6 +27,11 @@ Folder::~Folder() {
   fs::remove_all(path_, ignored);
 }
 
+std::filesystem::path memoryFolder() {
+  constexpr char Memory[] = "/dev/shm";
+  return ::access(Memory, W_OK) == 0 ? Memory : std::filesystem::temp_directory_path();
+}
+
 void putFile(const fs::path& path, std::string_view contents) {
   fs::create_directories(path.parent_path());
   std::ofstream(path, std::ios::binary) << contents;

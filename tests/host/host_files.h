@@ -23,6 +23,10 @@ class Folder {
   std::filesystem::path path_;
 };
 
+/// Where a test that would wait for the disk ten thousand times keeps its folder; what it shows
+/// must need no disk.
+std::filesystem::path memoryFolder();
+
 /// Makes missing folders on the way.
 void putFile(const std::filesystem::path& path, std::string_view contents);
 std::string fileText(const std::filesystem::path& path);

@@ -1,8 +1,6 @@
 // The same syncs on two phones: one installs through coordinators, the other does not. Whatever the
 // mix, both must end with the same applications and tell the desktop the same.
 
-#include <unistd.h>
-
 #include <algorithm>
 #include <array>
 #include <random>
@@ -18,6 +16,7 @@ namespace appsync::host {
 namespace {
 
 using testing::Folder;
+using testing::memoryFolder;
 
 enum class Wish {
   Install,
@@ -39,12 +38,6 @@ struct Round {
   bool installingAllowed = true;
   bool removingAllowed = true;
 };
-
-/// The syncs here would wait for the disk ten thousand times, and what they show needs none.
-std::filesystem::path memoryFolder() {
-  constexpr char Memory[] = "/dev/shm";
-  return ::access(Memory, W_OK) == 0 ? Memory : std::filesystem::temp_directory_path();
-}
 
 /// Packages, each made when it is first asked for.
 class Shelf {
