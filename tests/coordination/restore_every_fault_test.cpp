@@ -1,0 +1,110 @@
+// Each call that a restore makes of the phone fails once. Whatever it is, the restore goes on: up
+// to there nothing changes, the other applications leave the trace they always leave, and the list
+// is used up.
+
+#include <algorithm>
+
+#include "tests/coordination/restore_list.h"
+
+namespace appsync::fakes {
+namespace {
+
+const char* const Applications[] = {"com.q", "com.r", "com.s"};
+
+/// A phone that restores three applications, the second of them demoted.
+class RestoringPhone : public RestoredBackupTest {
+ public:
+  explicit RestoringPhone(bool coordinated) : RestoredBackupTest(coordinated) {
+    phone.files.putPlist(DemotedApps, PropertyList::Dictionary{
+                                          {"AutomaticDowngrades", PropertyList::Array{"com.r"}}});
+    PropertyList::Dictionary list;
+    for (const char* identifier : Applications) {
+      list.emplace(identifier, entryWith(plainMetadata()));
+    }
+    putList(std::move(list));
+  }
+
+  void TestBody() override {}
+
+  void fail(const std::string& operation, unsigned call) {
+    phone.faults.failCall(operation, call, Refused);
+  }
+  /// The whole trace, with what was only asked.
+  Trace restore() {
+    std::optional<Error> error = Refused;
+    EXPECT_TRUE(client->reconcileRestoreOfType(2, &error));
+    EXPECT_FALSE(error);
+    return phone.trace.readable(TraceAll);
+  }
+  bool listIsUsedUp() const { return listIsKept(); }
+};
+
+std::string operationOf(const std::string& line) {
+  const std::size_t end = line.find('(');
+  const std::size_t dot = line.find('.');
+  if (end == std::string::npos || dot > end || line.find(' ') < end) return {};
+  return line.substr(0, end);
+}
+
+/// What one application leaves in a trace.
+Trace partOf(const Trace& trace, const std::string& identifier) {
+  const std::string beginning = said("processing halvo restore info for '" + identifier + "'");
+  const std::string other = said("processing halvo restore info for '");
+  auto begin = std::find_if(trace.begin(), trace.end(),
+                            [&](const std::string& line) { return line.starts_with(beginning); });
+  if (begin == trace.end()) return {};
+  const auto end = std::find_if(begin + 1, trace.end(), [&](const std::string& line) {
+    return line.starts_with(other) ||
+           line.find("removeItem(" + std::string(KeptCopy)) != std::string::npos;
+  });
+  return {begin, end};
+}
+
+class EveryRestoreFaultTest : public testing::TestWithParam<bool> {
+ protected:
+  /// What concerns no application in particular concerns the list, which is then not read.
+  void expectOthersUntouched(const Trace& calm, const Trace& trace, const std::string& fault) {
+    const auto concerned = std::find_if(
+        std::begin(Applications), std::end(Applications),
+        [&](const char* identifier) { return fault.find(identifier) != std::string::npos; });
+    if (concerned == std::end(Applications)) return;
+    for (const char* identifier : Applications) {
+      if (identifier == *concerned) continue;
+      EXPECT_EQ(partOf(trace, identifier), partOf(calm, identifier));
+    }
+  }
+};
+
+TEST_P(EveryRestoreFaultTest, ConcernsOneApplicationAtMost) {
+  const Trace calm = RestoringPhone(GetParam()).restore();
+  std::map<std::string, unsigned> calls;
+  unsigned struck = 0;
+  for (const std::string& line : calm) {
+    const std::string operation = operationOf(line);
+    if (operation.empty()) continue;
+    const unsigned call = ++calls[operation];
+    SCOPED_TRACE(operation + ", call " + std::to_string(call));
+    RestoringPhone phone(GetParam());
+    phone.fail(operation, call);
+    const Trace trace = phone.restore();
+
+    const Trace before = upTo(trace, "fault ");
+    if (before.size() == trace.size()) continue;  // an operation that cannot fail
+    ++struck;
+    ASSERT_LE(before.size(), calm.size());
+    EXPECT_TRUE(std::equal(before.begin(), before.end(), calm.begin()));
+    const std::string& fault = trace[before.size()];
+    expectOthersUntouched(calm, trace, fault);
+    const bool notMoved = fault.starts_with("fault FileManager.moveItem") ||
+                          fault == "fault FileManager.fileExists(" + std::string(RestoreList) + ")";
+    EXPECT_EQ(phone.listIsUsedUp(), !notMoved);
+  }
+  EXPECT_GT(struck, GetParam() ? 40u : 20u);
+}
+
+INSTANTIATE_TEST_SUITE_P(BothModes, EveryRestoreFaultTest, testing::Bool(), [](const auto& given) {
+  return given.param ? "Coordinated" : "Uncoordinated";
+});
+
+}  // namespace
+}  // namespace appsync::fakes
