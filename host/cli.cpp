@@ -110,6 +110,7 @@ int runCommandLine(int argc, char** argv) {
   // Character widths need a UTF-8 locale, whatever the person's is.
   if (!::setlocale(LC_CTYPE, "") || displayWidth("\u00e9") != 1) ::setlocale(LC_CTYPE, "C.UTF-8");
   ::signal(SIGPIPE, SIG_IGN);
+  ::signal(SIGXFSZ, SIG_IGN);  // writing beyond a limit fails like writing to a full disk
 
   CommandContext context;
   CLI::App app("Keeps a phone's applications in step with a library of packages.", "appsync");
@@ -119,6 +120,7 @@ int runCommandLine(int argc, char** argv) {
   Command chosen;
   addGlobalOptions(app, context);
   addSyncCommands(app, chosen);
+  addBackupCommand(app, chosen);
   addRestoreCommand(app, chosen);
   addLookCommands(app, chosen);
   addHomeScreenCommand(app, chosen);

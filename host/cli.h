@@ -64,6 +64,7 @@ std::string policyText(device::EmbeddedDevice& device, PolicySetting setting);
 
 // Each adds a group of commands; parsing sets `chosen` to the one that was named.
 void addSyncCommands(CLI::App& app, Command& chosen);
+void addBackupCommand(CLI::App& app, Command& chosen);
 void addRestoreCommand(CLI::App& app, Command& chosen);
 void addPhoneCommands(CLI::App& app, Command& chosen);
 void addLookCommands(CLI::App& app, Command& chosen);

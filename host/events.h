@@ -54,6 +54,21 @@ struct DataEnded {
   std::optional<std::string> failure;  ///< reason
 };
 
+/// An application is being saved; `bytes` of its own data so far.
+struct SavingProgress {
+  std::string identifier;
+  std::string name;
+  std::uint64_t bytes = 0;
+  std::size_t number = 0;  ///< of the application, from 1
+  std::size_t count = 0;   ///< of all applications
+};
+
+struct ApplicationSaved {
+  std::string identifier;
+  std::string name;
+  std::optional<std::string> failure;  ///< reason
+};
+
 /// A restored application has its place on the home screen, without its package.
 struct PlaceholderStands {
   std::string identifier;
@@ -97,7 +112,7 @@ struct FailedEntry {
   std::string reason;
 };
 
-/// The last event.
+/// The last event of a sync or a restore.
 struct Summary {
   std::vector<std::string> installed;
   std::vector<std::string> updated;
@@ -106,10 +121,18 @@ struct Summary {
   std::vector<SkippedEntry> skipped;
 };
 
+/// The last event of a backup.
+struct BackupSummary {
+  std::vector<std::string> saved;
+  std::vector<FailedEntry> failed;
+  bool made = false;  ///< else an older backup stays as it was
+};
+
 using Event =
     std::variant<PackageProblem, PlannedEntry, PlaceholderSwept, DeletedOnPhone, TransferProgress,
-                 TransferEnded, DataProgress, DataEnded, PlaceholderStands, Notice, InstallWaiting,
-                 InstallEnded, ClientLogLine, Interrupted, SyncBroken, Summary>;
+                 TransferEnded, DataProgress, DataEnded, SavingProgress, ApplicationSaved,
+                 PlaceholderStands, Notice, InstallWaiting, InstallEnded, ClientLogLine,
+                 Interrupted, SyncBroken, Summary, BackupSummary>;
 
 /// Tells people or programs what happens. Called from any thread.
 class Reporter {

@@ -59,6 +59,16 @@ Json jsonOf(const DataEnded& event) {
   return withFailure({{"event", "data-ended"}, {"identifier", event.identifier}}, event.failure);
 }
 
+Json jsonOf(const SavingProgress& event) {
+  return {{"event", "saving"},    {"identifier", event.identifier}, {"name", event.name},
+          {"bytes", event.bytes}, {"number", event.number},         {"count", event.count}};
+}
+
+Json jsonOf(const ApplicationSaved& event) {
+  return withFailure({{"event", "saved"}, {"identifier", event.identifier}, {"name", event.name}},
+                     event.failure);
+}
+
 Json jsonOf(const PlaceholderStands& event) {
   return {{"event", "placeholder"},
           {"identifier", event.identifier},
@@ -110,11 +120,16 @@ Json jsonOf(const Summary& event) {
           {"skipped", reasons(event.skipped)}};
 }
 
+Json jsonOf(const BackupSummary& event) {
+  return {{"event", "summary"}, {"saved", event.saved}, {"failed", reasons(event.failed)}};
+}
+
 }  // namespace
 
 void JsonReporter::report(const Event& event) {
-  const bool essential =
-      std::holds_alternative<Summary>(event) || std::holds_alternative<SyncBroken>(event);
+  const bool essential = std::holds_alternative<Summary>(event) ||
+                         std::holds_alternative<BackupSummary>(event) ||
+                         std::holds_alternative<SyncBroken>(event);
   if (quiet_ && !essential) return;
   writeJsonLine(output_, std::visit([](const auto& value) { return jsonOf(value); }, event));
 }

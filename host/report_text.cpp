@@ -7,6 +7,14 @@
 #include "host/text.h"
 
 namespace appsync::host {
+namespace {
+
+/// Adds "3 installed" and the like.
+void addCount(std::string& counts, std::size_t count, std::string_view what) {
+  if (count > 0) counts += fmt::format("{}{} {}", counts.empty() ? "" : ", ", count, what);
+}
+
+}  // namespace
 
 TextReporter::TextReporter(Output& output, Output& errorOutput, const ReportOptions& options,
                            bool terminal, bool colour)
@@ -118,6 +126,19 @@ void TextReporter::tell(const DataEnded& event) {
   if (options_.verbose && !event.failure) print(Style::Dim, "data", subject(event.identifier));
 }
 
+void TextReporter::tell(const SavingProgress& event) {
+  const std::string bytes = event.bytes > 0 ? ", " + byteCount(event.bytes) : "";
+  status_.showBar("Saving " + event.name,
+                  static_cast<double>(event.number - 1) / static_cast<double>(event.count),
+                  fmt::format("{} of {}{}", event.number, event.count, bytes));
+}
+
+void TextReporter::tell(const ApplicationSaved& event) {
+  if (!options_.verbose || event.failure) return;
+  print(Style::Good, "saved",
+        fmt::format("{} ({})", printable(event.name), printable(event.identifier)));
+}
+
 void TextReporter::tell(const PlaceholderStands& event) {
   print(Style::Plain, "restored",
         fmt::format("{} as a {}placeholder", subject(event.identifier),
@@ -172,20 +193,30 @@ void TextReporter::tell(const Summary& event) {
   if (!options_.showPlan) tellCounts(event);
 }
 
+void TextReporter::tell(const BackupSummary& event) {
+  status_.clear();
+  for (const FailedEntry& entry : event.failed) {
+    printError("failed",
+               fmt::format("{}: {}", printable(entry.identifier), printable(entry.reason)));
+  }
+  if (!event.made) return print(Style::Warning, "stopped", "no backup was made");
+  std::string counts;
+  addCount(counts, event.saved.size(), "saved");
+  addCount(counts, event.failed.size(), "failed");
+  print(Style::Plain, "done", counts.empty() ? "no applications to save" : counts);
+}
+
 void TextReporter::tellCounts(const Summary& event) {
   const auto upToDate = static_cast<std::size_t>(
       std::count_if(event.skipped.begin(), event.skipped.end(),
                     [](const SkippedEntry& entry) { return entry.upToDate; }));
   std::string counts;
-  const auto add = [&](std::size_t count, std::string_view what) {
-    if (count > 0) counts += fmt::format("{}{} {}", counts.empty() ? "" : ", ", count, what);
-  };
-  add(event.installed.size(), "installed");
-  add(event.updated.size(), "updated");
-  add(event.deleted.size(), "deleted");
-  add(event.failed.size(), "failed");
-  add(event.skipped.size() - upToDate, "skipped");
-  add(upToDate, "up to date");
+  addCount(counts, event.installed.size(), "installed");
+  addCount(counts, event.updated.size(), "updated");
+  addCount(counts, event.deleted.size(), "deleted");
+  addCount(counts, event.failed.size(), "failed");
+  addCount(counts, event.skipped.size() - upToDate, "skipped");
+  addCount(counts, upToDate, "up to date");
   print(Style::Plain, "done", counts.empty() ? "nothing to do" : counts);
 }
 

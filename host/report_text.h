@@ -28,6 +28,8 @@ class TextReporter : public Reporter {
   void tell(const TransferEnded& event);
   void tell(const DataProgress& event);
   void tell(const DataEnded& event);
+  void tell(const SavingProgress& event);
+  void tell(const ApplicationSaved& event);
   void tell(const PlaceholderStands& event);
   void tell(const Notice& event);
   void tell(const InstallWaiting& event);
@@ -36,6 +38,7 @@ class TextReporter : public Reporter {
   void tell(const Interrupted& event);
   void tell(const SyncBroken& event);
   void tell(const Summary& event);
+  void tell(const BackupSummary& event);
   void tellCounts(const Summary& event);
 
   /// "word       rest", the word in the style's colour.

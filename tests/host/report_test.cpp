@@ -120,6 +120,34 @@ TEST_F(Reporting, TellsARestoreInPlainLines) {
   EXPECT_THAT(text, Not(HasSubstr("\x1b[2J")));
 }
 
+TEST_F(Reporting, TellsABackupInJson) {
+  const BackupSummary summary{{"a"}, {{"b", "damaged"}}, true};
+  EXPECT_THAT(
+      json({SavingProgress{"a", "A", 5, 1, 2}, ApplicationSaved{"a", "A", {}},
+            ApplicationSaved{"b", "B", "damaged"}, summary}),
+      ElementsAre(
+          R"({"event":"saving","identifier":"a","name":"A","bytes":5,"number":1,"count":2})",
+          R"({"event":"saved","identifier":"a","name":"A","success":true})",
+          R"({"event":"saved","identifier":"b","name":"B","success":false,"reason":"damaged"})",
+          R"({"event":"summary","saved":["a"],"failed":[{"identifier":"b","reason":"damaged"}]})"));
+}
+
+TEST_F(Reporting, TellsABackupInPlainLines) {
+  const ApplicationSaved saved{"com.a", "A\n", {}};
+  const BackupSummary summary{{"com.a", "com.c"}, {{"com.b", "damaged"}}, true};
+  EXPECT_THAT(told({}, {SavingProgress{"com.a", "A", 5, 1, 2}, saved, summary}),
+              ElementsAre("failed     com.b: damaged", "done       2 saved, 1 failed"));
+  EXPECT_THAT(told({.verbose = true}, {saved, ApplicationSaved{"com.b", "B", "damaged"}}),
+              ElementsAre("saved      A\uFFFD (com.a)"));
+  EXPECT_THAT(told({}, {BackupSummary{{}, {}, true}}),
+              ElementsAre("done       no applications to save"));
+  EXPECT_THAT(told({}, {BackupSummary{}}), ElementsAre("stopped    no backup was made"));
+  const std::string text = onTerminal({SavingProgress{"a", "A\x1b[2J", 5000, 3, 5}}, false);
+  EXPECT_THAT(text, HasSubstr("Saving A"));
+  EXPECT_THAT(text, HasSubstr(" 40%  3 of 5, 5.0 kB"));
+  EXPECT_THAT(text, Not(HasSubstr("\x1b[2J")));
+}
+
 TEST_F(Reporting, GivesTheSummaryAsPromised) {
   EXPECT_THAT(
       json({Mixed, Summary{}}),

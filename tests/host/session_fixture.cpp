@@ -24,6 +24,10 @@ std::string lineOf(const Event& event) {
           [](const TransferEnded& e) { return "sent " + e.identifier + reasonText(e.failure); },
           [](const DataProgress& e) { return "data " + e.identifier; },
           [](const DataEnded& e) { return "data-ended " + e.identifier + reasonText(e.failure); },
+          [](const SavingProgress& e) {
+            return fmt::format("saving {} {}/{} {}", e.identifier, e.number, e.count, e.bytes);
+          },
+          [](const ApplicationSaved& e) { return "saved " + e.identifier + reasonText(e.failure); },
           [](const PlaceholderStands& e) {
             return (e.demoted ? "demoted " : "placeholder ") + e.identifier + " " + e.name;
           },
@@ -34,6 +38,7 @@ std::string lineOf(const Event& event) {
           [](const Interrupted&) { return std::string("interrupted"); },
           [](const SyncBroken& e) { return "broken " + e.reason; },
           [](const Summary&) { return std::string("summary"); },
+          [](const BackupSummary&) { return std::string("backup summary"); },
       },
       event);
 }

@@ -1,0 +1,405 @@
+#include <sys/stat.h>
+
+#include <cerrno>
+
+#include "host/backup.h"
+#include "host/phone.h"
+#include "tests/host/session_fixture.h"
+#include "tests/test_pch.h"
+
+namespace appsync::host {
+namespace {
+
+namespace fs = std::filesystem;
+using Dictionary = PropertyList::Dictionary;
+using Lines = std::vector<std::string>;
+using testing::appInfo;
+using ::testing::Contains;
+using ::testing::ElementsAre;
+using ::testing::EndsWith;
+using testing::Folder;
+using testing::RecordingClient;
+using testing::RecordingReporter;
+
+/// A client whose preparation a test can give something to do.
+class PreparingClient : public RecordingClient {
+ public:
+  using RecordingClient::RecordingClient;
+  void prepareForBackup() noexcept override {
+    if (onPrepare) onPrepare();
+  }
+  std::function<void()> onPrepare;
+};
+
+/// Backups of a fake phone in a real folder.
+class BackupRunTest : public ::testing::Test {
+ protected:
+  BackupRunTest() { phone_.homeScreen.setOrder({"com.b", "com.a"}); }
+
+  BackupPhone backupPhone() {
+    return {phone_.platform(),
+            [this](std::string_view identifier, const device::EmbeddedDevice::DataSink& sink,
+                   std::optional<Error>* error) { return giveData(identifier, sink, error); },
+            [this](std::string_view identifier) {
+              const auto blob = blobs_.find(identifier);
+              return blob == blobs_.end() ? std::nullopt : std::optional(toBytes(blob->second));
+            },
+            [this](std::string_view identifier) { return isBusyWith_ && isBusyWith_(identifier); }};
+  }
+
+  bool giveData(std::string_view identifier, const device::EmbeddedDevice::DataSink& sink,
+                std::optional<Error>* error) {
+    const auto found = data_.find(identifier);
+    const std::string_view data = found == data_.end() ? "" : std::string_view(found->second);
+    for (std::size_t begin = 0; begin < data.size(); begin += 1000) {
+      if (onPiece_) onPiece_(begin);
+      if (sink(asBytes(data.substr(begin, 1000)))) continue;
+      setError(error, Error::posix(ECANCELED));
+      return false;
+    }
+    const auto failure = dataFailures_.find(identifier);
+    if (failure == dataFailures_.end()) return true;
+    setError(error, failure->second);
+    return false;
+  }
+
+  BackupSummary backUp() {
+    std::string problem;
+    const auto writer = BackupWriter::open(target_, problem);
+    EXPECT_TRUE(writer) << problem;
+    const BackupPhone phone = backupPhone();
+    return BackupRun(client_, phone, *writer, reporter_, interruption_).run();
+  }
+
+  void expectMade(const BackupSummary& summary) {
+    EXPECT_TRUE(summary.made);
+    EXPECT_EQ(summary.failed.size(), 0u);
+  }
+
+  Backup saved() {
+    std::string problem;
+    auto backup = readBackup(target_, problem);
+    EXPECT_TRUE(backup) << problem;
+    return backup ? std::move(*backup) : Backup();
+  }
+
+  static Dictionary dictionaryOf(ByteView bytes) {
+    const auto list = parsePropertyList(bytes);
+    EXPECT_TRUE(list && list->asDictionary());
+    return list && list->asDictionary() ? *list->asDictionary() : Dictionary();
+  }
+
+  Dictionary entries() { return dictionaryOf(saved().applications); }
+
+  /// A value of an application's entry as text; "none" when there is none.
+  std::string valueOf(const char* identifier, const char* key) {
+    const Dictionary list = entries();
+    const PropertyList* entry = find(list, identifier);
+    const PropertyList* value = entry ? entry->find(key) : nullptr;
+    return value && value->asData() ? std::string(asText(*value->asData())) : "none";
+  }
+
+  Dictionary metadataOf(const char* identifier) {
+    return dictionaryOf(asBytes(valueOf(identifier, "HalvoMetadata")));
+  }
+
+  Dictionary demotions() { return dictionaryOf(saved().demotions); }
+
+  std::string containerOf(const char* identifier) {
+    const auto record = phone_.appRegistry.recordForIdentifier(identifier, false);
+    return record ? *record->bundleContainerPath : "";
+  }
+
+  void putMetadata(const char* identifier, std::string_view text) {
+    phone_.files.putFile(containerOf(identifier) + "/HalvoMetadata.plist", text);
+  }
+
+  static std::string xml(const Dictionary& dictionary) { return testing::xmlText(dictionary); }
+
+  fakes::FakePlatform phone_;
+  Interruption interruption_;
+  HostProcess host_{SyncHostBundleIdentifier, "com.corvane.twc.AppsClient", interruption_};
+  PreparingClient client_{phone_, host_};
+  RecordingReporter reporter_;
+  Folder folder_;
+  const fs::path target_ = folder_ / "backup";
+  std::map<std::string, std::string, std::less<>> data_;
+  std::map<std::string, std::string, std::less<>> blobs_;
+  std::map<std::string, Error, std::less<>> dataFailures_;
+  std::function<bool(std::string_view)> isBusyWith_;
+  std::function<void(std::size_t)> onPiece_;
+};
+
+TEST_F(BackupRunTest, SavesEveryApplicationOfTheUserAndTheHomeScreen) {
+  phone_.appRegistry.seedInstalled("com.b");
+  phone_.appRegistry.seedPlaceholder("com.a", InstallType::Restore);
+  AppRecord system;
+  system.applicationIdentifier = "com.system";
+  system.applicationType = ApplicationTypeSystem;
+  phone_.appRegistry.seedInstalled(system);
+  data_["com.b"] = std::string(2500, 'd');
+
+  const BackupSummary summary = backUp();
+  expectMade(summary);
+  EXPECT_EQ(summary.saved, (Lines{"com.a", "com.b"}));
+  EXPECT_EQ(reporter_.lines(),
+            (Lines{"saving com.a 1/2 0", "saved com.a", "saving com.b 2/2 0", "saved com.b"}));
+  const Backup backup = saved();
+  EXPECT_EQ(entries().size(), 2u);
+  ASSERT_EQ(backup.data.size(), 1u) << "empty data has no archive";
+  EXPECT_EQ(testing::fileText(backup.data.at("com.b").path), data_["com.b"]);
+  EXPECT_EQ(parsePropertyList(backup.iconLayout),
+            PropertyList(PropertyList::Array{"com.b", "com.a"}));
+}
+
+TEST_F(BackupRunTest, APhoneWithoutApplicationsGivesAnEmptyBackup) {
+  expectMade(backUp());
+  EXPECT_EQ(entries().size(), 0u);
+}
+
+TEST_F(BackupRunTest, TellsProgressOfLargeData) {
+  phone_.appRegistry.seedInstalled("com.a");
+  data_["com.a"] = std::string(2'500'000, 'd');
+  expectMade(backUp());
+  EXPECT_EQ(reporter_.lines("saving"),
+            (Lines{"saving com.a 1/1 0", "saving com.a 1/1 1049000", "saving com.a 1/1 2098000"}));
+}
+
+TEST_F(BackupRunTest, PreparesTheClientBeforeAnythingIsRead) {
+  phone_.appRegistry.seedInstalled("com.a");
+  const std::string prepared = xml({{"bundleVersion", "7"}, {"title", "Prepared"}});
+  client_.onPrepare = [&] { putMetadata("com.a", prepared); };
+  expectMade(backUp());
+  EXPECT_EQ(valueOf("com.a", "HalvoMetadata"), prepared);
+}
+
+TEST_F(BackupRunTest, MetadataThatTellsVersionAndNameIsSavedAsItStands) {
+  for (const char* name : {"title", "itemName"}) {
+    phone_.appRegistry.seedInstalled("com.a", "2.0");
+    const std::string stored = "  " + xml({{"bundleVersion", "1.0"}, {name, "Name"}, {"x", 1}});
+    putMetadata("com.a", stored.substr(2) + "\n\n");
+    expectMade(backUp());
+    EXPECT_EQ(valueOf("com.a", "HalvoMetadata"), stored.substr(2) + "\n\n");
+  }
+}
+
+TEST_F(BackupRunTest, MetadataThatLacksThemIsCompletedFromTheRegistry) {
+  AppRecord record;
+  record.applicationIdentifier = "com.a";
+  record.bundleVersion = "2.0";
+  record.displayName = "Shown";
+  const Dictionary whole{{"bundleVersion", "2.0"}, {"title", "Shown"}};
+  const std::pair<const char*, Dictionary> cases[] = {
+      {"", whole},
+      {"no property list", whole},
+      {"<plist version=\"1.0\"><array/></plist>", whole},
+      {"<plist version=\"1.0\"><dict><key>x</key><true/></dict></plist>",
+       {{"bundleVersion", "2.0"}, {"title", "Shown"}, {"x", true}}},
+      {"<plist version=\"1.0\"><dict><key>bundleVersion</key><string>1.0</string></dict></plist>",
+       {{"bundleVersion", "1.0"}, {"title", "Shown"}}},
+      {"<plist version=\"1.0\"><dict><key>itemName</key><string>Item</string></dict></plist>",
+       {{"bundleVersion", "2.0"}, {"itemName", "Item"}}},
+      {"<plist version=\"1.0\"><dict><key>bundleVersion</key><array/>"
+       "<key>title</key><integer>5</integer></dict></plist>",
+       whole},
+  };
+  for (const auto& [stored, expected] : cases) {
+    phone_.appRegistry.seedInstalled(record);
+    putMetadata("com.a", stored);
+    expectMade(backUp());
+    EXPECT_EQ(metadataOf("com.a"), expected) << stored;
+  }
+  phone_.files.erase(containerOf("com.a") + "/HalvoMetadata.plist");
+  expectMade(backUp());
+  EXPECT_EQ(metadataOf("com.a"), whole);
+}
+
+TEST_F(BackupRunTest, AnApplicationThatTellsNothingOfItselfStillComesBack) {
+  AppRecord record;
+  record.applicationIdentifier = "com.a";
+  phone_.appRegistry.seedInstalled(record);
+  expectMade(backUp());
+  EXPECT_EQ(metadataOf("com.a"), (Dictionary{{"bundleVersion", "0"}, {"title", "com.a"}}));
+}
+
+TEST_F(BackupRunTest, SavesTheOpaqueBlobWhereThereIsOne) {
+  phone_.appRegistry.seedInstalled("com.a");
+  phone_.appRegistry.seedInstalled("com.b");
+  blobs_["com.a"] = "blob";
+  expectMade(backUp());
+  EXPECT_EQ(valueOf("com.a", "ApplicationSINF"), "blob");
+  EXPECT_EQ(valueOf("com.b", "ApplicationSINF"), "none");
+}
+
+TEST_F(BackupRunTest, SavesThePlaceholdersIconAsItIsAndDrawsThatOfAnInstalledApplication) {
+  for (const char* identifier : {"com.drawn", "com.bare"}) {
+    phone_.appRegistry.seedInstalled(identifier);
+  }
+  for (const char* identifier : {"com.placeholder", "com.iconless"}) {
+    phone_.appRegistry.seedPlaceholder(identifier, InstallType::Restore);
+  }
+  const auto bundleOf = [&](const char* identifier) {
+    return *phone_.appRegistry.recordForIdentifier(identifier, false)->bundlePath;
+  };
+  Dictionary info = appInfo("com.drawn", "1.0", "Drawn");
+  info["KBBundleIconFile"] = "icon.png";
+  phone_.files.putPlist(bundleOf("com.drawn") + "/Info.plist", info);
+  phone_.files.putFile(bundleOf("com.drawn") + "/icon.png", "source");
+  phone_.files.putFile(bundleOf("com.placeholder") + "/Icon.png", "any bytes");
+  expectMade(backUp());
+  EXPECT_EQ(valueOf("com.drawn", "PlaceholderIcon"), "public.png 2x2");
+  EXPECT_EQ(valueOf("com.bare", "PlaceholderIcon"), "none");
+  EXPECT_EQ(valueOf("com.placeholder", "PlaceholderIcon"), "any bytes");
+  EXPECT_EQ(valueOf("com.iconless", "PlaceholderIcon"), "none");
+
+  phone_.imageEncoders.failFinalize(true);
+  expectMade(backUp());
+  EXPECT_EQ(valueOf("com.drawn", "PlaceholderIcon"), "none");
+  phone_.imageEncoders.failCreate(true);
+  expectMade(backUp());
+}
+
+TEST_F(BackupRunTest, AnUpdateUnderWaySavesTheInstalledVersion) {
+  phone_.appRegistry.seedInstalled("com.a", "1.0");
+  phone_.appRegistry.seedPlaceholder("com.a", InstallType::Sync, "2.0");
+  expectMade(backUp());
+  EXPECT_EQ(metadataOf("com.a").at("bundleVersion"), PropertyList("1.0"));
+}
+
+TEST_F(BackupRunTest, WhatABrokenOffSyncLeftIsNotSaved) {
+  phone_.appRegistry.seedPlaceholder("com.a", InstallType::Sync);
+  const BackupSummary summary = backUp();
+  expectMade(summary);
+  EXPECT_EQ(summary.saved, Lines());
+}
+
+TEST_F(BackupRunTest, SavesWhichApplicationsAreDemotedAndByWhat) {
+  auto& registry = phone_.appRegistry;
+  registry.seedPlaceholder("com.automatic", InstallType::Downgrade);
+  registry.seedPlaceholder("com.intentional", InstallType::IntentionalDowngrade);
+  registry.seedPlaceholder("com.listed", InstallType::Restore);
+  registry.seedPlaceholder("com.asked-for", InstallType::StoreDownload);
+  registry.seedPlaceholder("com.coming", InstallType::Restore);
+  registry.seedInstalled("com.back");
+  phone_.files.putPlist(
+      exchange::DemotedApplications,
+      Dictionary{{"AutomaticDowngrades", PropertyList::Array{"com.gone", "com.listed", 5}},
+                 {"IntentionalDowngrades",
+                  PropertyList::Array{"com.listed", "com.back", "com.asked-for"}}});
+  expectMade(backUp());
+  EXPECT_EQ(demotions(),
+            (Dictionary{
+                {"AutomaticDowngrades", PropertyList::Array{"com.automatic", "com.listed"}},
+                {"IntentionalDowngrades", PropertyList::Array{"com.intentional", "com.listed"}}}));
+}
+
+TEST_F(BackupRunTest, ADemotedApplicationsFileOfAnyOtherFormIsNone) {
+  phone_.appRegistry.seedPlaceholder("com.a", InstallType::Downgrade);
+  const Dictionary expected{{"AutomaticDowngrades", PropertyList::Array{"com.a"}},
+                            {"IntentionalDowngrades", PropertyList::Array{}}};
+  phone_.files.putFile(exchange::DemotedApplications, "nonsense");
+  expectMade(backUp());
+  EXPECT_EQ(demotions(), expected);
+  phone_.files.putPlist(exchange::DemotedApplications,
+                        Dictionary{{"AutomaticDowngrades", "com.a"}, {"Other", 1}});
+  expectMade(backUp());
+  EXPECT_EQ(demotions(), expected);
+}
+
+TEST_F(BackupRunTest, AnApplicationWhoseDataCannotBeReadFailsAlone) {
+  for (const char* identifier : {"com.a", "com.b", "com.c"}) {
+    phone_.appRegistry.seedInstalled(identifier);
+    data_[identifier] = std::string(5000, 'd');
+  }
+  dataFailures_["com.b"] = Error::posix(EACCES, "notes.txt");
+  const BackupSummary summary = backUp();
+  EXPECT_TRUE(summary.made);
+  EXPECT_EQ(summary.saved, (Lines{"com.a", "com.c"}));
+  ASSERT_EQ(summary.failed.size(), 1u);
+  EXPECT_EQ(summary.failed[0].identifier, "com.b");
+  EXPECT_EQ(summary.failed[0].reason, "its data cannot be saved: notes.txt: Permission denied");
+  EXPECT_FALSE(entries().contains("com.b"));
+  EXPECT_FALSE(fs::exists(target_ / "Data/com.b.tar"));
+  EXPECT_THAT(reporter_.lines(), Contains("saved com.b failed: " + summary.failed[0].reason));
+}
+
+TEST_F(BackupRunTest, AnApplicationWhoseMetadataCannotBeReadFailsAlone) {
+  phone_.appRegistry.seedPlaceholder("com.a", InstallType::Downgrade);
+  phone_.appRegistry.seedInstalled("com.b");
+  phone_.faults.failWhere("FileManager.contentsAtPath", "com.a/HalvoMetadata.plist",
+                          Error::posix(EIO));
+  const BackupSummary summary = backUp();
+  EXPECT_TRUE(summary.made);
+  EXPECT_EQ(summary.saved, (Lines{"com.b"}));
+  ASSERT_EQ(summary.failed.size(), 1u);
+  EXPECT_EQ(summary.failed[0].reason, "its metadata cannot be read: Input/output error");
+  EXPECT_EQ(demotions().at("AutomaticDowngrades"), PropertyList(PropertyList::Array{}));
+}
+
+TEST_F(BackupRunTest, AHomeScreenThatDoesNotAnswerEndsTheBackup) {
+  phone_.appRegistry.seedInstalled("com.a");
+  phone_.homeScreen.setFlattenedIconState(std::nullopt);
+  const BackupSummary summary = backUp();
+  EXPECT_FALSE(summary.made);
+  EXPECT_EQ(summary.saved, Lines());
+  EXPECT_THAT(reporter_.lines(), Contains("broken the home screen does not tell its layout"));
+  EXPECT_FALSE(fs::exists(target_));
+}
+
+TEST_F(BackupRunTest, AnUnwritableTargetEndsTheBackupAndLeavesTheOlderOne) {
+  phone_.appRegistry.seedInstalled("com.a");
+  expectMade(backUp());
+  phone_.appRegistry.seedInstalled("com.b");
+  data_["com.a"] = std::string(5000, 'd');
+  onPiece_ = [&](std::size_t) {  // somebody takes the folder away
+    for (const auto& item : fs::directory_iterator(folder_.path())) {
+      if (item.path().filename() != "backup") fs::remove_all(item);
+    }
+  };
+  const BackupSummary summary = backUp();
+  EXPECT_FALSE(summary.made);
+  EXPECT_EQ(summary.saved, Lines());
+  EXPECT_THAT(reporter_.lines("broken"), ElementsAre(EndsWith("No such file or directory")));
+  EXPECT_EQ(entries().size(), 1u);
+}
+
+TEST_F(BackupRunTest, AnInterruptionLeavesTheOlderBackup) {
+  phone_.appRegistry.seedInstalled("com.a");
+  expectMade(backUp());
+  phone_.appRegistry.seedInstalled("com.b");
+  data_["com.a"] = std::string(5000, 'd');
+  onPiece_ = [&](std::size_t offset) {
+    if (offset == 2000) interruption_.request();
+  };
+  const BackupSummary summary = backUp();
+  EXPECT_FALSE(summary.made);
+  EXPECT_EQ(summary.saved, Lines());
+  EXPECT_EQ(summary.failed.size(), 0u);
+  EXPECT_THAT(reporter_.lines(), Contains("interrupted"));
+  EXPECT_EQ(entries().size(), 1u);
+}
+
+TEST_F(BackupRunTest, WaitsForWhatThePhoneIsBusyWith) {
+  phone_.appRegistry.seedPlaceholder("com.a", InstallType::Sync);
+  phone_.appRegistry.seedInstalled("com.b");
+  int asked = 0;
+  isBusyWith_ = [&](std::string_view identifier) {
+    if (identifier != "com.b" || ++asked < 3) return identifier == "com.b";
+    phone_.appRegistry.seedInstalled("com.a");
+    return false;
+  };
+  EXPECT_EQ(backUp().saved, (Lines{"com.a", "com.b"}));
+  EXPECT_EQ(asked, 3);
+}
+
+TEST_F(BackupRunTest, AnInterruptionEndsTheWaiting) {
+  phone_.appRegistry.seedInstalled("com.a");
+  isBusyWith_ = [&](std::string_view) {
+    interruption_.request();
+    return true;
+  };
+  EXPECT_FALSE(backUp().made);
+}
+
+}  // namespace
+}  // namespace appsync::host
