@@ -7,6 +7,16 @@
 
 namespace appsync::host {
 
+void claimDownloads(AppRegistry& apps) {
+  for (const auto& item : applicationsPresent(apps).placeholders) {
+    const AppRecord& record = item.second;
+    if (record.installType != InstallType::StoreDownload) continue;
+    if (const auto progress = apps.installProgressSync(record)) {
+      progress->setInstallState(InstallState::Active);
+    }
+  }
+}
+
 void Store::deliver(const std::set<std::string>& except) {
   takeOrders(except);
   send();

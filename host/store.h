@@ -14,6 +14,11 @@
 
 namespace appsync::host {
 
+/// Shows the store's downloads as under way, which they are once a person has asked for them: the
+/// client asks the host for the package of every other placeholder, and takes it away when the host
+/// has none.
+void claimDownloads(AppRegistry& apps);
+
 /// The store: brings the packages of applications that have only a placeholder, from a catalogue.
 ///
 /// Packages that install coordinators expect of it go to them. Every other one goes to the registry

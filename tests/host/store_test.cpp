@@ -224,5 +224,15 @@ TEST_F(StoreTest, TellsWhyAPackageCouldNotBeSent) {
   EXPECT_EQ(phone.appRegistry.progress("com.a")->installState(), InstallState::Paused);
 }
 
+TEST_F(StoreTest, ClaimsOnlyWhatWasAskedForOfIt) {
+  seedRestoring("com.asked", InstallType::StoreDownload);
+  seedRestoring("com.b");
+  seedRestoring("com.without-progress", InstallType::StoreDownload);
+  phone.appRegistry.dropProgress("com.without-progress");
+  claimDownloads(phone.appRegistry);
+  EXPECT_EQ(phone.appRegistry.progress("com.asked")->installState(), InstallState::Active);
+  EXPECT_EQ(phone.appRegistry.progress("com.b")->installState(), InstallState::Waiting);
+}
+
 }  // namespace
 }  // namespace appsync::host
