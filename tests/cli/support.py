@@ -22,6 +22,8 @@ EVENTS = {
     "transfer-ended": {"identifier": str, "success": bool},
     "data": {"identifier": str, "name": str, "done": int, "total": int},
     "data-ended": {"identifier": str, "success": bool},
+    "saving": {"identifier": str, "name": str, "bytes": int, "number": int, "count": int},
+    "saved": {"identifier": str, "name": str, "success": bool},
     "placeholder": {"identifier": str, "name": str, "demoted": bool},
     "notice": {"message": str},
     "waiting": {"identifier": str, "retrySeconds": int, "message": str},
@@ -31,6 +33,7 @@ EVENTS = {
     "error": {"message": str},
     "summary": {"installed": list, "updated": list, "deleted": list, "failed": list,
                 "skipped": list},
+    "backup-summary": {"saved": list, "failed": list},
 }
 
 
@@ -83,9 +86,10 @@ class Case(unittest.TestCase):
         self.assertEqual(err, "")
         return [json.loads(line) for line in out.splitlines()]
 
-    def check_events(self, events):
+    def check_events(self, events, summary="summary"):
+        """`summary` names what the last event must hold."""
         for event in events:
-            expected = EVENTS[event["event"]]
+            expected = EVENTS[summary if event["event"] == "summary" else event["event"]]
             for key, kind in expected.items():
                 self.assertIsInstance(event[key], kind, event)
             allowed = {"event", *expected}
