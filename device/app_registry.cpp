@@ -5,6 +5,7 @@
 #include <cerrno>
 
 #include "device/application_rows.h"
+#include "device/demotion.h"
 #include "device/identifiers.h"
 #include "device/installers.h"
 #include "device/installs.h"
@@ -168,6 +169,13 @@ bool DeviceAppRegistry::removeApplication(std::string_view bundleId,
     return removeForPerson(core_, identifier, reason);
   };
   return changeApplication(bundleId, remove, error);
+}
+
+bool DeviceAppRegistry::demote(std::string_view bundleId, std::optional<Error>* error) noexcept {
+  const auto demote = [&](const std::string& identifier, std::optional<Error>* reason) {
+    return demoteForPerson(core_, identifier, reason);
+  };
+  return changeApplication(bundleId, demote, error);
 }
 
 bool DeviceAppRegistry::askForDemoted(std::string_view bundleId) noexcept {

@@ -28,6 +28,8 @@ class DeviceAppRegistry final : public AppRegistry {
 
   /// What a person does: the application goes with its placeholder and data.
   bool removeApplication(std::string_view bundleId, std::optional<Error>* error) noexcept;
+  /// What a person does: only the application's placeholder and data stay.
+  bool demote(std::string_view bundleId, std::optional<Error>* error) noexcept;
   /// What a person does: a demoted application is to come back. Its placeholder becomes that of a
   /// download from the store. False when there is no such placeholder.
   bool askForDemoted(std::string_view bundleId) noexcept;

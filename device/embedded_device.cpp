@@ -157,6 +157,10 @@ class FolderDevice final : public EmbeddedDevice {
     return removed;
   }
 
+  bool demote(std::string_view bundleId, std::optional<Error>* error) noexcept override {
+    return registry_.demote(bundleId, error);
+  }
+
   bool setPolicy(PolicySetting setting, PolicyValue value,
                  std::optional<Error>* error) noexcept override {
     return policy_.set(setting, value, error);

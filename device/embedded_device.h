@@ -136,6 +136,10 @@ class EmbeddedDevice {
   /// Removes an application with its placeholder and data. False (with a reason) when there is
   /// none.
   virtual bool uninstall(std::string_view bundleId, std::optional<Error>* error) noexcept = 0;
+  /// Takes an application's package away; its data and a placeholder of
+  /// InstallType::IntentionalDowngrade stay. False (with a reason) when it is not installed, is
+  /// open, is being updated or belongs to the system.
+  virtual bool demote(std::string_view bundleId, std::optional<Error>* error) noexcept = 0;
   virtual bool setPolicy(PolicySetting setting, PolicyValue value,
                          std::optional<Error>* error) noexcept = 0;
 

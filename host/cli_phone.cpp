@@ -48,6 +48,15 @@ ExitCode runUninstall(const std::string& identifier, CommandContext& context) {
   return ExitCode::Done;
 }
 
+ExitCode runDemote(const std::string& identifier, CommandContext& context) {
+  const auto device = context.openDevice(device::Access::Write);
+  std::optional<Error> error;
+  if (!device->demote(identifier, &error)) fail("demote", identifier, error);
+  say(context, {{"event", "demoted"}, {"identifier", identifier}},
+      fmt::format("Demoted {}: its placeholder and data stay.", printable(identifier)));
+  return ExitCode::Done;
+}
+
 /// What a person can do while another process writes the device: EmbeddedDevice::launch and others.
 using Gesture = bool (*)(const std::filesystem::path&, std::string_view, device::DeviceError&,
                          std::optional<Error>*);
@@ -145,6 +154,8 @@ void addPhoneCommands(CLI::App& app, Command& chosen) {
 
   addIdentifierCommand(app, chosen, "uninstall", "Uninstall an application, as a person would",
                        &runUninstall);
+  addIdentifierCommand(app, chosen, "demote",
+                       "Keep only the placeholder and the data of an application", &runDemote);
   addIdentifierCommand(app, chosen, "launch", "Open an application on the phone", &runLaunch);
   addIdentifierCommand(app, chosen, "quit", "Close an application on the phone", &runQuit);
   addIdentifierCommand(app, chosen, "tap", "Tap a placeholder: have its application come next",

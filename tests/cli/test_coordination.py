@@ -91,6 +91,25 @@ class TapAndCancel(support.Case):
                       self.run_appsync("cancel", "com.a-big", code=1)[1])
 
 
+class Demotion(support.Case):
+    def check_demoted_application(self, *options):
+        self.init(*options)
+        self.offer("com.a")
+        self.sync()
+        self.assertEqual(self.json_lines("demote", "com.a"),
+                         [{"event": "demoted", "identifier": "com.a"}])
+        self.assertEqual(self.apps(), {"com.a?": "1.0"})
+        self.assertEqual(self.json_lines("tap", "com.a"),
+                         [{"event": "tapped", "identifier": "com.a"}])
+        self.run_appsync("demote", "com.a", code=1)
+
+    def test_a_demoted_application_can_be_asked_for(self):
+        self.check_demoted_application()
+
+    def test_a_demoted_application_can_be_asked_for_where_installs_are_coordinated(self):
+        self.check_demoted_application("--coordination", "on")
+
+
 class Refusals(support.Case):
     def check_refused(self, identifier):
         for command in ("tap", "cancel"):

@@ -103,7 +103,7 @@ class Usage(support.Case):
 
     def test_applications_that_are_not_there(self):
         self.init()
-        for command in ("uninstall", "launch"):
+        for command in ("uninstall", "launch", "demote"):
             self.assertIn("com.absent", self.one_line(command, "com.absent", code=1))
         self.run_appsync("quit", "com.absent")
 
