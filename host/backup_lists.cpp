@@ -19,11 +19,6 @@ constexpr const char* IntentionalKey = "IntentionalDowngrades";
 /// Of an application that tells none itself: without any it could not come back.
 constexpr const char* UnknownVersion = "0";
 
-bool describes(const PropertyList::Dictionary& metadata) {
-  return findString(metadata, "bundleVersion") &&
-         (findString(metadata, "title") || findString(metadata, "itemName"));
-}
-
 void complete(PropertyList::Dictionary& metadata, const AppRecord& record) {
   if (!findString(metadata, "bundleVersion")) {
     metadata["bundleVersion"] = record.bundleVersion.value_or(UnknownVersion);
@@ -34,7 +29,8 @@ void complete(PropertyList::Dictionary& metadata, const AppRecord& record) {
   }
 }
 
-/// The file as it stands, if a phone can make a placeholder of it; else completed.
+/// Completed, if need be, so that a phone can make a placeholder of it; and always written in the
+/// same way, since a phone that coordinates installs does not keep the file's own bytes.
 std::optional<Bytes> metadataOf(FileManager& files, const AppRecord& record, std::string& problem) {
   std::optional<Error> error = Error::posix(ENOENT);
   std::optional<Bytes> bytes;
@@ -48,10 +44,9 @@ std::optional<Bytes> metadataOf(FileManager& files, const AppRecord& record, std
   }
   const auto parsed = bytes ? parsePropertyList(*bytes) : std::nullopt;
   const PropertyList::Dictionary* stored = parsed ? parsed->asDictionary() : nullptr;
-  if (stored && describes(*stored)) return bytes;
   PropertyList::Dictionary metadata = stored ? *stored : PropertyList::Dictionary();
   complete(metadata, record);
-  bytes = serializePropertyList(std::move(metadata), PropertyListFormat::Xml, &error);
+  bytes = serializePropertyList(std::move(metadata), PropertyListFormat::Binary, &error);
   if (!bytes) problem = "its metadata cannot be written: " + error->localizedDescription();
   return bytes;
 }

@@ -119,9 +119,8 @@ class Backups(BackupCase):
         self.backup()
         del metadata["is-auto-download"]
         self.assertEqual(self.metadata("com.a"), metadata)
-        self.assertEqual(
-            self.list()["com.a"]["HalvoMetadata"],
-            (self.container("com.a") / "HalvoMetadata.plist").read_bytes())
+        prepared = (self.container("com.a") / "HalvoMetadata.plist").read_bytes()
+        self.assertEqual(plistlib.loads(prepared), metadata)
 
     def test_no_file_of_the_phone_changes(self):
         self.fill()

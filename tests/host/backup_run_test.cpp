@@ -167,19 +167,24 @@ TEST_F(BackupRunTest, TellsProgressOfLargeData) {
 
 TEST_F(BackupRunTest, PreparesTheClientBeforeAnythingIsRead) {
   phone_.appRegistry.seedInstalled("com.a");
-  const std::string prepared = xml({{"bundleVersion", "7"}, {"title", "Prepared"}});
-  client_.onPrepare = [&] { putMetadata("com.a", prepared); };
+  const Dictionary prepared{{"bundleVersion", "7"}, {"title", "Prepared"}};
+  client_.onPrepare = [&] { putMetadata("com.a", xml(prepared)); };
   expectMade(backUp());
-  EXPECT_EQ(valueOf("com.a", "HalvoMetadata"), prepared);
+  EXPECT_EQ(metadataOf("com.a"), prepared);
 }
 
-TEST_F(BackupRunTest, MetadataThatTellsVersionAndNameIsSavedAsItStands) {
+TEST_F(BackupRunTest, MetadataThatTellsVersionAndNameIsSavedWhateverItsFormatWas) {
   for (const char* name : {"title", "itemName"}) {
     phone_.appRegistry.seedInstalled("com.a", "2.0");
-    const std::string stored = "  " + xml({{"bundleVersion", "1.0"}, {name, "Name"}, {"x", 1}});
-    putMetadata("com.a", stored.substr(2) + "\n\n");
-    expectMade(backUp());
-    EXPECT_EQ(valueOf("com.a", "HalvoMetadata"), stored.substr(2) + "\n\n");
+    const Dictionary stored{{"bundleVersion", "1.0"}, {name, "Name"}, {"x", 1}};
+    std::set<std::string> saved;
+    for (const auto format : {PropertyListFormat::Xml, PropertyListFormat::Binary}) {
+      putMetadata("com.a", asText(serializePropertyList(stored, format).value()));
+      expectMade(backUp());
+      EXPECT_EQ(metadataOf("com.a"), stored);
+      saved.insert(valueOf("com.a", "HalvoMetadata"));
+    }
+    EXPECT_EQ(saved.size(), 1U);
   }
 }
 
