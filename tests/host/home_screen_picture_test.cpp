@@ -89,7 +89,7 @@ Image part(const Image& image, const Box& box) {
   return result;
 }
 
-/// What stands in the place of each icon, without its name.
+/// What stands in the place of each icon, without the corners that show the background.
 std::vector<Image> drawIcons(const std::vector<ScreenIcon>& icons) {
   const auto colour = [](std::size_t i) { return Pixel{int(i) * 10 + 3, 250, 7, 255}; };
   std::vector<ScreenIcon> places;
@@ -103,7 +103,10 @@ std::vector<Image> drawIcons(const std::vector<ScreenIcon>& icons) {
     if (pixel[1] == 250 && pixel[2] == 7) boxes[pixel].add(x, y);
   });
   std::vector<Image> images;
-  for (std::size_t i = 0; i < icons.size(); ++i) images.push_back(part(drawn, boxes.at(colour(i))));
+  for (std::size_t i = 0; i < icons.size(); ++i) {
+    const Box& box = boxes.at(colour(i));
+    images.push_back(part(drawn, {box.left + 10, box.top + 10, box.right - 10, box.bottom - 10}));
+  }
   return images;
 }
 
@@ -119,8 +122,9 @@ std::vector<Bytes> drawTiles(const std::vector<std::string>& names) {
 }
 
 int brightness(const Pixel& pixel) { return pixel[0] + pixel[1] + pixel[2]; }
-int colourfulness(const Pixel& pixel) {
-  return std::max({pixel[0], pixel[1], pixel[2]}) - std::min({pixel[0], pixel[1], pixel[2]});
+double saturation(const Pixel& pixel) {
+  const double greatest = std::max({pixel[0], pixel[1], pixel[2]});
+  return (greatest - std::min({pixel[0], pixel[1], pixel[2]})) / greatest;
 }
 
 std::size_t whitePixels(const Image& image) {
@@ -162,10 +166,10 @@ TEST(HomeScreenPicture, APlaceholderIsDarkerAndGreyerThanTheInstalledApplication
   const auto drawn = drawIcons({icon(Red), icon(Red, State::Waiting), icon(Red, State::Loading),
                                 icon(Red, State::Paused), icon(Red, State::Away)});
   for (std::size_t i = 1; i < drawn.size(); ++i) {
-    for (const std::uint32_t x : {12u, 60u, 108u}) {
-      const Pixel before = at(drawn[0], x, 12), after = at(drawn[i], x, 12);
-      EXPECT_LT(brightness(after), brightness(before));
-      EXPECT_LT(colourfulness(after), colourfulness(before));
+    for (const std::uint32_t x : {2u, 50u, 98u}) {
+      const Pixel before = at(drawn[0], x, 2), after = at(drawn[i], x, 2);
+      EXPECT_LT(brightness(after), brightness(before) * 2 / 3);
+      EXPECT_LT(saturation(after), saturation(before) * 0.8);
     }
   }
 }
@@ -232,6 +236,16 @@ TEST(HomeScreenPicture, TheNameStandsUnderItsIcon) {
   EXPECT_GE(name.top, above.bottom);
   EXPECT_LT(name.bottom, icons.bottom);
   EXPECT_NEAR(double(name.left + name.right), double(above.left + above.right), 6) << "centred";
+}
+
+TEST(HomeScreenPicture, ALongNameIsCutWithAnEllipsis) {
+  const auto named = [](const char* name) {
+    return draw({{name, plain(Red), State::Installed, 0}}).pixels;
+  };
+  const Bytes cut = named("Stillwater Recordings");
+  EXPECT_EQ(cut, named("Stillwater Recordings Professional"));
+  EXPECT_NE(cut, named("Stillwater"));
+  EXPECT_NE(cut, named("Stillwater Re"));
 }
 
 TEST(HomeScreenPicture, NoNameLeavesItsCell) {
