@@ -2,9 +2,11 @@
 // sanitizer's build that links them.
 #define SANITIZER_HOOK extern "C" [[gnu::visibility("default")]] const char*
 
+// NOLINTBEGIN(bugprone-reserved-identifier): the sanitizers name them
 SANITIZER_HOOK __lsan_default_suppressions();
 SANITIZER_HOOK __lsan_default_options();
 SANITIZER_HOOK __tsan_default_suppressions();
+// NOLINTEND(bugprone-reserved-identifier)
 
 // Fontconfig's patterns refer to their parts by distances instead of pointers, so the fonts that a
 // process keeps until its end look lost.

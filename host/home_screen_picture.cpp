@@ -13,9 +13,9 @@ namespace appsync::host {
 namespace {
 
 // All lengths are in points; a picture has one or two pixels for each.
-constexpr std::size_t Columns = 4, Rows = IconsPerPage / Columns;
+constexpr std::size_t Columns = 4;
 constexpr double PageWidth = 376, PageHeight = 668, PageGap = 16, PageCorner = 30;
-constexpr double FirstCellLeft = 16, FirstIconTop = 34, CellWidth = 86, CellHeight = 97;
+constexpr double FirstIconLeft = 29, FirstIconTop = 34, CellWidth = 86, CellHeight = 97;
 constexpr double IconSide = 60, IconCorner = 0.225 * IconSide;
 constexpr double NameBaseline = IconSide + 17, DotsTop = PageHeight - 22;
 constexpr HomeScreenText::Style NameStyle{12, 79};
@@ -66,9 +66,9 @@ class Painter {
   void page(const ScreenView& view, std::size_t page, const ScreenIcon* icons, std::size_t count) {
     background();
     for (std::size_t i = 0; i < count; ++i) {
-      const Place cell(drawing_,
-                       FirstCellLeft + double(i % Columns) * CellWidth + (CellWidth - IconSide) / 2,
-                       FirstIconTop + double(i / Columns) * CellHeight);
+      const std::size_t row = i / Columns, column = i % Columns;
+      const Place place(drawing_, FirstIconLeft + double(column) * CellWidth,
+                        FirstIconTop + double(row) * CellHeight);
       icon(icons[i]);
     }
     if (view.pageCount > 1) dots(view.pageCount, page);
@@ -265,8 +265,9 @@ Image drawHomeScreen(const ScreenView& view, const std::vector<ScreenIcon>& icon
   cairo_scale(drawing.get(), scale, scale);
   Painter painter(drawing.get());
   for (std::size_t i = 0; i < shown; ++i) {
-    const Place page(drawing.get(), double(i % PagesPerRow) * (PageWidth + PageGap),
-                     double(i / PagesPerRow) * (PageHeight + PageGap));
+    const std::size_t row = i / PagesPerRow, column = i % PagesPerRow;
+    const Place page(drawing.get(), double(column) * (PageWidth + PageGap),
+                     double(row) * (PageHeight + PageGap));
     const std::size_t first = std::min(i * IconsPerPage, icons.size());
     painter.page(view, view.firstPage + i, icons.data() + first,
                  std::min(IconsPerPage, icons.size() - first));
