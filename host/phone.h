@@ -70,6 +70,7 @@ inline constexpr std::string_view RestoreState =
     "/var/mobile/Library/ApplicationSync/RestoreState.plist";
 inline constexpr std::string_view RestoreList =
     "/var/mobile/Media/HalvoRestore/RestoreApplications.plist";
+inline constexpr std::string_view WaitingData = "/var/mobile/Media/HalvoRestore/Data";
 inline constexpr std::string_view DemotedApplications =
     "/var/mobile/Library/Preferences/com.corvane.Safekeep.DemotedApps.plist";
 inline constexpr std::string_view Downloads = "/var/mobile/Media/Downloads";

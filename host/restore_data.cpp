@@ -74,6 +74,17 @@ std::optional<std::string> clear(const RestorePhone& phone, const std::string& i
 
 }  // namespace
 
+bool ownsData(const RestorePhone& phone, const std::string& identifier) {
+  if (phone.files.directoryExists(joinPath(exchange::WaitingData, identifier))) return false;
+  bool any = false;
+  const auto look = [&](ByteView bytes) {
+    any = !bytes.empty();
+    return !any;
+  };
+  phone.saveData(identifier, look, nullptr);
+  return any;
+}
+
 std::optional<std::string> giveBackData(const RestorePhone& phone, const BackedUpApplication& app,
                                         const BackupFile* file, Reporter& reporter,
                                         const Interruption& interruption) {

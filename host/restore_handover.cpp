@@ -89,6 +89,7 @@ class HandoverInProgress {
       if (result_.installed.contains(app.identifier) || result_.failures.contains(app.identifier)) {
         continue;
       }
+      if (isRestoring(app.identifier) && ownsData(phone_, app.identifier)) continue;
       const auto file = backup_.data.find(app.identifier);
       const auto failure =
           host::giveBackData(phone_, app, file == backup_.data.end() ? nullptr : &file->second,

@@ -114,8 +114,9 @@ RestorePhone RestoreTest::restorePhone() {
   return {std::move(base), phone.homeScreen,
           [this](std::string_view identifier, const device::EmbeddedDevice::DataSink& sink,
                  std::optional<Error>*) {
-            const auto found = waiting.find(std::string(identifier));
-            return found == waiting.end() || sink(toBytes(found->second));
+            const auto& all = waiting.contains(std::string(identifier)) ? waiting : owned;
+            const auto found = all.find(std::string(identifier));
+            return found == all.end() || sink(toBytes(found->second));
           },
           [this](std::string_view identifier, const device::EmbeddedDevice::DataSource& source,
                  std::optional<Error>* error) {

@@ -58,6 +58,7 @@ class RestoreTest : public SessionTest {
   std::map<std::string, std::string> data;
   /// What waits on the phone, by identifier.
   RestoringClient::Waiting waiting;
+  std::map<std::string, std::string> owned;  ///< data of applications without a package
   RestoringClient client{phone, host, waiting, coordination};
   bool packages = false;                        ///< from `folder`
   bool store = false;                           ///< from `folder`

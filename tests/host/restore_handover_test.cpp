@@ -89,6 +89,17 @@ TEST_F(HandoverTest, LaysOutDataAnewThatIsOfAnotherBackup) {
   EXPECT_THAT(waiting, ElementsAre(Pair("com.a", "data of a"), Pair("com.b", "data of b")));
 }
 
+TEST_F(HandoverTest, LeavesTheDataOfADemotedApplicationAlone) {
+  backUp("com.a", "data of a");
+  seedRestoring("com.a", InstallType::IntentionalDowngrade);
+  owned["com.a"] = "made since";
+  handOver();
+  EXPECT_THAT(waiting, IsEmpty());
+  owned.clear();
+  handOver();
+  EXPECT_THAT(waiting, ElementsAre(Pair("com.a", "data of a")));
+}
+
 TEST_F(HandoverTest, TellsHowFarDataHasCome) {
   backUp("com.a", std::string(2500, 'x'));
   handOver();

@@ -29,6 +29,11 @@ class RestoreKillTest : public ::testing::TestWithParam<Way> {
     if (GetParam().packages) input.packages = shelf_.library();
     return input;
   }
+  static std::vector<std::string> undisturbed(const RestoreInput& all) {
+    RestoringPhone phone(GetParam().coordination);
+    phone.restore(all);
+    return phone.picture();
+  }
 
  private:
   SampleBackup backup_;
@@ -37,14 +42,13 @@ class RestoreKillTest : public ::testing::TestWithParam<Way> {
 
 TEST_P(RestoreKillTest, SecondRestoreFinishes) {
   const RestoreInput all = input();
-  RestoringPhone undisturbed(GetParam().coordination);
-  undisturbed.restore(all);
+  const std::vector<std::string> expected = undisturbed(all);
   bool died = true;
   for (int step = 0; died && !HasFailure(); ++step) {
     RestoringPhone phone(GetParam().coordination);
     died = phone.restoreAndDie(all, step);
     phone.restore(all);
-    EXPECT_EQ(phone.picture(), undisturbed.picture()) << "after step " << step;
+    EXPECT_EQ(phone.picture(), expected) << "after step " << step;
     EXPECT_FALSE(phone.device().files().fileExists(exchange::RestoreList));
     if (!died) {
       EXPECT_GT(step, 30);

@@ -13,16 +13,15 @@ using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 using Demotion = SampleBackup::Demotion;
 
-class RestoreScenario : public ::testing::TestWithParam<bool> {
+class Restores : public ::testing::Test {
  protected:
-  RestoreScenario() {
+  explicit Restores(bool coordination) : phone(coordination) {
     backup.add("com.a", "notes of a");
     backup.add("com.b");
     backup.add("com.c", "notes of c", Demotion::Automatic);
     backup.add("com.d", "notes of d", Demotion::Intentional);
   }
 
-  bool coordination() const { return GetParam(); }
   std::string restore() { return phone.restore(backup.read()); }
   std::string restoreWithStore() {
     RestoreInput input = backup.read();
@@ -39,7 +38,19 @@ class RestoreScenario : public ::testing::TestWithParam<bool> {
 
   SampleBackup backup;
   Shelf shelf;
-  RestoringPhone phone{GetParam()};
+  RestoringPhone phone;
+};
+
+/// In both ways of installing.
+class RestoreScenario : public Restores, public ::testing::WithParamInterface<bool> {
+ protected:
+  RestoreScenario() : Restores(GetParam()) {}
+  bool coordination() const { return GetParam(); }
+};
+
+class CoordinatedRestoreScenario : public Restores {
+ protected:
+  CoordinatedRestoreScenario() : Restores(true) {}
 };
 
 constexpr const char* Waits = ": waits for its package";
@@ -101,8 +112,7 @@ TEST_P(RestoreScenario, StoreMayComeLaterAndWithPartOfThePackages) {
   EXPECT_EQ(phone.notes("com.a"), "notes of a");
 }
 
-TEST_P(RestoreScenario, DemotedApplicationComesWhenItIsAskedFor) {
-  if (!coordination()) GTEST_SKIP() << "every restored placeholder is alike there";
+TEST_F(CoordinatedRestoreScenario, DemotedApplicationComesWhenItIsAskedFor) {
   offerAll();
   restoreWithStore();
   device::DeviceError problem;
@@ -185,6 +195,20 @@ TEST_P(RestoreScenario, WhatWasMadeSinceIsLeftAlone) {
   const std::string notes = "/var/mobile/Containers/Data/com.a/notes";
   ASSERT_TRUE(phone.device().files().createFile(notes, toBytes("made since"), {}));
   restoreWithStore();
+  EXPECT_EQ(phone.notes("com.a"), "made since");
+}
+
+TEST_P(RestoreScenario, DataOfAnApplicationThatWasDemotedSinceIsLeftAlone) {
+  offerAll();
+  restoreWithStore();
+  const std::string notes = "/var/mobile/Containers/Data/com.a/notes";
+  ASSERT_TRUE(phone.device().files().createFile(notes, toBytes("made since"), {}));
+  std::optional<Error> error;
+  ASSERT_TRUE(phone.device().demote("com.a", &error)) << error->localizedDescription();
+  EXPECT_THAT(restoreWithStore(), HasSubstr(std::string("skipped com.a") + Demoted));
+  device::DeviceError problem;
+  ASSERT_TRUE(device::EmbeddedDevice::tap(phone.folder(), "com.a", problem, &error));
+  EXPECT_THAT(restoreWithStore(), HasSubstr("installed com.a"));
   EXPECT_EQ(phone.notes("com.a"), "made since");
 }
 
