@@ -62,6 +62,9 @@ class RestoreCase(support.Case):
         self.events = events
         return events[-1]
 
+    def start_restore(self, *arguments):
+        return self.start("--json", "restore", self.backup, *arguments)
+
     def reasons(self, entries):
         return {entry["identifier"]: entry["reason"] for entry in entries}
 

@@ -1,4 +1,4 @@
-"""Backups that come back to new phones, whole, in parts, interrupted and killed."""
+"""Backups that come back to new phones, whole, in parts and interrupted."""
 
 import json
 import plistlib
@@ -101,9 +101,6 @@ done       2 installed, 2 skipped
 """)
         self.assertEqual(self.run_appsync("--quiet", "restore", self.backup), ("", ""))
 
-    def start_restore(self, *arguments):
-        return self.start("--json", "restore", self.backup, *arguments)
-
     def make_large(self):
         """An application that takes a while to send."""
         self.offer("com.b", body=support.noise(30_000_000), ending=".tar", name="Big" * 60)
@@ -124,33 +121,6 @@ done       2 installed, 2 skipped
                          {"com.b": "interrupted; the next restore does it"})
         self.assertEqual(events[-1]["installed"], ["com.a"])
         self.assertEqual(self.restore("--store", self.library)["installed"], ["com.b"])
-
-    def picture(self):
-        """What a person finds on the phone."""
-        self.take_backup(self.folder / "look")
-        layout = plistlib.loads((self.folder / "look/IconState.plist").read_bytes())
-        files = {str(path.relative_to(self.folder / "look")): path.read_bytes()
-                 for path in (self.folder / "look").rglob("*") if path.is_file()}
-        apps = [{key: app[key] for key in ("identifier", "version", "name", "placeholder")}
-                for app in self.json_lines("apps")]
-        return apps, layout, files
-
-    def check_killed_anywhere(self, *arguments):
-        self.use("undisturbed")
-        self.restore(*arguments)
-        expected = self.picture()
-        for number in range(len(self.events)):
-            self.use(f"killed-{number}")
-            process = self.start_restore(*arguments)
-            for _ in range(number + 1):
-                process.stdout.readline()
-            process.kill()
-            process.communicate()
-            self.restore(*arguments)
-            self.assertEqual(self.picture(), expected, f"killed after {number + 1} events")
-
-    def test_killed_anywhere(self):
-        self.check_killed_anywhere("--store", self.library)
 
     def test_a_reader_that_goes_away_does_not_stop_the_restore(self):
         self.use("new")
