@@ -44,10 +44,10 @@ std::optional<Bytes> dataOption(const PropertyList::Dictionary& options, std::st
   return data ? std::optional(*data) : std::nullopt;
 }
 
-/// Demoted, or asked for before.
+/// What came from a backup may be demoted too, and asking twice is no harm.
 bool canBeAskedFor(InstallType placeholder) {
   return placeholder == InstallType::Downgrade ||
-         placeholder == InstallType::IntentionalDowngrade ||
+         placeholder == InstallType::IntentionalDowngrade || placeholder == InstallType::Restore ||
          placeholder == InstallType::StoreDownload;
 }
 
@@ -178,7 +178,7 @@ bool DeviceAppRegistry::demote(std::string_view bundleId, std::optional<Error>* 
   return changeApplication(bundleId, demote, error);
 }
 
-bool DeviceAppRegistry::askForDemoted(std::string_view bundleId) noexcept {
+bool DeviceAppRegistry::askFor(std::string_view bundleId) noexcept {
   bool asked = false;
   const auto ask = [&](const std::string& identifier, std::optional<Error>* error) {
     return core_.database.change(

@@ -30,9 +30,9 @@ class DeviceAppRegistry final : public AppRegistry {
   bool removeApplication(std::string_view bundleId, std::optional<Error>* error) noexcept;
   /// What a person does: only the application's placeholder and data stay.
   bool demote(std::string_view bundleId, std::optional<Error>* error) noexcept;
-  /// What a person does: a demoted application is to come back. Its placeholder becomes that of a
-  /// download from the store. False when there is no such placeholder.
-  bool askForDemoted(std::string_view bundleId) noexcept;
+  /// What a person does: a demoted or restored application is to come. Its placeholder becomes that
+  /// of a download from the store. False when there is no such placeholder.
+  bool askFor(std::string_view bundleId) noexcept;
   /// Registers an application that comes with the system.
   bool addSystemApplication(std::string_view bundleId, std::string_view displayName,
                             std::string_view version, std::optional<Error>* error) noexcept;

@@ -105,7 +105,7 @@ class FolderDevice final : public EmbeddedDevice {
   std::optional<Error> carryOut(PersonWish wish, std::string_view bundleId) {
     if (wish == PersonWish::Tap) {
       const bool heard =
-          (coordination_ && coordination_->tap(bundleId)) || registry_.askForDemoted(bundleId);
+          (coordination_ && coordination_->tap(bundleId)) || registry_.askFor(bundleId);
       return heard ? std::nullopt : std::optional(notInstalling(bundleId));
     }
     if (!coordination_) return notInstalling(bundleId);

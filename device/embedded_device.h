@@ -186,9 +186,9 @@ class EmbeddedDevice {
   // writes the device; without one they are done here. False (with a reason) when no coordinated
   // install of the application is on its way, or it is past cancelling.
 
-  /// The install's client is asked to bring this application first. A demoted application is asked
-  /// for: its placeholder's install type becomes InstallType::StoreDownload, also without
-  /// coordination.
+  /// The install's client is asked to bring this application first. A demoted or restored
+  /// application that waits is asked for: its placeholder's install type becomes
+  /// InstallType::StoreDownload, also without coordination.
   static bool tap(const std::filesystem::path& folder, std::string_view bundleId,
                   DeviceError& deviceError, std::optional<Error>* error) noexcept;
   static bool cancel(const std::filesystem::path& folder, std::string_view bundleId,

@@ -1,6 +1,7 @@
 #!/usr/bin/env bash
 # Takes the sample library through three desktop syncs of a new device, and checks what comes out.
-# Then a second device, which installs through coordinators, goes through the same.
+# Then a second device, which installs through coordinators, goes through the same. At the end both
+# come back from a backup on new devices.
 #
 # usage: examples/demo.sh APPSYNC [FOLDER]      FOLDER: where it works, build/demo by default
 set -euo pipefail
@@ -41,6 +42,47 @@ expect_apps() { # "NAME VERSION"...
     fail "these applications were expected (<) and found (>):"$'\n'"$(cat difference)"
 }
 
+# Runs the installed Tally of a device with its own data there, and insists that it has counted.
+run_tally() { # DEVICE ARGUMENT...
+  local device=$1 path
+  shift
+  path=$("$program" --device "$device" --json apps | python3 -c '
+import json, sys
+print(next(a["path"] for a in map(json.loads, sys.stdin) if a["identifier"] == "org.example.tally"))')
+  printf '\n$ Tally %s\n' "$*"
+  APP_DATA=$PWD/$device/root/var/mobile/Containers/Data/org.example.tally \
+    "$device/root$path/Tally" "$@" | tee output.txt
+  grep -q '3  |||' output.txt || fail "Tally does not count"
+}
+
+# A person demotes an application; the device is backed up and comes back as another one, to which
+# the store brings the packages.
+come_back() { # DEVICE INIT_OPTION...
+  local device=$1
+  shift
+  local -x APPSYNC_DEVICE=$PWD/$device
+  rm -rf "backup-$device" "backup-of-restored-$device" "restored-$device"
+  run 0 demote org.example.meridian
+  run 0 backup "backup-$device"
+  apps_of "$APPSYNC_DEVICE" >before.txt
+
+  APPSYNC_DEVICE=$PWD/restored-$device
+  run 0 init "$@"
+  run 0 restore "backup-$device" --store library/third
+  apps_of "$APPSYNC_DEVICE" >after.txt
+  paste before.txt after.txt | expand -t 36
+  cmp before.txt after.txt || fail "the restored device holds other applications"
+  run_tally "restored-$device"
+
+  run 0 --quiet backup "backup-of-restored-$device"
+  diff -r "backup-$device" "backup-of-restored-$device" ||
+    fail "a backup of the restored device is another one"
+  run 0 tap org.example.meridian
+  run 0 --quiet restore "backup-$device" --store library/third
+  apps_of "$APPSYNC_DEVICE" | grep -x "meridian 1.6" >/dev/null ||
+    fail "the demoted application that was asked for did not come"
+}
+
 title "The sample library: 12 applications, packed by appsync, zip, 7-Zip, Python and tar"
 "$root/examples/build-library" "$program" library
 ls -sh1 library/first
@@ -74,14 +116,7 @@ grep -q "org.example.jot not installed.*Marking as deleted" log.txt ||
   fail "the inventory did not report Jot as deleted"
 
 title "An installed application runs"
-tally=$("$program" --json apps | python3 -c '
-import json, sys
-print(next(a["path"] for a in map(json.loads, sys.stdin) if a["identifier"] == "org.example.tally"))')
-export APP_DATA=$PWD/data
-rm -rf data
-printf '\n$ Tally add "desktop sync" 3\n'
-"phone/root$tally/Tally" add "desktop sync" 3 | tee output.txt
-grep -q '3  |||' output.txt || fail "Tally does not count"
+run_tally phone add "desktop sync" 3
 
 title "What is on the phone now"
 run 0 apps
@@ -109,4 +144,14 @@ apps_of coordinated >with.txt
 paste without.txt with.txt | expand -t 24
 cmp without.txt with.txt || fail "the two devices hold different applications"
 
-printf '\nAll is as it should be. The devices are %s and %s\n' "$PWD/phone" "$PWD/coordinated"
+title "A backup of the first device, and a new device that comes back from it"
+come_back phone
+
+title "The same where installs are coordinated"
+run_tally coordinated add "desktop sync" 3
+come_back coordinated --coordination on
+
+title "The home screen of the restored device"
+run 0 --device restored-coordinated home-screen -o home-screen.png
+
+printf '\nAll is as it should be. The devices are in %s\n' "$PWD"

@@ -191,8 +191,9 @@ TEST_F(UncoordinatedTest, NoInstallCanBeTappedOrCancelled) {
   EXPECT_EQ(problem.problem, DeviceProblem::Missing);
 }
 
-TEST_F(UncoordinatedTest, ADemotedApplicationThatIsTappedIsAskedForOnceAndForAll) {
-  for (const InstallType demotion : {InstallType::Downgrade, InstallType::IntentionalDowngrade}) {
+TEST_F(UncoordinatedTest, ADemotedOrRestoredApplicationThatIsTappedIsAskedForOnceAndForAll) {
+  for (const InstallType demotion :
+       {InstallType::Downgrade, InstallType::IntentionalDowngrade, InstallType::Restore}) {
     ASSERT_TRUE(demote(demotion));
     DeviceError problem;
     for (int tap = 0; tap < 2; ++tap) {
