@@ -1,7 +1,5 @@
 """Restores that are killed after each line they tell: a second one ends as an undisturbed one."""
 
-import plistlib
-
 import support
 from restore_support import RestoreCase
 
@@ -12,12 +10,11 @@ class Killed(RestoreCase):
     def picture(self):
         """What a person finds on the phone."""
         self.take_backup(self.folder / "look")
-        layout = plistlib.loads((self.folder / "look/IconState.plist").read_bytes())
         files = {str(path.relative_to(self.folder / "look")): path.read_bytes()
                  for path in (self.folder / "look").rglob("*") if path.is_file()}
         apps = [{key: app[key] for key in ("identifier", "version", "name", "placeholder")}
                 for app in self.json_lines("apps")]
-        return apps, layout, files
+        return apps, files
 
     def test_killed_after_any_line(self):
         arguments = (self.packages, self.library)
