@@ -66,11 +66,12 @@ ExitCode runHomeScreen(const HomeScreenOptions& options, CommandContext& context
   const auto device = context.openDevice(device::Access::ReadOnly);
   const auto order = device->homeScreenOrder();
   const ScreenView view = viewOf(pagesFor(order.size()), options.page);
+  const HomeScreenIcons source(*device, view.iconSide());
   std::vector<ScreenIcon> icons;
   const std::size_t first = view.firstPage * IconsPerPage;
   const std::size_t end = std::min(first + view.pagesShown * IconsPerPage, order.size());
   for (std::size_t i = first; i < end; ++i) {
-    if (auto icon = iconOf(*device, order[i], view.iconSide())) icons.push_back(std::move(*icon));
+    if (auto icon = source.iconOf(order[i])) icons.push_back(std::move(*icon));
   }
   writeFile(fs::absolute(options.output), encode(drawHomeScreen(view, icons)));
   if (context.quiet && !context.json) return ExitCode::Done;

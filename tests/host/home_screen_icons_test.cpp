@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include "device/image_encoder.h"
+#include "host/phone.h"
 #include "platform/property_list_codec.h"
 #include "tests/host/host_files.h"
 
@@ -35,9 +36,9 @@ int redOf(const std::optional<ScreenIcon>& icon) {
   return std::to_integer<int>(icon->picture->pixels.at((Side * Side / 2 + Side / 2) * 4));
 }
 
-class HomeScreenIcons : public ::testing::Test {
+class HomeScreenIconsTest : public ::testing::Test {
  protected:
-  HomeScreenIcons() {
+  HomeScreenIconsTest() {
     device::DeviceError problem;
     EXPECT_TRUE(device::EmbeddedDevice::initialize(folder / "phone", {}, problem));
     open(device::Access::Write);
@@ -88,7 +89,7 @@ class HomeScreenIcons : public ::testing::Test {
   }
 
   std::optional<ScreenIcon> shown(const std::string& identifier) {
-    return iconOf(*phone, identifier, Side);
+    return HomeScreenIcons(*phone, Side).iconOf(identifier);
   }
 
   testing::Folder folder;
@@ -102,7 +103,7 @@ class HomeScreenIcons : public ::testing::Test {
   }
 };
 
-TEST_F(HomeScreenIcons, AnInstalledApplicationShowsItsNameAndIcon) {
+TEST_F(HomeScreenIconsTest, AnInstalledApplicationShowsItsNameAndIcon) {
   install("com.a", application("Tally"));
   const auto icon = shown("com.a");
   ASSERT_TRUE(icon);
@@ -111,7 +112,7 @@ TEST_F(HomeScreenIcons, AnInstalledApplicationShowsItsNameAndIcon) {
   EXPECT_EQ(redOf(icon), 100);
 }
 
-TEST_F(HomeScreenIcons, TheArtworkStandsInForABrokenOrMissingIcon) {
+TEST_F(HomeScreenIconsTest, TheArtworkStandsInForABrokenOrMissingIcon) {
   Entries broken = application();
   broken["Sample.app/Icon.png"] = pictureFile(100).substr(0, 60);
   install("com.a", broken);
@@ -121,7 +122,7 @@ TEST_F(HomeScreenIcons, TheArtworkStandsInForABrokenOrMissingIcon) {
   EXPECT_EQ(redOf(shown("com.a")), 200);
 }
 
-TEST_F(HomeScreenIcons, WithoutAnyPictureThereIsNone) {
+TEST_F(HomeScreenIconsTest, WithoutAnyPictureThereIsNone) {
   Entries broken = application();
   broken["Sample.app/Icon.png"] = "no picture";
   broken["HalvoArtwork"] = "none either";
@@ -132,7 +133,7 @@ TEST_F(HomeScreenIcons, WithoutAnyPictureThereIsNone) {
   EXPECT_EQ(redOf(shown("com.a")), -1);
 }
 
-TEST_F(HomeScreenIcons, ALinkOutOfThePhoneIsNotFollowed) {
+TEST_F(HomeScreenIconsTest, ALinkOutOfThePhoneIsNotFollowed) {
   install("com.a", application());
   testing::putFile(folder / "outside.png", pictureFile(77));
   const auto record = phone->appRegistry().recordForIdentifier("com.a", false);
@@ -145,17 +146,17 @@ TEST_F(HomeScreenIcons, ALinkOutOfThePhoneIsNotFollowed) {
   EXPECT_EQ(redOf(shown("com.a")), -1);
 }
 
-TEST_F(HomeScreenIcons, AnApplicationWithoutANameShowsItsIdentifier) {
+TEST_F(HomeScreenIconsTest, AnApplicationWithoutANameShowsItsIdentifier) {
   install("com.a", application(""));
   EXPECT_EQ(shown("com.a")->name, "com.a");
 }
 
-TEST_F(HomeScreenIcons, WhatIsNotOnThePhoneHasNoIcon) {
+TEST_F(HomeScreenIconsTest, WhatIsNotOnThePhoneHasNoIcon) {
   EXPECT_FALSE(shown("com.a"));
   EXPECT_FALSE(shown("../.."));
 }
 
-TEST_F(HomeScreenIcons, APlaceholderShowsTheProgressOfItsInstall) {
+TEST_F(HomeScreenIconsTest, APlaceholderShowsTheProgressOfItsInstall) {
   addPlaceholder("com.new");
   EXPECT_EQ(shown("com.new")->state, State::Waiting);
   EXPECT_EQ(shown("com.new")->name, "Coming");
@@ -177,24 +178,24 @@ TEST_F(HomeScreenIcons, APlaceholderShowsTheProgressOfItsInstall) {
   EXPECT_EQ(shown("com.new")->state, State::Away);
 }
 
-TEST_F(HomeScreenIcons, ProgressIsSeenByAnotherProcessThatOnlyReads) {
+TEST_F(HomeScreenIconsTest, ProgressIsSeenByAnotherProcessThatOnlyReads) {
   addPlaceholder("com.new");
   progress("com.new")->setInstallState(InstallState::Active);
   device::DeviceError problem;
   const auto reader =
       device::EmbeddedDevice::open(folder / "phone", device::Access::ReadOnly, problem);
   ASSERT_TRUE(reader) << problem.message;
-  EXPECT_EQ(iconOf(*reader, "com.new", Side)->state, State::Loading);
+  EXPECT_EQ(HomeScreenIcons(*reader, Side).iconOf("com.new")->state, State::Loading);
 }
 
-TEST_F(HomeScreenIcons, AnInstallThatWasBrokenOffIsPaused) {
+TEST_F(HomeScreenIconsTest, AnInstallThatWasBrokenOffIsPaused) {
   addPlaceholder("com.new");
   progress("com.new")->setInstallState(InstallState::Active);
   open(device::Access::Write);
   EXPECT_EQ(shown("com.new")->state, State::Paused);
 }
 
-TEST_F(HomeScreenIcons, ADemotedApplicationIsAwayUntilItsPackageComes) {
+TEST_F(HomeScreenIconsTest, ADemotedApplicationIsAwayUntilItsPackageComes) {
   for (const InstallType type : {InstallType::Downgrade, InstallType::IntentionalDowngrade}) {
     addPlaceholder("com.new", pictureFile(50), type);
     EXPECT_EQ(shown("com.new")->state, State::Away);
@@ -205,7 +206,19 @@ TEST_F(HomeScreenIcons, ADemotedApplicationIsAwayUntilItsPackageComes) {
   }
 }
 
-TEST_F(HomeScreenIcons, AnUpdateIsShownAsItsPlaceholderWithWhatThatLacks) {
+TEST_F(HomeScreenIconsTest, APlaceholderOfARestoreIsAwayIfItsApplicationIsDemoted) {
+  addPlaceholder("com.a", pictureFile(50), InstallType::Restore);
+  addPlaceholder("com.b", pictureFile(50), InstallType::Restore);
+  const auto list = serializePropertyList(
+      PropertyList::Dictionary{{"IntentionalDowngrades", PropertyList::Array{"com.b"}}},
+      PropertyListFormat::Binary);
+  ASSERT_TRUE(phone->files().createDirectory(exchange::SyncRoot, true, {}));
+  ASSERT_TRUE(phone->files().writeAtomically(exchange::DemotedApplications, *list));
+  EXPECT_EQ(shown("com.a")->state, State::Waiting);
+  EXPECT_EQ(shown("com.b")->state, State::Away);
+}
+
+TEST_F(HomeScreenIconsTest, AnUpdateIsShownAsItsPlaceholderWithWhatThatLacks) {
   install("com.a", application("Tally"));
   addPlaceholder("com.a", "", InstallType::Sync, "");
   const auto icon = shown("com.a");
