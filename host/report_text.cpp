@@ -140,6 +140,10 @@ void TextReporter::tell(const ApplicationSaved& event) {
 }
 
 void TextReporter::tell(const PlaceholderStands& event) {
+  if (event.name != event.identifier) {
+    planned_.try_emplace(event.identifier,
+                         PlannedEntry{Action::Install, event.identifier, "", "", event.name});
+  }
   print(Style::Plain, "restored",
         fmt::format("{} as a {}placeholder", subject(event.identifier),
                     event.demoted ? "demoted " : ""));

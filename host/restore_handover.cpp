@@ -1,7 +1,5 @@
 #include "host/restore_handover.h"
 
-#include <fmt/format.h>
-
 #include <cerrno>
 
 #include "host/package_reader.h"
@@ -109,14 +107,7 @@ class HandoverInProgress {
       }
       return;
     }
-    // The home screen keeps places for what is still to come.
-    const int status =
-        phone_.homeScreen.setIconState(phone_.homeScreen.serverPort(), backup_.iconLayout);
-    if (status != 0) {
-      result_.broken = fmt::format("the home screen does not take its layout: {}",
-                                   oneLine(Error::posix(status).localizedDescription()));
-      return;
-    }
+    putBackLayout();
     std::optional<Error> error;
     const auto list = list_.only(result_.listed, &error);
     const bool done = write(exchange::DemotedApplications, backup_.demotions, &error) && list &&
@@ -124,6 +115,16 @@ class HandoverInProgress {
     if (done) return;
     result_.broken = "the phone does not take the backup: " +
                      oneLine(error.value_or(Error::posix(EIO)).localizedDescription());
+  }
+
+  /// The home screen keeps places for what is still to come.
+  void putBackLayout() {
+    if (backup_.iconLayout.empty()) return;
+    const int status =
+        phone_.homeScreen.setIconState(phone_.homeScreen.serverPort(), backup_.iconLayout);
+    if (status == 0) return;
+    reporter_.report(Notice{"the home screen does not take its layout: " +
+                            oneLine(Error::posix(status).localizedDescription())});
   }
 
   bool write(std::string_view path, const Bytes& bytes, std::optional<Error>* error) {

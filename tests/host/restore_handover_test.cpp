@@ -197,6 +197,19 @@ TEST_F(HandoverTest, WaitsForWhatThePhoneStillDoesByItself) {
   EXPECT_THAT(handOver().installed, ElementsAre("com.a"));
 }
 
+TEST_F(HandoverTest, GoesOnWithoutALayoutThatTheHomeScreenRefuses) {
+  backUp("com.a");
+  Backup damaged = backup();
+  damaged.iconLayout = toBytes("damaged");
+  std::string problem;
+  const RestoreList list = RestoreList::of(damaged, problem).value();
+  const Handover given = host::handOver(restorePhone(), damaged, list, reporter, interruption);
+  EXPECT_FALSE(given.broken);
+  EXPECT_THAT(namesOnList(), ElementsAre("com.a"));
+  EXPECT_THAT(reporter.lines("notice"),
+              ElementsAre(HasSubstr("the home screen does not take its layout: ")));
+}
+
 TEST_F(HandoverTest, TellsWhenThePhoneTakesNoFile) {
   backUp("com.a");
   for (const auto path : {exchange::DemotedApplications, exchange::RestoreList}) {
