@@ -20,6 +20,12 @@ constexpr std::chrono::milliseconds InstallPoll{10};
 
 void ignoreProgress(double) {}
 
+std::set<std::string> identifiersOf(const SyncPlan& plan) {
+  std::set<std::string> identifiers;
+  for (const PlannedEntry& entry : plan.entries) identifiers.insert(entry.identifier);
+  return identifiers;
+}
+
 }  // namespace
 
 void InstallWatch::assertionDenied(std::string_view bundleId) noexcept {
@@ -66,9 +72,7 @@ Session::~Session() {
 SyncResult Session::run(const SyncInput& input) {
   PackageSender sender(client_, queue_, phone_, reporter_, interruption_, input.library);
   // What the client hears late of a killed sync must not reach this sync's todo list.
-  while (!interruption_.requested() && phoneIsBusy(input.plan)) {
-    std::this_thread::sleep_for(InstallPoll);
-  }
+  waitUntilIdle(phone_, identifiersOf(input.plan));
   sweepPlaceholders();
   removeLeftOverPackages(phone_.files);
   SyncResult result;
@@ -149,12 +153,6 @@ bool Session::isSettled(const std::string& identifier, const std::vector<TodoEnt
   });
 }
 
-bool Session::phoneIsBusy(const SyncPlan& plan) {
-  return std::any_of(plan.entries.begin(), plan.entries.end(), [&](const PlannedEntry& entry) {
-    return phone_.isBusyWith(entry.identifier);
-  });
-}
-
 /// Coordinators settle, and the phone removes and tidies up, after the client's calls have
 /// returned, which would be too late for this sync's result.
 void Session::waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent) {
@@ -164,7 +162,8 @@ void Session::waitForCoordination(const SyncPlan& plan, const std::set<std::stri
     return std::all_of(sent.begin(), sent.end(),
                        [&](const std::string& identifier) { return isSettled(identifier, todo); });
   };
-  while (phoneIsBusy(plan) || !installsSettled()) std::this_thread::sleep_for(InstallPoll);
+  while (!installsSettled()) std::this_thread::sleep_for(InstallPoll);
+  waitUntilIdle(phone_, identifiersOf(plan));
 }
 
 /// The client never asks for a package whose placeholder stands already.

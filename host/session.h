@@ -66,7 +66,6 @@ class Session {
   bool transfer(const SyncPlan& plan, PackageSender& sender);
   void findCoordinators(const std::vector<SyncAssetPtr>& assets);
   bool isSettled(const std::string& identifier, const std::vector<TodoEntry>& todo);
-  bool phoneIsBusy(const SyncPlan& plan);
   void waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent);
 
   void sweepPlaceholders();
