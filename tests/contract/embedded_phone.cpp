@@ -8,6 +8,7 @@
 #include <cstring>
 #include <filesystem>
 #include <stdexcept>
+#include <thread>
 
 #include "device/embedded_device.h"
 #include "platform/property_list_codec.h"
@@ -55,12 +56,12 @@ std::string package(std::string_view identifier, std::string_view version) {
 
 class EmbeddedPhone : public Phone {
  public:
-  EmbeddedPhone() {
+  explicit EmbeddedPhone(const PhoneOptions& options) {
     std::string pattern = (fs::temp_directory_path() / "contract-XXXXXX").string();
     if (!mkdtemp(pattern.data())) throw std::runtime_error("no temporary folder");
     folder_ = pattern;
     device::DeviceError error;
-    if (device::EmbeddedDevice::initialize(folder_, {}, error)) {
+    if (device::EmbeddedDevice::initialize(folder_, {options.coordination}, error)) {
       device_ = device::EmbeddedDevice::open(folder_, device::Access::Write, error);
     }
     if (!device_) throw std::runtime_error(error.message);
@@ -120,6 +121,17 @@ class EmbeddedPhone : public Phone {
     return kept;
   }
   void passTime(std::chrono::milliseconds) override {}
+  bool tap(std::string_view identifier) override {
+    device::DeviceError problem;
+    return device::EmbeddedDevice::tap(folder_, identifier, problem, nullptr);
+  }
+  bool cancelInstall(std::string_view identifier) override {
+    device::DeviceError problem;
+    return device::EmbeddedDevice::cancel(folder_, identifier, problem, nullptr);
+  }
+  void settle(std::string_view identifier) override {
+    while (device_->isBusyWith(identifier)) std::this_thread::yield();
+  }
 
  private:
   fs::path folder_;
@@ -130,6 +142,8 @@ class EmbeddedPhone : public Phone {
 
 }  // namespace
 
-std::unique_ptr<Phone> makeEmbeddedPhone() { return std::make_unique<EmbeddedPhone>(); }
+std::unique_ptr<Phone> makeEmbeddedPhone(const PhoneOptions& options) {
+  return std::make_unique<EmbeddedPhone>(options);
+}
 
 }  // namespace appsync::contract

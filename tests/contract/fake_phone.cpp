@@ -1,3 +1,5 @@
+#include <cerrno>
+
 #include "tests/contract/phone.h"
 #include "tests/fakes/fake_platform.h"
 
@@ -5,8 +7,15 @@ namespace appsync::contract {
 
 namespace {
 
+/// Who cancels in the person's name.
+constexpr CoordinationClientId PersonClientID = 15;
+
 class FakePhone : public Phone {
  public:
+  explicit FakePhone(const PhoneOptions& options) {
+    fakes_.installCoordination.setEnabled(options.coordination);
+  }
+
   Platform platform() override { return fakes_.platform(); }
   void putPackage(std::string_view path, std::string_view identifier,
                   std::string_view version) override {
@@ -42,6 +51,19 @@ class FakePhone : public Phone {
     return kept;
   }
   void passTime(std::chrono::milliseconds time) override { fakes_.backgroundQueue.advance(time); }
+  bool tap(std::string_view identifier) override {
+    const auto live = fakes_.installCoordination.liveCoordinator(identifier);
+    if (live) fakes_.installCoordination.fireShouldPrioritize(*live);
+    return live != nullptr;
+  }
+  bool cancelInstall(std::string_view identifier) override {
+    const auto live = fakes_.installCoordination.liveCoordinator(identifier);
+    return live && live->cancel(Error::posix(ECANCELED), PersonClientID);
+  }
+  void settle(std::string_view identifier) override {
+    fakes_.installCoordination.carryOn(identifier);
+    fakes_.installCoordination.waitForEvents();
+  }
 
  private:
   fakes::FakePlatform fakes_;
@@ -49,6 +71,8 @@ class FakePhone : public Phone {
 
 }  // namespace
 
-std::unique_ptr<Phone> makeFakePhone() { return std::make_unique<FakePhone>(); }
+std::unique_ptr<Phone> makeFakePhone(const PhoneOptions& options) {
+  return std::make_unique<FakePhone>(options);
+}
 
 }  // namespace appsync::contract

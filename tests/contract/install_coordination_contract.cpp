@@ -1,60 +1,20 @@
-// What every coordination service promises, shown on the fake.
+// What every coordination service promises of its coordinators, promises and placeholders.
 #include <future>
-#include <thread>
 
-#include "tests/fakes/fake_platform.h"
+#include "tests/contract/coordination_contract.h"
 
 namespace appsync::contract {
 namespace {
 
-/// Keeps the events it gets, as text.
-class EventRecorder : public CoordinatorObserver {
- public:
-  void promiseDidBeginFulfillmentWithIdentifier(std::uint64_t identifier) noexcept override {
-    events.push_back("begin " + std::to_string(identifier));
-  }
-  void coordinatorDidInstallPlaceholder(InstallCoordinator& coordinator) noexcept override {
-    add("placeholder", coordinator);
-  }
-  void coordinatorDidCompleteSuccessfully(InstallCoordinator& coordinator) noexcept override {
-    add(coordinator.error() ? "failed" : "complete", coordinator);
-  }
-  void coordinatorShouldPrioritize(InstallCoordinator& coordinator) noexcept override {
-    add("prioritize", coordinator);
-  }
-  void coordinatorCanceledWithReason(InstallCoordinator& coordinator, const Error& reason,
-                                     CoordinationClientId client) noexcept override {
-    add("canceled " + reason.domain + " by " + std::to_string(client), coordinator);
-  }
+class InstallCoordinationContract : public CoordinationContract {};
 
-  // Written by one event at a time; firing waits for the event.
-  std::vector<std::string> events;
-  std::thread::id thread;
+SERVICE_CONTRACT_OF(InstallCoordinationContract);
 
- private:
-  void add(const std::string& event, const InstallCoordinator& coordinator) {
-    events.push_back(event + " " + coordinator.bundleIdentifier().value_or("none"));
-    thread = std::this_thread::get_id();
-  }
-};
+TEST_P(InstallCoordinationContract, SaysThatInstallsAreCoordinated) {
+  EXPECT_TRUE(coordination.coordinationIsEnabled());
+}
 
-class InstallCoordinationContract : public testing::Test {
- protected:
-  std::shared_ptr<InstallCoordinator> make(std::string_view identifier,
-                                           CoordinatorKind kind = CoordinatorKind::Initiating) {
-    return coordination.coordinatorFor(kind, identifier, SyncHostClientID, true, nullptr, nullptr);
-  }
-
-  fakes::FakePlatform fakes;
-  fakes::FakeInstallCoordination& fake = fakes.installCoordination;
-  InstallCoordination& coordination = fake;
-  const Error reason = Error::withDescription(TWErrorDomain, 30, "given up");
-  EventRecorder recorder;
-};
-
-using Events = std::vector<std::string>;
-
-TEST_F(InstallCoordinationContract, MakesACoordinatorOnlyWhenAskedTo) {
+TEST_P(InstallCoordinationContract, MakesACoordinatorOnlyWhenAskedTo) {
   bool created = true;
   EXPECT_FALSE(coordination.coordinatorFor(CoordinatorKind::Initiating, "com.a", SyncHostClientID,
                                            false, &created, nullptr));
@@ -72,26 +32,29 @@ TEST_F(InstallCoordinationContract, MakesACoordinatorOnlyWhenAskedTo) {
   EXPECT_FALSE(created);
 }
 
-TEST_F(InstallCoordinationContract, AnyKindFindsAnExistingCoordinatorAndMakesNone) {
+TEST_P(InstallCoordinationContract, AnyKindFindsAnExistingCoordinatorAndMakesNone) {
   EXPECT_FALSE(coordination.coordinatorFor(CoordinatorKind::Any, "com.a", SyncHostClientID, true,
                                            nullptr, nullptr));
   const auto made = make("com.a", CoordinatorKind::Updating);
-  EXPECT_EQ(coordination.coordinatorFor(CoordinatorKind::Any, "com.a", SyncHostClientID, false,
-                                        nullptr, nullptr),
-            made);
+  EXPECT_EQ(live("com.a"), made);
 }
 
-TEST_F(InstallCoordinationContract, AnotherClientsCoordinatorIsGivenOutWhateverItsKind) {
-  const auto stores = fake.seedCoordinator(CoordinatorKind::Restoring, "com.a", KQClientKiosk);
-  bool created = true;
-  const auto found = coordination.coordinatorFor(CoordinatorKind::Initiating, "com.a",
-                                                 SyncHostClientID, true, &created, nullptr);
-  EXPECT_EQ(found, stores);
-  EXPECT_FALSE(created);
-  EXPECT_EQ(found->creatorIdentifier(), KQClientKiosk);
+TEST_P(InstallCoordinationContract, OneCoordinatorOfAnApplicationIsLiveWhateverItsKindAndMaker) {
+  const auto stores = make("com.a", CoordinatorKind::Restoring, KQClientKiosk);
+  const auto own = make("com.b", CoordinatorKind::Updating);
+  for (const auto& [identifier, live] : {std::pair("com.a", stores), std::pair("com.b", own)}) {
+    for (const bool create : {true, false}) {
+      bool created = true;
+      EXPECT_EQ(coordination.coordinatorFor(CoordinatorKind::Initiating, identifier,
+                                            SyncHostClientID, create, &created, nullptr),
+                live);
+      EXPECT_FALSE(created);
+    }
+  }
+  EXPECT_EQ(stores->creatorIdentifier(), KQClientKiosk);
 }
 
-TEST_F(InstallCoordinationContract, ACoordinatorHasWhatWasSet) {
+TEST_P(InstallCoordinationContract, ACoordinatorHasWhatWasSet) {
   const auto coordinator = make("com.a");
   EXPECT_FALSE(coordinator->hasInstallOptions());
   EXPECT_FALSE(coordinator->hasInitialQPKAssetPromises());
@@ -101,18 +64,15 @@ TEST_F(InstallCoordinationContract, ACoordinatorHasWhatWasSet) {
   EXPECT_FALSE(coordinator->hasPlaceholderPromise());
   EXPECT_EQ(coordinator->appAssetPromiseResponsibleClient(), 0U);
 
-  const auto package =
-      coordination.createPathTransferPromise("com.a-Asset", SyncHostClientID, std::nullopt, 0);
+  const auto package = packagePromise("com.a");
   const auto data =
       coordination.createOutOfBandTransferPromise("com.a-UserData", SyncHostClientID, 0);
-  const auto placeholder =
-      coordination.createAppPlaceholder("A", "com.a", InstallType::Sync, SyncHostClientID);
-  ASSERT_TRUE(package && data && placeholder);
+  ASSERT_TRUE(package && data);
   EXPECT_TRUE(coordinator->setInstallOptions({}, nullptr));
   EXPECT_TRUE(coordinator->setInitialQPKAssetPromises({}, nullptr));
   EXPECT_TRUE(coordinator->setAppAssetPromise(package, nullptr));
   EXPECT_TRUE(coordinator->setUserDataPromise(data, nullptr));
-  EXPECT_TRUE(coordinator->setPlaceholderPromise(placeholder, nullptr));
+  EXPECT_TRUE(coordinator->setPlaceholderPromise(placeholder("com.a"), nullptr));
   EXPECT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(KQClientKiosk, nullptr));
 
   EXPECT_TRUE(coordinator->hasInstallOptions());
@@ -124,15 +84,33 @@ TEST_F(InstallCoordinationContract, ACoordinatorHasWhatWasSet) {
   EXPECT_EQ(coordinator->appAssetPromiseResponsibleClient(), KQClientKiosk);
 }
 
-TEST_F(InstallCoordinationContract, NoPlaceholderIsRefusedWithAnError) {
-  std::optional<Error> error;
+TEST_P(InstallCoordinationContract, APlaceholderThatIsMissingCancelledOrAnothersIsRefused) {
   const auto coordinator = make("com.a");
-  EXPECT_FALSE(coordinator->setPlaceholderPromise(nullptr, &error));
-  EXPECT_TRUE(error);
-  EXPECT_FALSE(coordinator->hasPlaceholderPromise());
+  const auto cancelled = placeholder("com.a");
+  cancelled->cancel(reason, SyncHostClientID);
+  for (const auto& wrong :
+       {std::shared_ptr<InstallPlaceholder>(), cancelled, placeholder("com.b")}) {
+    std::optional<Error> error;
+    EXPECT_FALSE(coordinator->setPlaceholderPromise(wrong, &error));
+    EXPECT_TRUE(error);
+    EXPECT_FALSE(coordinator->setPlaceholderPromise(wrong, nullptr));
+    EXPECT_FALSE(coordinator->hasPlaceholderPromise());
+  }
 }
 
-TEST_F(InstallCoordinationContract, APromiseTellsItsProgressAndItsPlace) {
+TEST_P(InstallCoordinationContract, APackagePromiseThatIsMissingOrCancelledIsRefused) {
+  const auto coordinator = make("com.a");
+  const auto cancelled = packagePromise("com.a");
+  cancelled->cancel(reason, SyncHostClientID);
+  for (const auto& wrong : {std::shared_ptr<PathTransferPromise>(), cancelled}) {
+    std::optional<Error> error;
+    EXPECT_FALSE(coordinator->setAppAssetPromise(wrong, &error));
+    EXPECT_TRUE(error);
+    EXPECT_FALSE(coordinator->hasAppAssetPromise());
+  }
+}
+
+TEST_P(InstallCoordinationContract, APromiseTellsItsProgressAndItsPlace) {
   const auto promise =
       coordination.createPathTransferPromise("com.a-Asset", SyncHostClientID, std::nullopt, 7);
   const auto other = coordination.createPathTransferPromise("com.a-Icon", SyncHostClientID,
@@ -152,79 +130,85 @@ TEST_F(InstallCoordinationContract, APromiseTellsItsProgressAndItsPlace) {
   EXPECT_EQ(promise->transferPath(), FileLocation::file("/tmp/package"));
 }
 
-TEST_F(InstallCoordinationContract, CancelledObjectsStayUsableWithoutEffect) {
-  const auto promise =
-      coordination.createPathTransferPromise("com.a-Asset", SyncHostClientID, std::nullopt, 0);
+TEST_P(InstallCoordinationContract, AFractionStaysBetweenNothingAndAll) {
+  const auto promise = packagePromise("com.a");
+  promise->setPercentComplete(1.5);
+  EXPECT_EQ(promise->percentComplete(), 1.0);
+  promise->setPercentComplete(-0.5);
+  EXPECT_EQ(promise->percentComplete(), 0);
+}
+
+TEST_P(InstallCoordinationContract, ACancelledPromiseStaysUsableWithoutEffect) {
+  const auto promise = packagePromise("com.a");
   promise->cancel(reason, SyncHostClientID);
   promise->setComplete(true);
   promise->setPercentComplete(1.0);
   EXPECT_FALSE(promise->isComplete());
   EXPECT_EQ(promise->percentComplete(), 0);
+}
 
+TEST_P(InstallCoordinationContract, ACancelledCoordinatorKeepsItsFirstReasonAndMakesRoom) {
   const auto coordinator = make("com.a");
+  const auto package = packagePromise("com.a");
+  ASSERT_TRUE(coordinator->setAppAssetPromise(package, nullptr));
   EXPECT_TRUE(coordinator->cancel(reason, SyncHostClientID));
+  EXPECT_TRUE(coordinator->cancel(Error::posix(5), SyncHostClientID)) << "it is cancelled";
   EXPECT_EQ(coordinator->error(), reason);
-  coordinator->setInstallOptions({}, nullptr);
+  EXPECT_TRUE(coordinator->setInstallOptions({}, nullptr));
   EXPECT_FALSE(coordinator->hasInstallOptions());
+  package->setComplete(true);
+  EXPECT_FALSE(package->isComplete()) << "its promises went with it";
   EXPECT_EQ(coordinator->bundleIdentifier(), "com.a");
+  EXPECT_EQ(live("com.a"), nullptr);
+  const auto next = make("com.a");
+  EXPECT_NE(next, coordinator);
+  EXPECT_FALSE(next->error());
+  EXPECT_FALSE(next->hasAppAssetPromise());
 }
 
-TEST_F(InstallCoordinationContract, AnEventGoesToTheCoordinatorsObserverElseToAListener) {
-  EventRecorder listening;
-  const auto listener =
-      coordination.createEventListener("com.corvane.service", {SyncHostClientID}, listening);
-  make("com.a");
-  const auto coordinator = fake.coordinator("com.a");
-  fake.fireDidInstallPlaceholder(*coordinator);
-  coordinator->setObserver(&recorder);
-  fake.fireShouldPrioritize(*coordinator);
-  fake.fireDidBeginFulfillment(*coordinator, 42);
-  coordinator->setObserver(nullptr);
-  fake.fireDidComplete(*coordinator);
-  EXPECT_EQ(listening.events, (Events{"placeholder com.a", "complete com.a"}));
-  EXPECT_EQ(recorder.events, (Events{"prioritize com.a", "begin 42"}));
-  EXPECT_NE(listening.thread, std::this_thread::get_id());
-}
+/// Uninstalls, and waits for the outcome.
+class CoordinatedUninstallContract : public CoordinationContract {
+ protected:
+  std::optional<Error> uninstall(std::string_view identifier) {
+    std::promise<std::optional<Error>> told;
+    coordination.uninstallApp(identifier, false, [&](const std::optional<Error>& error) {
+      thread = std::this_thread::get_id();
+      told.set_value(error);
+    });
+    return told.get_future().get();
+  }
+  std::thread::id thread;
+};
 
-TEST_F(InstallCoordinationContract, AListenerHearsOnlyOfItsClientsCoordinators) {
-  const auto stores = fake.seedCoordinator(CoordinatorKind::Initiating, "com.a", KQClientKiosk);
-  const auto listener =
-      coordination.createEventListener("com.corvane.service", {SyncHostClientID}, recorder);
-  fake.fireCanceled(*stores, reason, KQClientKiosk);
-  EXPECT_EQ(recorder.events, Events{});
-}
+SERVICE_CONTRACT_OF(CoordinatedUninstallContract);
 
-TEST_F(InstallCoordinationContract, AFailedInstallCompletesWithAnErrorOnTheCoordinator) {
-  make("com.a")->setObserver(&recorder);
-  fake.fireDidComplete(*fake.coordinator("com.a"), reason);
-  fake.fireCanceled(*fake.coordinator("com.a"), reason, KQClientKiosk);
-  EXPECT_EQ(recorder.events, (Events{"failed com.a", "canceled TWError by 1 com.a"}));
-}
-
-TEST_F(InstallCoordinationContract, NothingIsDeliveredAfterRemovingAnObserverOrAListener) {
-  make("com.a")->setObserver(&recorder);
-  coordination.removeObserver(&recorder);
-  fake.fireDidComplete(*fake.coordinator("com.a"));
-  auto listener =
-      coordination.createEventListener("com.corvane.service", {SyncHostClientID}, recorder);
-  listener.reset();
-  fake.fireDidComplete(*fake.coordinator("com.a"));
-  EXPECT_EQ(recorder.events, Events{});
-}
-
-TEST_F(InstallCoordinationContract, UninstallingTellsTheOutcomeOnAnotherThread) {
-  fakes.appRegistry.seedInstalled("com.a");
-  std::promise<std::pair<std::optional<Error>, std::thread::id>> told;
-  coordination.uninstallApp("com.a", false, [&](const std::optional<Error>& error) {
-    told.set_value({error, std::this_thread::get_id()});
-  });
-  const auto [error, thread] = told.get_future().get();
-  EXPECT_FALSE(error);
+TEST_P(CoordinatedUninstallContract, TellsTheOutcomeOnAnotherThread) {
+  ASSERT_TRUE(installPackage("com.a"));
+  EXPECT_FALSE(uninstall("com.a"));
   EXPECT_NE(thread, std::this_thread::get_id());
-  EXPECT_FALSE(fakes.appRegistry.installed("com.a"));
+  EXPECT_FALSE(platform.appRegistry.isApplicationInstalled("com.a"));
 }
 
-TEST_F(InstallCoordinationContract, AnErrorForThePersonCarriesItsCause) {
+TEST_P(CoordinatedUninstallContract, FailsForWhatIsNotThere) {
+  EXPECT_TRUE(uninstall("com.a"));
+  EXPECT_TRUE(uninstall(""));
+}
+
+TEST_P(CoordinatedUninstallContract, EndsAnUpdateAndLeavesTheOldVersion) {
+  ASSERT_TRUE(installPackage("com.a", "1.0"));
+  const auto coordinator = prepare("com.a", CoordinatorKind::Updating);
+  phone->settle("com.a");
+  ASSERT_TRUE(hasPlaceholder("com.a"));
+  EXPECT_FALSE(uninstall("com.a"));
+  phone->settle("com.a");
+  EXPECT_EQ(recorder.count("canceled com.a by "), 1U);
+  EXPECT_TRUE(coordinator->error());
+  EXPECT_EQ(live("com.a"), nullptr);
+  EXPECT_FALSE(hasPlaceholder("com.a"));
+  EXPECT_EQ(version("com.a"), "1.0");
+}
+
+TEST_P(InstallCoordinationContract, AnErrorForThePersonCarriesItsCause) {
   const Error shown = coordination.createUserPresentableError(1, 0, reason);
   EXPECT_EQ(shown.code, 1);
   ASSERT_TRUE(shown.underlying);

@@ -58,14 +58,26 @@ class Phone {
   virtual std::vector<KeptLine> logLines() = 0;
   /// Lets the time of the background queue pass, where it does not pass by itself.
   virtual void passTime(std::chrono::milliseconds time) = 0;
+
+  // The person taps the application's placeholder or cancels its install; false when no coordinated
+  // install of it is on its way.
+  virtual bool tap(std::string_view identifier) = 0;
+  virtual bool cancelInstall(std::string_view identifier) = 0;
+  /// Until the coordination service has nothing left to do for the application by itself: all that
+  /// could be installed is, and whoever is there has been told.
+  virtual void settle(std::string_view identifier) = 0;
 };
 
-std::unique_ptr<Phone> makeFakePhone();
-std::unique_ptr<Phone> makeEmbeddedPhone();
+struct PhoneOptions {
+  bool coordination = false;
+};
+
+std::unique_ptr<Phone> makeFakePhone(const PhoneOptions& options);
+std::unique_ptr<Phone> makeEmbeddedPhone(const PhoneOptions& options);
 
 struct PhoneKind {
   const char* name;
-  std::unique_ptr<Phone> (*make)();
+  std::unique_ptr<Phone> (*make)(const PhoneOptions& options);
 
   friend void PrintTo(const PhoneKind& kind, std::ostream* out) { *out << kind.name; }
 };
@@ -73,6 +85,8 @@ struct PhoneKind {
 /// A suite that runs against every phone.
 class ServiceContract : public testing::TestWithParam<PhoneKind> {
  protected:
+  explicit ServiceContract(const PhoneOptions& options = {}) : phone(GetParam().make(options)) {}
+
   // Conveniences on top of the services.
   void putFile(std::string_view path, std::string_view text);
   std::optional<std::string> textAt(std::string_view path);
@@ -85,7 +99,7 @@ class ServiceContract : public testing::TestWithParam<PhoneKind> {
                       std::optional<Error>* error = nullptr);
   std::string placeholderBundle(std::string_view identifier, std::string_view version);
 
-  std::unique_ptr<Phone> phone = GetParam().make();
+  const std::unique_ptr<Phone> phone;
   Platform platform = phone->platform();
 };
 

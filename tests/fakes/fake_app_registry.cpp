@@ -177,24 +177,7 @@ bool FakeAppRegistry::uninstallApplication(std::string_view bundleId,
                                            const PropertyList::Dictionary& options) noexcept {
   trace_.add(TraceCall, callText("AppRegistry.uninstallApplication", bundleId, options));
   const PropertyList* only = find(options, UninstallPlaceholdersOnlyKey);
-  const bool placeholdersOnly = only && only->booleanValue();
-  const std::scoped_lock lock(mutex_);
-  const auto found = applications_.find(bundleId);
-  if (found == applications_.end() || uninstallFailures_.contains(bundleId)) return false;
-  Application& application = found->second;
-  const bool hadPlaceholder = application.placeholder.has_value();
-  if (!hadPlaceholder && (placeholdersOnly || !application.installed)) return false;
-  const AppRecord& gone = hadPlaceholder ? *application.placeholder : *application.installed;
-  files_.erase(*gone.bundleContainerPath);
-  if (hadPlaceholder) {
-    application.placeholder.reset();
-    if (application.progress) application.progress->end(application.progress->installState());
-  } else {
-    application.installed.reset();
-    installerService_.addUninstalled(bundleId);
-  }
-  postReport();
-  return true;
+  return remove(bundleId, only && only->booleanValue());
 }
 
 std::shared_ptr<InstallProgress> FakeAppRegistry::installProgress(const AppRecord& record,

@@ -51,6 +51,8 @@ class FakeAppRegistry : public AppRegistry {
                        std::string_view version = "1.0");
   /// The application and its placeholder are gone, as if the person had removed them.
   void removeAll(std::string_view identifier);
+  /// What uninstallApplication takes away, untraced; false when there is nothing.
+  bool remove(std::string_view identifier, bool placeholderOnly);
   /// A record that only BundleKind::All visits, such as an extension's.
   void seedOther(AppRecord record);
 

@@ -95,6 +95,26 @@ void FakeAppRegistry::removeAll(std::string_view identifier) {
   postReport();
 }
 
+bool FakeAppRegistry::remove(std::string_view identifier, bool placeholderOnly) {
+  const std::scoped_lock lock(mutex_);
+  const auto found = applications_.find(identifier);
+  if (found == applications_.end() || uninstallFailures_.contains(identifier)) return false;
+  Application& application = found->second;
+  const bool hadPlaceholder = application.placeholder.has_value();
+  if (!hadPlaceholder && (placeholderOnly || !application.installed)) return false;
+  const AppRecord& gone = hadPlaceholder ? *application.placeholder : *application.installed;
+  files_.erase(*gone.bundleContainerPath);
+  if (hadPlaceholder) {
+    application.placeholder.reset();
+    if (application.progress) application.progress->end(application.progress->installState());
+  } else {
+    application.installed.reset();
+    installerService_.addUninstalled(identifier);
+  }
+  postReport();
+  return true;
+}
+
 void FakeAppRegistry::seedOther(AppRecord record) {
   const std::scoped_lock lock(mutex_);
   fillIn(record, "Plugins");

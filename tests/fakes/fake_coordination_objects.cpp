@@ -8,6 +8,22 @@ namespace {
 
 std::string promiseText(const DataPromise* promise) { return promise ? promise->name() : "none"; }
 
+/// Why a promise is not taken.
+std::optional<Error> objection(const std::shared_ptr<PathTransferPromise>& promise) {
+  if (!promise) return Error::posix(EINVAL);
+  const auto* const fake = dynamic_cast<const FakePathTransferPromise*>(promise.get());
+  if (!fake || !fake->state().cancellation) return std::nullopt;
+  return Error::posix(ECANCELED);
+}
+
+std::optional<Error> objection(const std::shared_ptr<InstallPlaceholder>& placeholder,
+                               const std::string& bundleId) {
+  if (!placeholder || placeholder->bundleIdentifier() != bundleId) return Error::posix(EINVAL);
+  const auto* const fake = dynamic_cast<const FakeInstallPlaceholder*>(placeholder.get());
+  if (!fake || !fake->state().cancellation) return std::nullopt;
+  return Error::posix(ECANCELED);
+}
+
 std::string optionsText(const InstallOptions& options) {
   return "type " + std::to_string(static_cast<std::uint64_t>(options.installType)) + " target " +
          std::to_string(options.installTargetType) +
@@ -88,18 +104,24 @@ void FakeInstallCoordinator::edit(const std::function<void(State&)>& apply) {
 
 template <typename Change>
 bool FakeInstallCoordinator::change(std::string_view operation, std::string arguments,
-                                    std::optional<Error>* error, Change apply) {
+                                    std::optional<Error>* error, Change apply,
+                                    const std::optional<Error>& refusal) {
   const std::string name = "InstallCoordinator." + std::string(operation);
   if (context_.faults.strikes(name, label(), error)) return false;
   context_.trace.add(TraceCall, callText(name, label(), arguments));
+  if (refusal) {
+    setError(error, *refusal);
+    return false;
+  }
   const std::scoped_lock lock(mutex_);
-  if (!state_.cancellation) apply(state_);
+  if (state_.isLive()) apply(state_);
   return true;
 }
 
 void FakeInstallCoordinator::setObserver(CoordinatorObserver* observer) noexcept {
   context_.trace.add(TraceCall, callText("InstallCoordinator.setObserver", label()));
   edit([&](State& state) { state.observer = observer; });
+  context_.service.observerChanged();
 }
 
 bool FakeInstallCoordinator::setInstallOptions(const InstallOptions& options,
@@ -124,8 +146,9 @@ std::shared_ptr<PathTransferPromise> FakeInstallCoordinator::appAssetPromise(
 
 bool FakeInstallCoordinator::setAppAssetPromise(const std::shared_ptr<PathTransferPromise>& promise,
                                                 std::optional<Error>* error) noexcept {
-  return change("setAppAssetPromise", promiseText(promise.get()), error,
-                [&](State& state) { state.appAssetPromise = promise; });
+  return change(
+      "setAppAssetPromise", promiseText(promise.get()), error,
+      [&](State& state) { state.appAssetPromise = promise; }, objection(promise));
 }
 
 bool FakeInstallCoordinator::setAppAssetPromiseResponsibleClient(
@@ -143,22 +166,16 @@ bool FakeInstallCoordinator::setUserDataPromise(
 
 bool FakeInstallCoordinator::setPlaceholderPromise(
     const std::shared_ptr<InstallPlaceholder>& placeholder, std::optional<Error>* error) noexcept {
-  if (!placeholder) {
-    context_.trace.add(TraceCall,
-                       callText("InstallCoordinator.setPlaceholderPromise", label(), "none"));
-    setError(error, Error::posix(EINVAL));
-    return false;
-  }
-  return change("setPlaceholderPromise", placeholder->description(), error,
-                [&](State& state) { state.placeholder = placeholder; });
+  return change(
+      "setPlaceholderPromise", placeholder ? placeholder->description() : "none", error,
+      [&](State& state) { state.placeholder = placeholder; }, objection(placeholder, label()));
 }
 
 bool FakeInstallCoordinator::cancel(const Error& reason, CoordinationClientId client) noexcept {
-  return change("cancel", argumentText(reason) + ", " + std::to_string(client), nullptr,
-                [&](State& state) {
-                  state.cancellation = Cancellation{reason, client};
-                  state.error = reason;
-                });
+  const bool taken = change("cancel", argumentText(reason) + ", " + std::to_string(client), nullptr,
+                            [](State&) {});
+  if (taken) context_.service.giveUp(*this, reason, client);
+  return taken && !state().completed;
 }
 
 std::string FakeInstallCoordinator::description() const { return "<Coordinator " + label() + ">"; }

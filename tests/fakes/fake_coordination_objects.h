@@ -1,6 +1,8 @@
 #pragma once
 
+#include <algorithm>
 #include <functional>
+#include <memory>
 #include <mutex>
 #include <utility>
 #include <vector>
@@ -17,12 +19,27 @@ struct Cancellation {
   bool operator==(const Cancellation&) const = default;
 };
 
+class FakeInstallCoordinator;
+
+/// What coordinators leave to their service.
+class CoordinatorOwner {
+ public:
+  virtual void observerChanged() = 0;
+  /// Cancels the coordinator, once, with what belongs to it.
+  virtual void giveUp(FakeInstallCoordinator& coordinator, const Error& reason,
+                      CoordinationClientId client) = 0;
+
+ protected:
+  ~CoordinatorOwner() = default;
+};
+
 /// What the objects of a coordination service share. Operations are traced, and fail where the plan
 /// says so, under "DataPromise.…", "InstallPlaceholder.…" and "InstallCoordinator.…"; their first
 /// argument is the promise's name or the bundle identifier.
 struct CoordinationContext {
   CallTrace& trace;
   FaultPlan& faults;
+  CoordinatorOwner& service;
 };
 
 /// How a data promise stands: the same for both sorts of promise.
@@ -34,6 +51,8 @@ struct PromiseState {
   std::optional<FileLocation> transferPath;
   double percentComplete = 0;
   bool complete = false;
+  bool began = false;  ///< its coordinator's client was told so
+  bool settled = false;
   std::optional<Cancellation> cancellation;
 };
 
@@ -48,7 +67,7 @@ class FakeDataPromise : public Promise {
   double percentComplete() const noexcept override { return state().percentComplete; }
   void setPercentComplete(double fraction) noexcept override {
     change(callText("DataPromise.setPercentComplete", name(), fraction),
-           [&](PromiseState& state) { state.percentComplete = fraction; });
+           [&](PromiseState& state) { state.percentComplete = std::clamp(fraction, 0.0, 1.0); });
   }
   bool isComplete() const noexcept override { return state().complete; }
   void setComplete(bool complete) noexcept override {
@@ -67,14 +86,25 @@ class FakeDataPromise : public Promise {
     const std::scoped_lock lock(mutex_);
     return state_;
   }
+  /// Its coordinator is over: nothing changes it any more.
+  void settle() {
+    const std::scoped_lock lock(mutex_);
+    state_.settled = true;
+  }
+  /// Whether there is something to tell its coordinator's client; true once.
+  bool begins() {
+    const std::scoped_lock lock(mutex_);
+    const bool begun = state_.percentComplete > 0 || state_.transferPath;
+    return begun && !std::exchange(state_.began, true);
+  }
 
  protected:
-  /// Without effect once cancelled.
+  /// Without effect once cancelled or settled.
   template <typename Change>
   void change(std::string line, Change apply) {
     context_.trace.add(TraceCall, std::move(line));
     const std::scoped_lock lock(mutex_);
-    if (!state_.cancellation) apply(state_);
+    if (!state_.cancellation && !state_.settled) apply(state_);
   }
 
  private:
@@ -136,7 +166,8 @@ class FakeInstallPlaceholder : public InstallPlaceholder {
   State state_;
 };
 
-class FakeInstallCoordinator : public InstallCoordinator {
+class FakeInstallCoordinator : public InstallCoordinator,
+                               public std::enable_shared_from_this<FakeInstallCoordinator> {
  public:
   struct State {
     CoordinatorKind kind = CoordinatorKind::Initiating;
@@ -150,7 +181,11 @@ class FakeInstallCoordinator : public InstallCoordinator {
     CoordinationClientId responsibleClient = 0;
     std::shared_ptr<OutOfBandTransferPromise> userDataPromise;
     std::shared_ptr<InstallPlaceholder> placeholder;
+    bool placeholderStands = false;
+    bool completed = false;
     std::optional<Cancellation> cancellation;
+
+    bool isLive() const { return !completed && !cancellation; }
   };
 
   FakeInstallCoordinator(CoordinationContext context, State state)
@@ -195,9 +230,10 @@ class FakeInstallCoordinator : public InstallCoordinator {
  private:
   /// "com.a", or "none" when the coordinator is not known any more.
   std::string label() const { return state().bundleIdentifier.value_or("none"); }
+  /// With a reason to refuse, nothing is changed.
   template <typename Change>
   bool change(std::string_view operation, std::string arguments, std::optional<Error>* error,
-              Change apply);
+              Change apply, const std::optional<Error>& refusal = std::nullopt);
 
   CoordinationContext context_;
   mutable std::mutex mutex_;

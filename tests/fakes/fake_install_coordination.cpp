@@ -56,9 +56,7 @@ std::shared_ptr<InstallCoordinator> FakeInstallCoordination::coordinatorFor(
   const std::scoped_lock lock(mutex_);
   for (const auto& coordinator : coordinators_) {
     const FakeInstallCoordinator::State state = coordinator->state();
-    if (state.bundleIdentifier != bundleId || state.cancellation) continue;
-    const bool fits = kind == CoordinatorKind::Any || state.kind == kind;
-    if (fits || state.creator != client) return coordinator;
+    if (state.bundleIdentifier == bundleId && state.isLive()) return coordinator;
   }
   if (!createIfNotExisting || kind == CoordinatorKind::Any) return nullptr;
   FakeInstallCoordinator::State state;
@@ -70,6 +68,16 @@ std::shared_ptr<InstallCoordinator> FakeInstallCoordination::coordinatorFor(
   return coordinators_.back();
 }
 
+PromiseState FakeInstallCoordination::newPromise(std::string_view name, CoordinationClientId client,
+                                                 std::uint64_t diskSpaceNeeded) {
+  PromiseState state;
+  state.name = name;
+  state.client = client;
+  state.identifier = nextPromise_++;
+  state.diskSpaceNeeded = diskSpaceNeeded;
+  return state;
+}
+
 std::shared_ptr<PathTransferPromise> FakeInstallCoordination::createPathTransferPromise(
     std::string_view name, CoordinationClientId client,
     const std::optional<FileLocation>& transferPath, std::uint64_t diskSpaceNeeded) noexcept {
@@ -77,8 +85,8 @@ std::shared_ptr<PathTransferPromise> FakeInstallCoordination::createPathTransfer
   if (context_.faults.next(operation, name)) return nullptr;
   context_.trace.add(TraceCall, callText(operation, name, client, transferPath, diskSpaceNeeded));
   const std::scoped_lock lock(mutex_);
-  PromiseState state{std::string(name), client, nextPromise_++, diskSpaceNeeded,
-                     transferPath,      0,      false,          {}};
+  PromiseState state = newPromise(name, client, diskSpaceNeeded);
+  state.transferPath = transferPath;
   pathPromises_.push_back(std::make_shared<FakePathTransferPromise>(context_, std::move(state)));
   return pathPromises_.back();
 }
@@ -89,7 +97,7 @@ std::shared_ptr<OutOfBandTransferPromise> FakeInstallCoordination::createOutOfBa
   if (context_.faults.next(operation, name)) return nullptr;
   context_.trace.add(TraceCall, callText(operation, name, client, diskSpaceNeeded));
   const std::scoped_lock lock(mutex_);
-  PromiseState state{std::string(name), client, nextPromise_++, diskSpaceNeeded, {}, 0, false, {}};
+  PromiseState state = newPromise(name, client, diskSpaceNeeded);
   outOfBandPromises_.push_back(
       std::make_shared<FakeOutOfBandTransferPromise>(context_, std::move(state)));
   return outOfBandPromises_.back();
@@ -112,20 +120,6 @@ std::shared_ptr<InstallPlaceholder> FakeInstallCoordination::createAppPlaceholde
   return placeholders_.back();
 }
 
-void FakeInstallCoordination::uninstallApp(
-    std::string_view bundleId, bool requestUserConfirmation,
-    std::function<void(const std::optional<Error>&)> completion) noexcept {
-  constexpr std::string_view operation = "InstallCoordination.uninstallApp";
-  std::optional<Error> error;
-  if (!context_.faults.strikes(operation, bundleId, &error)) {
-    context_.trace.add(TraceCall, callText(operation, bundleId, requestUserConfirmation));
-  }
-  events_.post([this, error, id = std::string(bundleId), completion = std::move(completion)] {
-    if (!error) registry_.removeAll(id);
-    completion(error);
-  });
-}
-
 Error FakeInstallCoordination::createUserPresentableError(
     std::int64_t code, std::uint64_t flag, const std::optional<Error>& underlying) noexcept {
   context_.trace.add(TraceQuery, callText("InstallCoordination.createUserPresentableError", code,
@@ -142,8 +136,11 @@ std::unique_ptr<CoordinatorEventListener> FakeInstallCoordination::createEventLi
   PropertyList::Array shown(clients.begin(), clients.end());
   context_.trace.add(TraceCall, callText(operation, serviceName, description(shown)));
   auto listener = std::make_unique<Listener>(*this, clients, delegate);
-  const std::scoped_lock lock(mutex_);
-  listeners_.push_back(listener.get());
+  {
+    const std::scoped_lock lock(mutex_);
+    listeners_.push_back(listener.get());
+  }
+  observerChanged();
   return listener;
 }
 
@@ -156,6 +153,8 @@ void FakeInstallCoordination::removeObserver(CoordinatorObserver* observer) noex
     });
   }
   delivered_.wait(lock, [&] { return delivering_ != observer; });
+  lock.unlock();
+  observerChanged();  // a listener may be there for what the observer would have had
 }
 
 void FakeInstallCoordination::removeListener(Listener* listener) {
@@ -174,52 +173,79 @@ CoordinatorObserver* FakeInstallCoordination::receiver(
   return nullptr;
 }
 
-void FakeInstallCoordination::fire(FakeInstallCoordinator& coordinator, const Event& event) {
-  events_.post([&] {
-    std::unique_lock lock(mutex_);
-    CoordinatorObserver* const observer = receiver(coordinator);
-    if (!observer) return;
+void FakeInstallCoordination::post(FakeInstallCoordinator& coordinator, Event event) {
+  {
+    const std::scoped_lock lock(mutex_);
+    pending_.push_back({coordinator.shared_from_this(), std::move(event)});
+  }
+  observerChanged();
+}
+
+void FakeInstallCoordination::fire(FakeInstallCoordinator& coordinator, Event event) {
+  post(coordinator, std::move(event));
+  events_.drain();
+}
+
+void FakeInstallCoordination::observerChanged() {
+  events_.post([this] { deliverPending(); });
+}
+
+void FakeInstallCoordination::deliverPending() {
+  std::unique_lock lock(mutex_);
+  while (true) {
+    CoordinatorObserver* observer = nullptr;
+    const auto next = std::ranges::find_if(pending_, [&](const PendingEvent& pending) {
+      observer = receiver(*pending.coordinator);
+      return observer != nullptr;
+    });
+    if (next == pending_.end()) return;
+    const PendingEvent event = std::move(*next);
+    pending_.erase(next);
     delivering_ = observer;
     lock.unlock();
-    event(*observer);
+    event.event(*observer, *event.coordinator);
     lock.lock();
     delivering_ = nullptr;
     delivered_.notify_all();
-  });
-  events_.drain();
+  }
 }
 
 void FakeInstallCoordination::fireDidBeginFulfillment(FakeInstallCoordinator& coordinator,
                                                       std::uint64_t promise) {
-  fire(coordinator, [&](CoordinatorObserver& observer) {
+  fire(coordinator, [promise](CoordinatorObserver& observer, FakeInstallCoordinator&) {
     observer.promiseDidBeginFulfillmentWithIdentifier(promise);
   });
 }
 
 void FakeInstallCoordination::fireDidInstallPlaceholder(FakeInstallCoordinator& coordinator) {
-  fire(coordinator, [&](CoordinatorObserver& observer) {
-    observer.coordinatorDidInstallPlaceholder(coordinator);
+  fire(coordinator, [](CoordinatorObserver& observer, FakeInstallCoordinator& subject) {
+    observer.coordinatorDidInstallPlaceholder(subject);
   });
 }
 
 void FakeInstallCoordination::fireDidComplete(FakeInstallCoordinator& coordinator,
                                               std::optional<Error> error) {
-  if (error) coordinator.edit([&](FakeInstallCoordinator::State& state) { state.error = error; });
-  fire(coordinator, [&](CoordinatorObserver& observer) {
-    observer.coordinatorDidCompleteSuccessfully(coordinator);
+  coordinator.edit([&](FakeInstallCoordinator::State& state) {
+    state.completed = true;
+    if (error) state.error = error;
+  });
+  fire(coordinator, [](CoordinatorObserver& observer, FakeInstallCoordinator& subject) {
+    observer.coordinatorDidCompleteSuccessfully(subject);
   });
 }
 
 void FakeInstallCoordination::fireShouldPrioritize(FakeInstallCoordinator& coordinator) {
-  fire(coordinator,
-       [&](CoordinatorObserver& observer) { observer.coordinatorShouldPrioritize(coordinator); });
+  fire(coordinator, [](CoordinatorObserver& observer, FakeInstallCoordinator& subject) {
+    observer.coordinatorShouldPrioritize(subject);
+  });
 }
 
 void FakeInstallCoordination::fireCanceled(FakeInstallCoordinator& coordinator, const Error& reason,
                                            CoordinationClientId client) {
-  fire(coordinator, [&](CoordinatorObserver& observer) {
-    observer.coordinatorCanceledWithReason(coordinator, reason, client);
-  });
+  fire(coordinator,
+       [reason, client](CoordinatorObserver& observer, FakeInstallCoordinator& subject) {
+         observer.coordinatorCanceledWithReason(subject, reason, client);
+       });
 }
 
 void FakeInstallCoordination::setEnabled(bool enabled) {

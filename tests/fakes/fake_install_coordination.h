@@ -1,6 +1,7 @@
 #pragma once
 
 #include <condition_variable>
+#include <deque>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -13,14 +14,16 @@
 
 namespace appsync::fakes {
 
-/// The coordination service: keeps what clients set and installs nothing. Events come only when a
-/// test fires them; they run on the service's own thread, and firing waits for them. Any operation
-/// can be made to fail through the fault plan under its trace name
-/// ("InstallCoordination.createAppPlaceholder", "InstallCoordinator.setInstallOptions").
-class FakeInstallCoordination : public InstallCoordination {
+/// The coordination service: keeps what clients set and installs nothing by itself. Besides those
+/// of `carryOn`, and of cancellations by others than the creator, events come only when a test
+/// fires them; they run on the service's own thread, and firing waits for them. One that nobody is
+/// there for is kept until somebody is. Any operation can be made to fail through the fault plan
+/// under its trace name ("InstallCoordination.createAppPlaceholder",
+/// "InstallCoordinator.setInstallOptions").
+class FakeInstallCoordination : public InstallCoordination, private CoordinatorOwner {
  public:
   FakeInstallCoordination(CallTrace& trace, FaultPlan& faults, FakeAppRegistry& registry)
-      : context_{trace, faults}, registry_(registry) {}
+      : context_{trace, faults, *this}, registry_(registry) {}
 
   // InstallCoordination
   bool coordinationIsEnabled() noexcept override;
@@ -40,7 +43,7 @@ class FakeInstallCoordination : public InstallCoordination {
   std::shared_ptr<InstallPlaceholder> createAppPlaceholder(
       std::string_view appName, std::string_view bundleId, InstallType installType,
       CoordinationClientId client) noexcept override;
-  /// The registry's application, or its placeholder, goes too.
+  /// Takes the registry's placeholder, else the application, and ends a live coordinator.
   void uninstallApp(std::string_view bundleId, bool requestUserConfirmation,
                     std::function<void(const std::optional<Error>&)> completion) noexcept override;
   /// Domain "UserPresentable", with the flag in the user info.
@@ -76,14 +79,48 @@ class FakeInstallCoordination : public InstallCoordination {
   void fireShouldPrioritize(FakeInstallCoordinator& coordinator);
   void fireCanceled(FakeInstallCoordinator& coordinator, const Error& reason,
                     CoordinationClientId client);
+
+  /// Does what there is to do for the application's live coordinator, as far as its client has
+  /// come: tells of a beginning, installs the placeholder, then the package.
+  void carryOn(std::string_view bundleId);
+  /// nullptr when there is none.
+  std::shared_ptr<FakeInstallCoordinator> liveCoordinator(std::string_view bundleId) const;
+
+  /// From now on completions of uninstalls are called only by completeUninstalls.
+  void holdUninstalls();
+  /// Calls all completions that are held, in order and on the service's thread; they stay, and can
+  /// be called again.
+  void completeUninstalls(const std::optional<Error>& error);
+
   /// Waits until every event and completion so far has run.
   void waitForEvents() { events_.drain(); }
 
  private:
   class Listener;
-  using Event = std::function<void(CoordinatorObserver&)>;
+  using Event = std::function<void(CoordinatorObserver&, FakeInstallCoordinator&)>;
+  using Completion = std::function<void(const std::optional<Error>&)>;
+  struct PendingEvent {
+    std::shared_ptr<FakeInstallCoordinator> coordinator;
+    Event event;
+  };
 
-  void fire(FakeInstallCoordinator& coordinator, const Event& event);
+  // CoordinatorOwner
+  void observerChanged() override;
+  void giveUp(FakeInstallCoordinator& coordinator, const Error& reason,
+              CoordinationClientId client) override;
+
+  /// The lock is held.
+  PromiseState newPromise(std::string_view name, CoordinationClientId client,
+                          std::uint64_t diskSpaceNeeded);
+  void fire(FakeInstallCoordinator& coordinator, Event event);
+  void post(FakeInstallCoordinator& coordinator, Event event);
+  void deliverPending();
+  void uninstall(const std::string& bundleId, std::optional<Error>& error);
+  bool installPlaceholder(FakeInstallCoordinator& coordinator);
+  void installPackage(FakeInstallCoordinator& coordinator);
+  void end(FakeInstallCoordinator& coordinator, const std::optional<Error>& error);
+  void settle(FakeInstallCoordinator& coordinator, bool keepPlaceholder);
+
   /// The lock is held.
   CoordinatorObserver* receiver(const FakeInstallCoordinator& coordinator) const;
   void removeListener(Listener* listener);
@@ -99,7 +136,10 @@ class FakeInstallCoordination : public InstallCoordination {
   std::vector<std::shared_ptr<FakeOutOfBandTransferPromise>> outOfBandPromises_;
   std::vector<std::shared_ptr<FakeInstallPlaceholder>> placeholders_;
   std::vector<Listener*> listeners_;
+  std::deque<PendingEvent> pending_;
   const CoordinatorObserver* delivering_ = nullptr;
+  bool holdsUninstalls_ = false;
+  std::vector<Completion> heldCompletions_;
   EventThread events_;  // last: its events use all of the above
 };
 

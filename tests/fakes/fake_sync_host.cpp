@@ -16,6 +16,10 @@ void FakeSyncHostService::prioritizeAsset(
   {
     const std::scoped_lock lock(mutex_);
     prioritized_.push_back(asset);
+    if (holdsCompletions_) {
+      heldCompletions_.push_back(std::move(completion));
+      return;
+    }
     error = prioritizeError_;
   }
   completion(error);
@@ -46,6 +50,18 @@ void FakeSyncHostService::setSupportsCancel(bool supported) {
 void FakeSyncHostService::setPrioritizeError(std::optional<Error> error) {
   const std::scoped_lock lock(mutex_);
   prioritizeError_ = std::move(error);
+}
+
+void FakeSyncHostService::holdCompletions() {
+  const std::scoped_lock lock(mutex_);
+  holdsCompletions_ = true;
+}
+
+void FakeSyncHostService::completePrioritize(const std::optional<Error>& error) {
+  std::unique_lock lock(mutex_);
+  const auto completions = heldCompletions_;
+  lock.unlock();
+  for (const auto& completion : completions) completion(error);
 }
 
 std::vector<SyncAssetPtr> FakeSyncHostService::prioritized() const {

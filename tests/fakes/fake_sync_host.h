@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <map>
 #include <mutex>
 #include <vector>
@@ -9,7 +10,7 @@
 
 namespace appsync::fakes {
 
-/// The host's device service; completions run before the request returns.
+/// The host's device service; completions run before the request returns, unless they are held.
 class FakeSyncHostService : public SyncHostService {
  public:
   explicit FakeSyncHostService(CallTrace& trace) : trace_(trace) {}
@@ -26,6 +27,10 @@ class FakeSyncHostService : public SyncHostService {
   void setSupportsCancel(bool supported);
   /// What completions of prioritizeAsset are given.
   void setPrioritizeError(std::optional<Error> error);
+  /// From now on completions are called only by completePrioritize.
+  void holdCompletions();
+  /// Calls all completions that are held; they stay, and can be called again.
+  void completePrioritize(const std::optional<Error>& error);
   std::vector<SyncAssetPtr> prioritized() const;
   std::vector<SyncAssetPtr> canceled() const;
 
@@ -35,6 +40,8 @@ class FakeSyncHostService : public SyncHostService {
   bool supportsPrioritize_ = true;
   bool supportsCancel_ = true;
   std::optional<Error> prioritizeError_;
+  bool holdsCompletions_ = false;
+  std::vector<std::function<void(const std::optional<Error>&)>> heldCompletions_;
   std::vector<SyncAssetPtr> prioritized_;
   std::vector<SyncAssetPtr> canceled_;
 };
