@@ -233,6 +233,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   std::set<std::string> _updatingApps;
   std::set<std::string> _userCancelledApps;
   std::unique_ptr<CoordinatorEventListener> _appInstallObserver;
+  /// Start-up may be announced on several threads at once.
+  std::mutex _startUpMutex;
 
   /// Retries that wait for their delay.
   DelayedTasks _retries;

@@ -15,6 +15,7 @@ SyncAssetPtr assetNamed(SyncHost& host, std::string_view bundleId) {
 }  // namespace
 
 void AppsClient::setupInstallCoordinatorObserver() {
+  const std::lock_guard lock(_startUpMutex);
   if (_appInstallObserver) return;
   _appInstallObserver = _platform.installCoordination.createEventListener(
       EventServiceName, {SyncHostClientID}, *this);

@@ -192,17 +192,6 @@ TEST_F(SyncEndTest, ASuccessfulSyncCancelsNothing) {
   EXPECT_EQ(phone.trace.log(), Trace{});
 }
 
-/// Keeps the completion of an uninstall for a later moment.
-class LateCoordination : public FakeInstallCoordination {
- public:
-  using FakeInstallCoordination::FakeInstallCoordination;
-  void uninstallApp(std::string_view, bool,
-                    std::function<void(const std::optional<Error>&)> completion) noexcept override {
-    complete = std::move(completion);
-  }
-  std::function<void(const std::optional<Error>&)> complete;
-};
-
 class CoordinatedUninstallTest : public CoordinationTest {
  protected:
   Trace uninstall() {
@@ -230,34 +219,6 @@ TEST_F(CoordinatedUninstallTest, AFailureIsLoggedInTheSameWordsButRecordedAsFail
                           said("Uninstall of com.a with install coordinator succeeded wiht error "
                                "Error Domain=Fault Code=7."),
                           R"(transaction step 7 party 1 phase 2 failed com.a "Uninstall app")"));
-}
-
-TEST_F(CoordinatedUninstallTest, MayEndAfterTheClientIsGone) {
-  LateCoordination late(phone.trace, phone.faults, phone.appRegistry);
-  const Platform all = phone.platform();
-  const Platform platform{all.log,
-                          all.files,
-                          all.appRegistry,
-                          late,
-                          all.installerService,
-                          all.backupManager,
-                          all.devicePolicy,
-                          all.homeScreen,
-                          all.iconRenderer,
-                          all.imageEncoders,
-                          all.transactionLog,
-                          all.systemNotifier,
-                          all.syncHost,
-                          all.backgroundQueue};
-  client = std::make_unique<AppsClient>(platform);
-  client->uninstallAppUsingCoordination("com.a");
-  client = nullptr;
-  forget();
-  late.complete(std::nullopt);
-  EXPECT_THAT(effects(),
-              ElementsAre(said("Uninstall of com.a with install coordinator succeeded wiht error "
-                               "(null)."),
-                          R"(transaction step 7 party 1 phase 2 ok com.a "Uninstall app")"));
 }
 
 }  // namespace
