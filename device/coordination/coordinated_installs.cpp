@@ -112,9 +112,12 @@ void CoordinatedInstalls::tidyUp(const std::string& identifier) {
   for (const PlaceholderRow& placeholder : left.placeholders) {
     const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
     core_.registry().uninstallApplication(identifier, options);
-    core_.change([&](SQLite::Database& database,
-                     Consequences&) { setPresence(database, placeholder, Presence::None); },
-                 nullptr);
+    core_.change(
+        [&](SQLite::Database& database, Consequences&) {
+          if (findApplication(database, identifier).placeholder) return;
+          setPresence(database, placeholder, Presence::None);
+        },
+        nullptr);
   }
   FileManager& files = core_.device().files;
   for (PromiseRow& package : left.packages) {
@@ -205,18 +208,19 @@ bool CoordinatedInstalls::installPackage(const CoordinatorState& state) {
     const std::lock_guard lock(mutex_);
     waiting_.erase(identifier);
   }
-  if (!begin(state)) return true;
-  adoptOptions(state);
+  const Beginning beginning = begin(state);
+  if (beginning != Beginning::Made) return beginning == Beginning::NotReady;
   const PropertyList::Dictionary options{{std::string(SWPackageTypeKey), SWPackageTypeCustomer},
                                          {std::string(KBBundleIdentifier), identifier}};
   std::optional<Error> error;
   const FileLocation package{*state.package->path, state.package->pathIsDirectory};
-  if (core_.registry().installApplication(package, options, &error)) error.reset();
-  finish(state, error);
+  const bool installed =
+      adoptOptions(state, &error) && core_.registry().installApplication(package, options, &error);
+  finish(state, installed ? std::nullopt : error);
   return false;
 }
 
-bool CoordinatedInstalls::begin(const CoordinatorState& state) {
+CoordinatedInstalls::Beginning CoordinatedInstalls::begin(const CoordinatorState& state) {
   bool ready = false;
   const bool begun = core_.change(
       [&](SQLite::Database& database, Consequences&) {
@@ -228,14 +232,15 @@ bool CoordinatedInstalls::begin(const CoordinatorState& state) {
         put(database, *row);
       },
       nullptr);
-  return begun && ready;
+  if (!begun) return Beginning::Failed;
+  return ready ? Beginning::Made : Beginning::NotReady;
 }
 
-void CoordinatedInstalls::adoptOptions(const CoordinatorState& state) {
+bool CoordinatedInstalls::adoptOptions(const CoordinatorState& state, std::optional<Error>* error) {
   const auto options = optionsFrom(*state.coordinator.options);
-  if (!options) return;
+  if (!options) return true;
   std::string container;
-  core_.change(
+  const bool adopted = core_.change(
       [&](SQLite::Database& database, Consequences&) {
         auto row = findApplication(database, state.coordinator.identifier).placeholder;
         if (!row) return;
@@ -244,12 +249,13 @@ void CoordinatedInstalls::adoptOptions(const CoordinatorState& state) {
         if (options->sinfData) row->sinf = options->sinfData;
         putApplication(database, *row);
       },
-      nullptr);
+      error);
   const std::optional<Bytes> metadata = metadataFile(options->storeMetadata);
-  if (container.empty() || !metadata) return;
+  if (!adopted || container.empty() || !metadata) return adopted;
   FileManager& files = core_.device().files;
   const std::string file = joinPath(container, MetadataFile);
   if (!files.fileExists(file)) files.writeAtomically(file, *metadata);
+  return true;
 }
 
 void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optional<Error>& error) {

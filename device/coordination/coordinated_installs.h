@@ -39,10 +39,11 @@ class CoordinatedInstalls {
   void copyIcon(const CoordinatorState& state, const std::string& bundle);
   bool installBundle(const CoordinatorState& state, const std::string& bundle,
                      std::optional<Error>* error);
-  /// Marks the package as being installed; false when the coordinator is not ready any more.
-  bool begin(const CoordinatorState& state);
+  enum class Beginning { Made, NotReady, Failed };
+  /// Marks the package as being installed, unless the coordinator is not ready any more.
+  Beginning begin(const CoordinatorState& state);
   /// Gives the placeholder what the options say of the package that takes its place.
-  void adoptOptions(const CoordinatorState& state);
+  bool adoptOptions(const CoordinatorState& state, std::optional<Error>* error);
   void finish(const CoordinatorState& state, const std::optional<Error>& error);
 
   /// Comes back later; an error when that is not to be.

@@ -43,11 +43,13 @@ CoordinationCore::~CoordinationCore() {
 }
 
 void CoordinationCore::start() {
-  const Consequences left = repairCoordination(device_);
-  for (const std::string& identifier : left.over) installs_.tidyUp(identifier);
-  sweepCoordination(device_);
+  const std::optional<Consequences> left = repairCoordination(device_);
+  if (left) {
+    for (const std::string& identifier : left->over) installs_.tidyUp(identifier);
+    sweepCoordination(device_);
+  }
   events_.start();
-  apply({left.ready, {}, true});
+  if (left) apply({left->ready, {}, true});
 }
 
 void CoordinationCore::tidyUp(const std::string& identifier) {
@@ -182,12 +184,6 @@ bool CoordinationCore::cancelPlaceholder(std::int64_t number, const Error& reaso
   return changed && cancelled;
 }
 
-std::optional<CoordinatorRow> CoordinationCore::coordinator(std::int64_t number) {
-  std::optional<CoordinatorRow> row;
-  read([&](SQLite::Database& database) { row = findCoordinator(database, number); });
-  return row;
-}
-
 std::optional<PromiseRow> CoordinationCore::promise(std::int64_t number) {
   std::optional<PromiseRow> row;
   read([&](SQLite::Database& database) { row = findPromise(database, number); });
@@ -213,8 +209,10 @@ void CoordinationCore::showProgress(const PromiseRow& promise) {
 
 std::shared_ptr<CoordinatorHandle> CoordinationCore::handleOf(const CoordinatorRow& row) {
   const std::lock_guard lock(mutex_);
-  return shared(coordinators_, row.number,
-                [&] { return std::make_shared<CoordinatorHandle>(gate_, row); });
+  const auto handle = shared(coordinators_, row.number,
+                             [&] { return std::make_shared<CoordinatorHandle>(gate_, row); });
+  if (!row.isLive()) handle->settle(row);
+  return handle;
 }
 
 std::shared_ptr<PathPromiseHandle> CoordinationCore::handleOf(const PromiseRow& row) {

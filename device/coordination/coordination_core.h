@@ -67,7 +67,6 @@ class CoordinationCore {
   bool cancelPromise(std::int64_t number, const Error& reason, CoordinationClientId client);
   bool cancelPlaceholder(std::int64_t number, const Error& reason, CoordinationClientId client);
 
-  std::optional<CoordinatorRow> coordinator(std::int64_t number);
   std::optional<PromiseRow> promise(std::int64_t number);
 
   /// Runs work in one transaction and then does what follows from it.

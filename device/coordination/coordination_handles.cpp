@@ -108,10 +108,22 @@ bool PlaceholderHandle::cancel(const Error& reason, CoordinationClientId client)
   });
 }
 
-CoordinatorRow CoordinatorHandle::row() const {
-  return with(CoordinatorRow(), [&](CoordinationCore& core) {
-    return core.coordinator(number()).value_or(CoordinatorRow());
+void CoordinatorHandle::settle(const CoordinatorRow& row) {
+  const std::lock_guard lock(mutex_);
+  settled_ = row;
+}
+
+std::optional<CoordinatorRow> CoordinatorHandle::find(std::optional<Error>* error) const {
+  {
+    const std::lock_guard lock(mutex_);
+    if (settled_) return settled_;
+  }
+  std::optional<CoordinatorRow> row;
+  with(false, [&](CoordinationCore& core) {
+    return core.read([&](SQLite::Database& database) { row = findCoordinator(database, number()); },
+                     error);
   });
+  return row;
 }
 
 bool CoordinatorHandle::change(const CoordinationCore::CoordinatorChange& change,
@@ -122,10 +134,11 @@ bool CoordinatorHandle::change(const CoordinationCore::CoordinatorChange& change
 }
 
 std::optional<Error> CoordinatorHandle::error() const {
-  const std::optional<Bytes> bytes = row().error;
-  if (!bytes) return std::nullopt;
+  std::optional<Error> failure;
+  const std::optional<CoordinatorRow> found = find(&failure);
+  if (!found || !found->error) return failure;
   // One that cannot be read is an error all the same.
-  return errorFrom(*bytes).value_or(Error::posix(EIO));
+  return errorFrom(*found->error).value_or(Error::posix(EIO));
 }
 
 void CoordinatorHandle::setObserver(CoordinatorObserver* observer) noexcept {

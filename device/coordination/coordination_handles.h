@@ -131,12 +131,19 @@ class CoordinatorHandle final : public InstallCoordinator, public ServiceObject 
   bool cancel(const Error& reason, CoordinationClientId client) noexcept override;
   std::string description() const override { return "<Coordinator " + identifier_ + ">"; }
 
+  /// Tells how the coordinator ended, so that it need not be read any more.
+  void settle(const CoordinatorRow& row);
+
  private:
-  CoordinatorRow row() const;
+  /// nullopt when there is none any more, or when it cannot be read (then with an error).
+  std::optional<CoordinatorRow> find(std::optional<Error>* error) const;
+  CoordinatorRow row() const { return find(nullptr).value_or(CoordinatorRow()); }
   bool change(const CoordinationCore::CoordinatorChange& change, std::optional<Error>* error);
 
   const std::string identifier_;
   const CoordinationClientId creator_;
+  mutable std::mutex mutex_;
+  std::optional<CoordinatorRow> settled_;  ///< guarded by mutex_
 };
 
 }  // namespace appsync::device

@@ -128,7 +128,7 @@ class Repair {
 
 }  // namespace
 
-Consequences repairCoordination(DeviceCore& device) {
+std::optional<Consequences> repairCoordination(DeviceCore& device) {
   // Bundles that were being built.
   if (device.files.fileExists(PlaceholderBundles)) device.files.removeItem(PlaceholderBundles);
   Consequences consequences;
@@ -140,7 +140,7 @@ Consequences repairCoordination(DeviceCore& device) {
                                for (CoordinatorRow& row : allCoordinators(database))
                                  repair.run(std::move(row));
                              });
-  if (!repaired) return {};
+  if (!repaired) return std::nullopt;
   for (const std::string& text : notes) {
     device.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default, text);
   }
@@ -159,20 +159,27 @@ void sweepCoordination(DeviceCore& device) {
             .run();
         Query(database,
               "DELETE FROM install_coordinators WHERE stage NOT IN (0, 1) "
-              "AND number NOT IN (SELECT coordinator FROM coordinator_events)")
+              "AND number NOT IN (SELECT coordinator FROM coordinator_events) "
+              "AND number NOT IN (SELECT c.number FROM install_coordinators c "
+              "JOIN install_placeholders p ON p.number = c.placeholder "
+              "WHERE c.error IS NOT NULL AND p.presence <> 0) "
+              "AND number NOT IN (SELECT c.number FROM install_coordinators c "
+              "JOIN data_promises p ON p.number = c.package_promise "
+              "WHERE p.complete AND p.path IS NOT NULL)")
             .run();
         Query(database,
               "DELETE FROM install_placeholders WHERE number NOT IN (SELECT placeholder "
-              "FROM install_coordinators WHERE stage IN (0, 1) AND placeholder IS NOT NULL)")
+              "FROM install_coordinators WHERE placeholder IS NOT NULL)")
             .run();
         // The initial promises' numbers are in a property list; those that are over are not needed.
         Query(database,
-              "DELETE FROM data_promises WHERE over OR number NOT IN ("
-              "SELECT package_promise FROM install_coordinators WHERE package_promise IS NOT NULL "
-              "UNION SELECT user_data_promise FROM install_coordinators "
+              "DELETE FROM data_promises WHERE number NOT IN (SELECT package_promise "
+              "FROM install_coordinators WHERE package_promise IS NOT NULL) "
+              "AND (over OR number NOT IN ("
+              "SELECT user_data_promise FROM install_coordinators "
               "WHERE user_data_promise IS NOT NULL "
               "UNION SELECT icon_promise FROM install_placeholders "
-              "WHERE icon_promise IS NOT NULL)")
+              "WHERE icon_promise IS NOT NULL))")
             .run();
       });
 }

@@ -6,6 +6,12 @@
 #include "device/coordination/coordination_values.h"
 
 namespace appsync::device {
+namespace {
+
+/// Until events that could not be read are looked for again.
+constexpr std::chrono::milliseconds RetryDelay{200};
+
+}  // namespace
 
 EventDelivery::EventDelivery(Database& database, Coordinators coordinators)
     : database_(database), coordinators_(std::move(coordinators)) {}
@@ -81,11 +87,11 @@ void EventDelivery::removeListener(std::uint64_t listener) {
 }
 
 bool EventDelivery::isBusy(std::string_view identifier) {
-  const std::vector<EventRow> events = pending();
+  const auto events = pending();
   const std::lock_guard lock(mutex_);
-  return std::ranges::any_of(events, [&](const EventRow& event) {
-    return event.coordinator.identifier == identifier && receiver(event.coordinator);
-  });
+  return events && std::ranges::any_of(*events, [&](const EventRow& event) {
+           return event.coordinator.identifier == identifier && receiver(event.coordinator);
+         });
 }
 
 CoordinatorObserver* EventDelivery::receiver(const CoordinatorRow& coordinator) const {
@@ -103,6 +109,7 @@ void EventDelivery::waitUntilReturned(const CoordinatorObserver* observer, Lock&
 }
 
 void EventDelivery::run() {
+  bool readable = true;
   Lock lock(mutex_);
   while (true) {
     if (!tasks_.empty()) {
@@ -117,17 +124,22 @@ void EventDelivery::run() {
     } else if (checkDue_) {
       checkDue_ = false;
       lock.unlock();
-      deliverAll();
+      readable = deliverAll();
       lock.lock();
+    } else if (!readable) {
+      changed_.wait_for(lock, RetryDelay);
+      checkDue_ = true;
     } else {
       changed_.wait(lock);
     }
   }
 }
 
-void EventDelivery::deliverAll() {
+bool EventDelivery::deliverAll() {
+  const auto events = pending();
+  if (!events) return false;
   std::set<std::int64_t> passedOver;  // so that a coordinator's events stay in their order
-  for (const EventRow& event : pending()) {
+  for (const EventRow& event : *events) {
     const std::int64_t coordinator = event.coordinator.number;
     if (!passedOver.contains(coordinator) && deliver(event)) {
       remove(event);
@@ -135,12 +147,15 @@ void EventDelivery::deliverAll() {
       passedOver.insert(coordinator);
     }
   }
+  return true;
 }
 
-std::vector<EventRow> EventDelivery::pending() {
+std::optional<std::vector<EventRow>> EventDelivery::pending() {
   std::vector<EventRow> events;
-  database_.read("the events of install coordinators could not be read",
-                 [&](SQLite::Database& database) { events = pendingEvents(database); });
+  const bool read =
+      database_.read("the events of install coordinators could not be read",
+                     [&](SQLite::Database& database) { events = pendingEvents(database); });
+  if (!read) return std::nullopt;
   const std::lock_guard lock(mutex_);
   std::erase_if(events, [&](const EventRow& event) { return delivered_.contains(event.number); });
   return events;

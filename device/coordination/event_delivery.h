@@ -6,6 +6,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <set>
 #include <thread>
 #include <vector>
@@ -17,7 +18,8 @@ namespace appsync::device {
 /// The service thread: delivers the stored events, one after another, to their coordinator's
 /// observer or else to a listener for its creator. An event goes out of the store when its receiver
 /// has returned, so that a process that dies meanwhile delivers it anew; one that nobody is there
-/// for stays. Thread-safe; no lock is held during a delivery.
+/// for stays. What cannot be read is tried again later. Thread-safe; no lock is held during a
+/// delivery.
 class EventDelivery {
  public:
   /// Gives the coordinator that an event shows.
@@ -54,11 +56,13 @@ class EventDelivery {
   using Lock = std::unique_lock<std::mutex>;
 
   void run();
-  void deliverAll();
+  /// False when the events could not be read.
+  bool deliverAll();
   bool deliver(const EventRow& event);
   void send(const EventRow& event, CoordinatorObserver& observer);
   void remove(const EventRow& event);
-  std::vector<EventRow> pending();
+  /// nullopt when they cannot be read.
+  std::optional<std::vector<EventRow>> pending();
   /// The lock is held.
   CoordinatorObserver* receiver(const CoordinatorRow& coordinator) const;
   void waitUntilReturned(const CoordinatorObserver* observer, Lock& lock);

@@ -95,8 +95,9 @@ void DeviceInstallCoordination::removeObserver(CoordinatorObserver* observer) no
 }
 
 std::int64_t DeviceInstallCoordination::enterPromise(PromiseRow& row) {
-  core_.change([&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
-  return row.number;
+  const bool entered =
+      core_.change([&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
+  return entered ? row.number : 0;
 }
 
 std::shared_ptr<PathTransferPromise> DeviceInstallCoordination::createPathTransferPromise(
@@ -149,16 +150,16 @@ void DeviceInstallCoordination::uninstallApp(
                                                 fmt::format("{} was uninstalled", identifier));
     bool ended = false;
     bool placeholderOnly = false;
-    core_.change(
+    std::optional<Error> error;
+    const bool changed = core_.change(
         [&](SQLite::Database& database, Consequences& consequences) {
           placeholderOnly = findApplication(database, identifier).placeholder.has_value();
           const auto live = findLiveCoordinator(database, identifier);
           ended = live && cancel(database, *live, reason, DeviceClientID, consequences);
         },
-        nullptr);
+        &error);
     // What a coordinator brought went with it; an installed version below it stays.
-    std::optional<Error> error;
-    {
+    if (changed) {
       const KeyedMutex::Guard guard(core_.device().applicationLocks, identifier);
       removeForClient(core_.device(), identifier, placeholderOnly, &error);
     }

@@ -71,6 +71,7 @@ class DeviceInstallCoordination final : public InstallCoordination {
   void hurry() noexcept { core_.hurry(); }
 
  private:
+  /// The row's number; 0 when it could not be entered.
   std::int64_t enterPromise(PromiseRow& row);
 
   CoordinationCore core_;

@@ -4,12 +4,8 @@
 
 #include <set>
 
-#include "device/app_registry.h"
-#include "device/device_folder.h"
-#include "device/installs.h"
-#include "device/log_files.h"
-#include "device/schema.h"
 #include "platform/bundle.h"
+#include "tests/device/device_parts.h"
 #include "tests/device/device_test.h"
 
 namespace appsync::device {
@@ -93,11 +89,10 @@ class FusedFiles final : public FileManager {
 /// it is made).
 class FusedDevice {
  public:
-  FusedDevice(const fs::path& folder, int steps) : fuse_(steps), paths_(folder) {
-    DeviceError problem;
-    database_ = openDatabase(paths_.folder, paths_.database, Access::Write, log_, problem);
-    if (!database_) _exit(1);
-    database_->read("", [&](SQLite::Database& connection) {
+  FusedDevice(const fs::path& folder, int steps)
+      : fuse_(steps),
+        parts_(folder, [this](auto& files) { return std::make_unique<FusedFiles>(files, fuse_); }) {
+    parts_.database().read("", [&](SQLite::Database& connection) {
       sqlite3_commit_hook(
           connection.getHandle(),
           [](void* fuse) {
@@ -106,26 +101,12 @@ class FusedDevice {
           },
           &fuse_);
     });
-    core_.emplace(DeviceCore{*database_, files_, handles_, containers_, log_, observers_, watcher_,
-                             foreground_, locks_});
-    registry_.emplace(*core_);
   }
-  DeviceAppRegistry& registry() { return *registry_; }
+  DeviceAppRegistry& registry() { return parts_.registry(); }
 
  private:
   Fuse fuse_;
-  DevicePaths paths_;
-  LogFiles log_{paths_.log, true};
-  std::unique_ptr<Database> database_;
-  ConfinedFileManager handles_{paths_.root};
-  FusedFiles files_{handles_, fuse_};
-  Containers containers_{files_, handles_, log_};
-  RegistryObservers observers_{[this] { return reportInstalls(*database_); }};
-  WatcherSlot watcher_;
-  Foreground foreground_{paths_.foreground};
-  KeyedMutex locks_;
-  std::optional<DeviceCore> core_;
-  std::optional<DeviceAppRegistry> registry_;
+  DeviceParts parts_;
 };
 
 class CrashTest : public DeviceTest {

@@ -1,6 +1,7 @@
 #include "tests/device/temporary_folder.h"
 
 #include <stdlib.h>
+#include <unistd.h>
 
 #include <cstdio>
 #include <fstream>
@@ -11,8 +12,8 @@ namespace appsync::device::testing {
 
 namespace fs = std::filesystem;
 
-TemporaryFolder::TemporaryFolder() {
-  std::string pattern = (fs::temp_directory_path() / "appsync-test-XXXXXX").string();
+TemporaryFolder::TemporaryFolder(const fs::path& parent) {
+  std::string pattern = (parent / "appsync-test-XXXXXX").string();
   if (!::mkdtemp(pattern.data())) throw std::runtime_error("cannot make " + pattern);
   path_ = pattern;
 }
@@ -20,6 +21,11 @@ TemporaryFolder::TemporaryFolder() {
 TemporaryFolder::~TemporaryFolder() {
   std::error_code ignored;
   fs::remove_all(path_, ignored);
+}
+
+fs::path memoryFolder() {
+  constexpr char Memory[] = "/dev/shm";
+  return ::access(Memory, W_OK) == 0 ? fs::path(Memory) : fs::temp_directory_path();
 }
 
 void putFile(const fs::path& path, std::string_view contents) {

@@ -10,7 +10,8 @@ namespace appsync::device::testing {
 /// A new empty folder that disappears with the object.
 class TemporaryFolder {
  public:
-  TemporaryFolder();
+  explicit TemporaryFolder(
+      const std::filesystem::path& parent = std::filesystem::temp_directory_path());
   ~TemporaryFolder();
   TemporaryFolder(const TemporaryFolder&) = delete;
   TemporaryFolder& operator=(const TemporaryFolder&) = delete;
@@ -21,6 +22,9 @@ class TemporaryFolder {
  private:
   std::filesystem::path path_;
 };
+
+/// For what would wait for the disk thousands of times and shows nothing that needs one.
+std::filesystem::path memoryFolder();
 
 /// Makes missing folders on the way.
 void putFile(const std::filesystem::path& path, std::string_view contents);
