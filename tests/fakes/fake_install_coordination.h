@@ -74,7 +74,7 @@ class FakeInstallCoordination : public InstallCoordination, private CoordinatorO
   // Events go to the coordinator's observer if one is set, else to a listener for its creator.
   void fireDidBeginFulfillment(FakeInstallCoordinator& coordinator, std::uint64_t promise);
   void fireDidInstallPlaceholder(FakeInstallCoordinator& coordinator);
-  /// With an error the coordinator carries it from now on.
+  /// The coordinator is over, and carries the error.
   void fireDidComplete(FakeInstallCoordinator& coordinator, std::optional<Error> error = {});
   void fireShouldPrioritize(FakeInstallCoordinator& coordinator);
   void fireCanceled(FakeInstallCoordinator& coordinator, const Error& reason,
