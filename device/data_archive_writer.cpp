@@ -41,16 +41,21 @@ class DataArchiveWriter {
 
   // Each returns false once there is an error.
 
-  bool fail(int reason, std::string_view path = {}) {
-    if (!error_) error_ = Error::posix(reason, path);
-    // Freeing the archive must not write an end to it.
-    if (archive_) ::archive_write_fail(archive_.get());
+  bool fail(int reason, std::string_view path = {}) { return fail(Error::posix(reason, path)); }
+
+  bool fail(Error error) {
+    if (!error_) error_ = std::move(error);
     return false;
+  }
+
+  bool failChanged(std::string_view path) {
+    return fail(Error::withDescription(POSIXErrorDomain, EBUSY,
+                                       std::string(path) + " changed while it was being saved"));
   }
 
   /// A warning tells that something would not come back as it was.
   bool check(int status, std::string_view path = {}) {
-    return status == ARCHIVE_OK || fail(EIO, path);
+    return (status == ARCHIVE_OK && !error_) || fail(EIO, path);
   }
 
   /// Not before the first entry: empty data has no archive.
@@ -65,16 +70,16 @@ class DataArchiveWriter {
     ::archive_write_set_bytes_per_block(archive_.get(), BlockSize);
     ::archive_write_set_bytes_in_last_block(archive_.get(), 1);
     const auto pass = [](archive*, void* self, const void* bytes, std::size_t size) -> la_ssize_t {
-      return static_cast<DataArchiveWriter*>(self)->pass(bytes, size);
+      static_cast<DataArchiveWriter*>(self)->pass(bytes, size);
+      return static_cast<la_ssize_t>(size);
     };
     return check(::archive_write_open(archive_.get(), this, nullptr, pass, nullptr));
   }
 
-  la_ssize_t pass(const void* bytes, std::size_t size) {
-    if (error_) return static_cast<la_ssize_t>(size);
-    if (sink_({static_cast<const std::byte*>(bytes), size})) return static_cast<la_ssize_t>(size);
-    error_ = Error::posix(ECANCELED);
-    return -1;
+  /// The library never hears of a failure, since it would not free all it has then. What it still
+  /// writes after one, up to an end, goes nowhere.
+  void pass(const void* bytes, std::size_t size) {
+    if (!error_ && !sink_({static_cast<const std::byte*>(bytes), size})) fail(ECANCELED);
   }
 
   bool addHeader(const std::string& path, const struct stat& status,
@@ -116,7 +121,7 @@ class DataArchiveWriter {
         ::openat(directory, name.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC | kind));
     const mode_t seen = status.st_mode & S_IFMT;
     if (!item || ::fstat(item.get(), &status) != 0) return fail(errno, path);
-    if ((status.st_mode & S_IFMT) != seen) return fail(EBUSY, path);  // changed meanwhile
+    if ((status.st_mode & S_IFMT) != seen) return failChanged(path);
     if (S_ISREG(seen)) return addHeader(path, status) && addContents(item.get(), path, status);
     return addHeader(path + "/", status) && addFolder(item.get(), path + "/", depth);
   }
@@ -137,9 +142,10 @@ class DataArchiveWriter {
       const ssize_t count = ::read(file, buffer_.data(), std::min<std::uint64_t>(left, BlockSize));
       if (count < 0 && errno == EINTR) continue;
       if (count < 0) return fail(errno, path);
-      if (count == 0) return fail(EBUSY, path);  // got shorter meanwhile
+      if (count == 0) return failChanged(path);
       const auto size = static_cast<std::size_t>(count);
-      if (::archive_write_data(archive_.get(), buffer_.data(), size) != count) return fail(EIO);
+      const la_ssize_t written = ::archive_write_data(archive_.get(), buffer_.data(), size);
+      if (!check(written == count ? ARCHIVE_OK : ARCHIVE_FATAL, path)) return false;
       left -= size;
     }
     return true;

@@ -181,12 +181,14 @@ class FolderWriter final : public BackupWriter {
  private:
   using Entries = std::map<std::string, ManifestEntry, std::less<>>;
 
-  /// Always false.
-  bool fail(const std::string& item, int errnoValue) {
+  // Both are always false.
+
+  bool fail(const std::string& item, int errnoValue) { return fail(item, systemText(errnoValue)); }
+
+  bool fail(const std::string& item, const std::string& reason) {
     if (!problem_.empty()) return false;
     const fs::path path = item.empty() ? target_.path : target_.path / item;
-    problem_ = fmt::format("cannot write the backup {}: {}", printable(path.string()),
-                           systemText(errnoValue));
+    problem_ = fmt::format("cannot write the backup {}: {}", printable(path.string()), reason);
     return false;
   }
 
@@ -229,7 +231,8 @@ class FolderWriter final : public BackupWriter {
     const std::string name = target_.name();
     if (target_.replaces) {
       if (::renameat2(parent, unfinished_.c_str(), parent, name.c_str(), RENAME_EXCHANGE) != 0) {
-        return fail("", errno);
+        if (errno != EINVAL) return fail("", errno);
+        return fail("", "the file system cannot exchange folders; name a new folder");
       }
     } else if (::renameat(parent, unfinished_.c_str(), parent, name.c_str()) != 0) {
       return fail("", errno);  // something has come there meanwhile
