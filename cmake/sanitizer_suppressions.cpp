@@ -1,4 +1,4 @@
-// What the sanitizers misunderstand of the libraries that draw text; goes into every program of a
+// What the sanitizers misunderstand of other people's libraries; goes into every program of a
 // sanitizer's build that links them.
 #define SANITIZER_HOOK extern "C" [[gnu::visibility("default")]] const char*
 
@@ -22,5 +22,7 @@ const char* __tsan_default_suppressions() {
          "called_from_lib:libglib-2.0.so\n"
          "called_from_lib:libpango-1.0.so\n"
          "called_from_lib:libpangoft2-1.0.so\n"
-         "called_from_lib:libpangocairo-1.0.so\n";
+         "called_from_lib:libpangocairo-1.0.so\n"
+         // The C library's time zone has a lock of its own, which the sanitizer does not see.
+         "race:tzset_internal\n";
 }

@@ -68,7 +68,7 @@ bool Restore::callClient(const RestoreInput& input) {
   }
   client_.reconcileRestoreOfType(FromDesktopBackup, &error);
   waitUntilIdle(phone_, handover_.listed);
-  claimDownloads(phone_.apps);
+  claimDownloads(phone_.apps, {});
   reportPlaceholders(input.list);
   transfer(input);
   return !interruption_.requested();

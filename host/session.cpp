@@ -7,6 +7,7 @@
 #include <thread>
 
 #include "host/staging.h"
+#include "host/store.h"
 #include "host/text.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
@@ -121,6 +122,7 @@ bool Session::reconcile(const SyncInput& input) {
 
 bool Session::transfer(const SyncPlan& plan, PackageSender& sender) {
   if (!interruption_.requested()) {
+    claimDownloads(phone_.apps, identifiersOf(plan));
     const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
     if (phone_.coordination) findCoordinators(assets);
     sender.send(assets);

@@ -7,10 +7,10 @@
 
 namespace appsync::host {
 
-void claimDownloads(AppRegistry& apps) {
+void claimDownloads(AppRegistry& apps, const std::set<std::string>& except) {
   for (const auto& item : applicationsPresent(apps).placeholders) {
     const AppRecord& record = item.second;
-    if (record.installType != InstallType::StoreDownload) continue;
+    if (record.installType != InstallType::StoreDownload || except.contains(item.first)) continue;
     if (const auto progress = apps.installProgressSync(record)) {
       progress->setInstallState(InstallState::Active);
     }

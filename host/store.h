@@ -14,10 +14,10 @@
 
 namespace appsync::host {
 
-/// Shows the store's downloads as under way, which they are once a person has asked for them: the
-/// client asks the host for the package of every other placeholder, and takes it away when the host
-/// has none.
-void claimDownloads(AppRegistry& apps);
+/// Shows the store's downloads but `except` as under way, which they are once a person has asked
+/// for them: the client asks the host for the package of every other placeholder, and takes it away
+/// when the host has none.
+void claimDownloads(AppRegistry& apps, const std::set<std::string>& except);
 
 /// The store: brings the packages of applications that have only a placeholder, from a catalogue.
 ///

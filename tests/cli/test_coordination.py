@@ -102,12 +102,19 @@ class Demotion(support.Case):
         self.assertEqual(self.json_lines("tap", "com.a"),
                          [{"event": "tapped", "identifier": "com.a"}])
         self.run_appsync("demote", "com.a", code=1)
+        self.offer("com.b")
+        (self.library / "com.a.zip").rename(self.folder / "com.a.zip")
+        self.sync()
+        self.assertEqual(self.apps(), {"com.a?": "1.0", "com.b": "1.0"})
 
     def test_a_demoted_application_can_be_asked_for(self):
         self.check_demoted_application()
 
     def test_a_demoted_application_can_be_asked_for_where_installs_are_coordinated(self):
         self.check_demoted_application("--coordination", "on")
+        (self.folder / "com.a.zip").rename(self.library / "com.a.zip")
+        self.sync("--install", "com.a")
+        self.assertEqual(self.apps(), {"com.a": "1.0", "com.b": "1.0"})
 
 
 class Refusals(support.Case):

@@ -229,7 +229,7 @@ TEST_F(StoreTest, ClaimsOnlyWhatWasAskedForOfIt) {
   seedRestoring("com.b");
   seedRestoring("com.without-progress", InstallType::StoreDownload);
   phone.appRegistry.dropProgress("com.without-progress");
-  claimDownloads(phone.appRegistry);
+  claimDownloads(phone.appRegistry, {});
   EXPECT_EQ(phone.appRegistry.progress("com.asked")->installState(), InstallState::Active);
   EXPECT_EQ(phone.appRegistry.progress("com.b")->installState(), InstallState::Waiting);
 }
