@@ -30,12 +30,24 @@ bool failWith(int reason) {
   return false;
 }
 
+/// An owner may have taken from a directory what it needs to be emptied.
+FileDescriptor openToEmpty(int directory, const std::string& name) {
+  const FileDescriptor handle(
+      ::openat(directory, name.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  struct stat status {};
+  if (handle && ::fstat(handle.get(), &status) == 0 && (status.st_mode & S_IRWXU) != S_IRWXU) {
+    // fchmod takes no handle of this sort.
+    ::chmod(("/proc/self/fd/" + std::to_string(handle.get())).c_str(), S_IRWXU);
+  }
+  return openChild(directory, name);
+}
+
 bool removeLevel(int directory, const std::string& name, int depth) {
   if (::unlinkat(directory, name.c_str(), 0) == 0) return true;
   if (errno != EISDIR && errno != EPERM) return false;
   if (depth > MaximumDepth) return failWith(ENAMETOOLONG);
   {
-    const FileDescriptor child = openChild(directory, name);
+    const FileDescriptor child = openToEmpty(directory, name);
     std::vector<std::string> names;
     if (!child || !listNames(child.get(), names)) return false;
     for (const std::string& inner : names)

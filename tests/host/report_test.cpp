@@ -107,11 +107,12 @@ TEST_F(Reporting, TellsARestoreInJson) {
 
 TEST_F(Reporting, TellsARestoreInPlainLines) {
   const PlannedEntry planned{Action::Install, "com.a", "1.0", "", "A"};
-  EXPECT_THAT(told({}, {planned, DataProgress{"com.a", "A", 5, 10}, DataEnded{"com.a", {}},
-                        PlaceholderStands{"com.a", "A", false},
-                        PlaceholderStands{"com.b", "B", true}, Notice{"by the way"}}),
-              ElementsAre("restored   A 1.0 (com.a) as a placeholder",
-                          "restored   B (com.b) as a demoted placeholder", "note       by the way"));
+  EXPECT_THAT(
+      told({}, {planned, DataProgress{"com.a", "A", 5, 10}, DataEnded{"com.a", {}},
+                PlaceholderStands{"com.a", "A", false}, PlaceholderStands{"com.b", "B", true},
+                Notice{"by the way"}}),
+      ElementsAre("restored   A 1.0 (com.a) as a placeholder",
+                  "restored   B (com.b) as a demoted placeholder", "note       by the way"));
   EXPECT_THAT(told({.verbose = true}, {DataEnded{"com.a", {}}, DataEnded{"com.b", "damaged"}}),
               ElementsAre("data       com.a"));
   const std::string text = onTerminal({DataProgress{"a", "A\x1b[2J", 5, 10}}, false);
