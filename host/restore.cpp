@@ -32,18 +32,7 @@ Restore::Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Repo
       phone_(std::move(phone)),
       reporter_(reporter),
       interruption_(interruption),
-      watch_(reporter) {
-  phone_.setWatcher(&watch_);
-  interruption_.setListener([this] {
-    reporter_.report(Interrupted{});
-    phone_.hurry();
-  });
-}
-
-Restore::~Restore() {
-  interruption_.setListener({});
-  phone_.setWatcher(nullptr);
-}
+      watch_(phone_, reporter, interruption) {}
 
 SyncResult Restore::run(const RestoreInput& input) {
   handover_ = handOver(phone_, input.backup, input.list, reporter_, interruption_);

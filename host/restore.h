@@ -5,6 +5,7 @@
 #include <set>
 #include <string>
 
+#include "host/install_watch.h"
 #include "host/library.h"
 #include "host/restore_handover.h"
 #include "host/restore_list.h"
@@ -28,9 +29,6 @@ class Restore {
  public:
   Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Reporter& reporter,
           Interruption& interruption);
-  ~Restore();
-  Restore(const Restore&) = delete;
-  Restore& operator=(const Restore&) = delete;
 
   SyncResult run(const RestoreInput& input);
 

@@ -29,27 +29,6 @@ std::set<std::string> identifiersOf(const SyncPlan& plan) {
 
 }  // namespace
 
-void InstallWatch::assertionDenied(std::string_view bundleId) noexcept {
-  reporter_.report(InstallWaiting{std::string(bundleId)});
-}
-
-void InstallWatch::installFinished(std::string_view bundleId,
-                                   const std::optional<Error>& error) noexcept {
-  const std::string identifier(bundleId);
-  std::optional<std::string> reason;
-  if (error) reason = oneLine(error->localizedDescription());
-  {
-    const std::lock_guard lock(mutex_);
-    if (reason) failures_[identifier] = *reason;
-  }
-  reporter_.report(InstallEnded{identifier, std::move(reason)});
-}
-
-std::map<std::string, std::string> InstallWatch::failures() const {
-  const std::lock_guard lock(mutex_);
-  return failures_;
-}
-
 Session::Session(SyncClient& client, TransferQueue& queue, Phone phone, Reporter& reporter,
                  Interruption& interruption)
     : client_(client),
@@ -57,18 +36,7 @@ Session::Session(SyncClient& client, TransferQueue& queue, Phone phone, Reporter
       phone_(std::move(phone)),
       reporter_(reporter),
       interruption_(interruption),
-      watch_(reporter) {
-  phone_.setWatcher(&watch_);
-  interruption_.setListener([this] {
-    reporter_.report(Interrupted{});
-    phone_.hurry();
-  });
-}
-
-Session::~Session() {
-  interruption_.setListener({});
-  phone_.setWatcher(nullptr);
-}
+      watch_(phone_, reporter, interruption) {}
 
 SyncResult Session::run(const SyncInput& input) {
   PackageSender sender(client_, queue_, phone_, reporter_, interruption_, input.library);

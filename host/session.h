@@ -2,13 +2,13 @@
 
 #include <map>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <set>
 #include <string>
 #include <vector>
 
 #include "host/events.h"
+#include "host/install_watch.h"
 #include "host/interruption.h"
 #include "host/package_sender.h"
 #include "host/phone.h"
@@ -31,31 +31,12 @@ struct SyncResult {
   bool completed = false;
 };
 
-/// Remembers why installs on the phone failed, and tells of them. Called from any thread.
-class InstallWatch : public device::DeviceWatcher {
- public:
-  explicit InstallWatch(Reporter& reporter) : reporter_(reporter) {}
-
-  void assertionDenied(std::string_view bundleId) noexcept override;
-  void installFinished(std::string_view bundleId,
-                       const std::optional<Error>& error) noexcept override;
-  std::map<std::string, std::string> failures() const;
-
- private:
-  Reporter& reporter_;
-  mutable std::mutex mutex_;
-  std::map<std::string, std::string> failures_;
-};
-
 /// One desktop sync: the client's calls in their order and the desktop's own work between them.
 /// Borrows everything; used once, by one thread.
 class Session {
  public:
   Session(SyncClient& client, TransferQueue& queue, Phone phone, Reporter& reporter,
           Interruption& interruption);
-  ~Session();
-  Session(const Session&) = delete;
-  Session& operator=(const Session&) = delete;
 
   SyncResult run(const SyncInput& input);
 
