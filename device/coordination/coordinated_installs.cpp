@@ -106,12 +106,16 @@ void CoordinatedInstalls::advance(const std::string& identifier) {
   }
 }
 
+void CoordinatedInstalls::removePlaceholder(const std::string& identifier) {
+  const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
+  core_.registry().uninstallApplication(identifier, options);
+}
+
 void CoordinatedInstalls::tidyUp(const std::string& identifier) {
   Leftovers left;
   core_.read([&](SQLite::Database& database) { left = findLeftovers(database, identifier); });
   for (const PlaceholderRow& placeholder : left.placeholders) {
-    const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
-    core_.registry().uninstallApplication(identifier, options);
+    removePlaceholder(identifier);
     core_.change(
         [&](SQLite::Database& database, Consequences&) {
           if (findApplication(database, identifier).placeholder) return;
@@ -262,6 +266,8 @@ void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optio
   if (error) {
     core_.log(fmt::format("The coordinated install of {} failed: {}", state.coordinator.identifier,
                           error->localizedDescription()));
+    // Before anybody hears of it, so that whoever does finds the phone as it is to stay.
+    removePlaceholder(state.coordinator.identifier);
   }
   // If this fails, what is still on record is carried on when the device is next opened.
   core_.change(

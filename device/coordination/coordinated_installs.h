@@ -45,6 +45,7 @@ class CoordinatedInstalls {
   /// Gives the placeholder what the options say of the package that takes its place.
   bool adoptOptions(const CoordinatorState& state, std::optional<Error>* error);
   void finish(const CoordinatorState& state, const std::optional<Error>& error);
+  void removePlaceholder(const std::string& identifier);
 
   /// Comes back later; an error when that is not to be.
   std::optional<Error> waitForForeground(const std::string& identifier);
