@@ -88,8 +88,7 @@ class PersonRacesTest : public ::testing::Test {
     input.newAnchor = "NEW";
     PlanOptions options;
     for (int number = 0; number < Applications; ++number) {
-      // No zip: reading its local times takes a lock that the thread sanitizer does not see.
-      const auto file = folder_ / (idOf(number) + "-" + version + ".tar");
+      const auto file = folder_ / (idOf(number) + "-" + version + ".zip");
       testing::packSample(file, idOf(number), version, 4000);
       options.install.push_back(idOf(number));
       input.library.packages.emplace(idOf(number),
