@@ -31,12 +31,9 @@ class HandoverInProgress {
  private:
   /// What a restore that was killed began is carried on by the phone itself.
   void look() {
-    result_.installed = applicationsPresent(phone_.apps).installed;
-    std::set<std::string> missing;
-    for (const BackedUpApplication& app : list_.applications()) {
-      if (!result_.installed.contains(app.identifier)) missing.insert(app.identifier);
-    }
-    waitUntilIdle(phone_, missing);
+    std::set<std::string> all;
+    for (const BackedUpApplication& app : list_.applications()) all.insert(app.identifier);
+    waitUntilIdle(phone_, all);
     ApplicationsPresent present = applicationsPresent(phone_.apps);
     result_.installed = std::move(present.installed);
     placeholders_ = std::move(present.placeholders);

@@ -21,6 +21,12 @@ constexpr std::chrono::milliseconds InstallPoll{10};
 
 void ignoreProgress(double) {}
 
+bool isDownloaded(const std::string& identifier, const std::vector<TodoEntry>& todo) {
+  return std::any_of(todo.begin(), todo.end(), [&](const TodoEntry& entry) {
+    return entry.identifier == identifier && entry.operation == "DOWNLOADED";
+  });
+}
+
 std::set<std::string> identifiersOf(const SyncPlan& plan) {
   std::set<std::string> identifiers;
   for (const PlannedEntry& entry : plan.entries) identifiers.insert(entry.identifier);
@@ -110,7 +116,8 @@ void Session::findCoordinators(const std::vector<SyncAssetPtr>& assets) {
   }
 }
 
-/// A completed install shows in the todo list; a cancelled one leaves no trace there.
+/// A completed install shows in the todo list; a cancelled one leaves no trace there, and one that
+/// the phone gave up stays as it is.
 bool Session::isSettled(const std::string& identifier, const std::vector<TodoEntry>& todo) {
   const auto& coordinator = coordinators_.at(identifier);
   const std::optional<Error> error = coordinator ? coordinator->error() : std::nullopt;
@@ -118,9 +125,10 @@ bool Session::isSettled(const std::string& identifier, const std::vector<TodoEnt
     cancelled_[identifier] = error ? oneLine(error->localizedDescription()) : CancelledOnPhone;
     return true;
   }
-  return std::none_of(todo.begin(), todo.end(), [&](const TodoEntry& entry) {
-    return entry.identifier == identifier && entry.operation == "DOWNLOADED";
-  });
+  if (!isDownloaded(identifier, todo)) return true;
+  if (phone_.isBusyWith(identifier)) return false;
+  // Nobody will do more for it, unless it was done since the list was read.
+  return isDownloaded(identifier, readTodoList(phone_.files, exchange::WorkArea));
 }
 
 /// Coordinators settle, and the phone removes and tidies up, after the client's calls have

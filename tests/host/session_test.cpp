@@ -1,3 +1,4 @@
+#include <atomic>
 #include <cerrno>
 #include <thread>
 
@@ -177,11 +178,16 @@ TEST_F(SessionTest, WaitsForCoordinatedInstalls) {
   coordination = true;
   client.installsAtOnce = false;
   std::thread coordinator;
+  std::atomic<bool> done = false;
   const auto set = [this](const char* operation) { putTodo({{"com.a", operation}}); };
   client.onSent = [&](const SyncAssetPtr&) {
     set("DOWNLOADED");
-    coordinator = std::thread([&] { set("INSTALLED"); });
+    coordinator = std::thread([&] {
+      set("INSTALLED");
+      done = true;
+    });
   };
+  isBusyWith = [&](std::string_view) { return coordinator.joinable() && !done; };
   makeCoordinator("com.a");
   const SyncResult result = sync();
   coordinator.join();
@@ -215,6 +221,16 @@ TEST_F(SessionTest, BeginsOnlyWhenThePhoneHasDoneWhatAKilledSyncLeft) {
   };
   EXPECT_EQ(text(sync().summary), "installed: com.a");
   EXPECT_EQ(looks, 0);
+}
+
+TEST_F(SessionTest, ACoordinatedInstallThatThePhoneGaveUpIsNotWaitedFor) {
+  offer("com.a");
+  coordination = true;
+  client.installsAtOnce = false;
+  client.onSent = [&](const SyncAssetPtr&) { putTodo({{"com.a", "DOWNLOADED"}}); };
+  makeCoordinator("com.a");
+  EXPECT_EQ(text(sync().summary),
+            "failed: com.a (the phone did not carry it out (appsync log tells more))");
 }
 
 TEST_F(SessionTest, ACoordinatedInstallThatWasCancelledIsNotWaitedFor) {
