@@ -1,5 +1,7 @@
 // Backups come back to new phones, with the real client, in both ways of installing.
 
+#include <atomic>
+
 #include "platform/property_list_codec.h"
 #include "tests/scenarios/restore_phone.h"
 #include "tests/test_pch.h"
@@ -220,8 +222,8 @@ TEST_P(RestoreScenario, InterruptionAnywhereIsMadeGood) {
   undisturbed.restore(input);
   for (int events = 0;; ++events) {
     RestoringPhone disturbed(coordination());
-    int left = events;
-    bool interrupted = false;
+    std::atomic<int> left = events;  // events come on the phone's threads too
+    std::atomic<bool> interrupted = false;
     disturbed.onEvent = [&](const Event&, Interruption& interruption) {
       if (left-- != 0) return;
       interrupted = true;
