@@ -106,6 +106,12 @@ void CommandContext::tellError(const std::string& message) {
   }
 }
 
+void CommandContext::tellIfUnseen(std::string_view work) {
+  if (out.error() != EPIPE) return;
+  err.line(
+      fmt::format("appsync: nobody reads the output any more; the {} ran to its end unseen", work));
+}
+
 int runCommandLine(int argc, char** argv) {
   // Character widths need a UTF-8 locale, whatever the person's is.
   if (!::setlocale(LC_CTYPE, "") || displayWidth("\u00e9") != 1) ::setlocale(LC_CTYPE, "C.UTF-8");

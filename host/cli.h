@@ -54,6 +54,8 @@ struct CommandContext {
   /// One line of a result: the object with --json, else the text.
   void tell(const Json& object, const std::string& text);
   void tellError(const std::string& message);
+  /// Says that the work went on when nobody read the output any more, if that is so.
+  void tellIfUnseen(std::string_view work);
 };
 
 /// What the chosen command does; it gives the exit code.

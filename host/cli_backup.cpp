@@ -1,5 +1,4 @@
 #include <CLI/CLI.hpp>
-#include <cerrno>
 
 #include "host/backup.h"
 #include "host/cli.h"
@@ -33,9 +32,7 @@ ExitCode runBackup(const std::string& folder, CommandContext& context) {
       BackupRun(loaded.client(), phone, *writer, *reporter, interruption).run();
   writer.reset();  // takes away what is not whole
   reporter->report(summary);
-  if (context.out.error() == EPIPE) {
-    context.err.line("appsync: nobody reads the output any more; the backup ran to its end unseen");
-  }
+  context.tellIfUnseen("backup");
   return exitCode(summary, interruption);
 }
 

@@ -1,5 +1,4 @@
 #include <CLI/CLI.hpp>
-#include <cerrno>
 
 #include "host/cli.h"
 #include "host/interruption.h"
@@ -63,10 +62,7 @@ ExitCode runRestore(const RestoreOptions& options, CommandContext& context) {
     result = restore.run(input);
   }
   reporter->report(result.summary);
-  if (context.out.error() == EPIPE) {
-    context.err.line(
-        "appsync: nobody reads the output any more; the restore ran to its end unseen");
-  }
+  context.tellIfUnseen("restore");
   return exitCode(result, interruption.requested());
 }
 

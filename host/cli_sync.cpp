@@ -1,7 +1,6 @@
 #include <fmt/format.h>
 
 #include <CLI/CLI.hpp>
-#include <cerrno>
 #include <chrono>
 
 #include "host/cli.h"
@@ -95,9 +94,7 @@ ExitCode runSync(const SyncOptions& options, CommandContext& context) {
     result = session.run(input);
   }
   const ExitCode code = finish(result, interruption.requested(), *reporter);
-  if (context.out.error() == EPIPE) {
-    context.err.line("appsync: nobody reads the output any more; the sync ran to its end unseen");
-  }
+  context.tellIfUnseen("sync");
   return code;
 }
 
