@@ -177,8 +177,8 @@ class InstallCoordinator {
 };
 
 /// Delivers the events of coordinators that have no observer of their own, for the client
-/// identifiers it was made for. Destroying it ends delivery; no event runs after the destructor has
-/// returned.
+/// identifiers it was made for, also those that nobody was there to hear before. Destroying it ends
+/// delivery; no event runs after the destructor has returned.
 class CoordinatorEventListener {
  public:
   virtual ~CoordinatorEventListener() = default;
@@ -192,9 +192,9 @@ class InstallCoordination {
   /// Whether installs are to be driven through coordinators; constant for the life of the process.
   virtual bool coordinationIsEnabled() noexcept = 0;
 
-  /// The application's coordinator of this kind (or of whatever kind, if another client made one
-  /// already). nullptr when there is none and none is to be made, or when it failed (with an
-  /// error). `created` may be null.
+  /// The application's coordinator: the live one, whatever its kind and whoever made it, else a new
+  /// one of this kind. nullptr when there is none and none is to be made, or when it failed (with
+  /// an error). `created` may be null.
   virtual std::shared_ptr<InstallCoordinator> coordinatorFor(
       CoordinatorKind kind, std::string_view bundleId, CoordinationClientId client,
       bool createIfNotExisting, bool* created, std::optional<Error>* error) noexcept = 0;
