@@ -8,7 +8,7 @@
 #include <random>
 #include <stdexcept>
 
-#include "device/image_encoder.h"
+#include "device/icons/image_encoder.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::bench {

@@ -6,8 +6,8 @@
 
 #include "client/apps_client.h"
 #include "device/embedded_device.h"
-#include "host/interruption.h"
-#include "host/sync_host.h"
+#include "host/base/interruption.h"
+#include "host/phone/sync_host.h"
 
 namespace appsync::bench {
 

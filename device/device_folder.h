@@ -5,8 +5,8 @@
 #include <string>
 #include <string_view>
 
-#include "device/embedded_device.h"
-#include "device/file_descriptor.h"
+#include "device/base/device_types.h"
+#include "device/base/file_descriptor.h"
 
 namespace appsync::device {
 

@@ -15,7 +15,7 @@
 #include <string>
 #include <system_error>
 
-#include "device/identifiers.h"
+#include "device/base/identifiers.h"
 
 namespace appsync::device {
 namespace {

@@ -6,8 +6,8 @@
 #include <string_view>
 #include <thread>
 
+#include "device/base/file_descriptor.h"
 #include "device/device_folder.h"
-#include "device/file_descriptor.h"
 #include "platform/error.h"
 
 namespace appsync::device {

@@ -5,9 +5,9 @@
 #include <cerrno>
 #include <set>
 
-#include "device/application_rows.h"
-#include "device/installs.h"
-#include "device/removal.h"
+#include "device/apps/installs.h"
+#include "device/apps/removal.h"
+#include "device/state/application_rows.h"
 
 namespace appsync::device {
 namespace {

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "device/device_core.h"
+#include "device/state/device_core.h"
 
 namespace appsync::device {
 

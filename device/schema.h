@@ -3,8 +3,8 @@
 #include <filesystem>
 #include <memory>
 
-#include "device/database.h"
-#include "device/embedded_device.h"
+#include "device/base/device_types.h"
+#include "device/state/database.h"
 
 namespace appsync::device {
 

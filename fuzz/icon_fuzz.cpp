@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <cstdlib>
 
-#include "device/icon_decoder.h"
+#include "device/icons/icon_decoder.h"
 
 namespace {
 

@@ -11,10 +11,10 @@
 #include <cstdlib>
 #include <filesystem>
 
-#include "device/directory_tree.h"
-#include "device/file_descriptor.h"
-#include "device/identifiers.h"
-#include "device/package_extractor.h"
+#include "device/base/directory_tree.h"
+#include "device/base/file_descriptor.h"
+#include "device/base/identifiers.h"
+#include "device/packages/package_extractor.h"
 
 namespace {
 

@@ -6,6 +6,9 @@
     client/ sync/ transfer/ coordination/ restore/     the plug-in: may include platform/ and itself
     platform/                                          may include nothing of the others
 
+Inside device/ and host/ each folder may include only those that stand before it in ORDER; the files
+beside device/'s folders put everything together, and no folder knows them.
+
 The plug-in and platform/ see no header but those of the C++ standard library. The one exception is
 the property-list codec, which alone may include libplist, and <locale.h> to shield it from the
 process's locale.
@@ -23,6 +26,10 @@ MAY_INCLUDE = {folder: PLUGIN | {"platform"} for folder in PLUGIN} | {
     "platform": {"platform"},
     "device": {"device", "platform"},
     "host": {"host", "device", "platform"},
+}
+ORDER = {
+    "device": "base files state journal icons packages home services apps coordination".split(),
+    "host": "base library report phone home_screen transfer sync backup restore cli".split(),
 }
 STANDARD_ONLY = PLUGIN | {"platform"}
 PLIST_FILE = "platform/property_list_codec.cpp"
@@ -53,6 +60,19 @@ def includes(text):
         yield line, angled or quoted or computed.strip(), quoted is not None
 
 
+def out_of_order(path, header):
+    """What is wrong between the folders of one layer, or None."""
+    top, *inside, _ = path.split("/")
+    _, *there, _ = header.split("/")
+    order = ORDER[top]
+    for folder in inside[:1] + there[:1]:
+        if folder not in order:
+            return f"{top}/{folder}/ has no place in the order of {top}/"
+    if not inside or there and order.index(there[0]) <= order.index(inside[0]):
+        return None
+    return f"{top}/{inside[0]}/ must not know {'/'.join([top, *there[:1]])}/"
+
+
 def problem(path, header, quoted):
     """What is wrong with this include in this file (both relative to the root), or None."""
     folder = path.split("/")[0]
@@ -62,7 +82,7 @@ def problem(path, header, quoted):
     if top in LAYERS and "/" in header:
         if top not in MAY_INCLUDE[folder]:
             return f"{folder}/ must not know {top}/"
-        return None
+        return out_of_order(path, header) if top == folder and top in ORDER else None
     if quoted:
         return "own headers are included as \"folder/name.h\""
     if path == PLIST_FILE and header in PLIST_HEADERS:

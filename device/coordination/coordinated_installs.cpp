@@ -4,9 +4,9 @@
 
 #include <cerrno>
 
-#include "device/application_rows.h"
 #include "device/coordination/coordination_core.h"
 #include "device/coordination/coordination_values.h"
+#include "device/state/application_rows.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 

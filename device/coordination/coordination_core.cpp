@@ -1,8 +1,8 @@
 #include "device/coordination/coordination_core.h"
 
+#include "device/apps/installs.h"
 #include "device/coordination/coordination_handles.h"
 #include "device/coordination/coordination_recovery.h"
-#include "device/installs.h"
 
 namespace appsync::device {
 namespace {

@@ -3,12 +3,12 @@
 #include <memory>
 #include <shared_mutex>
 
-#include "device/app_registry.h"
+#include "device/apps/app_registry.h"
 #include "device/coordination/coordinated_installs.h"
 #include "device/coordination/coordination_state.h"
 #include "device/coordination/event_delivery.h"
 #include "device/coordination/keyed_workers.h"
-#include "device/device_core.h"
+#include "device/state/device_core.h"
 
 namespace appsync::device {
 

@@ -4,10 +4,10 @@
 
 #include <cerrno>
 
-#include "device/application_rows.h"
+#include "device/base/identifiers.h"
 #include "device/coordination/coordinated_installs.h"
 #include "device/coordination/coordination_values.h"
-#include "device/identifiers.h"
+#include "device/state/application_rows.h"
 
 namespace appsync::device {
 namespace {

@@ -1,7 +1,7 @@
 #pragma once
 
 #include "device/coordination/coordination_state.h"
-#include "device/device_core.h"
+#include "device/state/device_core.h"
 
 namespace appsync::device {
 

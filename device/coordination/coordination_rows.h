@@ -5,7 +5,7 @@
 #include <string_view>
 #include <vector>
 
-#include "device/database.h"
+#include "device/state/database.h"
 #include "platform/install_coordination.h"
 
 namespace appsync::device {

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "device/database.h"
+#include "device/state/database.h"
 
 namespace appsync::device {
 

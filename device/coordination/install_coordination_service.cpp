@@ -5,10 +5,10 @@
 #include <algorithm>
 #include <cerrno>
 
-#include "device/application_rows.h"
+#include "device/apps/removal.h"
+#include "device/base/identifiers.h"
 #include "device/coordination/coordination_handles.h"
-#include "device/identifiers.h"
-#include "device/removal.h"
+#include "device/state/application_rows.h"
 
 namespace appsync::device {
 namespace {

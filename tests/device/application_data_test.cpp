@@ -5,9 +5,9 @@
 #include <sys/un.h>
 #include <unistd.h>
 
-#include "device/containers.h"
-#include "device/data_archive.h"
-#include "device/temporary_file.h"
+#include "device/base/temporary_file.h"
+#include "device/files/containers.h"
+#include "device/packages/data_archive.h"
 #include "tests/device/device_test.h"
 #include "tests/device/package_builder.h"
 
@@ -24,7 +24,7 @@ const std::string Data = Containers::dataPath(App);
 const std::string Waiting = Containers::waitingDataPath(App);
 
 /// Gives the text in pieces of a few bytes.
-EmbeddedDevice::DataSource piecesOf(std::string_view text, std::size_t piece = 1000) {
+DataSource piecesOf(std::string_view text, std::size_t piece = 1000) {
   return [text, piece](std::uint8_t* bytes, std::size_t size) mutable {
     const std::string_view next = text.substr(0, std::min(piece, size));
     std::copy(next.begin(), next.end(), bytes);

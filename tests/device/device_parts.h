@@ -4,10 +4,10 @@
 #include <memory>
 #include <stdexcept>
 
-#include "device/app_registry.h"
+#include "device/apps/app_registry.h"
+#include "device/apps/installs.h"
 #include "device/device_folder.h"
-#include "device/installs.h"
-#include "device/log_files.h"
+#include "device/journal/log_files.h"
 #include "device/schema.h"
 
 namespace appsync::device {

@@ -1,11 +1,11 @@
-#include "device/directory_tree.h"
+#include "device/base/directory_tree.h"
 
 #include <fcntl.h>
 #include <grp.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "device/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 #include "tests/device/device_test.h"
 
 namespace appsync::device {

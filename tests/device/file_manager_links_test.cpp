@@ -5,8 +5,8 @@
 #include <atomic>
 #include <thread>
 
-#include "device/file_manager.h"
-#include "device/file_receiver.h"
+#include "device/files/file_manager.h"
+#include "device/files/file_receiver.h"
 #include "tests/device/temporary_folder.h"
 
 namespace appsync::device::testing {

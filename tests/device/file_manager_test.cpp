@@ -1,4 +1,4 @@
-#include "device/file_manager.h"
+#include "device/files/file_manager.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

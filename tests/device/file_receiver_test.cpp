@@ -1,4 +1,4 @@
-#include "device/file_receiver.h"
+#include "device/files/file_receiver.h"
 
 #include <gtest/gtest.h>
 

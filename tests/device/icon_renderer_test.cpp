@@ -1,4 +1,4 @@
-#include "device/icon_renderer.h"
+#include "device/icons/icon_renderer.h"
 
 #include <gtest/gtest.h>
 

@@ -1,4 +1,4 @@
-#include "device/image_encoder.h"
+#include "device/icons/image_encoder.h"
 
 #include <gtest/gtest.h>
 #include <png.h>

@@ -1,4 +1,4 @@
-#include "device/log_files.h"
+#include "device/journal/log_files.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -7,7 +7,7 @@
 #include <fstream>
 #include <thread>
 
-#include "device/log_format.h"
+#include "device/journal/log_format.h"
 #include "tests/device/temporary_folder.h"
 
 namespace appsync::device::testing {

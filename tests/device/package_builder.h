@@ -7,8 +7,8 @@
 #include <string_view>
 #include <vector>
 
-#include "device/file_descriptor.h"
-#include "device/package_extractor.h"
+#include "device/base/file_descriptor.h"
+#include "device/packages/package_extractor.h"
 #include "tests/device/temporary_folder.h"
 
 namespace appsync::device::testing {

@@ -1,4 +1,4 @@
-#include "device/package_names.h"
+#include "device/packages/package_names.h"
 
 #include <gtest/gtest.h>
 

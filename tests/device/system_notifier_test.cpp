@@ -1,4 +1,4 @@
-#include "device/system_notifier.h"
+#include "device/services/system_notifier.h"
 
 #include <gtest/gtest.h>
 

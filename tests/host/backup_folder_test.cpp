@@ -1,4 +1,4 @@
-#include "host/backup_folder.h"
+#include "host/backup/backup_folder.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>

@@ -2,8 +2,8 @@
 
 #include <cerrno>
 
-#include "host/backup.h"
-#include "host/phone.h"
+#include "host/backup/backup.h"
+#include "host/phone/phone.h"
 #include "tests/host/session_fixture.h"
 #include "tests/test_pch.h"
 
@@ -38,7 +38,7 @@ class BackupRunTest : public ::testing::Test {
 
   BackupPhone backupPhone() {
     return {phone_.platform(),
-            [this](std::string_view identifier, const device::EmbeddedDevice::DataSink& sink,
+            [this](std::string_view identifier, const device::DataSink& sink,
                    std::optional<Error>* error) { return giveData(identifier, sink, error); },
             [this](std::string_view identifier) {
               const auto blob = blobs_.find(identifier);
@@ -47,7 +47,7 @@ class BackupRunTest : public ::testing::Test {
             [this](std::string_view identifier) { return isBusyWith_ && isBusyWith_(identifier); }};
   }
 
-  bool giveData(std::string_view identifier, const device::EmbeddedDevice::DataSink& sink,
+  bool giveData(std::string_view identifier, const device::DataSink& sink,
                 std::optional<Error>* error) {
     const auto found = data_.find(identifier);
     const std::string_view data = found == data_.end() ? "" : std::string_view(found->second);

@@ -1,9 +1,9 @@
-#include "host/home_screen_icons.h"
+#include "host/home_screen/home_screen_icons.h"
 
 #include <gtest/gtest.h>
 
-#include "device/image_encoder.h"
-#include "host/phone.h"
+#include "device/icons/image_encoder.h"
+#include "host/phone/phone.h"
 #include "platform/property_list_codec.h"
 #include "tests/host/host_files.h"
 

@@ -1,4 +1,4 @@
-#include "host/home_screen_picture.h"
+#include "host/home_screen/home_screen_picture.h"
 
 #include <gtest/gtest.h>
 

@@ -8,8 +8,8 @@
 #include <iterator>
 #include <random>
 
-#include "host/archive_writer.h"
-#include "host/package_reader.h"
+#include "host/base/archive_writer.h"
+#include "host/library/package_reader.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 

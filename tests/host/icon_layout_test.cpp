@@ -1,4 +1,4 @@
-#include "host/icon_layout.h"
+#include "host/library/icon_layout.h"
 
 #include "platform/property_list_codec.h"
 #include "tests/host/host_files.h"

@@ -1,6 +1,6 @@
-#include "host/package_reader.h"
+#include "host/library/package_reader.h"
 
-#include "host/library.h"
+#include "host/library/library.h"
 #include "platform/bundle.h"
 #include "tests/host/host_files.h"
 #include "tests/test_pch.h"

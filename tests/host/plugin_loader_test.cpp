@@ -1,4 +1,4 @@
-#include "host/plugin_loader.h"
+#include "host/phone/plugin_loader.h"
 
 #include "platform/bundle.h"
 #include "platform/plugin.h"

@@ -1,10 +1,10 @@
-#include "host/report.h"
+#include "host/report/report.h"
 
 #include <sys/mman.h>
 #include <unistd.h>
 
-#include "host/json_line.h"
-#include "host/report_text.h"
+#include "host/base/json_line.h"
+#include "host/report/report_text.h"
 #include "tests/test_pch.h"
 
 namespace appsync::host {

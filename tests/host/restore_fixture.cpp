@@ -112,13 +112,12 @@ RestorePhone RestoreTest::restorePhone() {
   Phone base = phoneForHost();
   base.setWatcher = [this](device::DeviceWatcher* watcher) { client.watcher = watcher; };
   return {std::move(base), phone.homeScreen,
-          [this](std::string_view identifier, const device::EmbeddedDevice::DataSink& sink,
-                 std::optional<Error>*) {
+          [this](std::string_view identifier, const device::DataSink& sink, std::optional<Error>*) {
             const auto& all = waiting.contains(std::string(identifier)) ? waiting : owned;
             const auto found = all.find(std::string(identifier));
             return found == all.end() || sink(toBytes(found->second));
           },
-          [this](std::string_view identifier, const device::EmbeddedDevice::DataSource& source,
+          [this](std::string_view identifier, const device::DataSource& source,
                  std::optional<Error>* error) {
             if (phone.faults.strikes("phone.restoreData", identifier, error)) return false;
             std::string bytes;

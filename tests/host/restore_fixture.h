@@ -1,6 +1,6 @@
 #pragma once
 
-#include "host/restore.h"
+#include "host/restore/restore.h"
 #include "platform/property_list_codec.h"
 #include "tests/host/session_fixture.h"
 

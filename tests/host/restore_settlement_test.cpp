@@ -1,4 +1,4 @@
-#include "host/restore_settlement.h"
+#include "host/restore/restore_settlement.h"
 
 #include "tests/host/restore_fixture.h"
 

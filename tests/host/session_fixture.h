@@ -7,8 +7,8 @@
 #include <string>
 #include <vector>
 
-#include "host/session.h"
-#include "host/sync_host.h"
+#include "host/phone/sync_host.h"
+#include "host/sync/session.h"
 #include "tests/fakes/fake_platform.h"
 #include "tests/host/host_files.h"
 #include "tests/test_pch.h"

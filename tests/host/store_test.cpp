@@ -1,5 +1,5 @@
 // What the store brings to a fake phone, through coordinators and without them.
-#include "host/store.h"
+#include "host/restore/store.h"
 
 #include <cerrno>
 

@@ -1,4 +1,4 @@
-#include "host/sync_host.h"
+#include "host/phone/sync_host.h"
 
 #include <cerrno>
 

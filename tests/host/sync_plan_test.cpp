@@ -1,4 +1,4 @@
-#include "host/sync_plan.h"
+#include "host/library/sync_plan.h"
 
 #include "tests/fakes/fake_platform.h"
 #include "tests/test_pch.h"

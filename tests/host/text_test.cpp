@@ -1,4 +1,4 @@
-#include "host/text.h"
+#include "host/base/text.h"
 
 #include <clocale>
 

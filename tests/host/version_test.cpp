@@ -1,4 +1,4 @@
-#include "host/version.h"
+#include "host/base/version.h"
 
 #include "tests/test_pch.h"
 

@@ -57,6 +57,15 @@ class Layers(unittest.TestCase):
         for folder in ("client", "sync", "transfer", "coordination", "restore"):
             self.assertRefused("host/a.cpp", f'#include "{folder}/x.h"\n', "must not know")
 
+    def test_folders_of_a_layer_know_only_those_before_them(self):
+        self.assertAllowed("device/apps/a.cpp", '#include "device/base/b.h"\n')
+        self.assertAllowed("device/apps/a.cpp", '#include "device/apps/b.h"\n')
+        self.assertAllowed("device/a.cpp", '#include "device/coordination/b.h"\n')
+        self.assertRefused("device/base/a.cpp", '#include "device/apps/b.h"\n', "must not know device/apps/")
+        self.assertRefused("device/apps/a.cpp", '#include "device/b.h"\n', "must not know device/")
+        self.assertRefused("host/sync/a.cpp", '#include "host/restore/b.h"\n', "must not know host/restore/")
+        self.assertRefused("host/new/a.cpp", '#include "host/base/b.h"\n', "no place in the order")
+
     def test_only_the_codec_uses_the_property_list_library(self):
         self.assertAllowed("platform/property_list_codec.cpp", "#include <plist/plist.h>\n")
         for path in ("platform/other.cpp", "client/a.cpp", "device/a.cpp", "host/a.cpp"):

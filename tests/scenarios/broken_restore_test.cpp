@@ -5,7 +5,7 @@
 
 #include "client/apps_client.h"
 #include "device/embedded_device.h"
-#include "host/sync_host.h"
+#include "host/phone/sync_host.h"
 #include "platform/property_list_codec.h"
 #include "tests/host/host_files.h"
 #include "tests/test_pch.h"

@@ -8,8 +8,8 @@
 
 #include "client/apps_client.h"
 #include "device/embedded_device.h"
-#include "host/session.h"
-#include "host/sync_host.h"
+#include "host/phone/sync_host.h"
+#include "host/sync/session.h"
 #include "tests/host/host_files.h"
 #include "tests/test_pch.h"
 

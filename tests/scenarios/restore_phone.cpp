@@ -4,7 +4,7 @@
 #include <unistd.h>
 
 #include "client/apps_client.h"
-#include "host/backup_folder.h"
+#include "host/backup/backup_folder.h"
 #include "platform/property_list_codec.h"
 #include "tests/test_pch.h"
 
@@ -154,8 +154,7 @@ RestorePhone stepping(const RestorePhone& phone, FileManager& files,
     step();
     return phone.receiveFile(path, error);
   };
-  const auto restoreData = [=](std::string_view identifier,
-                               const device::EmbeddedDevice::DataSource& source,
+  const auto restoreData = [=](std::string_view identifier, const device::DataSource& source,
                                std::optional<Error>* error) {
     const auto stepped = [&](std::uint8_t* bytes, std::size_t size) {
       step();

@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "device/embedded_device.h"
-#include "host/restore.h"
+#include "host/restore/restore.h"
 #include "tests/host/host_files.h"
 
 namespace appsync::host::testing {

@@ -1,0 +1,226 @@
+#include "device/apps/app_registry.h"
+
+#include <fmt/format.h>
+
+#include <cerrno>
+
+#include "device/apps/demotion.h"
+#include "device/apps/installers.h"
+#include "device/apps/installs.h"
+#include "device/apps/removal.h"
+#include "device/base/identifiers.h"
+#include "device/state/application_rows.h"
+#include "platform/bundle.h"
+
+namespace appsync::device {
+namespace {
+
+constexpr std::string_view ReadFailed = "the registry could not be read";
+
+bool isOfKind(const AppRecord& record, BundleKind kind) {
+  return record.applicationType ==
+         (kind == BundleKind::System ? ApplicationTypeSystem : ApplicationTypeUser);
+}
+
+/// Of each application the installed version, or its placeholder if that is all there is.
+std::vector<AppRecord> onePerApplication(const std::vector<AppRecord>& sorted, BundleKind kind) {
+  std::vector<AppRecord> chosen;
+  std::string_view last;
+  for (const AppRecord& record : sorted) {
+    const bool first = record.applicationIdentifier != last;
+    last = record.applicationIdentifier;
+    if (first && isOfKind(record, kind)) chosen.push_back(record);
+  }
+  return chosen;
+}
+
+Error invalid(std::string_view text) {
+  return Error::withDescription(POSIXErrorDomain, EINVAL, text);
+}
+
+std::optional<Bytes> dataOption(const PropertyList::Dictionary& options, std::string_view key) {
+  const PropertyList* value = find(options, key);
+  const PropertyList::Data* data = value ? value->asData() : nullptr;
+  return data ? std::optional(*data) : std::nullopt;
+}
+
+/// What came from a backup may be demoted too, and asking twice is no harm.
+bool canBeAskedFor(InstallType placeholder) {
+  return placeholder == InstallType::Downgrade ||
+         placeholder == InstallType::IntentionalDowngrade || placeholder == InstallType::Restore ||
+         placeholder == InstallType::StoreDownload;
+}
+
+PlaceholderOptions placeholderOptions(const PropertyList::Dictionary& options) {
+  const PropertyList* type = find(options, SWInstallTypeKey);
+  return {static_cast<InstallType>(type ? type->asUnsigned().value_or(0) : 0),
+          dataOption(options, SWHalvoMetadataKey), dataOption(options, SWApplicationSINFKey)};
+}
+
+}  // namespace
+
+void DeviceAppRegistry::addObserver(AppRegistryObserver* observer) noexcept {
+  core_.observers.add(observer);
+}
+
+void DeviceAppRegistry::removeObserver(AppRegistryObserver* observer) noexcept {
+  core_.observers.remove(observer);
+}
+
+bool DeviceAppRegistry::isApplicationInstalled(std::string_view bundleId) noexcept {
+  return recordForIdentifier(bundleId, false).has_value();
+}
+
+std::optional<AppRecord> DeviceAppRegistry::recordForIdentifier(std::string_view bundleId,
+                                                                bool placeholder) noexcept {
+  ApplicationRows rows;
+  core_.database.read(
+      ReadFailed, [&](SQLite::Database& database) { rows = findApplication(database, bundleId); });
+  if (rows.installed && !placeholder) return rows.installed->record();
+  if (rows.placeholder) return rows.placeholder->record();
+  return std::nullopt;
+}
+
+std::vector<AppRecord> DeviceAppRegistry::records() noexcept {
+  std::vector<AppRecord> records;
+  core_.database.read(ReadFailed, [&](SQLite::Database& database) {
+    for (const ApplicationRow& row : allApplications(database)) records.push_back(row.record());
+  });
+  return records;
+}
+
+void DeviceAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept {
+  const std::vector<AppRecord> all = records();
+  bool stop = false;
+  for (const AppRecord& record : kind == BundleKind::All ? all : onePerApplication(all, kind)) {
+    visitor(record, stop);
+    if (stop) return;
+  }
+}
+
+bool DeviceAppRegistry::changeApplication(
+    std::string_view bundleId,
+    const std::function<bool(const std::string&, std::optional<Error>*)>& change,
+    std::optional<Error>* error) noexcept {
+  try {
+    if (!core_.database.writable()) {
+      setError(error, Error::withDescription(POSIXErrorDomain, EROFS,
+                                             "the device is open for reading only"));
+      return false;
+    }
+    if (!isUsableIdentifier(bundleId)) {
+      setError(error, refusal(PackageRefusal::BadInfo,
+                              "the identifier holds characters that no identifier may have"));
+      return false;
+    }
+    const std::string identifier(bundleId);
+    const KeyedMutex::Guard guard(core_.applicationLocks, identifier);
+    return change(identifier, error);
+  } catch (const std::exception& failure) {
+    setError(error, Error::withDescription(POSIXErrorDomain, EIO, failure.what()));
+    return false;
+  }
+}
+
+bool DeviceAppRegistry::installApplication(const FileLocation& package,
+                                           const PropertyList::Dictionary& options,
+                                           std::optional<Error>* error) noexcept {
+  const std::string* type = findString(options, SWPackageTypeKey);
+  const std::string* identifier = findString(options, KBBundleIdentifier);
+  const bool placeholder = type && *type == SWPackageTypePlaceholder;
+  if (!identifier || !type || (!placeholder && *type != SWPackageTypeCustomer)) {
+    setError(error, invalid("the options lack an identifier or a known package type"));
+    return false;
+  }
+  if (placeholder != package.isDirectory) {
+    setError(error, invalid(placeholder ? "a placeholder is installed from its directory"
+                                        : "a package is installed from a file"));
+    return false;
+  }
+  if (placeholder) {
+    const auto install = [&](const std::string& id, std::optional<Error>* reason) {
+      return installPlaceholder(core_, package.path, id, placeholderOptions(options), reason);
+    };
+    return changeApplication(*identifier, install, error);
+  }
+  std::optional<Error> reason;
+  const auto install = [&](const std::string& id, std::optional<Error>* why) {
+    return installPackage(core_, package.path, id, why);
+  };
+  const bool installed = changeApplication(*identifier, install, &reason);
+  core_.watcher.installFinished(*identifier, reason);
+  if (reason) setError(error, std::move(*reason));
+  return installed;
+}
+
+bool DeviceAppRegistry::uninstallApplication(std::string_view bundleId,
+                                             const PropertyList::Dictionary& options) noexcept {
+  const PropertyList* only = find(options, UninstallPlaceholdersOnlyKey);
+  const bool placeholderOnly = only && only->booleanValue();
+  const auto remove = [&](const std::string& identifier, std::optional<Error>* error) {
+    return removeForClient(core_, identifier, placeholderOnly, error);
+  };
+  return changeApplication(bundleId, remove, nullptr);
+}
+
+bool DeviceAppRegistry::removeApplication(std::string_view bundleId,
+                                          std::optional<Error>* error) noexcept {
+  const auto remove = [&](const std::string& identifier, std::optional<Error>* reason) {
+    return removeForPerson(core_, identifier, reason);
+  };
+  return changeApplication(bundleId, remove, error);
+}
+
+bool DeviceAppRegistry::demote(std::string_view bundleId, std::optional<Error>* error) noexcept {
+  const auto demote = [&](const std::string& identifier, std::optional<Error>* reason) {
+    return demoteForPerson(core_, identifier, reason);
+  };
+  return changeApplication(bundleId, demote, error);
+}
+
+bool DeviceAppRegistry::askFor(std::string_view bundleId) noexcept {
+  bool asked = false;
+  const auto ask = [&](const std::string& identifier, std::optional<Error>* error) {
+    return core_.database.change(
+        "the application could not be asked for", Database::Commit::OnDisk,
+        [&](SQLite::Database& database) {
+          std::optional<ApplicationRow> row = findApplication(database, identifier).placeholder;
+          asked = row && canBeAskedFor(row->installType);
+          if (!asked) return;
+          row->installType = InstallType::StoreDownload;
+          putApplication(database, *row);
+        },
+        error);
+  };
+  return changeApplication(bundleId, ask, nullptr) && asked;
+}
+
+bool DeviceAppRegistry::addSystemApplication(std::string_view bundleId,
+                                             std::string_view displayName, std::string_view version,
+                                             std::optional<Error>* error) noexcept {
+  const auto install = [&](const std::string& identifier, std::optional<Error>* reason) {
+    return installSystemApplication(core_, identifier, std::string(displayName),
+                                    std::string(version), reason);
+  };
+  return changeApplication(bundleId, install, error);
+}
+
+std::shared_ptr<InstallProgress> DeviceAppRegistry::installProgress(const AppRecord& record,
+                                                                    InstallPhase phase) noexcept {
+  // Every install of this device begins at Loading, whatever phase it has come to.
+  return phase == InstallPhase::Loading ? installProgressSync(record) : nullptr;
+}
+
+std::shared_ptr<InstallProgress> DeviceAppRegistry::installProgressSync(
+    const AppRecord& record) noexcept {
+  return currentProgress(core_.database, core_.observers, record.applicationIdentifier);
+}
+
+void DeviceAppRegistry::installPhaseFinished(InstallProgress& progress) noexcept {
+  if (progress.installPhase() != InstallPhase::Loading) return;
+  const InstallState state = progress.installState();
+  if (state == InstallState::Failed || state == InstallState::Canceled) return;
+  progress.setInstallPhase(InstallPhase::Installing);
+}
+
+}  // namespace appsync::device

@@ -1,0 +1,53 @@
+#pragma once
+
+#include "device/state/device_core.h"
+#include "platform/app_registry.h"
+
+namespace appsync::device {
+
+/// The registry in the device's database. Installs of different applications run beside one
+/// another; what changes one application waits its turn.
+class DeviceAppRegistry final : public AppRegistry {
+ public:
+  explicit DeviceAppRegistry(DeviceCore& core) : core_(core) {}
+
+  void addObserver(AppRegistryObserver* observer) noexcept override;
+  void removeObserver(AppRegistryObserver* observer) noexcept override;
+  bool isApplicationInstalled(std::string_view bundleId) noexcept override;
+  std::optional<AppRecord> recordForIdentifier(std::string_view bundleId,
+                                               bool placeholder) noexcept override;
+  void enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept override;
+  bool installApplication(const FileLocation& package, const PropertyList::Dictionary& options,
+                          std::optional<Error>* error) noexcept override;
+  bool uninstallApplication(std::string_view bundleId,
+                            const PropertyList::Dictionary& options) noexcept override;
+  std::shared_ptr<InstallProgress> installProgress(const AppRecord& record,
+                                                   InstallPhase phase) noexcept override;
+  std::shared_ptr<InstallProgress> installProgressSync(const AppRecord& record) noexcept override;
+  void installPhaseFinished(InstallProgress& progress) noexcept override;
+
+  /// What a person does: the application goes with its placeholder and data.
+  bool removeApplication(std::string_view bundleId, std::optional<Error>* error) noexcept;
+  /// What a person does: only the application's placeholder and data stay.
+  bool demote(std::string_view bundleId, std::optional<Error>* error) noexcept;
+  /// What a person does: a demoted or restored application is to come. Its placeholder becomes that
+  /// of a download from the store. False when there is no such placeholder.
+  bool askFor(std::string_view bundleId) noexcept;
+  /// Registers an application that comes with the system.
+  bool addSystemApplication(std::string_view bundleId, std::string_view displayName,
+                            std::string_view version, std::optional<Error>* error) noexcept;
+  /// Every record, the placeholder after the installed version of the same identifier.
+  std::vector<AppRecord> records() noexcept;
+
+ private:
+  /// Runs a change of one application, alone on it. False with an error for an identifier that
+  /// cannot be used, a device opened for reading, or a change that failed.
+  bool changeApplication(
+      std::string_view bundleId,
+      const std::function<bool(const std::string& identifier, std::optional<Error>* error)>& change,
+      std::optional<Error>* error) noexcept;
+
+  DeviceCore& core_;
+};
+
+}  // namespace appsync::device

@@ -1,0 +1,133 @@
+#include "device/apps/application_data.h"
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <stdio.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <new>
+
+#include "device/base/directory_tree.h"
+#include "device/base/temporary_file.h"
+#include "device/packages/data_archive.h"
+#include "device/packages/package_names.h"
+#include "device/state/application_rows.h"
+
+namespace appsync::device {
+namespace {
+
+std::string parentOf(const std::string& path) { return path.substr(0, path.rfind('/')); }
+
+/// Whether what a restore has still to give back is the application's data.
+bool ownsWaitingData(DeviceCore& core, std::string_view identifier, bool& waiting,
+                     std::optional<Error>* error) {
+  const bool read = core.database.read(
+      "the registry could not be read",
+      [&](SQLite::Database& database) {
+        waiting = !findApplication(database, identifier).installed;
+      },
+      error);
+  waiting = waiting && core.containers.dataWaits(identifier);
+  return read;
+}
+
+std::optional<Error> save(DeviceCore& core, const std::string& identifier, const DataSink& sink) {
+  const KeyedMutex::Guard guard(core.applicationLocks, identifier);
+  std::optional<Error> error;
+  bool waiting = false;
+  if (!ownsWaitingData(core, identifier, waiting, &error)) return error;
+  const std::string path =
+      waiting ? Containers::waitingDataPath(identifier) : Containers::dataPath(identifier);
+  const FileDescriptor parent = core.handles.openDirectory(parentOf(path), &error);
+  const FileDescriptor directory(parent ? ::openat(parent.get(), identifier.c_str(),
+                                                   O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC)
+                                        : -1);
+  if (!directory) {
+    if (parent) error = Error::posix(errno, path);
+    return error->code == ENOENT ? std::nullopt : error;  // it never had any
+  }
+  return writeDataArchive(directory.get(), sink, [&](std::string_view skipped) {
+    core.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default,
+                   fmt::format("{} is left out of the backup: it is no file, folder or link",
+                               shown(joinPath(path, skipped))));
+  });
+}
+
+/// A folder under a temporary name, which disappears with the object whatever stands there then.
+class UnfinishedFolder {
+ public:
+  explicit UnfinishedFolder(int parent) : parent_(parent), name_(makeTemporaryName()) {
+    if (::mkdirat(parent, name_.c_str(), 0755) != 0) return;
+    folder_ = FileDescriptor(
+        ::openat(parent, name_.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  }
+  ~UnfinishedFolder() { removeTree(parent_, name_); }
+  UnfinishedFolder(const UnfinishedFolder&) = delete;
+  UnfinishedFolder& operator=(const UnfinishedFolder&) = delete;
+
+  int fd() const { return folder_.get(); }
+
+  /// False with errno set; what has this name is then as it was.
+  bool takePlaceOf(const std::string& name) {
+    return (::renameat2(parent_, name_.c_str(), parent_, name.c_str(), RENAME_NOREPLACE) == 0 ||
+            (errno == EEXIST &&
+             ::renameat2(parent_, name_.c_str(), parent_, name.c_str(), RENAME_EXCHANGE) == 0)) &&
+           syncToDisk(parent_);
+  }
+
+ private:
+  const int parent_;
+  const std::string name_;
+  FileDescriptor folder_;
+};
+
+std::optional<Error> restore(DeviceCore& core, const std::string& identifier,
+                             const DataSource& source) {
+  const KeyedMutex::Guard guard(core.applicationLocks, identifier);
+  std::optional<Error> error;
+  const std::string path = Containers::waitingDataPath(identifier);
+  if (!core.files.createDirectory(parentOf(path), true, {}, &error)) return error;
+  const FileDescriptor parent = core.handles.openDirectory(parentOf(path), &error);
+  if (!parent) return error;
+  UnfinishedFolder folder(parent.get());
+  if (folder.fd() < 0) return Error::posix(errno, path);
+  std::uint64_t entries = 0;
+  if (auto refusal = readDataArchive(source, folder.fd(), entries)) return refusal;
+  if (entries == 0) {
+    if (core.containers.removeWaitingData(identifier)) return std::nullopt;
+    return Error::posix(EIO, path);
+  }
+  // One flush for all of it, before it can be seen.
+  if (syncFileSystem(folder.fd()) && folder.takePlaceOf(identifier)) return std::nullopt;
+  return Error::posix(errno, path);
+}
+
+/// Runs the work, which must not throw.
+template <typename Work>
+bool guarded(std::optional<Error>* error, Work work) {
+  std::optional<Error> reason;
+  try {
+    reason = work();
+  } catch (const std::bad_alloc&) {
+    reason = Error::posix(ENOMEM);
+  }
+  if (!reason) return true;
+  setError(error, std::move(*reason));
+  return false;
+}
+
+}  // namespace
+
+bool saveApplicationData(DeviceCore& core, std::string_view identifier, const DataSink& sink,
+                         std::optional<Error>* error) {
+  return guarded(error, [&] { return save(core, std::string(identifier), sink); });
+}
+
+bool restoreApplicationData(DeviceCore& core, std::string_view identifier, const DataSource& source,
+                            std::optional<Error>* error) {
+  return guarded(error, [&] { return restore(core, std::string(identifier), source); });
+}
+
+}  // namespace appsync::device

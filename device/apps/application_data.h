@@ -1,0 +1,17 @@
+#pragma once
+
+#include "device/base/device_types.h"
+#include "device/state/device_core.h"
+
+namespace appsync::device {
+
+// An application's own data on its way into a backup and back. See EmbeddedDevice; the identifier
+// is usable.
+
+bool saveApplicationData(DeviceCore& core, std::string_view identifier, const DataSink& sink,
+                         std::optional<Error>* error);
+/// The device is open for writing.
+bool restoreApplicationData(DeviceCore& core, std::string_view identifier, const DataSource& source,
+                            std::optional<Error>* error);
+
+}  // namespace appsync::device

@@ -1,0 +1,101 @@
+#include "device/apps/demotion.h"
+
+#include <fmt/format.h>
+
+#include <cerrno>
+
+#include "device/apps/installers.h"
+#include "device/state/application_rows.h"
+#include "platform/bundle.h"
+#include "platform/property_list_codec.h"
+
+namespace appsync::device {
+namespace {
+
+constexpr std::string_view IconFile = "Icon.png";
+constexpr std::string_view BundleParts = "/tmp/com.corvane.demotion";
+
+Error objection(int code, std::string_view identifier, std::string_view reason) {
+  return Error::withDescription(POSIXErrorDomain, code, fmt::format("{} {}", identifier, reason));
+}
+
+std::optional<Error> objectionTo(const std::string& identifier, const ApplicationRows& rows) {
+  if (!rows.installed) return objection(ENOENT, identifier, "is not installed");
+  if (rows.installed->type == ApplicationTypeSystem) {
+    return objection(EPERM, identifier, "belongs to the system");
+  }
+  const bool isUpdating =
+      rows.placeholder && rows.placeholder->installType != InstallType::IntentionalDowngrade;
+  if (isUpdating) return objection(EBUSY, identifier, "is just being updated");
+  return std::nullopt;
+}
+
+std::string iconOf(FileManager& files, const ApplicationRow& installed) {
+  const auto info = loadDictionary(files, joinPath(installed.bundlePath(), "Info.plist"));
+  const std::string* name = info ? findString(*info, KBBundleIconFile) : nullptr;
+  const std::string icon = name ? joinPath(installed.bundlePath(), *name) : std::string();
+  const auto attributes = icon.empty() ? std::nullopt : files.attributesOfItem(icon);
+  return attributes && !attributes->isDirectory ? icon
+                                                : joinPath(installed.container, "HalvoArtwork");
+}
+
+/// A placeholder without an icon is better than none.
+bool buildBundle(FileManager& files, const ApplicationRow& installed, const std::string& bundle,
+                 std::optional<Error>* error) {
+  PropertyList::Dictionary info{{std::string(KBBundleIdentifier), installed.identifier},
+                                {std::string(KBBundleDisplayName), installed.displayName},
+                                {std::string(KBBundleExecutable), installed.displayName},
+                                {std::string(KBBundleIconFile), IconFile}};
+  if (installed.version) info.emplace(KBBundleVersion, *installed.version);
+  const auto bytes = serializePropertyList(info, PropertyListFormat::Xml, error);
+  files.removeItem(bundle);
+  if (!bytes || !files.createDirectory(bundle, true, {}, error) ||
+      !files.writeAtomically(joinPath(bundle, "Info.plist"), *bytes, error)) {
+    return false;
+  }
+  files.copyItem(iconOf(files, installed), joinPath(bundle, IconFile));
+  return true;
+}
+
+bool layPlaceholder(DeviceCore& core, const ApplicationRow& installed,
+                    std::optional<Error>* error) {
+  const std::string bundle = joinPath(BundleParts, installed.identifier + ".app");
+  const PlaceholderOptions options{
+      InstallType::IntentionalDowngrade,
+      core.files.contentsAtPath(joinPath(installed.container, "HalvoMetadata.plist")),
+      installed.sinf};
+  const bool laid = buildBundle(core.files, installed, bundle, error) &&
+                    installPlaceholder(core, bundle, installed.identifier, options, error);
+  core.files.removeItem(bundle);
+  return laid;
+}
+
+bool takePackage(DeviceCore& core, const ApplicationRow& installed, std::optional<Error>* error) {
+  const bool erased = core.database.change(
+      fmt::format("{} could not be demoted", installed.identifier), Database::Commit::OnDisk,
+      [&](SQLite::Database& database) { eraseApplication(database, installed); }, error);
+  if (erased) core.containers.remove(installed.container);
+  return erased;
+}
+
+}  // namespace
+
+bool demoteForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error) {
+  ApplicationRows rows;
+  const bool read = core.database.read(
+      "the registry could not be read",
+      [&](SQLite::Database& database) { rows = findApplication(database, identifier); }, error);
+  if (!read) return false;
+  std::optional<Error> reason = objectionTo(identifier, rows);
+  const Foreground::HoldResult held =
+      reason ? Foreground::HoldResult{} : core.foreground.hold(identifier);
+  if (held.isRunning) reason = objection(EBUSY, identifier, "is open; close it first");
+  if (!reason && !held.hold) reason = Error::posix(EIO, identifier);
+  if (reason) {
+    setError(error, *reason);
+    return false;
+  }
+  return layPlaceholder(core, *rows.installed, error) && takePackage(core, *rows.installed, error);
+}
+
+}  // namespace appsync::device

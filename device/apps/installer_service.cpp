@@ -1,0 +1,42 @@
+#include "device/apps/installer_service.h"
+
+#include "device/base/clock.h"
+
+namespace appsync::device {
+
+std::optional<PropertyList::Dictionary> DeviceInstallerService::lookupUninstalled() noexcept {
+  PropertyList::Dictionary found;
+  const bool read = database_.read(
+      "the uninstalled applications could not be read", [&](SQLite::Database& database) {
+        Query query(database, "SELECT identifier, time FROM uninstalled");
+        while (query.next()) {
+          const PropertyList::Date date{query.real(1) - PropertyListEpoch};
+          found.emplace(query.text(0), PropertyList::Dictionary{{"Date", date}});
+        }
+      });
+  if (!read) return std::nullopt;
+  return found;
+}
+
+int DeviceInstallerService::clearUninstalled(const std::vector<std::string>& bundleIds) noexcept {
+  std::optional<Error> error;
+  const bool cleared = database_.change(
+      "the uninstalled applications could not be cleared", Database::Commit::Ordinary,
+      [&](SQLite::Database& database) {
+        for (const std::string& identifier : bundleIds) forgetUninstalled(database, identifier);
+      },
+      &error);
+  return cleared ? 0 : static_cast<int>(error ? error->code : -1);
+}
+
+void recordUninstalled(SQLite::Database& database, std::string_view identifier) {
+  Query(database, "INSERT OR REPLACE INTO uninstalled VALUES (?, ?)", identifier,
+        secondsSince1970())
+      .run();
+}
+
+void forgetUninstalled(SQLite::Database& database, std::string_view identifier) {
+  Query(database, "DELETE FROM uninstalled WHERE identifier = ?", identifier).run();
+}
+
+}  // namespace appsync::device

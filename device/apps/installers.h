@@ -1,0 +1,39 @@
+#pragma once
+
+#include <string>
+
+#include "device/packages/package_extractor.h"
+#include "device/state/application_rows.h"
+#include "device/state/device_core.h"
+
+namespace appsync::device {
+
+// Ways for an application to come onto the device. Each is on disk when it returns true and leaves
+// everything as it was when it returns false or the machine goes down before. The identifier is
+// usable and the caller holds its application lock.
+
+/// Installs an application package in the place of the installed version and of the placeholder.
+bool installPackage(DeviceCore& core, const std::string& package, const std::string& identifier,
+                    std::optional<Error>* error);
+
+struct PlaceholderOptions {
+  InstallType installType = InstallType::None;
+  std::optional<Bytes> metadata;  ///< becomes the container's HalvoMetadata.plist
+  std::optional<Bytes> sinf;
+};
+
+/// Installs a placeholder from its bundle directory, which it copies, and begins the application's
+/// install. It replaces an earlier placeholder and lies over an installed version.
+bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
+                        const std::string& identifier, const PlaceholderOptions& options,
+                        std::optional<Error>* error);
+
+/// Registers an application that comes with the system.
+bool installSystemApplication(DeviceCore& core, const std::string& identifier,
+                              const std::string& displayName, const std::string& version,
+                              std::optional<Error>* error);
+
+/// A refusal with a text that begins with its name.
+Error refusal(PackageRefusal reason, std::string_view detail);
+
+}  // namespace appsync::device

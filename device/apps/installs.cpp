@@ -1,0 +1,159 @@
+#include "device/apps/installs.h"
+
+#include <fmt/format.h>
+
+#include "device/state/application_rows.h"
+
+namespace appsync::device {
+namespace {
+
+constexpr std::string_view ReadFailed = "an install's progress could not be read";
+constexpr std::string_view ChangeFailed = "an install's progress could not be changed";
+
+/// Reads and writes one row of "installs". A row that is over changes no more and stays readable,
+/// which gives holders the last values.
+class RowProgress final : public InstallProgress {
+ public:
+  RowProgress(Database& database, RegistryObservers& observers, std::int64_t number,
+              std::string identifier)
+      : database_(database),
+        observers_(observers),
+        number_(number),
+        identifier_(std::move(identifier)) {}
+
+  InstallState installState() const noexcept override {
+    return static_cast<InstallState>(read("SELECT state FROM installs WHERE number = ?"));
+  }
+  void setInstallState(InstallState state) noexcept override {
+    if (write("UPDATE installs SET state = ?1 WHERE number = ?2 AND NOT over AND state <> ?1",
+              static_cast<std::int64_t>(state))) {
+      observers_.installsChanged();
+    }
+  }
+  InstallPhase installPhase() const noexcept override {
+    return static_cast<InstallPhase>(read("SELECT phase FROM installs WHERE number = ?"));
+  }
+  void setInstallPhase(InstallPhase phase) noexcept override {
+    if (write("UPDATE installs SET phase = ?1 WHERE number = ?2 AND NOT over AND phase <> ?1",
+              static_cast<std::int64_t>(phase))) {
+      observers_.installsChanged();
+    }
+  }
+  std::int64_t totalUnitCount() const noexcept override {
+    return read("SELECT total FROM installs WHERE number = ?");
+  }
+  void setTotalUnitCount(std::int64_t count) noexcept override {
+    write("UPDATE installs SET total = ?1 WHERE number = ?2 AND NOT over", count);
+  }
+  std::int64_t completedUnitCount() const noexcept override {
+    return read("SELECT completed FROM installs WHERE number = ?");
+  }
+  void setCompletedUnitCount(std::int64_t count) noexcept override {
+    write("UPDATE installs SET completed = ?1 WHERE number = ?2 AND NOT over", count);
+  }
+  void cancel() noexcept override;
+
+  std::string description() const override {
+    return fmt::format("<{} {}/{} state {} phase {}>", identifier_, completedUnitCount(),
+                       totalUnitCount(), static_cast<std::uint64_t>(installState()),
+                       static_cast<std::uint64_t>(installPhase()));
+  }
+
+ private:
+  std::int64_t read(const char* sql) const noexcept {
+    std::int64_t value = 0;
+    database_.read(ReadFailed, [&](SQLite::Database& database) {
+      Query query(database, sql, number_);
+      if (query.next()) value = query.integer(0);
+    });
+    return value;
+  }
+
+  /// True when the row changed.
+  bool write(const char* sql, std::int64_t value) noexcept {
+    int changed = 0;
+    database_.change(ChangeFailed, Database::Commit::Ordinary, [&](SQLite::Database& database) {
+      changed = Query(database, sql, value, number_).run();
+    });
+    return changed > 0;
+  }
+
+  Database& database_;
+  RegistryObservers& observers_;
+  const std::int64_t number_;
+  const std::string identifier_;
+};
+
+void RowProgress::cancel() noexcept {
+  std::vector<AppRecord> records;
+  const bool changed =
+      write("UPDATE installs SET state = ?1 WHERE number = ?2 AND NOT over AND state <> ?1",
+            static_cast<std::int64_t>(InstallState::Canceled));
+  if (!changed) return;
+  database_.read(ReadFailed, [&](SQLite::Database& database) {
+    const ApplicationRows rows = findApplication(database, identifier_);
+    if (rows.any())
+      records.push_back((rows.placeholder ? rows.placeholder : rows.installed)->record());
+  });
+  observers_.installsCancelled(records);
+  observers_.installsChanged();
+}
+
+}  // namespace
+
+void beginInstall(SQLite::Database& database, std::string_view identifier) {
+  endInstall(database, identifier, InstallState::Canceled);
+  Query(database,
+        "INSERT INTO installs (identifier, state, phase, total, completed, over) "
+        "VALUES (?, ?, ?, 0, 0, 0)",
+        identifier, InstallState::Waiting, InstallPhase::Loading)
+      .run();
+}
+
+bool endInstall(SQLite::Database& database, std::string_view identifier, InstallState finalState) {
+  return Query(database,
+               "UPDATE installs SET over = 1, state = ? WHERE identifier = ? AND NOT over",
+               finalState, identifier)
+             .run() > 0;
+}
+
+bool isInstalling(SQLite::Database& database, std::string_view identifier) {
+  return Query(database,
+               "SELECT 1 FROM installs WHERE identifier = ? AND NOT over AND state IN (?, ?, ?)",
+               identifier, InstallState::Waiting, InstallState::Active, InstallState::Paused)
+      .next();
+}
+
+RegistryObservers::Report reportInstalls(Database& database) {
+  RegistryObservers::Report report;
+  database.read("the installs under way could not be read", [&](SQLite::Database& connection) {
+    Query query(connection,
+                "SELECT identifier, state FROM installs WHERE NOT over AND state IN (?, ?, ?) "
+                "ORDER BY number",
+                InstallState::Waiting, InstallState::Active, InstallState::Paused);
+    while (query.next()) {
+      const ApplicationRows rows = findApplication(connection, query.text(0));
+      if (!rows.any()) continue;
+      const bool paused = query.as<InstallState>(1) == InstallState::Paused;
+      const ApplicationRow& row = rows.placeholder ? *rows.placeholder : *rows.installed;
+      (paused ? report.paused : report.prioritized).push_back(row.record());
+    }
+  });
+  return report;
+}
+
+std::shared_ptr<InstallProgress> currentProgress(Database& database, RegistryObservers& observers,
+                                                 std::string_view identifier) {
+  std::shared_ptr<InstallProgress> progress;
+  database.read(ReadFailed, [&](SQLite::Database& connection) {
+    Query query(connection, "SELECT number FROM installs WHERE identifier = ? AND NOT over",
+                identifier);
+    if (query.next()) {
+      progress = std::make_shared<RowProgress>(database, observers, query.integer(0),
+                                               std::string(identifier));
+    }
+  });
+  return progress;
+}
+
+}  // namespace appsync::device

@@ -1,0 +1,140 @@
+#include <fmt/format.h>
+
+#include "device/apps/installer_service.h"
+#include "device/apps/installers.h"
+#include "device/apps/installs.h"
+#include "device/apps/removal.h"
+#include "device/home/icon_order.h"
+#include "platform/bundle.h"
+
+namespace appsync::device {
+namespace {
+
+constexpr std::string_view MetadataFile = "HalvoMetadata.plist";
+constexpr std::string_view ArtworkFile = "HalvoArtwork";
+
+/// A package without a store file of its own keeps the placeholder's or the old version's.
+bool carryOver(DeviceCore& core, std::string_view file, const ApplicationRows& before,
+               const std::string& container, std::optional<Error>* error) {
+  for (const std::optional<ApplicationRow>& row : {before.placeholder, before.installed}) {
+    if (!row) continue;
+    const std::string source = joinPath(row->container, file);
+    if (!core.files.fileExists(source)) continue;
+    return core.files.copyItem(source, joinPath(container, file), error);
+  }
+  return true;
+}
+
+/// Done before the switch: if that fails or never comes, the data waits where the next attempt
+/// leaves it.
+bool prepareData(DeviceCore& core, const std::string& identifier, const ApplicationRows& before,
+                 std::optional<Error>* error) {
+  if (!removeAbandonedData(core, identifier, error)) return false;
+  // What the person has made with an installed version since is worth more than old data.
+  const bool comesBack =
+      !before.installed ||
+      (before.placeholder && before.placeholder->installType == InstallType::Restore);
+  return comesBack && core.containers.dataWaits(identifier)
+             ? core.containers.adoptWaitingData(identifier, error)
+             : core.containers.makeData(identifier, error);
+}
+
+bool extractInto(DeviceCore& core, const std::string& package, const std::string& container,
+                 const std::string& identifier, ApplicationRow& row, const ApplicationRows& before,
+                 std::optional<Error>* error) {
+  const FileDescriptor file = core.handles.openFile(package, error);
+  if (!file) return false;
+  const FileDescriptor target = core.handles.openDirectory(container, error);
+  if (!target) return false;
+  const std::optional<ExtractedPackage> extracted =
+      extractPackage(file.get(), target.get(), identifier, PackageLimits{}, error);
+  if (!extracted) return false;
+  row.bundle = extracted->bundleName;
+  row.diskUsage = extracted->bytes;
+  describe(row, extracted->info);
+  return (extracted->hasMetadata || carryOver(core, MetadataFile, before, container, error)) &&
+         (extracted->hasArtwork || carryOver(core, ArtworkFile, before, container, error));
+}
+
+bool isDeviceBased(DeviceCore& core, const std::string& container) {
+  const auto metadata = loadDictionary(core.files, joinPath(container, MetadataFile));
+  const PropertyList* flag = metadata ? find(*metadata, "DeviceBasedQLP") : nullptr;
+  return flag && flag->booleanValue();
+}
+
+void inherit(ApplicationRow& row, const ApplicationRows& before) {
+  row.type = before.type();
+  if (before.installed) row.sinf = before.installed->sinf;
+  if (!before.placeholder) return;
+  row.installType = before.placeholder->installType;
+  if (before.placeholder->sinf) row.sinf = before.placeholder->sinf;
+}
+
+bool switchTo(DeviceCore& core, const ApplicationRow& row, const ApplicationRows& before,
+              std::optional<Error>* error) {
+  return core.database.change(
+      fmt::format("{} could not be entered in the registry", row.identifier),
+      Database::Commit::OnDisk,
+      [&](SQLite::Database& database) {
+        if (before.placeholder) eraseApplication(database, *before.placeholder);
+        putApplication(database, row);
+        endInstall(database, row.identifier, InstallState::Finished);
+        forgetUninstalled(database, row.identifier);
+        appendToIconOrder(database, row.identifier);
+      },
+      error);
+}
+
+bool replaceApplication(DeviceCore& core, const std::string& package, const std::string& identifier,
+                        const ApplicationRows& before, std::optional<Error>* error) {
+  StagedContainer staged(core.containers, error);
+  if (!staged.isMade()) return false;
+  ApplicationRow row;
+  row.identifier = identifier;
+  row.container = staged.path();
+  inherit(row, before);
+  if (!extractInto(core, package, staged.path(), identifier, row, before, error)) return false;
+  row.deviceBased = isDeviceBased(core, staged.path());
+  // One flush for all files of the package, before a row of the registry names them.
+  if (!prepareData(core, identifier, before, error) || !core.containers.flush(error) ||
+      !switchTo(core, row, before, error)) {
+    return false;
+  }
+  staged.keep();
+  if (before.installed) core.containers.remove(before.installed->container);
+  if (before.placeholder) core.containers.remove(before.placeholder->container);
+  return true;
+}
+
+void markInstalling(DeviceCore& core, const std::string& identifier) {
+  if (const auto progress = currentProgress(core.database, core.observers, identifier)) {
+    progress->setInstallState(InstallState::Active);
+    if (progress->installPhase() == InstallPhase::Loading) {
+      progress->setInstallPhase(InstallPhase::Installing);
+    }
+  }
+}
+
+void markFailed(DeviceCore& core, const std::string& identifier) {
+  core.database.change(
+      "a failed install could not be ended", Database::Commit::Ordinary,
+      [&](SQLite::Database& database) { endInstall(database, identifier, InstallState::Failed); });
+}
+
+}  // namespace
+
+bool installPackage(DeviceCore& core, const std::string& package, const std::string& identifier,
+                    std::optional<Error>* error) {
+  ApplicationRows before;
+  const bool read = core.database.read(
+      "the registry could not be read",
+      [&](SQLite::Database& database) { before = findApplication(database, identifier); }, error);
+  if (!read) return false;
+  markInstalling(core, identifier);
+  const bool installed = replaceApplication(core, package, identifier, before, error);
+  if (!installed) markFailed(core, identifier);
+  core.observers.installsChanged();
+  return installed;
+}
+
+}  // namespace appsync::device

@@ -1,0 +1,143 @@
+#include <fmt/format.h>
+
+#include <filesystem>
+
+#include "device/apps/installers.h"
+#include "device/apps/installs.h"
+#include "device/home/icon_order.h"
+#include "platform/bundle.h"
+#include "platform/installer_service.h"
+#include "platform/property_list_codec.h"
+
+namespace appsync::device {
+namespace {
+
+/// The bundle's information dictionary, if it is one of a placeholder of this application.
+std::optional<PropertyList::Dictionary> readInfo(DeviceCore& core, const std::string& bundle,
+                                                 const std::string& identifier,
+                                                 std::optional<Error>* error) {
+  std::optional<Error> cause;
+  auto info = loadDictionary(core.files, joinPath(bundle, "Info.plist"), &cause);
+  if (!info) {
+    setError(error, refusal(PackageRefusal::BadInfo,
+                            cause ? cause->localizedDescription() : "Info.plist is missing"));
+    return std::nullopt;
+  }
+  const std::string* found = findString(*info, KBBundleIdentifier);
+  if (found && *found == identifier) return info;
+  setError(error, found ? refusal(PackageRefusal::WrongIdentifier,
+                                  fmt::format("Info.plist names {}, not {}", *found, identifier))
+                        : refusal(PackageRefusal::BadInfo, "Info.plist names no application"));
+  return std::nullopt;
+}
+
+std::string bundleName(const std::string& directory, const std::string& identifier) {
+  const std::string last = std::filesystem::path(directory).filename();
+  return last.size() > 4 && last.ends_with(".app") ? last : identifier + ".app";
+}
+
+std::uint64_t sizeOf(DeviceCore& core, const std::string& file) {
+  const auto attributes = core.files.attributesOfItem(file);
+  return attributes ? attributes->size : 0;
+}
+
+bool fill(DeviceCore& core, const std::string& source, const PlaceholderOptions& options,
+          ApplicationRow& row, std::optional<Error>* error) {
+  if (!core.files.copyItem(source, row.bundlePath(), error)) return false;
+  row.diskUsage = sizeOf(core, joinPath(row.bundlePath(), "Info.plist")) +
+                  sizeOf(core, joinPath(row.bundlePath(), "Icon.png"));
+  if (!options.metadata) return true;
+  const std::string metadata = joinPath(row.container, "HalvoMetadata.plist");
+  row.diskUsage += options.metadata->size();
+  return core.files.writeAtomically(metadata, *options.metadata, error);
+}
+
+/// A sync's placeholder that a power failure takes is made anew by the next sync; any other is all
+/// that is left of its application.
+bool mustLast(const ApplicationRow& row) { return row.installType != InstallType::Sync; }
+
+/// Enters the placeholder; `replaced` is the one it takes the place of.
+bool enter(DeviceCore& core, ApplicationRow& row, std::optional<ApplicationRow>& replaced,
+           std::optional<Error>* error) {
+  return core.database.change(
+      fmt::format("the placeholder of {} could not be entered in the registry", row.identifier),
+      mustLast(row) ? Database::Commit::OnDisk : Database::Commit::Ordinary,
+      [&](SQLite::Database& database) {
+        ApplicationRows before = findApplication(database, row.identifier);
+        row.type = before.type();
+        putApplication(database, row);
+        beginInstall(database, row.identifier);
+        appendToIconOrder(database, row.identifier);
+        replaced = std::move(before.placeholder);
+      },
+      error);
+}
+
+}  // namespace
+
+bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
+                        const std::string& identifier, const PlaceholderOptions& options,
+                        std::optional<Error>* error) {
+  const auto info = readInfo(core, bundleDirectory, identifier, error);
+  if (!info) return false;
+  StagedContainer staged(core.containers, error);
+  if (!staged.isMade()) return false;
+  ApplicationRow row;
+  row.identifier = identifier;
+  row.placeholder = true;
+  row.container = staged.path();
+  row.bundle = bundleName(bundleDirectory, identifier);
+  row.installType = options.installType;
+  row.sinf = options.sinf;
+  describe(row, *info);
+  std::optional<ApplicationRow> replaced;
+  if (!fill(core, bundleDirectory, options, row, error) ||
+      (mustLast(row) && !core.containers.flush(error)) || !enter(core, row, replaced, error)) {
+    return false;
+  }
+  staged.keep();
+  if (replaced) core.containers.remove(replaced->container);
+  core.observers.installsChanged();
+  return true;
+}
+
+bool installSystemApplication(DeviceCore& core, const std::string& identifier,
+                              const std::string& displayName, const std::string& version,
+                              std::optional<Error>* error) {
+  StagedContainer staged(core.containers, error);
+  if (!staged.isMade()) return false;
+  ApplicationRow row;
+  row.identifier = identifier;
+  row.type = ApplicationTypeSystem;
+  row.container = staged.path();
+  row.bundle = identifier + ".app";
+  const PropertyList::Dictionary info{{std::string(KBBundleIdentifier), identifier},
+                                      {std::string(KBBundleDisplayName), displayName},
+                                      {std::string(KBBundleVersion), version}};
+  describe(row, info);
+  const auto bytes = serializePropertyList(info, PropertyListFormat::Xml, error);
+  if (!bytes || !core.files.createDirectory(row.bundlePath(), false, {}, error) ||
+      !core.files.writeAtomically(joinPath(row.bundlePath(), "Info.plist"), *bytes, error)) {
+    return false;
+  }
+  ApplicationRows before;
+  const bool entered = core.database.change(
+      fmt::format("{} could not be entered in the registry", identifier), Database::Commit::OnDisk,
+      [&](SQLite::Database& database) {
+        before = findApplication(database, identifier);
+        putApplication(database, row);
+        appendToIconOrder(database, identifier);
+      },
+      error);
+  if (!entered) return false;
+  staged.keep();
+  if (before.installed) core.containers.remove(before.installed->container);
+  return true;
+}
+
+Error refusal(PackageRefusal reason, std::string_view detail) {
+  return Error::withDescription(InstallerServiceErrorDomain, static_cast<std::int64_t>(reason),
+                                fmt::format("{}: {}", name(reason), detail));
+}
+
+}  // namespace appsync::device

@@ -1,0 +1,131 @@
+#include "device/apps/removal.h"
+
+#include <fmt/format.h>
+
+#include <cerrno>
+
+#include "device/apps/installer_service.h"
+#include "device/apps/installs.h"
+#include "device/home/icon_order.h"
+#include "device/state/application_rows.h"
+
+namespace appsync::device {
+namespace {
+
+Error notInstalled(std::string_view identifier) {
+  return Error::withDescription(POSIXErrorDomain, ENOENT,
+                                fmt::format("{} is not installed", identifier));
+}
+
+Error belongsToSystem(std::string_view identifier) {
+  return Error::withDescription(
+      POSIXErrorDomain, EPERM,
+      fmt::format("{} belongs to the system and cannot be removed", identifier));
+}
+
+/// The data is only named here, so that a crash before all of it is gone is made good later.
+void abandonData(SQLite::Database& database, std::string_view identifier) {
+  Query(database, "INSERT OR REPLACE INTO abandoned_data VALUES (?)", identifier).run();
+}
+
+void eraseInstalled(SQLite::Database& database, const ApplicationRow& installed) {
+  if (installed.type == ApplicationTypeSystem) throw Refused{belongsToSystem(installed.identifier)};
+  eraseApplication(database, installed);
+  recordUninstalled(database, installed.identifier);
+  removeFromIconOrder(database, installed.identifier);
+  abandonData(database, installed.identifier);
+}
+
+void erasePlaceholder(SQLite::Database& database, const ApplicationRow& placeholder) {
+  eraseApplication(database, placeholder);
+  endInstall(database, placeholder.identifier, InstallState::Canceled);
+}
+
+void removeFiles(DeviceCore& core, const std::string& identifier, const ApplicationRows& removed) {
+  if (removed.placeholder) core.containers.remove(removed.placeholder->container);
+  if (removed.installed) {
+    core.foreground.quit(identifier, nullptr);
+    core.containers.remove(removed.installed->container);
+  }
+  removeAbandonedData(core, identifier, nullptr);
+}
+
+std::string purpose(std::string_view identifier) {
+  return fmt::format("{} could not be taken out of the registry", identifier);
+}
+
+}  // namespace
+
+bool removeForClient(DeviceCore& core, const std::string& identifier, bool placeholderOnly,
+                     std::optional<Error>* error) {
+  ApplicationRows removed;
+  const bool erased = core.database.change(
+      purpose(identifier), Database::Commit::OnDisk,
+      [&](SQLite::Database& database) {
+        ApplicationRows present = findApplication(database, identifier);
+        if (present.placeholder) {
+          erasePlaceholder(database, *present.placeholder);
+          removed.placeholder = std::move(present.placeholder);
+        } else if (present.installed && !placeholderOnly) {
+          eraseInstalled(database, *present.installed);
+          removed.installed = std::move(present.installed);
+        } else {
+          throw Refused{notInstalled(identifier)};
+        }
+      },
+      error);
+  if (!erased) return false;
+  removeFiles(core, identifier, removed);
+  core.observers.installsChanged();
+  return true;
+}
+
+bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error) {
+  ApplicationRows removed;
+  bool brokenOff = false;
+  const bool erased = core.database.change(
+      purpose(identifier), Database::Commit::OnDisk,
+      [&](SQLite::Database& database) {
+        removed = findApplication(database, identifier);
+        if (!removed.any()) throw Refused{notInstalled(identifier)};
+        brokenOff = removed.placeholder && isInstalling(database, identifier);
+        if (removed.installed) eraseInstalled(database, *removed.installed);
+        if (!removed.placeholder) return;
+        erasePlaceholder(database, *removed.placeholder);
+        recordUninstalled(database, identifier);
+        removeFromIconOrder(database, identifier);
+        abandonData(database, identifier);
+      },
+      error);
+  if (!erased) return false;
+  removeFiles(core, identifier, removed);
+  core.containers.removeWaitingData(identifier);
+  if (brokenOff) core.observers.installsCancelled({removed.placeholder->record()});
+  core.observers.installsChanged();
+  return true;
+}
+
+bool removeAbandonedData(DeviceCore& core, const std::string& identifier,
+                         std::optional<Error>* error) {
+  bool abandoned = false;
+  const bool read = core.database.read(
+      "the list of abandoned data could not be read",
+      [&](SQLite::Database& database) {
+        abandoned =
+            Query(database, "SELECT 1 FROM abandoned_data WHERE identifier = ?", identifier).next();
+      },
+      error);
+  if (!read || !abandoned) return read;
+  if (!core.containers.removeData(identifier)) {
+    setError(error, Error::posix(EIO, Containers::dataPath(identifier)));
+    return false;
+  }
+  return core.database.change(
+      "the list of abandoned data could not be changed", Database::Commit::Ordinary,
+      [&](SQLite::Database& database) {
+        Query(database, "DELETE FROM abandoned_data WHERE identifier = ?", identifier).run();
+      },
+      error);
+}
+
+}  // namespace appsync::device

@@ -1,0 +1,25 @@
+#pragma once
+
+#include <string>
+
+#include "device/state/device_core.h"
+
+namespace appsync::device {
+
+// Ways for an application to leave the device. Each is on disk when it returns true. The identifier
+// is usable and the caller holds its application lock, but for the first.
+
+/// What the registry's clients ask for: takes the placeholder if there is one, else (unless
+/// `placeholderOnly`) the application with its data.
+bool removeForClient(DeviceCore& core, const std::string& identifier, bool placeholderOnly,
+                     std::optional<Error>* error);
+
+/// What a person does: takes the application, its placeholder, its data and what a restore still
+/// had for it. Observers hear of an install that this breaks off.
+bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
+
+/// Ends the removal of an application's data that was begun earlier, if there is such.
+bool removeAbandonedData(DeviceCore& core, const std::string& identifier,
+                         std::optional<Error>* error);
+
+}  // namespace appsync::device

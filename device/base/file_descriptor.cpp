@@ -1,0 +1,50 @@
+#include "device/base/file_descriptor.h"
+
+#include <unistd.h>
+
+#include <cerrno>
+
+namespace appsync::device {
+
+namespace {
+
+/// Hands `bytes` over piece by piece to `put`, which takes (piece, bytes handed over before).
+template <typename Put>
+bool putAll(ByteView bytes, Put put) noexcept {
+  std::size_t done = 0;
+  while (done < bytes.size()) {
+    const ssize_t count = put(bytes.subspan(done), done);
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return false;
+    done += static_cast<std::size_t>(count);
+  }
+  return true;
+}
+
+}  // namespace
+
+void FileDescriptor::reset(int fd) noexcept {
+  if (fd_ >= 0) {
+    const int saved = errno;
+    ::close(fd_);
+    errno = saved;
+  }
+  fd_ = fd;
+}
+
+bool writeAll(int fd, ByteView bytes) noexcept {
+  return putAll(
+      bytes, [fd](ByteView piece, std::size_t) { return ::write(fd, piece.data(), piece.size()); });
+}
+
+bool writeAllAt(int fd, ByteView bytes, std::uint64_t offset) noexcept {
+  return putAll(bytes, [fd, offset](ByteView piece, std::size_t done) {
+    return ::pwrite(fd, piece.data(), piece.size(), static_cast<off_t>(offset + done));
+  });
+}
+
+bool syncToDisk(int fd) noexcept { return ::fsync(fd) == 0; }
+
+bool syncFileSystem(int fd) noexcept { return ::syncfs(fd) == 0; }
+
+}  // namespace appsync::device

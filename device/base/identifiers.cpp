@@ -1,0 +1,23 @@
+#include "device/base/identifiers.h"
+
+#include <algorithm>
+
+namespace appsync::device {
+namespace {
+
+constexpr std::size_t MaximumLength = 200;  // leaves room for a suffix within NAME_MAX
+
+bool isAlphanumeric(char c) {
+  return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9');
+}
+
+bool isAllowed(char c) { return isAlphanumeric(c) || c == '.' || c == '_' || c == '-'; }
+
+}  // namespace
+
+bool isUsableIdentifier(std::string_view identifier) {
+  return identifier.size() <= MaximumLength && std::ranges::all_of(identifier, isAllowed) &&
+         std::ranges::any_of(identifier, isAlphanumeric);
+}
+
+}  // namespace appsync::device

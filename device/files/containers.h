@@ -1,0 +1,73 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "device/files/file_manager.h"
+#include "platform/log.h"
+
+namespace appsync::device {
+
+/// Directories of the phone that hold applications, their data, and data that a restore has still
+/// to give back. All paths are the phone's. Identifiers must be usable. Thread-safe.
+class Containers {
+ public:
+  /// Changes go through `files`, handles come from `handles`; both show the same phone.
+  Containers(FileManager& files, ConfinedFileManager& handles, Log& log)
+      : files_(files), handles_(handles), log_(log) {}
+
+  static std::string dataPath(std::string_view identifier);
+  static std::string waitingDataPath(std::string_view identifier);
+
+  /// Makes an empty container, private until a row of the registry names it.
+  std::optional<std::string> make(std::optional<Error>* error);
+  /// Removes a container. What cannot be removed is logged, and swept when the device is opened.
+  void remove(const std::string& container);
+  std::vector<std::string> list();
+
+  /// Puts all of the phone's files on disk.
+  bool flush(std::optional<Error>* error);
+
+  /// Whether a restore left data that is still to be given back to the application.
+  bool dataWaits(std::string_view identifier);
+  /// Gives the waiting data to the application in the place of what it has.
+  bool adoptWaitingData(std::string_view identifier, std::optional<Error>* error);
+  bool removeWaitingData(std::string_view identifier);
+  bool makeData(std::string_view identifier, std::optional<Error>* error);
+  /// The applications that have a data directory with nothing in it.
+  std::vector<std::string> emptyData();
+  /// True when the application has no data any more.
+  bool removeData(std::string_view identifier);
+
+ private:
+  std::vector<std::string> namesIn(std::string_view directory);
+  bool removeIfThere(const std::string& path);
+
+  FileManager& files_;
+  ConfinedFileManager& handles_;
+  Log& log_;
+};
+
+/// A container that disappears with the object unless it is kept.
+class StagedContainer {
+ public:
+  StagedContainer(Containers& containers, std::optional<Error>* error)
+      : containers_(containers), path_(containers.make(error)) {}
+  ~StagedContainer() {
+    if (path_) containers_.remove(*path_);
+  }
+  StagedContainer(const StagedContainer&) = delete;
+  StagedContainer& operator=(const StagedContainer&) = delete;
+
+  bool isMade() const { return path_.has_value(); }
+  const std::string& path() const { return *path_; }
+  void keep() { path_.reset(); }
+
+ private:
+  Containers& containers_;
+  std::optional<std::string> path_;
+};
+
+}  // namespace appsync::device

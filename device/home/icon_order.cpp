@@ -1,0 +1,36 @@
+#include "device/home/icon_order.h"
+
+namespace appsync::device {
+namespace {
+
+std::vector<std::string> identifiersOf(Query query) {
+  std::vector<std::string> identifiers;
+  while (query.next()) identifiers.push_back(query.text(0));
+  return identifiers;
+}
+
+}  // namespace
+
+void appendToIconOrder(SQLite::Database& database, std::string_view identifier) {
+  Query(database, "INSERT OR IGNORE INTO icon_order (identifier) VALUES (?)", identifier).run();
+}
+
+void removeFromIconOrder(SQLite::Database& database, std::string_view identifier) {
+  Query(database, "DELETE FROM icon_order WHERE identifier = ?", identifier).run();
+}
+
+void adoptIconOrder(SQLite::Database& database, const std::vector<std::string>& identifiers) {
+  const std::vector<std::string> before =
+      identifiersOf({database, "SELECT identifier FROM icon_order ORDER BY position"});
+  Query(database, "DELETE FROM icon_order").run();
+  for (const std::string& identifier : identifiers) appendToIconOrder(database, identifier);
+  for (const std::string& identifier : before) appendToIconOrder(database, identifier);
+}
+
+std::vector<std::string> shownIconOrder(SQLite::Database& database) {
+  return identifiersOf({database,
+                        "SELECT identifier FROM icon_order WHERE identifier IN "
+                        "(SELECT identifier FROM applications) ORDER BY position"});
+}
+
+}  // namespace appsync::device

@@ -1,0 +1,37 @@
+#pragma once
+
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "device/base/device_types.h"
+#include "device/state/database.h"
+#include "platform/transaction_log.h"
+
+namespace appsync::device {
+
+/// Install milestones, kept in the device's database.
+class StoredTransactionLog final : public TransactionLog {
+ public:
+  explicit StoredTransactionLog(Database& database) : database_(database) {}
+
+  void initializeWithLog(const LogHandle& handle) noexcept override;
+  void logScenario(std::string_view scenario, std::optional<std::uint32_t> step, bool success,
+                   std::string_view bundleId, std::string_view description) noexcept override;
+  void logStep(std::uint32_t step, std::uint32_t party, std::uint32_t phase, bool success,
+               std::string_view bundleId, std::string_view description) noexcept override;
+
+  /// The records after `number`, oldest first.
+  std::vector<TransactionRecord> recordsAfter(std::int64_t number) noexcept;
+
+ private:
+  void keep(const TransactionRecord& record) noexcept;
+
+  Database& database_;
+  std::mutex mutex_;
+  // Who writes the records that come; guarded by mutex_.
+  std::string subsystem_;
+  std::string category_;
+};
+
+}  // namespace appsync::device

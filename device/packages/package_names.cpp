@@ -1,0 +1,121 @@
+#include "device/packages/package_names.h"
+
+#include <array>
+#include <cstdio>
+#include <optional>
+
+#include "platform/utf8.h"
+
+namespace appsync::device {
+
+namespace {
+
+/// Takes the first character off a non-empty text; nullopt (and nothing taken) when it is
+/// malformed.
+std::optional<char32_t> takeCharacter(std::string_view& text) {
+  const auto byteAt = [&](std::size_t i) { return static_cast<unsigned char>(text[i]); };
+  const unsigned char first = byteAt(0);
+  const std::size_t length = first < 0x80   ? 1
+                             : first < 0xc2 ? 0
+                             : first < 0xe0 ? 2
+                             : first < 0xf0 ? 3
+                                            : 4;
+  if (length == 0 || first > 0xf4 || text.size() < length) return std::nullopt;
+  char32_t value = length == 1 ? first : first & (0x7fU >> length);
+  for (std::size_t i = 1; i < length; ++i) {
+    if ((byteAt(i) & 0xc0) != 0x80) return std::nullopt;
+    value = value << 6 | (byteAt(i) & 0x3f);
+  }
+  const bool overlong = (length == 3 && value < 0x800) || (length == 4 && value < 0x10000);
+  const bool surrogate = value >= 0xd800 && value <= 0xdfff;
+  if (overlong || surrogate || value > 0x10ffff) return std::nullopt;
+  text.remove_prefix(length);
+  return value;
+}
+
+bool isInvisibleControl(char32_t c) {
+  return c < 0x20 || (c >= 0x7f && c < 0xa0) || c == 0x2028 || c == 0x2029 ||
+         (c >= 0x202a && c <= 0x202e) || (c >= 0x2066 && c <= 0x2069);
+}
+
+/// Capital letters that stand a fixed way before their small ones, or alternate with them.
+struct Range {
+  char32_t first;
+  char32_t last;
+  char32_t distance;  ///< 0: a small letter follows each capital one of the same parity as `first`
+};
+
+constexpr std::array Ranges{
+    Range{'A', 'Z', 32},     Range{0xc0, 0xd6, 32},     Range{0xd8, 0xde, 32},
+    Range{0x100, 0x12e, 0},  Range{0x132, 0x136, 0},    Range{0x139, 0x147, 0},
+    Range{0x14a, 0x176, 0},  Range{0x179, 0x17d, 0},    Range{0x388, 0x38a, 37},
+    Range{0x38e, 0x38f, 63}, Range{0x391, 0x3a1, 32},   Range{0x3a3, 0x3ab, 32},
+    Range{0x400, 0x40f, 80}, Range{0x410, 0x42f, 32},   Range{0x460, 0x480, 0},
+    Range{0x48a, 0x4be, 0},  Range{0x4c1, 0x4cd, 0},    Range{0x4d0, 0x52e, 0},
+    Range{0x531, 0x556, 48}, Range{0xff21, 0xff3a, 32},
+};
+
+constexpr std::array<std::pair<char32_t, char32_t>, 8> Singles{{
+    {0x178, 0xff},   // Y with diaeresis
+    {0x17f, 's'},    // long s
+    {0x386, 0x3ac},  // alpha with tonos
+    {0x38c, 0x3cc},  // omicron with tonos
+    {0x3c2, 0x3c3},  // final sigma
+    {0x212a, 'k'},   // Kelvin
+    {0x212b, 0xe5},  // Angstrom
+    {0xb5, 0x3bc},   // micro
+}};
+
+char32_t folded(char32_t c) {
+  for (const Range& range : Ranges) {
+    if (c < range.first || c > range.last) continue;
+    if (range.distance != 0) return c + range.distance;
+    return (c - range.first) % 2 == 0 ? c + 1 : c;
+  }
+  for (const auto& [from, to] : Singles)
+    if (c == from) return to;
+  return c;
+}
+
+}  // namespace
+
+bool holdsInvisibleControls(std::string_view name) {
+  while (!name.empty()) {
+    const std::optional<char32_t> c = takeCharacter(name);
+    if (!c || isInvisibleControl(*c)) return true;
+  }
+  return false;
+}
+
+std::string foldCase(std::string_view name) {
+  std::string result;
+  result.reserve(name.size());
+  while (!name.empty()) {
+    const std::optional<char32_t> c = takeCharacter(name);
+    if (!c) return result.append(name);
+    appendUtf8(result, folded(*c));
+  }
+  return result;
+}
+
+std::string shown(std::string_view name) {
+  constexpr std::size_t longest = 120;
+  std::string result;
+  while (!name.empty() && result.size() < longest) {
+    const std::string_view before = name;
+    const std::optional<char32_t> c = takeCharacter(name);
+    if (c && !isInvisibleControl(*c)) {
+      result.append(before.substr(0, before.size() - name.size()));
+      continue;
+    }
+    if (!c) name.remove_prefix(1);
+    for (const char byte : before.substr(0, before.size() - name.size())) {
+      std::array<char, 5> escape{};
+      std::snprintf(escape.data(), escape.size(), "\\x%02x", static_cast<unsigned char>(byte));
+      result += escape.data();
+    }
+  }
+  return name.empty() ? result : result + "...";
+}
+
+}  // namespace appsync::device

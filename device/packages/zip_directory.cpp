@@ -1,0 +1,186 @@
+#include "device/packages/zip_directory.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <string>
+#include <string_view>
+
+#include "device/packages/package_entry_rules.h"
+#include "device/packages/package_names.h"
+
+namespace appsync::device {
+
+namespace {
+
+constexpr std::uint32_t LocalSignature = 0x04034b50;
+constexpr std::uint32_t CentralSignature = 0x02014b50;
+constexpr std::uint32_t EndSignature = 0x06054b50;
+constexpr std::uint32_t LargeEndSignature = 0x06064b50;
+constexpr std::uint32_t LocatorSignature = 0x07064b50;
+constexpr std::size_t LocalSize = 30;
+constexpr std::size_t CentralSize = 46;
+constexpr std::size_t EndSize = 22;
+constexpr std::size_t LargeEndSize = 56;
+constexpr std::size_t LocatorSize = 20;
+/// How far from the end of the file the archive library looks for the end record.
+constexpr std::uint64_t Tail = 16 << 10;
+constexpr std::uint32_t InLargeField = 0xffffffff;
+constexpr std::uint16_t LargeField = 0x0001;
+
+/// Little-endian number of `size` bytes; the caller has checked that they are there.
+std::uint64_t number(std::string_view bytes, std::size_t at, std::size_t size) {
+  std::uint64_t value = 0;
+  for (std::size_t i = size; i-- > 0;)
+    value = value << 8 | static_cast<unsigned char>(bytes[at + i]);
+  return value;
+}
+
+std::optional<Error> damaged(std::string_view detail) {
+  return refusalError(PackageRefusal::Damaged, detail);
+}
+
+struct Directory {
+  std::uint64_t entries = 0;
+  std::uint64_t size = 0;
+  std::uint64_t offset = 0;
+  std::uint64_t end = 0;  ///< where it must have ended
+};
+
+class ZipFile {
+ public:
+  ZipFile(int fd, std::uint64_t size) : fd_(fd), size_(size) {}
+
+  std::optional<Error> check(std::uint64_t maximumEntries) const {
+    Directory directory;
+    if (auto error = findDirectory(directory)) return error;
+    if (directory.offset > directory.end || directory.size != directory.end - directory.offset)
+      return damaged("the table of contents is not where it should be");
+    std::uint64_t entries = 0;
+    for (std::uint64_t at = directory.offset; at < directory.end; ++entries) {
+      if (entries == maximumEntries)
+        return refusalError(PackageRefusal::TooManyEntries,
+                            "more than " + std::to_string(maximumEntries) + " files and folders");
+      if (auto error = checkEntry(directory.end, at)) return error;
+    }
+    if (entries != directory.entries) return damaged("the table of contents is cut off");
+    if (entries == 0) return refusalError(PackageRefusal::NoApplication, "the archive is empty");
+    return std::nullopt;
+  }
+
+ private:
+  /// Empty when the file does not hold all of it.
+  std::string read(std::uint64_t at, std::size_t count) const {
+    if (at > size_ || count > size_ - at) return {};
+    std::string bytes(count, '\0');
+    std::size_t done = 0;
+    while (done < count) {
+      const ssize_t part =
+          ::pread(fd_, bytes.data() + done, count - done, static_cast<off_t>(at + done));
+      if (part < 0 && errno == EINTR) continue;
+      if (part <= 0) return {};
+      done += static_cast<std::size_t>(part);
+    }
+    return bytes;
+  }
+
+  std::optional<Error> findDirectory(Directory& directory) const {
+    const std::uint64_t tailSize = std::min(size_, Tail);
+    const std::string tail = read(size_ - tailSize, static_cast<std::size_t>(tailSize));
+    const std::size_t found = tail.rfind(std::string_view("PK\x05\x06", 4));
+    if (found == std::string::npos || tail.size() - found < EndSize)
+      return damaged("the archive is cut off");
+    const std::string_view end = std::string_view(tail).substr(found);
+    if (end.size() != EndSize + number(end, 20, 2))
+      return damaged("something follows the end of the archive");
+    const std::uint64_t disk = number(end, 4, 2);
+    directory = {number(end, 10, 2), number(end, 12, 4), number(end, 16, 4),
+                 size_ - tailSize + found};
+    if (auto error = readLargeEnd(directory)) return error;
+    if ((disk != 0 && disk != 0xffff) || number(end, 8, 2) != number(end, 10, 2))
+      return damaged("it is one part of an archive in several parts");
+    return std::nullopt;
+  }
+
+  /// Archives past 4 GiB or 65,535 entries have a larger end record in front of the usual one.
+  std::optional<Error> readLargeEnd(Directory& directory) const {
+    if (directory.end < LocatorSize) return std::nullopt;
+    const std::string locator = read(directory.end - LocatorSize, LocatorSize);
+    if (locator.empty() || number(locator, 0, 4) != LocatorSignature) return std::nullopt;
+    const std::uint64_t at = number(locator, 8, 8);
+    const std::string record = read(at, LargeEndSize);
+    if (record.empty() || number(record, 0, 4) != LargeEndSignature)
+      return damaged("its end record is not where it should be");
+    if (number(locator, 4, 4) != 0 || number(record, 16, 4) != 0 || number(record, 20, 4) != 0)
+      return damaged("it is one part of an archive in several parts");
+    directory = {number(record, 32, 8), number(record, 40, 8), number(record, 48, 8), at};
+    return std::nullopt;
+  }
+
+  std::optional<Error> checkEntry(std::uint64_t end, std::uint64_t& at) const {
+    const std::string header = read(at, CentralSize);
+    if (header.empty() || number(header, 0, 4) != CentralSignature)
+      return damaged("the table of contents is wrong");
+    const std::size_t nameSize = number(header, 28, 2);
+    const std::size_t extraSize = number(header, 30, 2);
+    const std::uint64_t whole = CentralSize + nameSize + extraSize + number(header, 32, 2);
+    if (whole > end - at) return damaged("the table of contents is cut off");
+    const std::string variable = read(at + CentralSize, nameSize + extraSize);
+    const std::string_view name = std::string_view(variable).substr(0, nameSize);
+    at += whole;
+    if (name.find('\0') != std::string_view::npos)
+      return refusalError(PackageRefusal::UnsafeName, "\"" + shown(name) + "\" holds a NUL");
+    if ((number(header, 8, 2) & 1) != 0)
+      return refusalError(PackageRefusal::Encrypted,
+                          "\"" + shown(name) + "\" can be read only with a password");
+    return checkLocal(name, localOffset(header, std::string_view(variable).substr(nameSize)));
+  }
+
+  static std::uint64_t localOffset(std::string_view header, std::string_view extra) {
+    const std::uint64_t offset = number(header, 42, 4);
+    if (offset != InLargeField) return offset;
+    while (extra.size() >= 4) {
+      const std::size_t size = std::min<std::size_t>(number(extra, 2, 2), extra.size() - 4);
+      if (number(extra, 0, 2) == LargeField) {
+        // It holds, in this order, only those fields that have no room in the header.
+        std::size_t skipped = number(header, 24, 4) == InLargeField ? 8 : 0;
+        skipped += number(header, 20, 4) == InLargeField ? 8 : 0;
+        return skipped + 8 <= size ? number(extra, 4 + skipped, 8) : offset;
+      }
+      extra.remove_prefix(4 + size);
+    }
+    return offset;
+  }
+
+  /// Programs that list an archive and programs that unpack it must see the same names.
+  std::optional<Error> checkLocal(std::string_view name, std::uint64_t offset) const {
+    const std::string header = read(offset, LocalSize);
+    const bool same = !header.empty() && number(header, 0, 4) == LocalSignature &&
+                      number(header, 26, 2) == name.size() &&
+                      read(offset + LocalSize, name.size()) == name;
+    if (same) return std::nullopt;
+    return damaged("\"" + shown(name) + "\" is not where the table of contents says");
+  }
+
+  const int fd_;
+  const std::uint64_t size_;
+};
+
+}  // namespace
+
+bool looksLikeZip(int packageFd) noexcept {
+  char magic[4] = {};
+  if (::pread(packageFd, magic, sizeof magic, 0) != sizeof magic) return false;
+  const std::uint64_t value = number(std::string_view(magic, sizeof magic), 0, sizeof magic);
+  return value == LocalSignature || value == EndSignature;
+}
+
+std::optional<Error> checkZipDirectory(int packageFd, std::uint64_t maximumEntries) {
+  struct stat status {};
+  if (::fstat(packageFd, &status) != 0) return Error::posix(errno);
+  return ZipFile(packageFd, static_cast<std::uint64_t>(status.st_size)).check(maximumEntries);
+}
+
+}  // namespace appsync::device

@@ -1,0 +1,90 @@
+#include "device/services/background_queue.h"
+
+#include <algorithm>
+
+namespace appsync::device {
+
+namespace {
+
+// Longer delays would overflow the clock.
+constexpr std::chrono::milliseconds LongestDelay = std::chrono::hours(24 * 365 * 10);
+
+}  // namespace
+
+ThreadBackgroundQueue::ThreadBackgroundQueue() : thread_([this] { run(); }) {}
+
+ThreadBackgroundQueue::~ThreadBackgroundQueue() {
+  {
+    const std::lock_guard lock(mutex_);
+    stopping_ = true;
+  }
+  changed_.notify_all();
+  thread_.join();
+}
+
+BackgroundQueue::Token ThreadBackgroundQueue::after(std::chrono::milliseconds delay,
+                                                    std::function<void()> task) noexcept {
+  const std::lock_guard lock(mutex_);
+  const Token token = ++lastToken_;
+  const Clock::time_point now = Clock::now();
+  const auto wait = std::clamp(delay, std::chrono::milliseconds(0), LongestDelay);
+  const Clock::time_point due = expedited_ ? now : now + wait;
+  due_.emplace(token, due);
+  pending_.emplace(Key{due, token}, std::move(task));
+  changed_.notify_all();
+  return token;
+}
+
+void ThreadBackgroundQueue::cancel(Token token) noexcept {
+  Tasks::node_type dropped;  // destroyed after the lock: what a task holds may call the queue
+  std::unique_lock lock(mutex_);
+  if (const auto due = due_.find(token); due != due_.end()) {
+    dropped = pending_.extract(Key{due->second, token});
+    due_.erase(due);
+  } else if (std::this_thread::get_id() != thread_.get_id()) {
+    finished_.wait(lock, [&] { return running_ != token; });
+  }
+  lock.unlock();
+}
+
+void ThreadBackgroundQueue::expedite() noexcept {
+  const std::lock_guard lock(mutex_);
+  expedited_ = true;
+  const Clock::time_point now = Clock::now();
+  std::size_t ahead = pending_.size();
+  Tasks hurried;
+  for (auto& [key, task] : pending_) {
+    // Distinct times in the past keep the order, also before tasks that come later.
+    const Clock::time_point due = std::min(key.first, now) - std::chrono::nanoseconds(ahead--);
+    due_[key.second] = due;
+    hurried.emplace(Key{due, key.second}, std::move(task));
+  }
+  pending_ = std::move(hurried);
+  changed_.notify_all();
+}
+
+void ThreadBackgroundQueue::run() {
+  std::unique_lock lock(mutex_);
+  while (!stopping_) {
+    if (pending_.empty()) {
+      changed_.wait(lock);
+      continue;
+    }
+    const Key next = pending_.begin()->first;
+    if (next.first > Clock::now()) {
+      changed_.wait_until(lock, next.first);
+      continue;
+    }
+    Tasks::node_type node = pending_.extract(pending_.begin());
+    due_.erase(next.second);
+    running_ = next.second;
+    lock.unlock();
+    node.mapped()();
+    node = {};  // what the task holds goes before anybody is told that it has ended
+    lock.lock();
+    running_.reset();
+    finished_.notify_all();
+  }
+}
+
+}  // namespace appsync::device

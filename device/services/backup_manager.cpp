@@ -1,0 +1,17 @@
+#include "device/services/backup_manager.h"
+
+#include "device/base/identifiers.h"
+
+namespace appsync::device {
+
+bool DeviceBackupManager::restoreDataExists(std::string_view bundleId) noexcept {
+  return isUsableIdentifier(bundleId) && core_.containers.dataWaits(bundleId);
+}
+
+void DeviceBackupManager::cancelApplicationRestore(std::string_view bundleId) noexcept {
+  if (!isUsableIdentifier(bundleId) || !core_.database.writable()) return;
+  const KeyedMutex::Guard guard(core_.applicationLocks, bundleId);
+  core_.containers.removeWaitingData(bundleId);
+}
+
+}  // namespace appsync::device

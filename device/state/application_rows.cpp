@@ -1,0 +1,96 @@
+#include "device/state/application_rows.h"
+
+#include "platform/bundle.h"
+
+namespace appsync::device {
+namespace {
+
+#define APPLICATION_COLUMNS                                                               \
+  "identifier, placeholder, type, container, bundle, version, display_name, disk_usage, " \
+  "install_type, launch_prohibited, device_based, sinf"
+
+ApplicationRow rowOf(const Query& query) {
+  ApplicationRow row;
+  row.identifier = query.text(0);
+  row.placeholder = query.boolean(1);
+  row.type = query.text(2);
+  row.container = query.text(3);
+  row.bundle = query.text(4);
+  row.version = query.optionalText(5);
+  row.displayName = query.text(6);
+  row.diskUsage = query.as<std::uint64_t>(7);
+  row.installType = query.as<InstallType>(8);
+  row.launchProhibited = query.boolean(9);
+  row.deviceBased = query.boolean(10);
+  row.sinf = query.optionalBytes(11);
+  return row;
+}
+
+}  // namespace
+
+AppRecord ApplicationRow::record() const {
+  AppRecord record;
+  record.applicationIdentifier = identifier;
+  record.bundleIdentifier = identifier;
+  record.bundleVersion = version;
+  record.bundlePath = bundlePath();
+  record.bundleContainerPath = container;
+  record.applicationType = type;
+  record.displayName = displayName;
+  record.staticDiskUsage = diskUsage;
+  record.installType = installType;
+  record.isPlaceholder = placeholder;
+  record.isDeviceBasedAssignment = deviceBased;
+  return record;
+}
+
+std::string ApplicationRows::type() const {
+  if (installed) return installed->type;
+  return placeholder ? placeholder->type : std::string(ApplicationTypeUser);
+}
+
+void describe(ApplicationRow& row, const PropertyList::Dictionary& info) {
+  const std::string* version = findString(info, KBBundleVersion);
+  const std::string* name = findString(info, KBBundleDisplayName);
+  const PropertyList* prohibited = find(info, "SWApplicationLaunchProhibited");
+  if (version) row.version = *version;
+  if (name) row.displayName = *name;
+  row.launchProhibited = prohibited && prohibited->booleanValue();
+}
+
+ApplicationRows findApplication(SQLite::Database& database, std::string_view identifier) {
+  ApplicationRows rows;
+  Query query(database, "SELECT " APPLICATION_COLUMNS " FROM applications WHERE identifier = ?",
+              identifier);
+  while (query.next()) {
+    ApplicationRow row = rowOf(query);
+    (row.placeholder ? rows.placeholder : rows.installed) = std::move(row);
+  }
+  return rows;
+}
+
+std::vector<ApplicationRow> allApplications(SQLite::Database& database) {
+  std::vector<ApplicationRow> rows;
+  Query query(database,
+              "SELECT " APPLICATION_COLUMNS " FROM applications ORDER BY identifier, placeholder");
+  while (query.next()) rows.push_back(rowOf(query));
+  return rows;
+}
+
+void putApplication(SQLite::Database& database, const ApplicationRow& row) {
+  Query(database,
+        "INSERT OR REPLACE INTO applications (" APPLICATION_COLUMNS
+        ") VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
+        row.identifier, row.placeholder, row.type, row.container, row.bundle, row.version,
+        row.displayName, row.diskUsage, row.installType, row.launchProhibited, row.deviceBased,
+        row.sinf)
+      .run();
+}
+
+void eraseApplication(SQLite::Database& database, const ApplicationRow& row) {
+  Query(database, "DELETE FROM applications WHERE identifier = ? AND placeholder = ?",
+        row.identifier, row.placeholder)
+      .run();
+}
+
+}  // namespace appsync::device

@@ -1,0 +1,54 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "device/state/database.h"
+#include "platform/app_registry.h"
+
+namespace appsync::device {
+
+/// One row of the registry: an installed application or a placeholder.
+struct ApplicationRow {
+  std::string identifier;
+  bool placeholder = false;
+  std::string type{ApplicationTypeUser};
+  std::string container;  ///< directory, as the phone sees it
+  std::string bundle;     ///< "<Name>.app" in it
+  std::optional<std::string> version;
+  std::string displayName;
+  std::uint64_t diskUsage = 0;  ///< bytes
+  InstallType installType = InstallType::None;
+  bool launchProhibited = false;
+  bool deviceBased = false;
+  std::optional<Bytes> sinf;
+
+  std::string bundlePath() const { return joinPath(container, bundle); }
+  AppRecord record() const;
+};
+
+/// What an application has in the registry.
+struct ApplicationRows {
+  std::optional<ApplicationRow> installed;
+  std::optional<ApplicationRow> placeholder;
+
+  bool any() const { return installed || placeholder; }
+  /// The type of whichever there is; a new application is the user's.
+  std::string type() const;
+};
+
+/// Takes over what a bundle's information dictionary says.
+void describe(ApplicationRow& row, const PropertyList::Dictionary& info);
+
+// These throw SQLite::Exception and are used within Database's work.
+
+ApplicationRows findApplication(SQLite::Database& database, std::string_view identifier);
+/// Sorted by identifier, the placeholder after the installed version.
+std::vector<ApplicationRow> allApplications(SQLite::Database& database);
+/// Replaces the row of the same sort, if there is one.
+void putApplication(SQLite::Database& database, const ApplicationRow& row);
+void eraseApplication(SQLite::Database& database, const ApplicationRow& row);
+
+}  // namespace appsync::device

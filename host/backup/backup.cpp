@@ -1,0 +1,141 @@
+#include "host/backup/backup.h"
+
+#include <fmt/format.h>
+
+#include <chrono>
+#include <thread>
+
+#include "host/base/text.h"
+
+namespace appsync::host {
+namespace {
+
+constexpr std::chrono::milliseconds IdlePoll{10};
+constexpr std::uint64_t BytesBetweenReports = std::uint64_t{1} << 20;
+constexpr int FlattenedIconState = 1;
+
+std::string nameOf(const AppRecord& record) {
+  return record.displayName.empty() ? record.applicationIdentifier : record.displayName;
+}
+
+std::string reasonOf(const std::optional<Error>& error) {
+  return error ? oneLine(error->localizedDescription()) : "unknown reason";
+}
+
+}  // namespace
+
+BackupRun::BackupRun(SyncClient& client, const BackupPhone& phone, BackupWriter& writer,
+                     Reporter& reporter, Interruption& interruption)
+    : client_(client),
+      phone_(phone),
+      writer_(writer),
+      reporter_(reporter),
+      interruption_(interruption) {
+  interruption_.setListener([this] { reporter_.report(Interrupted{}); });
+}
+
+BackupRun::~BackupRun() { interruption_.setListener({}); }
+
+BackupSummary BackupRun::run() {
+  summary_.made = saveAll();
+  if (summary_.made) {
+    for (const AppRecord& record : saved_) summary_.saved.push_back(record.applicationIdentifier);
+  }
+  return std::move(summary_);
+}
+
+bool BackupRun::saveAll() {
+  client_.prepareForBackup();
+  waitUntilIdle(applicationsToSave(phone_.services.appRegistry));
+  const std::vector<AppRecord> applications = applicationsToSave(phone_.services.appRegistry);
+  count_ = applications.size();
+  for (const AppRecord& record : applications) {
+    if (!save(record)) return false;
+  }
+  if (!saveLists() || interruption_.requested()) return false;
+  return writer_.finish() || broken(writer_.problem());
+}
+
+/// What an install under way replaces could not be read.
+void BackupRun::waitUntilIdle(const std::vector<AppRecord>& applications) {
+  for (const AppRecord& record : applications) {
+    while (!interruption_.requested() && phone_.isBusyWith(record.applicationIdentifier)) {
+      std::this_thread::sleep_for(IdlePoll);
+    }
+  }
+}
+
+bool BackupRun::save(const AppRecord& record) {
+  if (interruption_.requested()) return false;
+  const std::string& identifier = record.applicationIdentifier;
+  ++number_;
+  reportProgress(record, 0);
+  std::string problem;
+  auto entry = restoreEntry(phone_, record, problem);
+  const auto failure = entry ? saveData(record) : std::optional(problem);
+  if (!writer_.problem().empty()) return broken(writer_.problem());
+  if (interruption_.requested()) return false;
+  reporter_.report(ApplicationSaved{identifier, nameOf(record), failure});
+  if (failure) {
+    summary_.failed.push_back({identifier, *failure});
+  } else {
+    entries_.emplace(identifier, std::move(*entry));
+    saved_.push_back(record);
+  }
+  return true;
+}
+
+std::optional<std::string> BackupRun::saveData(const AppRecord& record) {
+  std::uint64_t bytes = 0;
+  std::uint64_t reported = 0;
+  const auto take = [&](ByteView piece) {
+    if (interruption_.requested() || !writer_.append(piece)) return false;
+    bytes += piece.size();
+    if (bytes - reported < BytesBetweenReports) return true;
+    reported = bytes;
+    reportProgress(record, bytes);
+    return true;
+  };
+  std::optional<Error> error;
+  if (!writer_.beginData(record.applicationIdentifier)) return writer_.problem();
+  const bool whole = phone_.saveData(record.applicationIdentifier, take, &error);
+  if (whole && bytes > 0) {
+    writer_.endData();
+  } else {
+    writer_.dropData();
+  }
+  if (whole) return std::nullopt;
+  return "its data cannot be saved: " + reasonOf(error);
+}
+
+bool BackupRun::saveLists() {
+  const Platform& services = phone_.services;
+  const auto layout = services.homeScreen.getFlattenedIconState(services.homeScreen.serverPort(),
+                                                                FlattenedIconState);
+  if (!layout) return broken("the home screen does not tell its layout");
+  // Binary, since it is mostly icons.
+  return addList(BackupApplicationsFile, std::move(entries_), PropertyListFormat::Binary) &&
+         addList(BackupDemotionsFile, demotionsAmong(services.files, saved_),
+                 PropertyListFormat::Xml) &&
+         (writer_.addFile(BackupIconLayoutFile, *layout) || broken(writer_.problem()));
+}
+
+bool BackupRun::addList(std::string_view name, const PropertyList& list,
+                        PropertyListFormat format) {
+  std::optional<Error> error;
+  const auto bytes = serializePropertyList(list, format, &error);
+  if (!bytes) return broken(fmt::format("{} cannot be made: {}", name, reasonOf(error)));
+  return writer_.addFile(name, *bytes) || broken(writer_.problem());
+}
+
+void BackupRun::reportProgress(const AppRecord& record, std::uint64_t bytes) {
+  reporter_.report(
+      SavingProgress{record.applicationIdentifier, nameOf(record), bytes, number_, count_});
+}
+
+bool BackupRun::broken(const std::string& reason) {
+  reporter_.report(SyncBroken{reason});
+  return false;
+}
+
+}  // namespace appsync::host

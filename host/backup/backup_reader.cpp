@@ -1,0 +1,128 @@
+#include <fmt/format.h>
+
+#include <cerrno>
+#include <system_error>
+
+#include "host/backup/backup_files.h"
+#include "host/backup/backup_folder.h"
+#include "host/backup/backup_manifest.h"
+#include "host/base/digest.h"
+#include "host/base/text.h"
+#include "platform/property_list_codec.h"
+
+namespace appsync::host {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr std::uint64_t LargestList = PropertyListLimits{}.bytes;
+
+std::optional<Bytes> wholeList(const BackupFile& file, std::string& problem) {
+  if (file.size > LargestList) {
+    problem = fmt::format("{} is too large", file.path.filename().string());
+    return std::nullopt;
+  }
+  BackupFileReader reader(file);
+  Bytes bytes(file.size + 1);  // room to meet the end
+  std::size_t filled = 0;
+  while (true) {
+    const std::int64_t count =
+        reader.read(reinterpret_cast<std::uint8_t*>(bytes.data()) + filled, bytes.size() - filled);
+    if (count < 0) {
+      problem = reader.problem();
+      return std::nullopt;
+    }
+    if (count == 0) break;
+    filled += static_cast<std::size_t>(count);
+  }
+  bytes.resize(filled);
+  return bytes;
+}
+
+bool readContents(const fs::path& folder, Backup& backup, std::string& problem) {
+  const auto manifest = readBackupManifest(folder, problem);
+  if (!manifest) return false;
+  for (const auto& [name, entry] : manifest->files) {
+    auto bytes = wholeList({folder / name, entry.size, entry.digest}, problem);
+    if (!bytes) return false;
+    if (name == BackupApplicationsFile) backup.applications = std::move(*bytes);
+    if (name == BackupDemotionsFile) backup.demotions = std::move(*bytes);
+    if (name == BackupIconLayoutFile) backup.iconLayout = std::move(*bytes);
+  }
+  for (const auto& [identifier, entry] : manifest->data) {
+    const fs::path path = folder / BackupDataFolder / backupDataName(identifier);
+    backup.data.emplace(identifier, BackupFile{path, entry.size, entry.digest});
+  }
+  return true;
+}
+
+}  // namespace
+
+std::optional<Backup> readBackup(const fs::path& folder, std::string& problem) {
+  const auto refuse = [&](const std::string& reason) {
+    problem = fmt::format("cannot use the backup {}: {}", printable(folder.string()), reason);
+    return std::nullopt;
+  };
+  std::error_code failure;
+  const fs::path real = fs::canonical(folder, failure);
+  if (failure == std::errc::no_such_file_or_directory) return refuse("there is no such folder");
+  if (failure) return refuse(failure.message());
+  if (!fs::is_directory(real, failure)) return refuse("it is no folder");
+  Backup backup;
+  std::string reason;
+  if (!readContents(real, backup, reason)) return refuse(reason);
+  return backup;
+}
+
+struct BackupFileReader::State {
+  explicit State(const BackupFile& described) : file(described) {
+    std::uint64_t size = 0;
+    descriptor = openBackupFile(file.path, size, problem);
+    if (descriptor && size != file.size) fail("is shorter or longer than the manifest tells");
+  }
+
+  std::int64_t fail(const std::string& reason) {
+    problem = fmt::format("{} {}", file.path.filename().string(), reason);
+    return -1;
+  }
+
+  std::int64_t checkEnd() {
+    if (position != file.size) return fail("is shorter or longer than the manifest tells");
+    if (!ended && digest.finish() != file.digest) return fail("does not match its digest");
+    ended = true;
+    return 0;
+  }
+
+  const BackupFile file;
+  device::FileDescriptor descriptor;
+  Sha256 digest;
+  std::uint64_t position = 0;
+  bool ended = false;
+  std::string problem;
+};
+
+BackupFileReader::BackupFileReader(const BackupFile& file)
+    : state_(std::make_unique<State>(file)) {}
+
+BackupFileReader::~BackupFileReader() = default;
+
+std::int64_t BackupFileReader::read(std::uint8_t* bytes, std::size_t size) {
+  State& state = *state_;
+  if (!state.problem.empty()) return -1;
+  if (size == 0 || state.ended) return 0;
+  const std::int64_t count = readSome(state.descriptor.get(), bytes, size);
+  if (count < 0) {
+    return state.fail("cannot be read: " + std::generic_category().message(errno));
+  }
+  if (count == 0) return state.checkEnd();
+  state.position += static_cast<std::uint64_t>(count);
+  if (state.position > state.file.size) return state.checkEnd();
+  state.digest.add(std::as_bytes(std::span(bytes, static_cast<std::size_t>(count))));
+  return count;
+}
+
+std::uint64_t BackupFileReader::position() const { return state_->position; }
+
+const std::string& BackupFileReader::problem() const { return state_->problem; }
+
+}  // namespace appsync::host

@@ -1,0 +1,281 @@
+#include <dirent.h>
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <system_error>
+#include <vector>
+
+#include "device/base/directory_tree.h"
+#include "device/base/file_descriptor.h"
+#include "device/base/identifiers.h"
+#include "host/backup/backup_files.h"
+#include "host/backup/backup_folder.h"
+#include "host/backup/backup_manifest.h"
+#include "host/base/digest.h"
+#include "host/base/text.h"
+
+namespace appsync::host {
+namespace {
+
+namespace fs = std::filesystem;
+using device::FileDescriptor;
+
+constexpr std::string_view UnfinishedMark = ".partial-";
+constexpr std::size_t UnfinishedDigits = 6;
+
+std::string systemText(int errnoValue) { return std::generic_category().message(errnoValue); }
+
+FileDescriptor openFolder(int directory, const std::string& name) {
+  return FileDescriptor(
+      ::openat(directory, name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+}
+
+/// Where a backup is to be: a folder of this machine, and its name in it.
+struct Target {
+  fs::path path;  ///< without links
+  FileDescriptor parent;
+  bool replaces = false;  ///< an older backup stands there
+
+  std::string name() const { return path.filename().string(); }
+};
+
+/// The path that a person means by `folder`: one that is a link keeps being one.
+fs::path resolve(const fs::path& folder) {
+  std::error_code failure;
+  fs::path path = fs::weakly_canonical(fs::absolute(folder), failure);
+  if (failure) path = fs::absolute(folder).lexically_normal();
+  return path.has_filename() ? path : path.parent_path();
+}
+
+/// The first thing in an older backup that no backup holds; it would be lost with it.
+std::string foreignItem(const fs::path& folder) {
+  std::error_code failure;
+  for (fs::directory_iterator item(folder, failure), end; !failure && item != end;
+       item.increment(failure)) {
+    const std::string name = item->path().filename().string();
+    if (name != BackupManifestFile && name != BackupApplicationsFile &&
+        name != BackupDemotionsFile && name != BackupIconLayoutFile && name != BackupDataFolder) {
+      return name;
+    }
+  }
+  return {};
+}
+
+/// Empty, or why the folder cannot become a backup.
+std::string objectionTo(Target& target) {
+  struct stat status {};
+  struct stat around {};
+  if (target.path == target.path.root_path()) return "it is no folder for a backup";
+  if (!target.parent) {
+    return fmt::format("{}: {}", printable(target.path.parent_path().string()), systemText(errno));
+  }
+  if (::fstatat(target.parent.get(), target.name().c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
+    return errno == ENOENT ? "" : systemText(errno);
+  }
+  if (!S_ISDIR(status.st_mode)) return "it is no folder";
+  if (::fstat(target.parent.get(), &around) == 0 && around.st_dev != status.st_dev) {
+    return "it is a mount point; name a folder in it";
+  }
+  std::error_code failure;
+  if (fs::is_empty(target.path, failure)) return "";
+  if (failure) return failure.message();
+  std::string problem;
+  if (!readBackupManifest(target.path, problem)) return "it is not empty, and " + problem;
+  if (const std::string name = foreignItem(target.path); !name.empty()) {
+    return fmt::format("it holds \"{}\", which is no part of a backup", printable(name));
+  }
+  target.replaces = true;
+  return "";
+}
+
+bool isUnfinished(const std::string& name, const std::string& backupName) {
+  const std::string prefix = fmt::format("{}{}", backupName, UnfinishedMark);
+  return name.starts_with(prefix) && name.size() == prefix.size() + UnfinishedDigits;
+}
+
+/// A writer at work holds the lock of its folder.
+bool lockFolder(int folder) { return ::flock(folder, LOCK_EX | LOCK_NB) == 0; }
+
+/// Removes what killed writers left beside the target.
+void sweep(const Target& target) {
+  std::error_code failure;
+  std::vector<std::string> names;
+  for (fs::directory_iterator item(target.path.parent_path(), failure), end;
+       !failure && item != end; item.increment(failure)) {
+    names.push_back(item->path().filename().string());
+  }
+  for (const std::string& name : names) {
+    if (!isUnfinished(name, target.name())) continue;
+    const FileDescriptor folder = openFolder(target.parent.get(), name);
+    if (folder && lockFolder(folder.get())) device::removeTree(target.parent.get(), name);
+  }
+}
+
+class FolderWriter final : public BackupWriter {
+ public:
+  explicit FolderWriter(Target target) : target_(std::move(target)) {}
+
+  ~FolderWriter() override {
+    file_.reset();
+    if (!unfinished_.empty()) device::removeTree(target_.parent.get(), unfinished_);
+  }
+
+  bool begin() {
+    std::string pattern = fmt::format("{}{}XXXXXX", target_.path.string(), UnfinishedMark);
+    if (!::mkdtemp(pattern.data())) return fail("", errno);
+    unfinished_ = fs::path(pattern).filename().string();
+    folder_ = openFolder(target_.parent.get(), unfinished_);
+    const std::string data(BackupDataFolder);
+    if (!folder_ || !lockFolder(folder_.get()) ||
+        ::mkdirat(folder_.get(), data.c_str(), 0700) != 0) {
+      return fail("", errno);
+    }
+    data_ = openFolder(folder_.get(), data);
+    return data_ || fail(data, errno);
+  }
+
+  bool addFile(std::string_view name, ByteView contents) override {
+    return create(folder_.get(), std::string(name)) && append(contents) &&
+           close(manifest_.files, name);
+  }
+
+  bool beginData(std::string_view identifier) override {
+    identifier_ = identifier;
+    if (!device::isUsableIdentifier(identifier)) return fail(identifier_, EINVAL);
+    return create(data_.get(), backupDataName(identifier));
+  }
+
+  bool append(ByteView contents) override {
+    if (!problem_.empty()) return false;
+    if (!device::writeAll(file_.get(), contents)) return fail(name_, errno);
+    digest_.add(contents);
+    size_ += contents.size();
+    return true;
+  }
+
+  bool endData() override { return close(manifest_.data, identifier_); }
+
+  void dropData() override {
+    if (!problem_.empty() || !file_) return;
+    file_.reset();
+    if (::unlinkat(data_.get(), name_.c_str(), 0) != 0) fail(name_, errno);
+  }
+
+  bool finish() override {
+    if (!problem_.empty()) return false;
+    const auto manifest = serializeManifest(manifest_);
+    const std::string name(BackupManifestFile);
+    if (!manifest) return fail(name, EFBIG);
+    return addFile(name, *manifest) && putOnDisk() && takePlace();
+  }
+
+  const std::string& problem() const override { return problem_; }
+
+ private:
+  using Entries = std::map<std::string, ManifestEntry, std::less<>>;
+
+  // Both are always false.
+
+  bool fail(const std::string& item, int errnoValue) { return fail(item, systemText(errnoValue)); }
+
+  bool fail(const std::string& item, const std::string& reason) {
+    if (!problem_.empty()) return false;
+    const fs::path path = item.empty() ? target_.path : target_.path / item;
+    problem_ = fmt::format("cannot write the backup {}: {}", printable(path.string()), reason);
+    return false;
+  }
+
+  bool create(int directory, const std::string& name) {
+    if (!problem_.empty()) return false;
+    name_ = name;
+    size_ = 0;
+    digest_.finish();
+    file_ = FileDescriptor(::openat(directory, name.c_str(),
+                                    O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
+    return file_ || fail(name, errno);
+  }
+
+  bool close(Entries& entries, std::string_view key) {
+    if (!problem_.empty()) return false;
+    entries.emplace(key, ManifestEntry{size_, digest_.finish()});
+    // Some file systems tell only here that there is no room.
+    return ::close(file_.release()) == 0 || fail(name_, errno);
+  }
+
+  bool syncFile(int directory, const std::string& name) {
+    const FileDescriptor file(::openat(directory, name.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+    return (file && device::syncToDisk(file.get())) || fail(name, errno);
+  }
+
+  /// All at the end: one by one would wait for the disk as often as there are files.
+  bool putOnDisk() {
+    for (const auto& [identifier, entry] : manifest_.data) {
+      if (!syncFile(data_.get(), backupDataName(identifier))) return false;
+    }
+    for (const auto& [name, entry] : manifest_.files) {
+      if (!syncFile(folder_.get(), name)) return false;
+    }
+    return (device::syncToDisk(data_.get()) || fail(std::string(BackupDataFolder), errno)) &&
+           (device::syncToDisk(folder_.get()) || fail("", errno));
+  }
+
+  bool takePlace() {
+    const int parent = target_.parent.get();
+    const std::string name = target_.name();
+    if (target_.replaces) {
+      if (::renameat2(parent, unfinished_.c_str(), parent, name.c_str(), RENAME_EXCHANGE) != 0) {
+        if (errno != EINVAL) return fail("", errno);
+        return fail("", "the file system cannot exchange folders; name a new folder");
+      }
+    } else if (::renameat(parent, unfinished_.c_str(), parent, name.c_str()) != 0) {
+      return fail("", errno);  // something has come there meanwhile
+    } else {
+      unfinished_.clear();
+    }
+    if (!device::syncToDisk(parent)) return fail("", errno);
+    // The older backup, now under the other name. What cannot be removed is swept the next time.
+    if (!unfinished_.empty()) device::removeTree(parent, std::exchange(unfinished_, {}));
+    return true;
+  }
+
+  const Target target_;
+  std::string unfinished_;  ///< name beside the target; empty when there is none any more
+  FileDescriptor folder_;
+  FileDescriptor data_;
+  BackupManifest manifest_;
+  std::string problem_;
+
+  // The file being written.
+  FileDescriptor file_;
+  std::string name_;
+  std::string identifier_;
+  Sha256 digest_;
+  std::uint64_t size_ = 0;
+};
+
+}  // namespace
+
+std::unique_ptr<BackupWriter> BackupWriter::open(const fs::path& folder, std::string& problem) {
+  Target target;
+  target.path = resolve(folder);
+  target.parent =
+      FileDescriptor(::open(target.path.parent_path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (const std::string objection = objectionTo(target); !objection.empty()) {
+    problem = fmt::format("cannot make a backup in {}: {}", printable(folder.string()), objection);
+    return nullptr;
+  }
+  sweep(target);
+  auto writer = std::make_unique<FolderWriter>(std::move(target));
+  if (writer->begin()) return writer;
+  problem = writer->problem();
+  return nullptr;
+}
+
+}  // namespace appsync::host

@@ -1,0 +1,147 @@
+#include "host/cli/cli.h"
+
+#include <fmt/format.h>
+#include <locale.h>
+#include <signal.h>
+
+#include <CLI/CLI.hpp>
+#include <algorithm>
+#include <cerrno>
+#include <string_view>
+#include <system_error>
+
+#include "host/base/text.h"
+
+namespace appsync::host {
+namespace {
+
+constexpr const char* Examples = R"(Examples:
+  appsync --device phone init
+  appsync package Tally.app -o library/Tally.zip
+  appsync --device phone sync library
+  appsync --device phone sync library --install org.example.tally --remove org.example.lantern
+  appsync --device phone --json apps
+
+Exit codes: 0 all done, 1 some application failed, 2 wrong usage, 3 device missing, busy or damaged,
+130 interrupted. APPSYNC_DEVICE and APPSYNC_PLUGIN stand for --device and --plugin.
+)";
+
+void addGlobalOptions(CLI::App& app, CommandContext& context) {
+  app.add_option("-d,--device", context.device, "Folder of the phone")
+      ->envname("APPSYNC_DEVICE")
+      ->type_name("DIR");
+  app.add_option("--plugin", context.plugin, "Plug-in bundle, if not the one beside the program")
+      ->envname("APPSYNC_PLUGIN")
+      ->type_name("DIR");
+  app.add_flag("--json", context.json, "One JSON object per line on standard output");
+  app.add_flag("-q,--quiet", context.quiet, "Only what failed");
+  app.add_flag("-v,--verbose", context.verbose, "The plan and the plug-in's log lines too");
+  app.set_version_flag("--version", "appsync " APPSYNC_VERSION);
+}
+
+std::string usageMessage(const CLI::App& app, const CLI::ParseError& error) {
+  std::string command = "appsync";
+  if (const auto unknown = app.remaining(); app.get_subcommands().empty() && !unknown.empty()) {
+    return fmt::format("unknown command \"{}\"; see appsync --help", printable(unknown.front()));
+  }
+  for (const CLI::App* chosen : app.get_subcommands()) command += " " + chosen->get_name();
+  return fmt::format("{}; see {} --help", printable(oneLine(error.what())), command);
+}
+
+bool asksForJson(int argc, char** argv) {
+  return std::any_of(argv, argv + argc, [](std::string_view text) { return text == "--json"; });
+}
+
+ExitCode run(const Command& command, CommandContext& context) {
+  try {
+    return command(context);
+  } catch (const CommandError& error) {
+    context.tellError(error.what());
+    return error.code();
+  } catch (const std::exception& error) {
+    context.tellError(printable(oneLine(error.what())));
+    return ExitCode::SomeFailed;
+  }
+}
+
+/// A reader that closed the pipe has seen enough; every other failure loses what was asked for.
+ExitCode withOutputChecked(ExitCode code, CommandContext& context) {
+  const int error = context.out.error();
+  if (error == 0 || error == EPIPE) return code;
+  context.err.line("appsync: cannot write to standard output: " +
+                   std::generic_category().message(error));
+  return code == ExitCode::Done ? ExitCode::SomeFailed : code;
+}
+
+}  // namespace
+
+std::filesystem::path CommandContext::deviceFolder() const {
+  if (device.empty()) {
+    throw CommandError(ExitCode::WrongUsage,
+                       "no phone named: give its folder with --device or APPSYNC_DEVICE");
+  }
+  return device;
+}
+
+std::unique_ptr<device::EmbeddedDevice> CommandContext::openDevice(device::Access access) const {
+  device::DeviceError error;
+  auto opened = device::EmbeddedDevice::open(deviceFolder(), access, error);
+  if (!opened) throw CommandError(ExitCode::DeviceUnusable, printable(error.message));
+  return opened;
+}
+
+void CommandContext::tell(const Json& object, const std::string& text) {
+  if (json) {
+    writeJsonLine(out, object);
+  } else {
+    out.line(text);
+  }
+}
+
+void CommandContext::tellError(const std::string& message) {
+  if (json) {
+    writeJsonLine(out, {{"event", "error"}, {"message", message}});
+  } else {
+    err.line("appsync: " + message);
+  }
+}
+
+void CommandContext::tellIfUnseen(std::string_view work) {
+  if (out.error() != EPIPE) return;
+  err.line(
+      fmt::format("appsync: nobody reads the output any more; the {} ran to its end unseen", work));
+}
+
+int runCommandLine(int argc, char** argv) {
+  // Character widths need a UTF-8 locale, whatever the person's is.
+  if (!::setlocale(LC_CTYPE, "") || displayWidth("\u00e9") != 1) ::setlocale(LC_CTYPE, "C.UTF-8");
+  ::signal(SIGPIPE, SIG_IGN);
+  ::signal(SIGXFSZ, SIG_IGN);  // writing beyond a limit fails like writing to a full disk
+
+  CommandContext context;
+  CLI::App app("Keeps a phone's applications in step with a library of packages.", "appsync");
+  app.footer(Examples);
+  app.require_subcommand(1);
+  app.fallthrough();
+  Command chosen;
+  addGlobalOptions(app, context);
+  addSyncCommands(app, chosen);
+  addBackupCommand(app, chosen);
+  addRestoreCommand(app, chosen);
+  addLookCommands(app, chosen);
+  addHomeScreenCommand(app, chosen);
+  addPhoneCommands(app, chosen);
+  addPackageCommand(app, chosen);
+  try {
+    app.parse(argc, argv);
+  } catch (const CLI::Success& help) {
+    return app.exit(help);
+  } catch (const CLI::ParseError& error) {
+    context.json = asksForJson(argc, argv);
+    context.tellError(usageMessage(app, error));
+    return static_cast<int>(ExitCode::WrongUsage);
+  }
+  return static_cast<int>(withOutputChecked(run(chosen, context), context));
+}
+
+}  // namespace appsync::host

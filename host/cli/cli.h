@@ -1,0 +1,79 @@
+#pragma once
+
+#include <filesystem>
+#include <functional>
+#include <memory>
+#include <stdexcept>
+#include <string>
+
+#include "device/embedded_device.h"
+#include "host/base/json_line.h"
+#include "host/base/output.h"
+
+namespace CLI {
+class App;
+}
+
+namespace appsync::host {
+
+/// What the command's exit code tells.
+enum class ExitCode {
+  Done = 0,
+  SomeFailed = 1,
+  WrongUsage = 2,
+  DeviceUnusable = 3,
+  Interrupted = 130
+};
+
+/// Ends a command with one line for people. Only thrown and caught inside the command line.
+class CommandError : public std::runtime_error {
+ public:
+  CommandError(ExitCode code, const std::string& message)
+      : std::runtime_error(message), code_(code) {}
+  ExitCode code() const { return code_; }
+
+ private:
+  ExitCode code_;
+};
+
+/// Options before the command, and where a command writes.
+struct CommandContext {
+  std::string device;
+  std::string plugin;
+  bool json = false;
+  bool quiet = false;
+  bool verbose = false;
+  Output out{1};
+  Output err{2};
+
+  /// The device's folder; a CommandError when none was named.
+  std::filesystem::path deviceFolder() const;
+  /// An open device; a CommandError when it cannot be used.
+  std::unique_ptr<device::EmbeddedDevice> openDevice(device::Access access) const;
+
+  /// One line of a result: the object with --json, else the text.
+  void tell(const Json& object, const std::string& text);
+  void tellError(const std::string& message);
+  /// Says that the work went on when nobody read the output any more, if that is so.
+  void tellIfUnseen(std::string_view work);
+};
+
+/// What the chosen command does; it gives the exit code.
+using Command = std::function<ExitCode(CommandContext&)>;
+
+/// "allow" or "forbid".
+std::string policyText(device::EmbeddedDevice& device, PolicySetting setting);
+
+// Each adds a group of commands; parsing sets `chosen` to the one that was named.
+void addSyncCommands(CLI::App& app, Command& chosen);
+void addBackupCommand(CLI::App& app, Command& chosen);
+void addRestoreCommand(CLI::App& app, Command& chosen);
+void addPhoneCommands(CLI::App& app, Command& chosen);
+void addLookCommands(CLI::App& app, Command& chosen);
+void addPackageCommand(CLI::App& app, Command& chosen);
+void addHomeScreenCommand(CLI::App& app, Command& chosen);
+
+/// The whole program `appsync`.
+int runCommandLine(int argc, char** argv);
+
+}  // namespace appsync::host

@@ -1,0 +1,94 @@
+#include <CLI/CLI.hpp>
+
+#include "host/base/interruption.h"
+#include "host/cli/cli.h"
+#include "host/cli/plugin_session.h"
+#include "host/phone/plugin_loader.h"
+#include "host/report/report.h"
+#include "host/restore/restore.h"
+
+namespace appsync::host {
+namespace {
+
+struct RestoreOptions {
+  std::string folder;
+  std::string catalogue;
+  std::string packages;
+};
+
+std::optional<Library> libraryAt(const std::string& folder) {
+  if (folder.empty()) return std::nullopt;
+  std::string problem;
+  auto library = readLibrary(folder, problem);
+  if (!library) throw CommandError(ExitCode::WrongUsage, problem);
+  return library;
+}
+
+RestoreInput readInput(const RestoreOptions& options) {
+  std::string problem;
+  auto backup = readBackup(options.folder, problem);
+  auto list = backup ? RestoreList::of(*backup, problem) : std::nullopt;
+  if (!list) throw CommandError(ExitCode::WrongUsage, problem);
+  return {std::move(*backup), std::move(*list), libraryAt(options.packages),
+          libraryAt(options.catalogue)};
+}
+
+void reportUnreadable(const std::optional<Library>& library, Reporter& reporter) {
+  if (!library) return;
+  for (const UnreadablePackage& file : library->unreadable) reporter.report(file);
+}
+
+ExitCode exitCode(const SyncResult& result, bool interrupted) {
+  if (interrupted) return ExitCode::Interrupted;
+  return result.completed && result.summary.failed.empty() ? ExitCode::Done : ExitCode::SomeFailed;
+}
+
+ExitCode runRestore(const RestoreOptions& options, CommandContext& context) {
+  const RestoreInput input = readInput(options);
+  const auto device = context.openDevice(device::Access::Write);
+  const auto reporter =
+      makeReporter(context.out, context.err, {context.json, context.quiet, context.verbose, false});
+  Interruption interruption;
+  const auto plugin = loadPlugin(context);
+  PluginSession loaded(*plugin, SyncHostBundleIdentifier, *device, interruption,
+                       context.verbose ? reporter.get() : nullptr);
+  reportUnreadable(input.packages, *reporter);
+  reportUnreadable(input.catalogue, *reporter);
+  const SignalWatcher signals(interruption);
+  SyncResult result;
+  {
+    Restore restore(loaded.client(), loaded.host(), restorePhoneOf(*device), *reporter,
+                    interruption);
+    result = restore.run(input);
+  }
+  reporter->report(result.summary);
+  context.tellIfUnseen("restore");
+  return exitCode(result, interruption.requested());
+}
+
+}  // namespace
+
+void addRestoreCommand(CLI::App& app, Command& chosen) {
+  auto options = std::make_shared<RestoreOptions>();
+  CLI::App* restore = app.add_subcommand("restore", "Bring the applications of a backup back");
+  restore->add_option("folder", options->folder, "Folder of the backup")
+      ->required()
+      ->type_name("FOLDER");
+  restore
+      ->add_option("--store", options->catalogue,
+                   "Folder of packages from which the store brings the applications")
+      ->type_name("CATALOGUE");
+  restore
+      ->add_option("--packages", options->packages,
+                   "Folder of packages that are sent to the phone from here")
+      ->type_name("LIBRARY");
+  restore->footer(
+      "Without packages, applications come back as placeholders with their data waiting.\n"
+      "A restore that was interrupted is finished by another one.\n"
+      "Example: appsync --device new-phone restore backup --store catalogue");
+  restore->callback([options, &chosen] {
+    chosen = [options](CommandContext& context) { return runRestore(*options, context); };
+  });
+}
+
+}  // namespace appsync::host

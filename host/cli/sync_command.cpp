@@ -1,0 +1,144 @@
+#include <fmt/format.h>
+
+#include <CLI/CLI.hpp>
+#include <chrono>
+
+#include "host/base/interruption.h"
+#include "host/base/text.h"
+#include "host/cli/cli.h"
+#include "host/cli/plugin_session.h"
+#include "host/library/icon_layout.h"
+#include "host/phone/plugin_loader.h"
+#include "host/report/report.h"
+#include "host/sync/session.h"
+
+namespace appsync::host {
+namespace {
+
+struct SyncOptions {
+  std::string library;
+  PlanOptions plan;
+  std::string iconLayout;
+  bool dryRun = false;
+};
+
+bool allowed(device::EmbeddedDevice& device, PolicySetting setting) {
+  return device.policy(setting) != PolicyValue::ExplicitlyNo;
+}
+
+SyncInput prepareInput(const SyncOptions& options) {
+  std::string problem;
+  SyncInput input;
+  auto library = readLibrary(options.library, problem);
+  if (!library) throw CommandError(ExitCode::WrongUsage, problem);
+  input.library = std::move(*library);
+  if (!options.iconLayout.empty()) {
+    input.iconLayout = readIconLayout(options.iconLayout, problem);
+    if (!input.iconLayout) throw CommandError(ExitCode::WrongUsage, problem);
+  }
+  const auto now = std::chrono::system_clock::now().time_since_epoch();
+  input.newAnchor = isoTime(std::chrono::duration<double>(now).count());
+  return input;
+}
+
+void plan(SyncInput& input, PlanOptions options, device::EmbeddedDevice& device) {
+  options.installingAllowed = allowed(device, PolicySetting::AppInstallationAllowed);
+  options.removingAllowed = allowed(device, PolicySetting::AppRemovalAllowed);
+  std::string problem;
+  auto made =
+      makePlan(input.library, installedApplications(device.appRegistry()), options, problem);
+  if (!made) throw CommandError(ExitCode::WrongUsage, problem);
+  input.plan = std::move(*made);
+}
+
+void reportPlan(const SyncInput& input, Reporter& reporter) {
+  for (const UnreadablePackage& file : input.library.unreadable) reporter.report(file);
+  for (const PlannedEntry& entry : input.plan.entries) reporter.report(entry);
+}
+
+ExitCode finish(const SyncResult& result, bool interrupted, Reporter& reporter) {
+  reporter.report(result.summary);
+  if (interrupted) return ExitCode::Interrupted;
+  const bool good = result.completed && result.summary.failed.empty();
+  return good ? ExitCode::Done : ExitCode::SomeFailed;
+}
+
+ExitCode dryRun(const SyncInput& input, Reporter& reporter) {
+  SyncPlan nothing;
+  nothing.skipped = input.plan.skipped;
+  return finish({settle(nothing, input.library, {}), true}, false, reporter);
+}
+
+ExitCode runSync(const SyncOptions& options, CommandContext& context) {
+  SyncInput input = prepareInput(options);
+  const auto device =
+      context.openDevice(options.dryRun ? device::Access::ReadOnly : device::Access::Write);
+  plan(input, options.plan, *device);
+  const auto reporter = makeReporter(
+      context.out, context.err, {context.json, context.quiet, context.verbose, options.dryRun});
+  if (options.dryRun) {
+    reportPlan(input, *reporter);
+    return dryRun(input, *reporter);
+  }
+
+  Interruption interruption;
+  const auto plugin = loadPlugin(context);
+  PluginSession loaded(*plugin, SyncHostBundleIdentifier, *device, interruption,
+                       context.verbose ? reporter.get() : nullptr);
+  reportPlan(input, *reporter);
+  const SignalWatcher signals(interruption);
+  SyncResult result;
+  {
+    Session session(loaded.client(), loaded.host().transfers(), phoneOf(*device), *reporter,
+                    interruption);
+    result = session.run(input);
+  }
+  const ExitCode code = finish(result, interruption.requested(), *reporter);
+  context.tellIfUnseen("sync");
+  return code;
+}
+
+ExitCode runClear(CommandContext& context) {
+  const auto device = context.openDevice(device::Access::Write);
+  const auto plugin = loadPlugin(context);
+  const Interruption interruption;
+  PluginSession loaded(*plugin, QueryToolBundleIdentifier, *device, interruption, nullptr);
+  loaded.client().clearSyncData();
+  if (context.json || !context.quiet) {
+    context.tell({{"event", "cleared"}}, "Cleared all sync data and took every placeholder away.");
+  }
+  return ExitCode::Done;
+}
+
+}  // namespace
+
+void addSyncCommands(CLI::App& app, Command& chosen) {
+  auto options = std::make_shared<SyncOptions>();
+  CLI::App* sync = app.add_subcommand("sync", "Bring the phone in step with a folder of packages");
+  sync->add_option("library", options->library, "Folder of packages")
+      ->required()
+      ->type_name("LIBRARY");
+  sync->add_option("--install", options->plan.install,
+                   "Install only this application, also anew in the same version (repeatable)")
+      ->type_name("ID")
+      ->allow_extra_args(false);
+  sync->add_option("--remove", options->plan.remove, "Remove this application (repeatable)")
+      ->type_name("ID")
+      ->allow_extra_args(false);
+  sync->add_flag("--mirror", options->plan.mirror, "Also remove what the library lacks");
+  sync->add_option("--icon-layout", options->iconLayout,
+                   "Order of the home screen: a property list, JSON array or one ID per line")
+      ->type_name("FILE");
+  sync->add_flag("--dry-run", options->dryRun, "Only show what would be done");
+  sync->footer(
+      "Without --install, every package that is new or newer is installed.\n"
+      "Example: appsync sync library --remove org.example.lantern --dry-run");
+  sync->callback([options, &chosen] {
+    chosen = [options](CommandContext& context) { return runSync(*options, context); };
+  });
+
+  CLI::App* clear = app.add_subcommand("clear", "Clear all sync data of the phone");
+  clear->callback([&chosen] { chosen = &runClear; });
+}
+
+}  // namespace appsync::host

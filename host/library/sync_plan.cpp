@@ -1,0 +1,176 @@
+#include "host/library/sync_plan.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <map>
+#include <set>
+
+#include "host/base/text.h"
+#include "host/base/version.h"
+
+namespace appsync::host {
+namespace {
+
+constexpr std::string_view InstallingForbidden =
+    "installing applications is forbidden on the phone (appsync policy --installing allow)";
+constexpr std::string_view RemovingForbidden =
+    "removing applications is forbidden on the phone (appsync policy --removing allow)";
+
+std::string versionText(std::string_view version) {
+  return version.empty() ? std::string("a version without number")
+                         : "version " + printable(version);
+}
+
+class Planner {
+ public:
+  Planner(const Library& library, const std::vector<InstalledApplication>& installed,
+          const PlanOptions& options)
+      : library_(library),
+        options_(options),
+        wanted_(options.install.begin(), options.install.end()),
+        unwanted_(options.remove.begin(), options.remove.end()) {
+    for (const InstalledApplication& application : installed) {
+      installed_.emplace(application.identifier, application);
+    }
+  }
+
+  std::optional<std::string> contradiction() const {
+    for (const std::string& identifier : wanted_) {
+      if (unwanted_.count(identifier) > 0) {
+        return fmt::format("{} is to be both installed and removed", printable(identifier));
+      }
+      if (!library_.find(identifier)) {
+        const std::size_t unread = library_.unreadable.size();
+        return fmt::format("no package for {} in {}{}", printable(identifier),
+                           printable(library_.folder.string()),
+                           unread == 0 ? "" : fmt::format(" (unreadable files: {})", unread));
+      }
+    }
+    if (options_.mirror && library_.packages.empty()) {
+      return fmt::format("{} holds no packages: --mirror would remove every application",
+                         printable(library_.folder.string()));
+    }
+    return std::nullopt;
+  }
+
+  SyncPlan plan() {
+    for (const std::string& identifier : unwanted_) remove(identifier);
+    if (options_.mirror) mirror();
+    for (const auto& [identifier, package] : library_.packages) {
+      if (unwanted_.count(identifier) > 0) continue;
+      if (wanted_.empty() || wanted_.count(identifier) > 0) install(package);
+    }
+    return std::move(plan_);
+  }
+
+ private:
+  const InstalledApplication* find(std::string_view identifier) const {
+    const auto found = installed_.find(identifier);
+    return found == installed_.end() ? nullptr : &found->second;
+  }
+
+  void skip(std::string_view identifier, std::string_view reason, bool upToDate = false) {
+    plan_.skipped.push_back({std::string(identifier), std::string(reason), upToDate});
+  }
+
+  void remove(const std::string& identifier) {
+    const InstalledApplication* application = find(identifier);
+    if (!application) return skip(identifier, "it is not installed");
+    if (application->isSystem) return skip(identifier, "it is a system application");
+    if (!options_.removingAllowed) return skip(identifier, RemovingForbidden);
+    plan_.entries.push_back({Action::Remove, identifier, application->version, application->version,
+                             application->name});
+  }
+
+  /// A file that cannot be read may be the package of any application.
+  void mirror() {
+    for (const auto& [identifier, application] : installed_) {
+      if (application.isSystem || application.isPlaceholder || library_.find(identifier) ||
+          unwanted_.count(identifier) > 0) {
+        continue;
+      }
+      const auto unread = std::find_if(library_.unreadable.begin(), library_.unreadable.end(),
+                                       [](const auto& file) { return file.looksLikePackage; });
+      if (unread == library_.unreadable.end()) {
+        remove(identifier);
+      } else {
+        skip(identifier, fmt::format("not removed: its package may be {}, which cannot be read",
+                                     printable(unread->file)));
+      }
+    }
+  }
+
+  void install(const LibraryPackage& package) {
+    const InstalledApplication* application = find(package.identifier);
+    const bool isInstalled = application && !application->isPlaceholder;
+    const std::string current = isInstalled ? application->version : std::string();
+    if (application && application->isSystem) {
+      return skip(package.identifier, "it is a system application");
+    }
+    Action action = Action::Install;
+    if (isInstalled) {
+      const auto order = compareVersions(package.version, current);
+      action = order > 0 ? Action::Update : order < 0 ? Action::Downgrade : Action::Reinstall;
+      if (order <= 0 && wanted_.empty()) {
+        return skip(package.identifier, versionText(current) + " is installed", true);
+      }
+    }
+    if (!options_.installingAllowed) return skip(package.identifier, InstallingForbidden);
+    plan_.entries.push_back({action, package.identifier, package.version, current, package.name});
+  }
+
+  const Library& library_;
+  const PlanOptions& options_;
+  const std::set<std::string, std::less<>> wanted_;
+  const std::set<std::string, std::less<>> unwanted_;
+  std::map<std::string, InstalledApplication, std::less<>> installed_;
+  SyncPlan plan_;
+};
+
+}  // namespace
+
+std::string_view name(Action action) {
+  switch (action) {
+    case Action::Install:
+      return "install";
+    case Action::Update:
+      return "update";
+    case Action::Reinstall:
+      return "reinstall";
+    case Action::Downgrade:
+      return "downgrade";
+    case Action::Remove:
+      return "remove";
+  }
+  return "install";
+}
+
+std::vector<InstalledApplication> installedApplications(AppRegistry& registry) {
+  std::map<std::string, InstalledApplication> found;
+  registry.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
+    const bool leftOver = record.isPlaceholder && record.installType == InstallType::Sync;
+    if (!record.isApplication || leftOver) return;
+    const auto [place, isNew] = found.try_emplace(record.applicationIdentifier);
+    if (!isNew && record.isPlaceholder) return;
+    place->second = {record.applicationIdentifier, record.bundleVersion.value_or(""),
+                     record.displayName, record.applicationType == ApplicationTypeSystem,
+                     record.isPlaceholder};
+  });
+  std::vector<InstalledApplication> result;
+  for (auto& [identifier, application] : found) result.push_back(std::move(application));
+  return result;
+}
+
+std::optional<SyncPlan> makePlan(const Library& library,
+                                 const std::vector<InstalledApplication>& installed,
+                                 const PlanOptions& options, std::string& problem) {
+  Planner planner(library, installed, options);
+  if (auto contradiction = planner.contradiction()) {
+    problem = std::move(*contradiction);
+    return std::nullopt;
+  }
+  return planner.plan();
+}
+
+}  // namespace appsync::host

@@ -1,3 +1,0 @@
-#include "host/cli.h"
-
-int main(int argc, char** argv) { return appsync::host::runCommandLine(argc, argv); }

@@ -1,0 +1,32 @@
+#include "host/phone/demotions.h"
+
+#include "host/phone/phone.h"
+#include "platform/bundle.h"
+
+namespace appsync::host {
+
+Demotions::Demotions(FileManager& files) {
+  const auto lists = loadDictionary(files, exchange::DemotedApplications);
+  for (const char* key : {"AutomaticDowngrades", "IntentionalDowngrades"}) {
+    const PropertyList* list = lists ? find(*lists, key) : nullptr;
+    if (!list || !list->asArray()) continue;
+    for (const PropertyList& item : *list->asArray()) {
+      if (const std::string* identifier = item.asString()) named_.insert(*identifier);
+    }
+  }
+}
+
+bool Demotions::holdBack(const AppRecord& placeholder) const {
+  switch (placeholder.installType) {
+    case InstallType::Downgrade:
+    case InstallType::IntentionalDowngrade:
+      return true;
+    case InstallType::Restore:
+      // Without coordination the phone makes every placeholder of a restore alike.
+      return named_.contains(placeholder.applicationIdentifier);
+    default:
+      return false;
+  }
+}
+
+}  // namespace appsync::host

@@ -1,0 +1,95 @@
+#pragma once
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <set>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "device/embedded_device.h"
+#include "platform/app_registry.h"
+#include "platform/file_manager.h"
+#include "platform/install_coordination.h"
+
+namespace appsync::host {
+
+/// What a sync needs of a phone beside the client. All outlive the sync.
+struct Phone {
+  FileManager& files;
+  AppRegistry& apps;
+  /// See EmbeddedDevice.
+  std::function<std::unique_ptr<device::FileReceiver>(std::string_view path,
+                                                      std::optional<Error>* error)>
+      receiveFile;
+  std::function<void(device::DeviceWatcher*)> setWatcher;
+  std::function<void()> hurry;
+  std::function<bool(std::string_view bundleId)> isBusyWith;
+  /// nullptr when installs are not driven through coordinators.
+  InstallCoordination* coordination = nullptr;
+};
+
+/// Borrows the device.
+Phone phoneOf(device::EmbeddedDevice& device);
+
+/// What a restore needs of a phone beside that. See EmbeddedDevice.
+struct RestorePhone : Phone {
+  HomeScreenService& homeScreen;
+  std::function<bool(std::string_view bundleId, const device::DataSink& sink,
+                     std::optional<Error>* error)>
+      saveData;
+  std::function<bool(std::string_view bundleId, const device::DataSource& source,
+                     std::optional<Error>* error)>
+      restoreData;
+  std::function<std::vector<std::string>(CoordinationClientId client)> packagesOwedBy;
+};
+
+/// Borrows the device.
+RestorePhone restorePhoneOf(device::EmbeddedDevice& device);
+
+/// Waits until the phone has nothing left to do for these applications by itself.
+void waitUntilIdle(const Phone& phone, const std::set<std::string>& identifiers);
+
+/// The applications that the registry knows.
+struct ApplicationsPresent {
+  std::set<std::string, std::less<>> installed;
+  std::map<std::string, AppRecord, std::less<>> placeholders;
+};
+ApplicationsPresent applicationsPresent(AppRegistry& registry);
+
+/// Shows the store's downloads but `except` as under way, which they are once a person has asked
+/// for them: the client asks the host for the package of every other placeholder, and takes it away
+/// when the host has none.
+void claimDownloads(AppRegistry& apps, const std::set<std::string>& except);
+
+// Where host and client exchange files on the phone.
+namespace exchange {
+inline constexpr std::string_view StagingRoot = "/var/mobile/Media/PublicStaging";
+inline constexpr std::string_view StagingArea = "/var/mobile/Media/PublicStaging/ApplicationSync";
+inline constexpr std::string_view SyncRoot = "/var/mobile/Library/ApplicationSync";
+inline constexpr std::string_view WorkArea = "/var/mobile/Library/ApplicationSync/HalvoStuff";
+inline constexpr std::string_view LastSyncState =
+    "/var/mobile/Library/ApplicationSync/LastSyncAppState.plist";
+inline constexpr std::string_view RestoreState =
+    "/var/mobile/Library/ApplicationSync/RestoreState.plist";
+inline constexpr std::string_view RestoreList =
+    "/var/mobile/Media/HalvoRestore/RestoreApplications.plist";
+inline constexpr std::string_view WaitingData = "/var/mobile/Media/HalvoRestore/Data";
+inline constexpr std::string_view DemotedApplications =
+    "/var/mobile/Library/Preferences/com.corvane.Safekeep.DemotedApps.plist";
+inline constexpr std::string_view Downloads = "/var/mobile/Media/Downloads";
+inline constexpr std::string_view TodoName = "ApplicationsSync.plist";
+inline constexpr std::string_view IconLayoutName = "DashelIconState.plist";
+}  // namespace exchange
+
+/// One entry of the todo list that the desktop gives the phone.
+struct TodoEntry {
+  std::string identifier;
+  std::string operation;
+};
+
+/// The todo list in a directory of the phone; empty when there is none that can be read.
+std::vector<TodoEntry> readTodoList(FileManager& files, std::string_view directory);
+
+}  // namespace appsync::host

@@ -1,0 +1,34 @@
+#include "host/report/report.h"
+
+#include <cstdlib>
+#include <string_view>
+
+#include "host/report/report_json.h"
+#include "host/report/report_text.h"
+
+namespace appsync::host {
+namespace {
+
+std::string_view environment(const char* name) {
+  const char* value = std::getenv(name);
+  return value ? value : "";
+}
+
+bool isAbleTerminal(const Output& output) {
+  return output.isTerminal() && environment("TERM") != "dumb";
+}
+
+}  // namespace
+
+bool wantsColour(const Output& output) {
+  return isAbleTerminal(output) && environment("NO_COLOR").empty();
+}
+
+std::unique_ptr<Reporter> makeReporter(Output& output, Output& errorOutput,
+                                       const ReportOptions& options) {
+  if (options.json) return std::make_unique<JsonReporter>(output, options.quiet);
+  return std::make_unique<TextReporter>(output, errorOutput, options, isAbleTerminal(output),
+                                        wantsColour(output));
+}
+
+}  // namespace appsync::host

@@ -1,0 +1,227 @@
+#include "host/report/report_text.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+
+#include "host/base/text.h"
+
+namespace appsync::host {
+namespace {
+
+/// Adds "3 installed" and the like.
+void addCount(std::string& counts, std::size_t count, std::string_view what) {
+  if (count > 0) counts += fmt::format("{}{} {}", counts.empty() ? "" : ", ", count, what);
+}
+
+}  // namespace
+
+TextReporter::TextReporter(Output& output, Output& errorOutput, const ReportOptions& options,
+                           bool terminal, bool colour)
+    : errorOutput_(errorOutput),
+      options_(options),
+      colour_(colour),
+      status_(output, terminal && !options.quiet) {}
+
+void TextReporter::report(const Event& event) {
+  const std::lock_guard lock(mutex_);
+  std::visit([this](const auto& value) { tell(value); }, event);
+}
+
+void TextReporter::print(Style style, std::string_view word, const std::string& rest) {
+  if (options_.quiet) return;
+  std::string_view begin;
+  switch (style) {
+    case Style::Plain:
+      break;
+    case Style::Good:
+      begin = "\x1b[32m";
+      break;
+    case Style::Bad:
+      begin = "\x1b[31m";
+      break;
+    case Style::Warning:
+      begin = "\x1b[33m";
+      break;
+    case Style::Dim:
+      begin = "\x1b[2m";
+      break;
+  }
+  const bool coloured = colour_ && !begin.empty();
+  status_.print(
+      fmt::format("{}{:<10}{} {}", coloured ? begin : "", word, coloured ? "\x1b[0m" : "", rest));
+}
+
+void TextReporter::printError(std::string_view word, const std::string& rest) {
+  if (options_.quiet) {
+    errorOutput_.line(fmt::format("appsync: {} {}", word, rest));
+  } else {
+    print(Style::Bad, word, rest);
+  }
+}
+
+std::string TextReporter::subject(const std::string& identifier) const {
+  const auto planned = planned_.find(identifier);
+  if (planned == planned_.end() || planned->second.name.empty()) return printable(identifier);
+  const PlannedEntry& entry = planned->second;
+  const std::string version = entry.version.empty() ? "" : " " + printable(entry.version);
+  return fmt::format("{}{} ({})", printable(entry.name), version, printable(identifier));
+}
+
+void TextReporter::showInstalling() {
+  if (installing_.empty()) return status_.clear();
+  status_.showText(installing_.size() == 1
+                       ? fmt::format("Installing {} ...", subject(*installing_.begin()))
+                       : fmt::format("Installing {} applications ...", installing_.size()));
+}
+
+void TextReporter::tell(const PackageProblem& event) {
+  if (options_.verbose) {
+    print(Style::Warning, "unreadable",
+          fmt::format("{}: {}", printable(event.file), printable(event.reason)));
+  }
+}
+
+void TextReporter::tell(const PlannedEntry& event) {
+  planned_[event.identifier] = event;
+  if (!options_.showPlan && !options_.verbose) return;
+  const bool changes = event.action == Action::Update || event.action == Action::Downgrade;
+  const std::string from = changes ? " from " + printable(event.installedVersion) : "";
+  print(Style::Plain, name(event.action), subject(event.identifier) + from);
+}
+
+void TextReporter::tell(const PlaceholderSwept& event) {
+  if (options_.verbose) {
+    print(Style::Dim, "cleaned", printable(event.identifier) + ": what a broken-off sync had left");
+  }
+}
+
+void TextReporter::tell(const DeletedOnPhone& event) {
+  print(Style::Warning, "gone", printable(event.identifier) + " was deleted on the phone");
+}
+
+void TextReporter::tell(const TransferProgress& event) {
+  if (event.total == 0) return;
+  status_.showBar("Sending " + event.name,
+                  static_cast<double>(event.sent) / static_cast<double>(event.total),
+                  fmt::format("{} of {}", byteCount(event.sent), byteCount(event.total)));
+}
+
+void TextReporter::tell(const TransferEnded& event) {
+  if (event.failure) return showInstalling();
+  installing_.insert(event.identifier);
+  showInstalling();
+  if (options_.verbose) print(Style::Dim, "sent", subject(event.identifier));
+}
+
+void TextReporter::tell(const DataProgress& event) {
+  if (event.total == 0) return;
+  status_.showBar("Data of " + event.name,
+                  static_cast<double>(event.done) / static_cast<double>(event.total),
+                  fmt::format("{} of {}", byteCount(event.done), byteCount(event.total)));
+}
+
+void TextReporter::tell(const DataEnded& event) {
+  status_.clear();
+  if (options_.verbose && !event.failure) print(Style::Dim, "data", subject(event.identifier));
+}
+
+void TextReporter::tell(const SavingProgress& event) {
+  const std::string bytes = event.bytes > 0 ? ", " + byteCount(event.bytes) : "";
+  status_.showBar("Saving " + event.name,
+                  static_cast<double>(event.number - 1) / static_cast<double>(event.count),
+                  fmt::format("{} of {}{}", event.number, event.count, bytes));
+}
+
+void TextReporter::tell(const ApplicationSaved& event) {
+  if (!options_.verbose || event.failure) return;
+  print(Style::Good, "saved",
+        fmt::format("{} ({})", printable(event.name), printable(event.identifier)));
+}
+
+void TextReporter::tell(const PlaceholderStands& event) {
+  if (event.name != event.identifier) {
+    planned_.try_emplace(event.identifier,
+                         PlannedEntry{Action::Install, event.identifier, "", "", event.name});
+  }
+  print(Style::Plain, "restored",
+        fmt::format("{} as a {}placeholder", subject(event.identifier),
+                    event.demoted ? "demoted " : ""));
+}
+
+void TextReporter::tell(const Notice& event) {
+  print(Style::Warning, "note", printable(event.text));
+}
+
+void TextReporter::tell(const InstallWaiting& event) {
+  const std::string identifier = printable(event.identifier);
+  print(Style::Warning, "waiting",
+        fmt::format("{} is open on the phone; it is installed when it quits (appsync quit {}), "
+                    "next try in {} s",
+                    subject(event.identifier), identifier, InstallRetrySeconds));
+}
+
+void TextReporter::tell(const InstallEnded& event) {
+  installing_.erase(event.identifier);
+  if (!event.failure) {
+    const auto planned = planned_.find(event.identifier);
+    const bool isNew = planned == planned_.end() || planned->second.action == Action::Install;
+    print(Style::Good, isNew ? "installed" : "updated", subject(event.identifier));
+  }
+  showInstalling();
+}
+
+void TextReporter::tell(const ClientLogLine& event) {
+  print(Style::Dim, "log", fmt::format("{}: {}", name(event.level), printable(event.text)));
+}
+
+void TextReporter::tell(const Interrupted&) {
+  print(Style::Warning, "ending", "cleanly; interrupt once more to end at once");
+}
+
+void TextReporter::tell(const SyncBroken& event) { printError("failed", printable(event.reason)); }
+
+void TextReporter::tell(const Summary& event) {
+  status_.clear();
+  for (const std::string& identifier : event.deleted) {
+    print(Style::Good, "deleted", subject(identifier));
+  }
+  for (const SkippedEntry& entry : event.skipped) {
+    if (entry.upToDate && !options_.verbose) continue;
+    print(Style::Warning, "skipped",
+          fmt::format("{}: {}", subject(entry.identifier), printable(entry.reason)));
+  }
+  for (const FailedEntry& entry : event.failed) {
+    printError("failed", fmt::format("{}: {}", subject(entry.identifier), printable(entry.reason)));
+  }
+  if (!options_.showPlan) tellCounts(event);
+}
+
+void TextReporter::tell(const BackupSummary& event) {
+  status_.clear();
+  for (const FailedEntry& entry : event.failed) {
+    printError("failed",
+               fmt::format("{}: {}", printable(entry.identifier), printable(entry.reason)));
+  }
+  if (!event.made) return print(Style::Warning, "stopped", "no backup was made");
+  std::string counts;
+  addCount(counts, event.saved.size(), "saved");
+  addCount(counts, event.failed.size(), "failed");
+  print(Style::Plain, "done", counts.empty() ? "no applications to save" : counts);
+}
+
+void TextReporter::tellCounts(const Summary& event) {
+  const auto upToDate = static_cast<std::size_t>(
+      std::count_if(event.skipped.begin(), event.skipped.end(),
+                    [](const SkippedEntry& entry) { return entry.upToDate; }));
+  std::string counts;
+  addCount(counts, event.installed.size(), "installed");
+  addCount(counts, event.updated.size(), "updated");
+  addCount(counts, event.deleted.size(), "deleted");
+  addCount(counts, event.failed.size(), "failed");
+  addCount(counts, event.skipped.size() - upToDate, "skipped");
+  addCount(counts, upToDate, "up to date");
+  print(Style::Plain, "done", counts.empty() ? "nothing to do" : counts);
+}
+
+}  // namespace appsync::host

@@ -1,0 +1,149 @@
+#include "host/restore/restore.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+
+#include "host/base/text.h"
+#include "host/phone/demotions.h"
+#include "host/restore/restore_packages.h"
+#include "host/restore/restore_settlement.h"
+#include "host/restore/store.h"
+
+namespace appsync::host {
+namespace {
+
+constexpr std::string_view Dataclass = "Application";
+constexpr std::int32_t FromDesktopBackup = 2;
+
+void addUnreadable(const std::optional<Library>& library, Summary& summary) {
+  if (!library) return;
+  for (const UnreadablePackage& file : library->unreadable) {
+    summary.skipped.push_back({file.file, file.reason, false});
+  }
+}
+
+}  // namespace
+
+Restore::Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Reporter& reporter,
+                 Interruption& interruption)
+    : client_(client),
+      host_(host),
+      phone_(std::move(phone)),
+      reporter_(reporter),
+      interruption_(interruption),
+      watch_(phone_, reporter, interruption) {}
+
+SyncResult Restore::run(const RestoreInput& input) {
+  handover_ = handOver(phone_, input.backup, input.list, reporter_, interruption_);
+  failures_ = handover_.failures;
+  const bool given = !handover_.broken || broken(*handover_.broken, std::nullopt);
+  SyncResult result;
+  result.completed = given && !interruption_.requested() && callClient(input);
+  if (input.catalogue && !broken_) bringFromStore(*input.catalogue);
+  result.summary = settle(input);
+  return result;
+}
+
+bool Restore::callClient(const RestoreInput& input) {
+  const auto dataclasses = client_.supportedDataclasses();
+  if (std::find(dataclasses.begin(), dataclasses.end(), Dataclass) == dataclasses.end()) {
+    return broken("the plug-in does not serve applications", std::nullopt);
+  }
+  std::optional<Error> error;
+  const auto ignoreProgress = [](double) {};
+  if (!client_.prepareForSyncWithHostAnchor(client_.currentSyncAnchor(), ignoreProgress, &error)) {
+    return broken("the phone cannot begin a restore", error);
+  }
+  client_.reconcileRestoreOfType(FromDesktopBackup, &error);
+  waitUntilIdle(phone_, handover_.listed);
+  claimDownloads(phone_.apps, {});
+  reportPlaceholders(input.list);
+  transfer(input);
+  return !interruption_.requested();
+}
+
+void Restore::transfer(const RestoreInput& input) {
+  static const Library None;
+  PackageSender sender(client_, host_.transfers(), phone_, reporter_, interruption_,
+                       input.packages ? *input.packages : None);
+  if (!interruption_.requested()) sender.send(client_.outstandingAssetTransfers());
+  sent_ = sender.outcome().sent;
+  note(sender.outcome().failures);
+  if (!phone_.coordination) {
+    bringPackages(input.packages ? *input.packages : None);
+  } else if (input.packages) {
+    reporter_.report(
+        Notice{"this phone takes restored applications only from the store (--store)"});
+  }
+  waitUntilIdle(phone_, sent_);
+  client_.assetTransferEndedWithSuccess(!interruption_.requested());
+  if (!phone_.coordination) sender.removeSentPackages();
+}
+
+/// Also what an earlier restore has sent, whatever the library holds now.
+void Restore::bringPackages(const Library& library) {
+  RestorePackages packages(client_, host_, phone_, reporter_, interruption_, library);
+  packages.deliver(leftOut());
+  note(packages.failures());
+}
+
+void Restore::bringFromStore(const Library& catalogue) {
+  Store store(host_, phone_, reporter_, interruption_, catalogue);
+  store.deliver(leftOut());
+  note(store.failures());
+}
+
+void Restore::reportPlaceholders(const RestoreList& list) {
+  const Demotions demotions(phone_.files);
+  const ApplicationsPresent present = applicationsPresent(phone_.apps);
+  for (const BackedUpApplication& app : list.applications()) {
+    const auto found = present.placeholders.find(app.identifier);
+    if (found == present.placeholders.end()) continue;
+    reporter_.report(
+        PlaceholderStands{app.identifier, app.name, demotions.holdBack(found->second)});
+  }
+}
+
+std::set<std::string> Restore::leftOut() const {
+  std::set<std::string> identifiers;
+  for (const auto& failure : handover_.failures) identifiers.insert(failure.first);
+  return identifiers;
+}
+
+void Restore::note(const std::map<std::string, std::string>& failures) {
+  failures_.insert(failures.begin(), failures.end());
+}
+
+Summary Restore::settle(const RestoreInput& input) {
+  note(watch_.failures());
+  RestoreEnd end;
+  end.installedBefore = handover_.installed;
+  end.present = applicationsPresent(phone_.apps);
+  const Demotions demotions(phone_.files);
+  for (const auto& [identifier, record] : end.present.placeholders) {
+    if (demotions.holdBack(record)) end.heldBack.insert(identifier);
+  }
+  for (const std::string& identifier : sent_) {
+    if (handover_.installed.contains(identifier)) end.updated.insert(identifier);
+  }
+  end.failures = failures_;
+  end.missing = input.catalogue                          ? "the store does not have it"
+                : input.packages && !phone_.coordination ? "the library does not have it"
+                                                         : "waits for its package";
+  end.interrupted = interruption_.requested();
+  end.broken = broken_;
+  Summary summary = settleRestore(input.list, end);
+  addUnreadable(input.packages, summary);
+  addUnreadable(input.catalogue, summary);
+  return summary;
+}
+
+bool Restore::broken(std::string_view what, const std::optional<Error>& error) {
+  broken_ = error ? fmt::format("{}: {}", what, oneLine(error->localizedDescription()))
+                  : std::string(what);
+  reporter_.report(SyncBroken{*broken_});
+  return false;
+}
+
+}  // namespace appsync::host

@@ -1,0 +1,98 @@
+#include "host/restore/restore_data.h"
+
+#include "host/base/digest.h"
+#include "host/base/text.h"
+
+namespace appsync::host {
+namespace {
+
+/// The archive of an application without data has no bytes.
+bool waitsAlready(const RestorePhone& phone, const std::string& identifier,
+                  const BackupFile* file) {
+  Sha256 digest;
+  std::uint64_t size = 0;
+  const std::uint64_t expected = file ? file->size : 0;
+  const auto compare = [&](ByteView bytes) {
+    digest.add(bytes);
+    size += bytes.size();
+    return size <= expected;
+  };
+  return phone.saveData(identifier, compare, nullptr) && size == expected &&
+         (!file || digest.finish() == file->digest);
+}
+
+/// Reports each hundredth.
+class ReportedData {
+ public:
+  ReportedData(const BackedUpApplication& app, const BackupFile& file, Reporter& reporter)
+      : app_(app), total_(file.size), reader_(file), reporter_(reporter) {}
+
+  std::int64_t read(std::uint8_t* bytes, std::size_t size) {
+    const std::int64_t count = reader_.read(bytes, size);
+    const std::uint64_t hundredths = total_ == 0 ? 100 : reader_.position() * 100 / total_;
+    if (count > 0 && hundredths > reported_) {
+      reported_ = hundredths;
+      reporter_.report(DataProgress{app_.identifier, app_.name, reader_.position(), total_});
+    }
+    return count;
+  }
+  const std::string& problem() const { return reader_.problem(); }
+
+ private:
+  const BackedUpApplication& app_;
+  const std::uint64_t total_;
+  BackupFileReader reader_;
+  Reporter& reporter_;
+  std::uint64_t reported_ = 0;
+};
+
+std::string cause(const std::optional<Error>& error) {
+  return error ? oneLine(error->localizedDescription()) : "no reason is known";
+}
+
+std::optional<std::string> layOut(const RestorePhone& phone, const BackedUpApplication& app,
+                                  const BackupFile& file, Reporter& reporter,
+                                  const Interruption& interruption) {
+  ReportedData data(app, file, reporter);
+  const auto source = [&](std::uint8_t* bytes, std::size_t size) {
+    return interruption.requested() ? -1 : data.read(bytes, size);
+  };
+  std::optional<Error> error;
+  if (phone.restoreData(app.identifier, source, &error)) return std::nullopt;
+  if (!data.problem().empty()) return "its data in the backup is damaged: " + data.problem();
+  if (interruption.requested()) return InterruptedReason;
+  return "its data could not be given back: " + cause(error);
+}
+
+/// What an earlier restore left waiting belongs to another backup.
+std::optional<std::string> clear(const RestorePhone& phone, const std::string& identifier) {
+  const auto nothing = [](std::uint8_t*, std::size_t) { return std::int64_t{0}; };
+  std::optional<Error> error;
+  if (phone.restoreData(identifier, nothing, &error)) return std::nullopt;
+  return "older data that waits for it could not be removed: " + cause(error);
+}
+
+}  // namespace
+
+bool ownsData(const RestorePhone& phone, const std::string& identifier) {
+  if (phone.files.directoryExists(joinPath(exchange::WaitingData, identifier))) return false;
+  bool any = false;
+  const auto look = [&](ByteView bytes) {
+    any = !bytes.empty();
+    return !any;
+  };
+  phone.saveData(identifier, look, nullptr);
+  return any;
+}
+
+std::optional<std::string> giveBackData(const RestorePhone& phone, const BackedUpApplication& app,
+                                        const BackupFile* file, Reporter& reporter,
+                                        const Interruption& interruption) {
+  if (waitsAlready(phone, app.identifier, file)) return std::nullopt;
+  if (!file) return clear(phone, app.identifier);
+  auto failure = layOut(phone, app, *file, reporter, interruption);
+  reporter.report(DataEnded{app.identifier, failure});
+  return failure;
+}
+
+}  // namespace appsync::host

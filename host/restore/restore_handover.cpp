@@ -1,0 +1,150 @@
+#include "host/restore/restore_handover.h"
+
+#include <cerrno>
+
+#include "host/base/text.h"
+#include "host/library/package_reader.h"
+#include "host/restore/restore_data.h"
+
+namespace appsync::host {
+namespace {
+
+class HandoverInProgress {
+ public:
+  HandoverInProgress(const RestorePhone& phone, const Backup& backup, const RestoreList& list,
+                     Reporter& reporter, const Interruption& interruption)
+      : phone_(phone),
+        backup_(backup),
+        list_(list),
+        reporter_(reporter),
+        interruption_(interruption) {}
+
+  Handover run() {
+    look();
+    sweepPlaceholders();
+    chooseForClient();
+    giveBackData();
+    if (!interruption_.requested()) putBack();
+    return std::move(result_);
+  }
+
+ private:
+  /// What a restore that was killed began is carried on by the phone itself.
+  void look() {
+    std::set<std::string> all;
+    for (const BackedUpApplication& app : list_.applications()) all.insert(app.identifier);
+    waitUntilIdle(phone_, all);
+    ApplicationsPresent present = applicationsPresent(phone_.apps);
+    result_.installed = std::move(present.installed);
+    placeholders_ = std::move(present.placeholders);
+  }
+
+  /// A broken-off sync's would keep the client from making a restore's.
+  void sweepPlaceholders() {
+    if (phone_.coordination) return;
+    for (const BackedUpApplication& app : list_.applications()) {
+      const auto found = placeholders_.find(app.identifier);
+      if (found == placeholders_.end() || found->second.installType != InstallType::Sync) continue;
+      const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
+      if (!phone_.apps.uninstallApplication(app.identifier, options)) continue;
+      placeholders_.erase(found);
+      reporter_.report(PlaceholderSwept{app.identifier});
+    }
+  }
+
+  void chooseForClient() {
+    for (const std::string& identifier : phone_.packagesOwedBy(KQClientKiosk)) {
+      owed_.insert(identifier);
+    }
+    for (const BackedUpApplication& app : list_.applications()) {
+      if (result_.installed.contains(app.identifier) || isRestoring(app.identifier)) continue;
+      if (!isUsableIdentifier(app.identifier)) {
+        result_.failures[app.identifier] = app.flaw;
+        continue;
+      }
+      result_.listed.insert(app.identifier);
+      reporter_.report(
+          PlannedEntry{Action::Install, app.identifier, app.version, std::string(), app.name});
+    }
+  }
+
+  /// Whether the client has done all that it can for the application.
+  bool isRestoring(const std::string& identifier) const {
+    const auto placeholder = placeholders_.find(identifier);
+    if (placeholder == placeholders_.end()) return false;
+    const InstallType type = placeholder->second.installType;
+    if (type == InstallType::Sync) return false;
+    // A coordinated restore's placeholder may stand before its package is left to the store.
+    return !phone_.coordination || type != InstallType::Restore || owed_.contains(identifier);
+  }
+
+  void giveBackData() {
+    for (const BackedUpApplication& app : list_.applications()) {
+      if (interruption_.requested()) return;
+      if (result_.installed.contains(app.identifier) || result_.failures.contains(app.identifier)) {
+        continue;
+      }
+      if (isRestoring(app.identifier) && ownsData(phone_, app.identifier)) continue;
+      const auto file = backup_.data.find(app.identifier);
+      const auto failure =
+          host::giveBackData(phone_, app, file == backup_.data.end() ? nullptr : &file->second,
+                             reporter_, interruption_);
+      if (!failure) continue;
+      // Without its data it would come back for good and forget what it was.
+      result_.listed.erase(app.identifier);
+      result_.failures[app.identifier] = *failure;
+    }
+  }
+
+  void putBack() {
+    if (result_.listed.empty()) {
+      // An older list would make the client do what is not wanted any more.
+      if (phone_.files.fileExists(exchange::RestoreList)) {
+        phone_.files.removeItem(exchange::RestoreList);
+      }
+      return;
+    }
+    putBackLayout();
+    std::optional<Error> error;
+    const auto list = list_.only(result_.listed, &error);
+    const bool done = write(exchange::DemotedApplications, backup_.demotions, &error) && list &&
+                      write(exchange::RestoreList, *list, &error);
+    if (done) return;
+    result_.broken = "the phone does not take the backup: " +
+                     oneLine(error.value_or(Error::posix(EIO)).localizedDescription());
+  }
+
+  /// The home screen keeps places for what is still to come.
+  void putBackLayout() {
+    if (backup_.iconLayout.empty()) return;
+    const int status =
+        phone_.homeScreen.setIconState(phone_.homeScreen.serverPort(), backup_.iconLayout);
+    if (status == 0) return;
+    reporter_.report(Notice{"the home screen does not take its layout: " +
+                            oneLine(Error::posix(status).localizedDescription())});
+  }
+
+  bool write(std::string_view path, const Bytes& bytes, std::optional<Error>* error) {
+    const std::string_view directory = path.substr(0, path.rfind('/'));
+    return phone_.files.createDirectory(directory, true, {}, error) &&
+           phone_.files.writeAtomically(path, bytes, error);
+  }
+
+  const RestorePhone& phone_;
+  const Backup& backup_;
+  const RestoreList& list_;
+  Reporter& reporter_;
+  const Interruption& interruption_;
+  std::map<std::string, AppRecord, std::less<>> placeholders_;
+  std::set<std::string> owed_;  // by the store
+  Handover result_;
+};
+
+}  // namespace
+
+Handover handOver(const RestorePhone& phone, const Backup& backup, const RestoreList& list,
+                  Reporter& reporter, const Interruption& interruption) {
+  return HandoverInProgress(phone, backup, list, reporter, interruption).run();
+}
+
+}  // namespace appsync::host

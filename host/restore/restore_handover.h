@@ -1,0 +1,30 @@
+#pragma once
+
+#include <map>
+#include <optional>
+#include <set>
+#include <string>
+
+#include "host/base/interruption.h"
+#include "host/library/events.h"
+#include "host/phone/phone.h"
+#include "host/restore/restore_list.h"
+
+namespace appsync::host {
+
+/// What a phone got of a backup before its client is called.
+struct Handover {
+  std::set<std::string, std::less<>> installed;  ///< was on the phone before, all applications
+  std::set<std::string> listed;                  ///< the client is to make placeholders of these
+  std::map<std::string, std::string> failures;   ///< reason by identifier of what was left out
+  std::optional<std::string> broken;             ///< why it was broken off, for people
+};
+
+/// Gives a phone what it lacks of a backup: first each application's data, then the order of the
+/// home screen and the demoted applications, and last the list that sets the client off. Broken off
+/// or killed anywhere, it has done no harm, and the next one carries on. What is installed is left
+/// alone, with its data.
+Handover handOver(const RestorePhone& phone, const Backup& backup, const RestoreList& list,
+                  Reporter& reporter, const Interruption& interruption);
+
+}  // namespace appsync::host

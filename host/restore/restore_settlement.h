@@ -1,0 +1,29 @@
+#pragma once
+
+#include <map>
+#include <optional>
+#include <set>
+#include <string>
+
+#include "host/library/events.h"
+#include "host/phone/phone.h"
+#include "host/restore/restore_list.h"
+
+namespace appsync::host {
+
+/// What is known when a restore is over.
+struct RestoreEnd {
+  std::set<std::string, std::less<>> installedBefore;
+  ApplicationsPresent present;
+  std::set<std::string> heldBack;               ///< demoted placeholders
+  std::set<std::string> updated;                ///< installed before, and again
+  std::map<std::string, std::string> failures;  ///< reason by identifier
+  std::string missing;                          ///< why a placeholder has no package
+  bool interrupted = false;
+  std::optional<std::string> broken;  ///< why the restore as a whole failed
+};
+
+/// What became of each application of the backup and of all others that the restore touched. Pure.
+Summary settleRestore(const RestoreList& list, const RestoreEnd& end);
+
+}  // namespace appsync::host

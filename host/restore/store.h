@@ -1,0 +1,64 @@
+#pragma once
+
+#include <map>
+#include <memory>
+#include <set>
+#include <string>
+
+#include "host/base/interruption.h"
+#include "host/library/events.h"
+#include "host/library/library.h"
+#include "host/phone/sync_host.h"
+#include "host/transfer/package_delivery.h"
+#include "host/transfer/package_transfer.h"
+
+namespace appsync::host {
+
+/// The store: brings the packages of applications that have only a placeholder, from a catalogue.
+///
+/// Packages that install coordinators expect of it go to them. Every other one goes to the registry
+/// by itself: a coordinator that fails takes its placeholder along, which here is all that is left
+/// of the application. Demoted applications are left alone until a person asks for them. Borrows
+/// everything; used once, by one thread.
+class Store {
+ public:
+  Store(HostProcess& host, const RestorePhone& phone, Reporter& reporter,
+        const Interruption& interruption, const Library& catalogue)
+      : host_(host),
+        phone_(phone),
+        reporter_(reporter),
+        interruption_(interruption),
+        catalogue_(catalogue) {}
+
+  /// Brings what is wanted but `except`, and returns when the phone has installed or refused it.
+  void deliver(const std::set<std::string>& except);
+
+  /// Why what the catalogue has was not brought, by identifier.
+  const std::map<std::string, std::string>& failures() const { return failures_; }
+
+ private:
+  struct Order {
+    SyncAssetPtr asset;
+    std::unique_ptr<PackageDelivery> delivery;
+    std::string target;  ///< file of the phone
+    PackageTransfer transfer;
+    bool arrived = false;
+  };
+
+  void takeOrders(const std::set<std::string>& except);
+  void order(const std::string& identifier, const std::string& name,
+             std::unique_ptr<PackageDelivery> delivery);
+  void send();
+  void sendChunk(Order& order);
+  void finish(Order& order, const std::optional<std::string>& failure);
+
+  HostProcess& host_;
+  const RestorePhone& phone_;
+  Reporter& reporter_;
+  const Interruption& interruption_;
+  const Library& catalogue_;
+  std::map<std::string, std::unique_ptr<Order>> orders_;  ///< by identifier
+  std::map<std::string, std::string> failures_;
+};
+
+}  // namespace appsync::host

@@ -1,0 +1,213 @@
+#include "host/sync/session.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <chrono>
+#include <thread>
+
+#include "host/base/text.h"
+#include "host/transfer/staging.h"
+#include "platform/bundle.h"
+#include "platform/property_list_codec.h"
+
+namespace appsync::host {
+namespace {
+
+constexpr std::string_view Dataclass = "Application";
+constexpr const char* CancelledOnPhone = "cancelled on the phone";
+constexpr std::chrono::milliseconds InstallPoll{10};
+
+void ignoreProgress(double) {}
+
+bool isDownloaded(const std::string& identifier, const std::vector<TodoEntry>& todo) {
+  return std::any_of(todo.begin(), todo.end(), [&](const TodoEntry& entry) {
+    return entry.identifier == identifier && entry.operation == "DOWNLOADED";
+  });
+}
+
+std::set<std::string> identifiersOf(const SyncPlan& plan) {
+  std::set<std::string> identifiers;
+  for (const PlannedEntry& entry : plan.entries) identifiers.insert(entry.identifier);
+  return identifiers;
+}
+
+}  // namespace
+
+Session::Session(SyncClient& client, TransferQueue& queue, Phone phone, Reporter& reporter,
+                 Interruption& interruption)
+    : client_(client),
+      queue_(queue),
+      phone_(std::move(phone)),
+      reporter_(reporter),
+      interruption_(interruption),
+      watch_(phone_, reporter, interruption) {}
+
+SyncResult Session::run(const SyncInput& input) {
+  PackageSender sender(client_, queue_, phone_, reporter_, interruption_, input.library);
+  // What the client hears late of a killed sync must not reach this sync's todo list.
+  waitUntilIdle(phone_, identifiersOf(input.plan));
+  sweepPlaceholders();
+  removeLeftOverPackages(phone_.files);
+  SyncResult result;
+  result.completed = callClient(input, sender);
+  result.summary = settle(input.plan, input.library, end(sender));
+  return result;
+}
+
+bool Session::callClient(const SyncInput& input, PackageSender& sender) {
+  if (!isServed()) return !broken_;
+  bool success = reconcile(input);
+  if (reconciled_) success = transfer(input.plan, sender);
+  client_.syncEndedWithSuccess(success);
+  if (success) writeApplicationsPresent();
+  return success;
+}
+
+bool Session::isServed() {
+  const auto dataclasses = client_.supportedDataclasses();
+  if (std::find(dataclasses.begin(), dataclasses.end(), Dataclass) == dataclasses.end()) {
+    return broken("the plug-in does not serve applications", std::nullopt);
+  }
+  const std::string hostAnchor = client_.currentSyncAnchor();
+  const auto disabledTypes = client_.disabledAssetTypes();
+  disabled_ = disabledTypes && disabledTypes->count(std::string(Dataclass)) > 0;
+  if (disabled_) return false;
+  std::optional<Error> error;
+  if (client_.prepareForSyncWithHostAnchor(hostAnchor, ignoreProgress, &error)) return true;
+  broken("the phone cannot begin a sync", error);
+  client_.syncEndedWithSuccess(false);
+  return false;
+}
+
+bool Session::reconcile(const SyncInput& input) {
+  reportDeletions(client_.installedAssets());
+  if (interruption_.requested()) return false;
+  std::optional<Error> error;
+  if (!stage(phone_.files, input.plan, input.library, input.iconLayout, &error)) {
+    return broken("the phone did not take the list of what is to be done", error);
+  }
+  const PropertyList::Dictionary description{{"Dataclass", Dataclass}};
+  reconciled_ = client_.reconcileSync(description, input.newAnchor, ignoreProgress, &error);
+  if (!reconciled_) broken("the phone could not take over what is to be done", error);
+  return reconciled_;
+}
+
+bool Session::transfer(const SyncPlan& plan, PackageSender& sender) {
+  if (!interruption_.requested()) {
+    claimDownloads(phone_.apps, identifiersOf(plan));
+    const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
+    if (phone_.coordination) findCoordinators(assets);
+    sender.send(assets);
+  }
+  if (phone_.coordination) waitForCoordination(plan, sender.outcome().sent);
+  client_.assetTransferEndedWithSuccess(!interruption_.requested());
+  // A coordinated install takes its package away itself, perhaps later.
+  if (!phone_.coordination) sender.removeSentPackages();
+  return !interruption_.requested();
+}
+
+/// Before anything is sent, so that an install that is over by then can only have been cancelled.
+void Session::findCoordinators(const std::vector<SyncAssetPtr>& assets) {
+  for (const SyncAssetPtr& asset : assets) {
+    coordinators_[asset->identifier] = phone_.coordination->coordinatorFor(
+        CoordinatorKind::Any, asset->identifier, SyncHostClientID, false, nullptr, nullptr);
+  }
+}
+
+/// A completed install shows in the todo list; a cancelled one leaves no trace there, and one that
+/// the phone gave up stays as it is.
+bool Session::isSettled(const std::string& identifier, const std::vector<TodoEntry>& todo) {
+  const auto& coordinator = coordinators_.at(identifier);
+  const std::optional<Error> error = coordinator ? coordinator->error() : std::nullopt;
+  if (!coordinator || error) {
+    cancelled_[identifier] = error ? oneLine(error->localizedDescription()) : CancelledOnPhone;
+    return true;
+  }
+  if (!isDownloaded(identifier, todo)) return true;
+  if (phone_.isBusyWith(identifier)) return false;
+  // Nobody will do more for it, unless it was done since the list was read.
+  return isDownloaded(identifier, readTodoList(phone_.files, exchange::WorkArea));
+}
+
+/// Coordinators settle, and the phone removes and tidies up, after the client's calls have
+/// returned, which would be too late for this sync's result.
+void Session::waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent) {
+  const auto installsSettled = [&] {
+    if (interruption_.requested()) return true;
+    const auto todo = readTodoList(phone_.files, exchange::WorkArea);
+    return std::all_of(sent.begin(), sent.end(),
+                       [&](const std::string& identifier) { return isSettled(identifier, todo); });
+  };
+  while (!installsSettled()) std::this_thread::sleep_for(InstallPoll);
+  waitUntilIdle(phone_, identifiersOf(plan));
+}
+
+/// The client never asks for a package whose placeholder stands already.
+void Session::sweepPlaceholders() {
+  std::vector<std::string> leftOver;
+  phone_.apps.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
+    if (!record.isPlaceholder || record.installType != InstallType::Sync) return;
+    const auto progress = phone_.apps.installProgressSync(record);
+    const bool onItsWay = progress && progress->installState() == InstallState::Active &&
+                          progress->installPhase() == InstallPhase::Installing;
+    if (!onItsWay) leftOver.push_back(record.applicationIdentifier);
+  });
+  for (const std::string& identifier : leftOver) {
+    const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
+    if (phone_.apps.uninstallApplication(identifier, options)) {
+      reporter_.report(PlaceholderSwept{identifier});
+    }
+  }
+}
+
+void Session::reportDeletions(const PropertyList::Dictionary& inventory) {
+  const PropertyList* deleted = find(inventory, "_Deleted");
+  if (!deleted || !deleted->asArray()) return;
+  for (const PropertyList& item : *deleted->asArray()) {
+    const PropertyList::Dictionary* entry = item.asDictionary();
+    const std::string* identifier = entry ? findString(*entry, KBBundleIdentifier) : nullptr;
+    if (identifier) reporter_.report(DeletedOnPhone{*identifier});
+  }
+}
+
+/// The next sync's inventory compares what is there with this list. The client deletes the old one
+/// when a sync ends.
+void Session::writeApplicationsPresent() {
+  PropertyList::Array present;
+  phone_.apps.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
+    if (record.isApplication && !record.isPlaceholder &&
+        record.applicationType == ApplicationTypeUser) {
+      present.emplace_back(record.applicationIdentifier);
+    }
+  });
+  std::optional<Error> error;
+  const auto bytes = serializePropertyList(std::move(present), PropertyListFormat::Binary, &error);
+  if (!bytes || !phone_.files.writeAtomically(exchange::LastSyncState, *bytes, &error)) {
+    broken("the list of applications present could not be written", error);
+  }
+}
+
+SyncEnd Session::end(const PackageSender& sender) const {
+  SyncEnd end;
+  if (reconciled_) end.todo = readTodoList(phone_.files, exchange::WorkArea);
+  phone_.apps.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
+    end.present.insert(record.applicationIdentifier);
+  });
+  end.transfers = sender.outcome();
+  end.installFailures = watch_.failures();
+  end.installFailures.insert(cancelled_.begin(), cancelled_.end());
+  end.disabled = disabled_;
+  end.interrupted = interruption_.requested();
+  end.broken = broken_;
+  return end;
+}
+
+bool Session::broken(std::string_view what, const std::optional<Error>& error) {
+  broken_ = error ? fmt::format("{}: {}", what, oneLine(error->localizedDescription()))
+                  : std::string(what);
+  reporter_.report(SyncBroken{*broken_});
+  return false;
+}
+
+}  // namespace appsync::host

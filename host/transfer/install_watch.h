@@ -1,0 +1,38 @@
+#pragma once
+
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "host/base/interruption.h"
+#include "host/library/events.h"
+#include "host/phone/phone.h"
+
+namespace appsync::host {
+
+/// Watches a phone for as long as it lives: tells of its installs, remembers why some failed, and
+/// hurries the phone when the person interrupts. Borrows everything. Called from any thread.
+class InstallWatch : public device::DeviceWatcher {
+ public:
+  InstallWatch(const Phone& phone, Reporter& reporter, Interruption& interruption);
+  ~InstallWatch() override;
+  InstallWatch(const InstallWatch&) = delete;
+  InstallWatch& operator=(const InstallWatch&) = delete;
+
+  void assertionDenied(std::string_view bundleId) noexcept override;
+  void installFinished(std::string_view bundleId,
+                       const std::optional<Error>& error) noexcept override;
+  /// Reason by identifier.
+  std::map<std::string, std::string> failures() const;
+
+ private:
+  const Phone& phone_;
+  Reporter& reporter_;
+  Interruption& interruption_;
+  mutable std::mutex mutex_;
+  std::map<std::string, std::string> failures_;
+};
+
+}  // namespace appsync::host

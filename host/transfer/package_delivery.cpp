@@ -1,0 +1,114 @@
+#include "host/transfer/package_delivery.h"
+
+#include "host/base/text.h"
+#include "platform/bundle.h"
+
+namespace appsync::host {
+namespace {
+
+constexpr std::int64_t ProgressUnits = 1000;
+constexpr const char* NotInstalled = "the phone did not install it (appsync log tells more)";
+
+class CoordinatedDelivery final : public PackageDelivery {
+ public:
+  CoordinatedDelivery(const Phone& phone, const std::string& identifier,
+                      std::shared_ptr<InstallCoordinator> coordinator)
+      : phone_(phone), identifier_(identifier), coordinator_(std::move(coordinator)) {}
+
+  void progressed(double fraction) override {
+    if (const auto package = promise()) package->setPercentComplete(fraction);
+  }
+
+  void gaveUp() override { progressed(0); }
+
+  void arrived(const std::string& path) override {
+    path_ = path;
+    const auto package = promise();
+    if (!package) return;
+    package->setTransferPath(FileLocation::file(path));
+    package->setComplete(true);
+  }
+
+  std::optional<std::string> settle() override {
+    waitUntilIdle(phone_, {identifier_});
+    const auto error = coordinator_->error();
+    const auto record = phone_.apps.recordForIdentifier(identifier_, false);
+    if (!error && record && !record->isPlaceholder) return std::nullopt;
+    // One that is over before its package was promised leaves the file alone.
+    phone_.files.removeItem(path_);
+    return error ? oneLine(error->localizedDescription()) : NotInstalled;
+  }
+
+ private:
+  /// A restore that was broken off may have made it already.
+  std::shared_ptr<PathTransferPromise> promise() {
+    if (!promise_) promise_ = coordinator_->appAssetPromise(nullptr);
+    if (promise_) return promise_;
+    promise_ = phone_.coordination->createPathTransferPromise(identifier_ + "-Asset", KQClientKiosk,
+                                                              std::nullopt, 0);
+    if (promise_ && !coordinator_->setAppAssetPromise(promise_, nullptr)) promise_.reset();
+    return promise_;
+  }
+
+  const Phone& phone_;
+  const std::string identifier_;
+  const std::shared_ptr<InstallCoordinator> coordinator_;
+  std::shared_ptr<PathTransferPromise> promise_;
+  std::string path_;
+};
+
+class RegistryDelivery final : public PackageDelivery {
+ public:
+  RegistryDelivery(const Phone& phone, const AppRecord& placeholder)
+      : phone_(phone),
+        identifier_(placeholder.applicationIdentifier),
+        progress_(phone.apps.installProgress(placeholder, InstallPhase::Loading)) {}
+
+  void progressed(double fraction) override {
+    if (!progress_) return;
+    if (!begun_) {
+      progress_->setInstallState(InstallState::Active);
+      progress_->setTotalUnitCount(ProgressUnits);
+      begun_ = true;
+    }
+    progress_->setCompletedUnitCount(static_cast<std::int64_t>(fraction * ProgressUnits));
+  }
+
+  void gaveUp() override {
+    if (progress_) progress_->setInstallState(InstallState::Paused);
+  }
+
+  void arrived(const std::string& path) override {
+    const PropertyList::Dictionary options{{std::string(SWPackageTypeKey), SWPackageTypeCustomer},
+                                           {std::string(KBBundleIdentifier), identifier_}};
+    std::optional<Error> error;
+    if (!phone_.apps.installApplication(FileLocation::file(path), options, &error)) {
+      failure_ = error ? oneLine(error->localizedDescription()) : NotInstalled;
+    }
+    phone_.files.removeItem(path);
+  }
+
+  std::optional<std::string> settle() override { return failure_; }
+
+ private:
+  const Phone& phone_;
+  const std::string identifier_;
+  const std::shared_ptr<InstallProgress> progress_;
+  bool begun_ = false;
+  std::optional<std::string> failure_;
+};
+
+}  // namespace
+
+std::unique_ptr<PackageDelivery> deliverToCoordinator(
+    const Phone& phone, const std::string& identifier,
+    std::shared_ptr<InstallCoordinator> coordinator) {
+  return std::make_unique<CoordinatedDelivery>(phone, identifier, std::move(coordinator));
+}
+
+std::unique_ptr<PackageDelivery> deliverToRegistry(const Phone& phone,
+                                                   const AppRecord& placeholder) {
+  return std::make_unique<RegistryDelivery>(phone, placeholder);
+}
+
+}  // namespace appsync::host

@@ -1,0 +1,36 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "host/phone/phone.h"
+
+namespace appsync::host {
+
+/// What a package that is being sent to a file of the phone is for. Used by one thread.
+class PackageDelivery {
+ public:
+  virtual ~PackageDelivery() = default;
+
+  /// A fraction of the package has been sent.
+  virtual void progressed(double fraction) = 0;
+  /// The package will not come now.
+  virtual void gaveUp() = 0;
+  /// The package lies at `path` of the phone and is the delivery's from now on.
+  virtual void arrived(const std::string& path) = 0;
+  /// Waits until the phone has installed or refused the package that arrived; gives the reason, for
+  /// people, when it was not installed.
+  virtual std::optional<std::string> settle() = 0;
+};
+
+/// Keeps the promise of a package that an install coordinator expects of the store.
+std::unique_ptr<PackageDelivery> deliverToCoordinator(
+    const Phone& phone, const std::string& identifier,
+    std::shared_ptr<InstallCoordinator> coordinator);
+
+/// Installs the package in the place of the application's placeholder.
+std::unique_ptr<PackageDelivery> deliverToRegistry(const Phone& phone,
+                                                   const AppRecord& placeholder);
+
+}  // namespace appsync::host

@@ -1,0 +1,77 @@
+#include "host/transfer/settlement.h"
+
+#include <algorithm>
+
+namespace appsync::host {
+namespace {
+
+std::string operationOf(const std::vector<TodoEntry>& todo, std::string_view identifier) {
+  const auto found = std::find_if(todo.begin(), todo.end(), [&](const TodoEntry& entry) {
+    return entry.identifier == identifier;
+  });
+  return found == todo.end() ? std::string() : found->operation;
+}
+
+const std::string* reasonFor(const std::string& identifier,
+                             const std::map<std::string, std::string>& reasons) {
+  const auto found = reasons.find(identifier);
+  return found == reasons.end() ? nullptr : &found->second;
+}
+
+/// Why an application that the phone was to get or to lose stayed as it was.
+std::string failureReason(const std::string& identifier, const SyncEnd& end) {
+  if (const auto* reason = reasonFor(identifier, end.installFailures)) return *reason;
+  if (const auto* reason = reasonFor(identifier, end.transfers.failures)) return *reason;
+  if (end.broken) return *end.broken;
+  if (end.interrupted) return "interrupted; the next sync does it";
+  return "the phone did not carry it out (appsync log tells more)";
+}
+
+void settleRemoval(const PlannedEntry& entry, const SyncEnd& end, Summary& summary) {
+  const bool taken = operationOf(end.todo, entry.identifier) == "remove";
+  if (taken && end.present.count(entry.identifier) == 0) {
+    summary.deleted.push_back(entry.identifier);
+  } else {
+    summary.failed.push_back({entry.identifier, failureReason(entry.identifier, end)});
+  }
+}
+
+void settleInstall(const PlannedEntry& entry, const SyncEnd& end, Summary& summary) {
+  const std::string operation = operationOf(end.todo, entry.identifier);
+  const bool asked = end.transfers.asked.count(entry.identifier) > 0;
+  if (operation == "INSTALLED") {
+    auto& list = entry.action == Action::Install ? summary.installed : summary.updated;
+    list.push_back(entry.identifier);
+  } else if (operation == "install" && !asked && !end.broken && !end.interrupted) {
+    summary.skipped.push_back({entry.identifier, "the phone did not ask for its package", false});
+  } else {
+    summary.failed.push_back({entry.identifier, failureReason(entry.identifier, end)});
+  }
+}
+
+}  // namespace
+
+Summary settle(const SyncPlan& plan, const Library& library, const SyncEnd& end) {
+  Summary summary;
+  summary.skipped = plan.skipped;
+  for (const PackageProblem& file : library.unreadable) {
+    if (file.looksLikePackage) {
+      summary.failed.push_back({file.file, file.reason});
+    } else {
+      summary.skipped.push_back({file.file, file.reason, false});
+    }
+  }
+  for (const PlannedEntry& entry : plan.entries) {
+    if (end.disabled) {
+      summary.skipped.push_back(
+          {entry.identifier, "the phone's restrictions forbid installing and removing", false});
+    } else if (entry.action == Action::Remove) {
+      settleRemoval(entry, end, summary);
+    } else {
+      settleInstall(entry, end, summary);
+    }
+  }
+  return summary;
+}
+
+}  // namespace appsync::host

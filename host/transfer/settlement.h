@@ -1,0 +1,29 @@
+#pragma once
+
+#include <map>
+#include <optional>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "host/library/events.h"
+#include "host/phone/phone.h"
+#include "host/transfer/package_sender.h"
+
+namespace appsync::host {
+
+/// What is known when a sync is over.
+struct SyncEnd {
+  std::vector<TodoEntry> todo;  ///< as the client left it; empty when it never took the list over
+  std::set<std::string, std::less<>> present;  ///< applications on the phone, placeholders included
+  TransferOutcome transfers;
+  std::map<std::string, std::string> installFailures;  ///< reason by identifier
+  bool disabled = false;                               ///< by the phone's restrictions
+  bool interrupted = false;
+  std::optional<std::string> broken;  ///< why the sync as a whole failed
+};
+
+/// What became of each entry of the plan and each file of the library. Pure.
+Summary settle(const SyncPlan& plan, const Library& library, const SyncEnd& end);
+
+}  // namespace appsync::host

@@ -1,0 +1,95 @@
+#include "host/transfer/staging.h"
+
+#include <cerrno>
+#include <set>
+
+#include "platform/property_list_codec.h"
+
+namespace appsync::host {
+namespace {
+
+/// The ending of a package that came without one.
+constexpr std::string_view PlainEnding = ".package";
+
+class Stage {
+ public:
+  Stage(FileManager& files, std::optional<Error>* error) : files_(files), error_(error) {}
+
+  bool makeDirectory(std::string_view path) {
+    return files_.createDirectory(path, true, {}, error_);
+  }
+
+  /// The client only ever sees a staging area that is whole, so single files need not be on disk.
+  bool write(std::string_view directory, std::string_view name, const std::optional<Bytes>& bytes) {
+    if (!bytes) return true;
+    const std::string path = joinPath(directory, name);
+    if (files_.createFile(path, *bytes, {})) return true;
+    setError(error_, Error::posix(EIO, path));
+    return false;
+  }
+
+  bool writeApplication(const LibraryPackage& package) {
+    const std::string directory = joinPath(exchange::StagingArea, package.identifier);
+    const PackageParts parts = readPackageParts(package.file);
+    return makeDirectory(directory) && write(directory, "Info.plist", parts.infoPlist) &&
+           write(directory, parts.iconName, parts.icon) &&
+           write(directory, "HalvoMetadata.plist", parts.metadata) &&
+           write(directory, "HalvoArtwork", parts.artwork);
+  }
+
+ private:
+  FileManager& files_;
+  std::optional<Error>* error_;
+};
+
+PropertyList todoList(const SyncPlan& plan) {
+  PropertyList::Array list;
+  for (const PlannedEntry& entry : plan.entries) {
+    const bool removes = entry.action == Action::Remove;
+    PropertyList::Dictionary todo{{"identifier", entry.identifier},
+                                  {"operation", removes ? "remove" : "install"},
+                                  {"name", entry.name}};
+    if (!entry.version.empty()) todo.emplace("version", entry.version);
+    list.emplace_back(std::move(todo));
+  }
+  return list;
+}
+
+}  // namespace
+
+bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
+           const std::optional<Bytes>& iconLayout, std::optional<Error>* error) {
+  Stage area(files, error);
+  files.removeItem(exchange::StagingArea);
+  if (!area.makeDirectory(exchange::StagingArea)) return false;
+  for (const PlannedEntry& entry : plan.entries) {
+    const LibraryPackage* package = library.find(entry.identifier);
+    if (entry.action == Action::Remove || !package) continue;
+    if (!area.writeApplication(*package)) return false;
+  }
+  const auto todo = serializePropertyList(todoList(plan), PropertyListFormat::Binary, error);
+  // The list comes last: without it the client does nothing with what else lies here.
+  return todo && area.write(exchange::StagingArea, exchange::IconLayoutName, iconLayout) &&
+         area.write(exchange::StagingArea, exchange::TodoName, todo);
+}
+
+std::string stagedPackageName(const LibraryPackage& package) {
+  const std::string_view ending = packageEnding(package.file.filename().string());
+  return package.identifier + std::string(ending.empty() ? PlainEnding : ending);
+}
+
+void removeLeftOverPackages(FileManager& files) {
+  static const std::set<std::string> settled = {"remove", "INSTALLED", "FAILED"};
+  for (const std::string_view directory : {exchange::WorkArea, exchange::StagingArea}) {
+    for (const TodoEntry& entry : readTodoList(files, directory)) {
+      if (settled.count(entry.operation) > 0 || !isUsableIdentifier(entry.identifier)) continue;
+      const std::string base = joinPath(exchange::StagingRoot, entry.identifier);
+      for (const std::string_view ending : packageEndings()) {
+        files.removeItem(base + std::string(ending));
+      }
+      files.removeItem(base + std::string(PlainEnding));
+    }
+  }
+}
+
+}  // namespace appsync::host

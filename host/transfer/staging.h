@@ -1,0 +1,23 @@
+#pragma once
+
+#include <optional>
+
+#include "host/library/library.h"
+#include "host/library/sync_plan.h"
+#include "host/phone/phone.h"
+
+namespace appsync::host {
+
+/// Puts into the phone's staging area what the client takes over: the todo list, each application's
+/// description, icon and metadata, and the icon layout. Whatever stood there before is gone. False
+/// with an error when the phone refuses.
+bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
+           const std::optional<Bytes>& iconLayout, std::optional<Error>* error);
+
+/// The name under which a package is sent: the identifier and the ending of the library's file.
+std::string stagedPackageName(const LibraryPackage& package);
+
+/// Removes packages that a broken-off sync left in the staging root.
+void removeLeftOverPackages(FileManager& files);
+
+}  // namespace appsync::host
