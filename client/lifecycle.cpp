@@ -4,7 +4,6 @@
 namespace appsync {
 namespace {
 
-constexpr std::string_view DataclassName = "Application";
 /// The client never syncs incrementally, so it keeps no anchor.
 constexpr std::string_view SyncAnchor = "NO_APP_SYNC_ANCHOR";
 constexpr std::string_view AccessQueueLabel = "com.corvane.qmx.Tarnway.AppSync";
@@ -56,7 +55,7 @@ bool AppsClient::_runsInSyncHost() const {
 }
 
 std::vector<std::string> AppsClient::supportedDataclasses() noexcept {
-  return {std::string(DataclassName)};
+  return {std::string(ApplicationDataclass)};
 }
 
 std::string AppsClient::currentSyncAnchor() noexcept { return std::string(SyncAnchor); }
@@ -69,7 +68,7 @@ bool AppsClient::prepareForSyncWithHostAnchor(std::string_view, const ProgressCa
 
 std::optional<std::set<std::string>> AppsClient::disabledAssetTypes() noexcept {
   if (_appInstallationAllowed() || _appRemovalAllowed()) return std::nullopt;
-  return std::set{std::string(DataclassName)};
+  return std::set{std::string(ApplicationDataclass)};
 }
 
 std::uint32_t AppsClient::_getAndResetNumAppInstallsAttempted() {

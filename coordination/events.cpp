@@ -9,7 +9,7 @@ namespace {
 constexpr std::string_view EventServiceName = "com.corvane.twc.ipx.icappobserverdelegate";
 
 SyncAssetPtr assetNamed(SyncHost& host, std::string_view bundleId) {
-  return host.makeDownload(bundleId, "Application", std::nullopt);
+  return host.makeDownload(bundleId, ApplicationDataclass, std::nullopt);
 }
 
 }  // namespace

@@ -15,11 +15,6 @@ PropertyList::Dictionary dictionaryAt(FileManager& files, const std::optional<st
   return loadDictionary(files, *path).value_or(PropertyList::Dictionary{});
 }
 
-std::optional<std::string> versionOf(const SyncAsset& asset) {
-  const std::string* version = findString(asset.variantOptions, AssetVersionKey);
-  return version ? std::optional(*version) : std::nullopt;
-}
-
 }  // namespace
 
 InstallPreparation::InstallPreparation(AppsClient& client, const Platform& platform,

@@ -11,6 +11,9 @@
 
 namespace appsync {
 
+/// What SyncAsset::dataclass and SyncClient::supportedDataclasses call applications.
+inline constexpr std::string_view ApplicationDataclass = "Application";
+
 // Bits of the "AssetParts" asked for and of SyncAsset::completedAssetParts.
 inline constexpr std::uint32_t kTWAssetPartApplication = 1;      ///< the application package
 inline constexpr std::uint32_t kTWAssetPartApplicationData = 2;  ///< the application's data
@@ -44,6 +47,9 @@ struct SyncAsset {
 };
 
 using SyncAssetPtr = std::shared_ptr<SyncAsset>;
+
+/// The version among the variant options; nullopt for none.
+std::optional<std::string> versionOf(const SyncAsset& asset);
 
 /// The short description, or the identifier when there is none.
 std::string description(const SyncAsset& asset);

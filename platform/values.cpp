@@ -97,6 +97,11 @@ std::string description(const AppRecord& record) {
   return record.applicationIdentifier + (record.isPlaceholder ? " (placeholder)" : "");
 }
 
+std::optional<std::string> versionOf(const SyncAsset& asset) {
+  const std::string* version = findString(asset.variantOptions, AssetVersionKey);
+  return version ? std::optional(*version) : std::nullopt;
+}
+
 std::string description(const SyncAsset& asset) {
   return asset.shortDescription.empty() ? asset.identifier : asset.shortDescription;
 }

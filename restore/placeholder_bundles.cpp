@@ -65,10 +65,9 @@ void AppsClient::_createPlaceHolderApplication(const SyncAssetPtr& asset) {
 
   // An empty version keeps the dictionary complete: without its placeholder, an update that fails
   // would take the installed application with it.
-  const std::string* version = findString(asset->variantOptions, AssetVersionKey);
   const PropertyList::Dictionary info =
-      placeholderInfo(identifier, version ? *version : std::string(), name, periodicalFlag(package),
-                      infoProhibitsLaunch(package));
+      placeholderInfo(identifier, versionOf(*asset).value_or(std::string()), name,
+                      periodicalFlag(package), infoProhibitsLaunch(package));
   if (!writePlaceholderInfo(_platform.files, path, info)) return;
   _log.normal("creating placeholder for '%{public}@'. info.plist=%{public}@", identifier, info);
 

@@ -9,8 +9,6 @@
 namespace appsync {
 namespace {
 
-constexpr std::string_view Dataclass = "Application";
-
 void dropInProgress(AppRegistry& registry, PropertyList::Dictionary& entries,
                     const ClientLog& log) {
   const InProgressAssetQuery::Answer answer =
@@ -104,7 +102,8 @@ SyncAssetPtr AppsClient::_prepareAsset(const TransferCandidate& app) {
   const std::string bundlePath = app.bundlePath.value_or(std::string());
   const bool rendered = _makeIconFromBundlePath(app.bundlePath, app.iconPath);
 
-  const SyncAssetPtr asset = _platform.syncHost.makeDownload(app.identifier, Dataclass, prettyName);
+  const SyncAssetPtr asset =
+      _platform.syncHost.makeDownload(app.identifier, ApplicationDataclass, prettyName);
   asset->icon = FileLocation::file(rendered ? app.iconPath : paths::artworkIn(container));
   asset->isRestore = app.isRestore;
 

@@ -12,11 +12,6 @@ namespace {
 
 constexpr std::int64_t ProgressUnits = 1000;
 
-std::optional<std::string> versionOf(const SyncAsset& asset) {
-  const std::string* version = findString(asset.variantOptions, AssetVersionKey);
-  return version ? std::optional(*version) : std::nullopt;
-}
-
 bool isUnfinished(InstallState state) {
   return static_cast<std::uint64_t>(state) < static_cast<std::uint64_t>(InstallState::Canceled);
 }

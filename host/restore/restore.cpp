@@ -13,7 +13,6 @@
 namespace appsync::host {
 namespace {
 
-constexpr std::string_view Dataclass = "Application";
 constexpr std::int32_t FromDesktopBackup = 2;
 
 void addUnreadable(const std::optional<Library>& library, Summary& summary) {
@@ -47,7 +46,8 @@ SyncResult Restore::run(const RestoreInput& input) {
 
 bool Restore::callClient(const RestoreInput& input) {
   const auto dataclasses = client_.supportedDataclasses();
-  if (std::find(dataclasses.begin(), dataclasses.end(), Dataclass) == dataclasses.end()) {
+  if (std::find(dataclasses.begin(), dataclasses.end(), ApplicationDataclass) ==
+      dataclasses.end()) {
     return broken("the plug-in does not serve applications", std::nullopt);
   }
   std::optional<Error> error;

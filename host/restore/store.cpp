@@ -53,7 +53,7 @@ void Store::order(const std::string& identifier, const std::string& name,
   if (!package) return;
   const std::string target = joinPath(exchange::Downloads, stagedPackageName(*package));
   orders_.emplace(identifier,
-                  new Order{host_.makeDownload(identifier, "Application", name),
+                  new Order{host_.makeDownload(identifier, ApplicationDataclass, name),
                             std::move(delivery), target, PackageTransfer(package->file, target)});
 }
 
