@@ -42,7 +42,12 @@ std::optional<bool> takeOverStagingArea(FileManager& files, const ClientLog& log
 bool AppsClient::reconcileSync(const PropertyList&, std::string_view newAnchor,
                                const ProgressCallback&, std::optional<Error>* error) noexcept {
   _log.normal("starting to reconcile sync with new anchor %{public}@", newAnchor);
-  std::optional<bool> result = takeOverStagingArea(_platform.files, _log, error);
+  std::optional<bool> result;
+  {
+    // A change on its way must not write the old list back over the new one.
+    const std::lock_guard lock(_stateFileMutex);
+    result = takeOverStagingArea(_platform.files, _log, error);
+  }
   if (!result) {
     const bool removalAllowed = _appRemovalAllowed();
     std::optional<PropertyList::Array> todoList = _loadPlist(paths::TodoList);

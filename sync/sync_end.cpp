@@ -64,7 +64,10 @@ void AppsClient::syncEndedWithSuccess(bool success) noexcept {
 
 void AppsClient::clearSyncData() noexcept {
   _log.normal("blasting work area");
-  _platform.files.removeItem(paths::SyncRoot);
+  {
+    const std::lock_guard lock(_stateFileMutex);
+    _platform.files.removeItem(paths::SyncRoot);
+  }
 
   _log.normal("Uninstalling all placeholder apps");
   _enumeratePlaceholdersWithBlock([this](const AppRecord& record, bool&) {
