@@ -228,7 +228,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   std::set<std::string> _qlpAppsToIgnore;
   AccessQueue _accessQueue;
   /// Whether installs go through coordinators; asked once.
-  bool _useInstallCoordinator = false;
+  /// The first cancellations may come before it is known.
+  std::atomic<bool> _useInstallCoordinator = false;
   /// Applications whose transfer replaces an installed version.
   std::set<std::string> _updatingApps;
   std::set<std::string> _userCancelledApps;
