@@ -1,6 +1,6 @@
 #include "client/log_message.h"
 
-#include <cstdio>
+#include <algorithm>
 
 namespace appsync {
 namespace {

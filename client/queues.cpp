@@ -34,18 +34,22 @@ OperationQueue::~OperationQueue() {
 void OperationQueue::add(std::function<void()> operation) {
   {
     const std::lock_guard lock(mutex_);
-    waiting_.push_back(std::move(operation));
-    if (waiting_.size() > idle_ && threads_.size() < maximum_) addThread();
+    if (waiting_.size() >= idle_ && threads_.size() < maximum_) addThread();
+    if (!threads_.empty()) {
+      waiting_.push_back(std::move(operation));
+      changed_.notify_all();
+      return;
+    }
   }
-  changed_.notify_all();
+  operation();
 }
 
 void OperationQueue::addThread() {
   try {
     threads_.emplace_back([this] { work(); });
   } catch (const std::system_error&) {
-    // The system has no thread to spare: those that are there do the work, only later.
-    if (threads_.empty()) throw;
+    // The system has no thread to spare: those that are there do the work, only later, and without
+    // any it is done at once.
   }
 }
 

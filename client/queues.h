@@ -3,6 +3,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstddef>
+#include <cstdint>
 #include <deque>
 #include <functional>
 #include <map>
@@ -11,6 +12,7 @@
 #include <optional>
 #include <string_view>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include "platform/background_queue.h"
@@ -51,7 +53,8 @@ class AccessQueue {
 };
 
 /// Runs operations in the order in which they were added, at most `maximum` at once. Threads are
-/// made as they are needed. The destructor runs what was added to its end. Thread-safe.
+/// made as they are needed; while the system has none to give, an operation runs in `add`. The
+/// destructor runs what was added to its end. Thread-safe.
 class OperationQueue {
  public:
   explicit OperationQueue(std::size_t maximum) : maximum_(maximum) {}
