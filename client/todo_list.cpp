@@ -9,12 +9,13 @@
 namespace appsync {
 namespace {
 
-/// The property list in a file. none without `damaged` for a missing or empty file.
+/// The property list in a file. none without `damaged` for a missing or empty file; `error` tells
+/// why it could not be read.
 std::optional<PropertyList> readPlist(FileManager& files, std::string_view path,
                                       std::optional<Error>* error, bool& damaged) {
   const std::optional<Bytes> bytes = files.contentsAtPath(path, error);
   if (!bytes || bytes->empty()) return std::nullopt;
-  std::optional<PropertyList> parsed = parsePropertyList(*bytes, error);
+  std::optional<PropertyList> parsed = parsePropertyList(*bytes);
   damaged = !parsed;
   return parsed;
 }

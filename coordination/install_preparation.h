@@ -54,7 +54,7 @@ class InstallPreparation {
   /// Empty when the coordinator had its options already.
   StoreMetadata storeMetadata_;
   std::uint64_t iconSize_ = 0;  ///< bytes
-  /// Of the step that failed last.
+  /// What the platform gave for the last step that could give a reason.
   std::optional<Error> error_;
 };
 

@@ -53,7 +53,7 @@ class RestorePreparation {
   std::shared_ptr<InstallCoordinator> coordinator_;
   /// The placeholder, when the coordinator did not take it.
   std::shared_ptr<InstallPlaceholder> adrift_;
-  /// Of the step that failed last.
+  /// What the platform gave for the last step that could give a reason.
   std::optional<Error> error_;
 };
 

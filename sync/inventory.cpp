@@ -50,8 +50,9 @@ using DictionaryOf = const PropertyList::Dictionary* (PropertyList::*)() const;
 
 void addAccounts(const ClientLog& log, FileManager& files, const AppRecord& record,
                  std::set<std::string>& accounts) {
-  const std::string path = paths::metadataIn(record.bundleContainerPath.value_or(std::string()));
-  const std::optional<PropertyList::Dictionary> metadata = loadDictionary(files, path);
+  std::optional<std::string> path;
+  if (record.bundleContainerPath) path = paths::metadataIn(*record.bundleContainerPath);
+  const auto metadata = path ? loadDictionary(files, *path) : std::nullopt;
   const PropertyList::Dictionary* root = metadata ? &*metadata : nullptr;
   const DictionaryOf dictionary = &PropertyList::asDictionary;
 
