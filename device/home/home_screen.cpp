@@ -60,8 +60,10 @@ int DeviceHomeScreen::setIconState(Port port, ByteView layout) noexcept {
 
 std::optional<Bytes> DeviceHomeScreen::getFlattenedIconState(Port port, int format) noexcept {
   if (port != ServerPort || format != FlattenedFormat) return std::nullopt;
+  auto order = readOrder();
+  if (!order) return std::nullopt;
   PropertyList::Array identifiers;
-  for (std::string& identifier : order()) identifiers.emplace_back(std::move(identifier));
+  for (std::string& identifier : *order) identifiers.emplace_back(std::move(identifier));
   return serializePropertyList(std::move(identifiers), PropertyListFormat::Binary);
 }
 
@@ -85,10 +87,15 @@ HomeScreenService::AssertionResult DeviceHomeScreen::createTerminationAssertion(
 }
 
 std::vector<std::string> DeviceHomeScreen::order() noexcept {
+  return readOrder().value_or(std::vector<std::string>{});
+}
+
+std::optional<std::vector<std::string>> DeviceHomeScreen::readOrder() noexcept {
   std::vector<std::string> identifiers;
-  core_.database.read("the icon order could not be read",
-                      [&](SQLite::Database& database) { identifiers = shownIconOrder(database); });
-  return identifiers;
+  const bool read = core_.database.read(
+      "the icon order could not be read",
+      [&](SQLite::Database& database) { identifiers = shownIconOrder(database); });
+  return read ? std::optional(std::move(identifiers)) : std::nullopt;
 }
 
 }  // namespace appsync::device

@@ -30,6 +30,9 @@ class DeviceHomeScreen final : public HomeScreenService {
   std::vector<std::string> order() noexcept;
 
  private:
+  /// nullopt when it cannot be read.
+  std::optional<std::vector<std::string>> readOrder() noexcept;
+
   DeviceCore& core_;
   std::atomic<bool> refusing_ = false;
 };

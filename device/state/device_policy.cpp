@@ -4,11 +4,12 @@ namespace appsync::device {
 
 PolicyValue StoredDevicePolicy::effectiveBoolValue(PolicySetting setting) noexcept {
   PolicyValue value = PolicyValue::NotSet;
-  database_.read("the policies could not be read", [&](SQLite::Database& database) {
-    Query query(database, "SELECT value FROM policies WHERE setting = ?", setting);
-    if (query.next()) value = query.as<PolicyValue>(0);
-  });
-  return value;
+  const bool read =
+      database_.read("the policies could not be read", [&](SQLite::Database& database) {
+        Query query(database, "SELECT value FROM policies WHERE setting = ?", setting);
+        if (query.next()) value = query.as<PolicyValue>(0);
+      });
+  return read ? value : PolicyValue::ExplicitlyNo;
 }
 
 bool StoredDevicePolicy::set(PolicySetting setting, PolicyValue value,

@@ -5,7 +5,8 @@
 
 namespace appsync::device {
 
-/// The device's restrictions, kept in its database; what was never set is NotSet.
+/// The device's restrictions, kept in its database; what was never set is NotSet. What
+/// cannot be read is forbidden.
 class StoredDevicePolicy final : public DevicePolicy {
  public:
   explicit StoredDevicePolicy(Database& database) : database_(database) {}

@@ -90,7 +90,8 @@ TEST_F(DeviceServicesTest, ADatabaseThatFailsGivesTheDocumentedFailureAndALogLin
   ASSERT_TRUE(installPackage("com.example.a"));
   SQLite::Database((folder / "device.db").string(), SQLite::OPEN_READWRITE)
       .exec("DROP TABLE policies; DROP TABLE uninstalled; DROP TABLE applications");
-  EXPECT_EQ(device->policy(PolicySetting::AppInstallationAllowed), PolicyValue::NotSet);
+  EXPECT_EQ(device->policy(PolicySetting::AppInstallationAllowed), PolicyValue::ExplicitlyNo)
+      << "what may be forbidden is not done";
   EXPECT_FALSE(device->setPolicy(PolicySetting::AppInstallationAllowed, PolicyValue::Yes, &error));
   EXPECT_EQ(error->code, EIO);
   EXPECT_FALSE(platform().installerService.lookupUninstalled());
@@ -99,8 +100,9 @@ TEST_F(DeviceServicesTest, ADatabaseThatFailsGivesTheDocumentedFailureAndALogLin
   EXPECT_FALSE(installPackage("com.example.b"));
   EXPECT_FALSE(device->uninstall("com.example.a", &error));
   EXPECT_EQ(static_cast<int>(device->homeScreen().createTerminationAssertion("a", 0).outcome), 3);
+  EXPECT_FALSE(device->homeScreen().getFlattenedIconState(device->homeScreen().serverPort(), 1));
   EXPECT_EQ(containerCount(), 1U) << "nothing is removed on the word of a broken registry";
-  EXPECT_GE(logTexts().size(), 7U);
+  EXPECT_GE(logTexts().size(), 8U);
   EXPECT_NE(logTexts().front().find("the policies could not be read"), std::string::npos);
 }
 
