@@ -14,7 +14,6 @@
 namespace appsync::host {
 namespace {
 
-constexpr std::string_view Dataclass = "Application";
 constexpr const char* CancelledOnPhone = "cancelled on the phone";
 constexpr std::chrono::milliseconds InstallPoll{10};
 
@@ -61,17 +60,18 @@ bool Session::callClient(const SyncInput& input, PackageSender& sender) {
   if (reconciled_) success = transfer(input.plan, sender);
   client_.syncEndedWithSuccess(success);
   if (success) writeApplicationsPresent();
-  return success;
+  return success && !broken_;
 }
 
 bool Session::isServed() {
   const auto dataclasses = client_.supportedDataclasses();
-  if (std::find(dataclasses.begin(), dataclasses.end(), Dataclass) == dataclasses.end()) {
+  if (std::find(dataclasses.begin(), dataclasses.end(), ApplicationDataclass) ==
+      dataclasses.end()) {
     return broken("the plug-in does not serve applications", std::nullopt);
   }
   const std::string hostAnchor = client_.currentSyncAnchor();
   const auto disabledTypes = client_.disabledAssetTypes();
-  disabled_ = disabledTypes && disabledTypes->count(std::string(Dataclass)) > 0;
+  disabled_ = disabledTypes && disabledTypes->count(std::string(ApplicationDataclass)) > 0;
   if (disabled_) return false;
   std::optional<Error> error;
   if (client_.prepareForSyncWithHostAnchor(hostAnchor, ignoreProgress, &error)) return true;
@@ -87,7 +87,7 @@ bool Session::reconcile(const SyncInput& input) {
   if (!stage(phone_.files, input.plan, input.library, input.iconLayout, &error)) {
     return broken("the phone did not take the list of what is to be done", error);
   }
-  const PropertyList::Dictionary description{{"Dataclass", Dataclass}};
+  const PropertyList::Dictionary description{{"Dataclass", ApplicationDataclass}};
   reconciled_ = client_.reconcileSync(description, input.newAnchor, ignoreProgress, &error);
   if (!reconciled_) broken("the phone could not take over what is to be done", error);
   return reconciled_;
