@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <set>
 
+#include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::host {
@@ -10,6 +11,18 @@ namespace {
 
 /// The ending of a package that came without one.
 constexpr std::string_view PlainEnding = ".package";
+
+/// An empty display name would hide the name of the todo list, and without a name the client makes
+/// no placeholder, which an update needs: a refused one takes the placeholder away, or else the
+/// installed application.
+std::optional<Bytes> withoutEmptyName(std::optional<Bytes> infoPlist) {
+  auto parsed = infoPlist ? parsePropertyList(*infoPlist) : std::nullopt;
+  PropertyList::Dictionary* const info = parsed ? parsed->asDictionary() : nullptr;
+  const std::string* name = info ? findString(*info, KBBundleDisplayName) : nullptr;
+  if (!name || !name->empty()) return infoPlist;
+  info->erase(std::string(KBBundleDisplayName));
+  return serializePropertyList(std::move(*parsed), PropertyListFormat::Binary);
+}
 
 class Stage {
  public:
@@ -31,7 +44,8 @@ class Stage {
   bool writeApplication(const LibraryPackage& package) {
     const std::string directory = joinPath(exchange::StagingArea, package.identifier);
     const PackageParts parts = readPackageParts(package.file);
-    return makeDirectory(directory) && write(directory, "Info.plist", parts.infoPlist) &&
+    return makeDirectory(directory) &&
+           write(directory, "Info.plist", withoutEmptyName(parts.infoPlist)) &&
            write(directory, parts.iconName, parts.icon) &&
            write(directory, "HalvoMetadata.plist", parts.metadata) &&
            write(directory, "HalvoArtwork", parts.artwork);
