@@ -13,7 +13,9 @@ extern "C" {
 /// Callable before anything else.
 std::uint32_t appsync_plugin_interface_version() noexcept;
 
-/// Makes the client. Borrows the services until appsync_plugin_destroy. nullptr on failure.
+/// Makes the client. Borrows the services until appsync_plugin_destroy. A completion that a service
+/// has not called by then may be called later; it uses the log and the transaction log only, which
+/// stay until then, like this library. nullptr on failure.
 appsync::SyncClient* appsync_plugin_create(const appsync::Platform* platform) noexcept;
 
 /// Destroys a client made here; nullptr is passed over.

@@ -89,6 +89,7 @@ void EventDelivery::removeListener(std::uint64_t listener) {
 bool EventDelivery::isBusy(std::string_view identifier) {
   const auto events = pending();
   const std::lock_guard lock(mutex_);
+  if (!tasks_.empty() || runsTask_) return true;
   return events && std::ranges::any_of(*events, [&](const EventRow& event) {
            return event.coordinator.identifier == identifier && receiver(event.coordinator);
          });
@@ -115,10 +116,12 @@ void EventDelivery::run() {
     if (!tasks_.empty()) {
       std::function<void()> task = std::move(tasks_.front());
       tasks_.pop_front();
+      runsTask_ = true;
       lock.unlock();
       task();
       task = nullptr;  // what it holds goes outside the lock too
       lock.lock();
+      runsTask_ = false;
     } else if (stopping_) {
       return;
     } else if (checkDue_) {

@@ -45,7 +45,8 @@ class EventDelivery {
   std::uint64_t addListener(std::set<CoordinationClientId> clients, CoordinatorObserver& delegate);
   void removeListener(std::uint64_t listener);
 
-  /// Whether there is an event of the application's coordinators that somebody gets or is getting.
+  /// Whether there is an event of the application's coordinators that somebody gets or is getting,
+  /// or any task that has not ended.
   bool isBusy(std::string_view identifier);
 
  private:
@@ -77,6 +78,7 @@ class EventDelivery {
   std::map<std::uint64_t, Listener> listeners_;
   std::uint64_t lastListener_ = 0;
   std::deque<std::function<void()>> tasks_;
+  bool runsTask_ = false;
   const CoordinatorObserver* delivering_ = nullptr;
   std::set<std::int64_t> delivered_;  ///< events that could not be taken out of the store
   bool checkDue_ = true;              // what was kept from before

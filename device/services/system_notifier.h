@@ -13,8 +13,9 @@
 namespace appsync::device {
 
 /// Named notifications inside this process. Callbacks run one after another, in the order of the
-/// postings, on a thread of the notifier; an observer is called for the postings made after it was
-/// added. A state belongs to a name: every token of the name sets the same one.
+/// postings and in that of the observers' being added, on a thread of the notifier; an observer is
+/// called for the postings made after it was added. A state belongs to a name: every token of the
+/// name sets the same one.
 class LocalNotifier final : public SystemNotifier {
  public:
   LocalNotifier();

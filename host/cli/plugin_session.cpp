@@ -1,5 +1,7 @@
 #include "host/cli/plugin_session.h"
 
+#include <future>
+
 namespace appsync::host {
 namespace {
 
@@ -18,6 +20,19 @@ Platform withLog(const Platform& services, Log& log) {
           services.systemNotifier,
           services.syncHost,
           services.backgroundQueue};
+}
+
+/// Returns when the client has heard of it: only then does it get the events that a killed sync
+/// left over, and only then can the phone be seen to have some for it.
+void announceStartUp(SystemNotifier& notifier) {
+  std::promise<void> heard;
+  const auto hear = [](void* observer) noexcept {
+    static_cast<std::promise<void>*>(observer)->set_value();
+  };
+  notifier.addObserver(&heard, TWStartupCompleteNotification, hear);
+  notifier.post(TWStartupCompleteNotification);
+  heard.get_future().wait();
+  notifier.removeObserver(&heard, TWStartupCompleteNotification);
 }
 
 }  // namespace
@@ -43,7 +58,7 @@ PluginSession::PluginSession(Plugin& plugin, std::string_view mainBundleIdentifi
       client_(plugin.createClient(withLog(device.platform(host_), log_))) {
   if (!client_) throw CommandError(ExitCode::SomeFailed, "the plug-in could not make its client");
   if (mainBundleIdentifier == SyncHostBundleIdentifier) {
-    device.systemNotifier().post(TWStartupCompleteNotification);
+    announceStartUp(device.systemNotifier());
   }
 }
 
