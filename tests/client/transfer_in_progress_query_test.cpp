@@ -25,7 +25,7 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::Optional;
 
-TEST_F(InProgressQuery, emptyListGivesTwoEmptyAnswersAndASuccess) {
+TEST_F(InProgressQuery, EmptyListGivesTwoEmptyAnswersAndASuccess) {
   const auto answer = ask();
   EXPECT_THAT(answer.inProgress, Optional(IsEmpty()));
   EXPECT_THAT(answer.restoring, Optional(IsEmpty()));
@@ -43,12 +43,12 @@ TEST_F(InProgressQuery, emptyListGivesTwoEmptyAnswersAndASuccess) {
   EXPECT_EQ(log.back(), "log default SyncBundle|Wait completed");
 }
 
-TEST_F(InProgressQuery, theObserverIsGoneAfterwards) {
+TEST_F(InProgressQuery, TheObserverIsGoneAfterwards) {
   ask();
   EXPECT_EQ(phone.appRegistry.observerCount(), 0u);
 }
 
-TEST_F(InProgressQuery, activeLoadingStoreDownloadIsInProgressButSyncInstallIsNot) {
+TEST_F(InProgressQuery, ActiveLoadingStoreDownloadIsInProgressButSyncInstallIsNot) {
   seed("com.store", InstallType::StoreDownload, InstallState::Active, InstallPhase::Loading);
   seed("com.sync", InstallType::Sync, InstallState::Active, InstallPhase::Loading);
   const auto answer = ask();
@@ -56,7 +56,7 @@ TEST_F(InProgressQuery, activeLoadingStoreDownloadIsInProgressButSyncInstallIsNo
   EXPECT_THAT(answer.restoring, Optional(IsEmpty()));
 }
 
-TEST_F(InProgressQuery, everyTypeButRestoreThatIsActiveAndInstallingIsInProgress) {
+TEST_F(InProgressQuery, EveryTypeButRestoreThatIsActiveAndInstallingIsInProgress) {
   seed("com.none", InstallType::None, InstallState::Active, InstallPhase::Installing);
   seed("com.store", InstallType::StoreDownload, InstallState::Active, InstallPhase::Installing);
   seed("com.sync", InstallType::Sync, InstallState::Active, InstallPhase::Installing);
@@ -66,7 +66,7 @@ TEST_F(InProgressQuery, everyTypeButRestoreThatIsActiveAndInstallingIsInProgress
   EXPECT_THAT(answer.restoring, Optional(ElementsAre("com.restore")));
 }
 
-TEST_F(InProgressQuery, activeRestoreInTheDataPhaseIsDropped) {
+TEST_F(InProgressQuery, ActiveRestoreInTheDataPhaseIsDropped) {
   seed("com.loading", InstallType::Restore, InstallState::Active, InstallPhase::Loading);
   seed("com.data", InstallType::Restore, InstallState::Active, InstallPhase::RestoringData);
   const auto answer = ask();
@@ -74,7 +74,7 @@ TEST_F(InProgressQuery, activeRestoreInTheDataPhaseIsDropped) {
   EXPECT_THAT(answer.restoring, Optional(ElementsAre("com.loading")));
 }
 
-TEST_F(InProgressQuery, installsThatAreNotActiveAreDropped) {
+TEST_F(InProgressQuery, InstallsThatAreNotActiveAreDropped) {
   seed("com.waiting", InstallType::Sync, InstallState::Waiting, InstallPhase::Installing);
   seed("com.paused", InstallType::Restore, InstallState::Paused, InstallPhase::Loading);
   seed("com.failed", InstallType::StoreDownload, InstallState::Failed, InstallPhase::Loading);
@@ -83,7 +83,7 @@ TEST_F(InProgressQuery, installsThatAreNotActiveAreDropped) {
   EXPECT_THAT(answer.restoring, Optional(IsEmpty()));
 }
 
-TEST_F(InProgressQuery, pausedInstallsAreOnlyLogged) {
+TEST_F(InProgressQuery, PausedInstallsAreOnlyLogged) {
   seed("com.a", InstallType::Sync, InstallState::Active, InstallPhase::Installing);
   const std::vector<AppRecord> paused = std::exchange(prioritized, {});
   const auto answer = ask(paused);
@@ -93,7 +93,7 @@ TEST_F(InProgressQuery, pausedInstallsAreOnlyLogged) {
             1u);
 }
 
-TEST_F(InProgressQuery, reportedApplicationWithoutPlaceholderOrProgressIsLoggedAndPassedOver) {
+TEST_F(InProgressQuery, ReportedApplicationWithoutPlaceholderOrProgressIsLoggedAndPassedOver) {
   phone.appRegistry.seedInstalled("com.whole");
   prioritized.push_back(*phone.appRegistry.installed("com.whole"));
   phone.appRegistry.seedPlaceholder("com.bare", InstallType::Sync);
@@ -108,7 +108,7 @@ TEST_F(InProgressQuery, reportedApplicationWithoutPlaceholderOrProgressIsLoggedA
            "log default SyncBundle|No install progress found for asset identifier com.bare"}));
 }
 
-TEST_F(InProgressQuery, logsTypeStateAndPhaseByName) {
+TEST_F(InProgressQuery, LogsTypeStateAndPhaseByName) {
   seed("com.odd", static_cast<InstallType>(9), InstallState::Active, InstallPhase::Installing);
   ask();
   EXPECT_THAT(phone.trace.log(),
@@ -133,7 +133,7 @@ class TwiceReportingRegistry : public fakes::FaultyAppRegistry {
   std::vector<AppRecord> second_;
 };
 
-TEST_F(InProgressQuery, secondReportChangesNothing) {
+TEST_F(InProgressQuery, SecondReportChangesNothing) {
   seed("com.late", InstallType::Sync, InstallState::Active, InstallPhase::Installing);
   TwiceReportingRegistry registry(phone, prioritized);
   const ClientLog log(phone.log, "com.corvane.twc.AppsClient");

@@ -66,7 +66,7 @@ const std::string InstallCall = "AppRegistry.installApplication(" + PackagePath 
                                 ", {KBBundleIdentifier = com.a; SWPackageTypeKey = "
                                 "SWPackageTypeCustomer})";
 
-TEST(InstallPlan, decidesByTheOutcomeAlone) {
+TEST(InstallPlan, DecidesByTheOutcomeAlone) {
   using Next = InstallPlan::Next;
   EXPECT_EQ(installPlanFor(AssertionOutcome::Success, "com.a").next, Next::Install);
   EXPECT_EQ(installPlanFor(AssertionOutcome::NotFound, "com.a").next, Next::Install);
@@ -79,7 +79,7 @@ TEST(InstallPlan, decidesByTheOutcomeAlone) {
   }
 }
 
-TEST_F(InstallQueue, installsUnderAnAssertionAndRemovesThePackage) {
+TEST_F(InstallQueue, InstallsUnderAnAssertionAndRemovesThePackage) {
   phone.appRegistry.seedPlaceholder("com.a");
   install(asset());
   EXPECT_THAT(
@@ -98,7 +98,7 @@ TEST_F(InstallQueue, installsUnderAnAssertionAndRemovesThePackage) {
   EXPECT_THAT(phone.homeScreen.heldAssertions(), testing::IsEmpty());
 }
 
-TEST_F(InstallQueue, assertionNotFoundInstallsAnyway) {
+TEST_F(InstallQueue, AssertionNotFoundInstallsAnyway) {
   phone.homeScreen.queueOutcomes("com.a", {AssertionOutcome::NotFound});
   install(asset());
   EXPECT_THAT(installTrace(),
@@ -113,7 +113,7 @@ TEST_F(InstallQueue, assertionNotFoundInstallsAnyway) {
                    "log default SyncBundle|Finished install for com.a"})));
 }
 
-TEST_F(InstallQueue, assertionDeniedRetriesAfterExactly30SecondsAndKeepsTheFile) {
+TEST_F(InstallQueue, AssertionDeniedRetriesAfterExactly30SecondsAndKeepsTheFile) {
   phone.homeScreen.queueOutcomes("com.a", {AssertionOutcome::Denied});
   phone.homeScreen.setRefusalsCarryAssertion(true);
   prepare();
@@ -157,7 +157,7 @@ TEST_F(InstallQueue, assertionDeniedRetriesAfterExactly30SecondsAndKeepsTheFile)
                "log default SyncBundle|Finished install for com.a"}))));
 }
 
-TEST_F(InstallQueue, keepsRetryingForAsLongAsTheHomeScreenRefuses) {
+TEST_F(InstallQueue, KeepsRetryingForAsLongAsTheHomeScreenRefuses) {
   phone.homeScreen.launch("com.a");
   prepare();
   client()._enqueueAssetInstall(asset());
@@ -174,7 +174,7 @@ TEST_F(InstallQueue, keepsRetryingForAsLongAsTheHomeScreenRefuses) {
   EXPECT_TRUE(phone.appRegistry.installed("com.a"));
 }
 
-TEST_F(InstallQueue, endOfTheTransfersWaitsForARetryThatWaits) {
+TEST_F(InstallQueue, EndOfTheTransfersWaitsForARetryThatWaits) {
   phone.homeScreen.queueOutcomes("com.a", {AssertionOutcome::Denied});
   prepare();
   client()._enqueueAssetInstall(asset());
@@ -196,7 +196,7 @@ TEST_F(InstallQueue, endOfTheTransfersWaitsForARetryThatWaits) {
   EXPECT_LT(installed, done);
 }
 
-TEST_F(InstallQueue, unknownAssertionErrorFailsWithPosix22AndRemovesTheFile) {
+TEST_F(InstallQueue, UnknownAssertionErrorFailsWithPosix22AndRemovesTheFile) {
   phone.host.setRecoverable(POSIXErrorDomain, false);
   phone.appRegistry.seedPlaceholder("com.a");
   phone.homeScreen.queueOutcomes("com.a", {static_cast<AssertionOutcome>(3)});
@@ -219,7 +219,7 @@ TEST_F(InstallQueue, unknownAssertionErrorFailsWithPosix22AndRemovesTheFile) {
   EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 0u);
 }
 
-TEST_F(InstallQueue, refusedPackageIsFailedForGoodAndItsPlaceholderRemoved) {
+TEST_F(InstallQueue, RefusedPackageIsFailedForGoodAndItsPlaceholderRemoved) {
   phone.appRegistry.seedInstalled("com.a", "1.0");
   phone.appRegistry.seedPlaceholder("com.a");
   phone.appRegistry.failInstall("com.a", Refused);
@@ -235,7 +235,7 @@ TEST_F(InstallQueue, refusedPackageIsFailedForGoodAndItsPlaceholderRemoved) {
   EXPECT_FALSE(phone.appRegistry.placeholder("com.a"));
 }
 
-TEST_F(InstallQueue, placeholderThatCannotBeRemovedIsLoggedAndRecorded) {
+TEST_F(InstallQueue, PlaceholderThatCannotBeRemovedIsLoggedAndRecorded) {
   phone.appRegistry.failInstall("com.a", Refused);
   phone.appRegistry.failUninstall("com.a");
   install(asset());
@@ -246,7 +246,7 @@ TEST_F(InstallQueue, placeholderThatCannotBeRemovedIsLoggedAndRecorded) {
                "placeholder\""));
 }
 
-TEST_F(InstallQueue, recoverableFailureLeavesTheTodoEntryForALaterSync) {
+TEST_F(InstallQueue, RecoverableFailureLeavesTheTodoEntryForALaterSync) {
   phone.appRegistry.seedPlaceholder("com.a");
   phone.appRegistry.failInstall("com.a", Passing);
   install(asset());
@@ -260,7 +260,7 @@ TEST_F(InstallQueue, recoverableFailureLeavesTheTodoEntryForALaterSync) {
                "recoverably\""));
 }
 
-TEST_F(InstallQueue, failedRestoreCountsAsRecoverableWhateverItsError) {
+TEST_F(InstallQueue, FailedRestoreCountsAsRecoverableWhateverItsError) {
   phone.appRegistry.seedPlaceholder("com.a", InstallType::Restore);
   phone.appRegistry.failInstall("com.a", Refused);
   const SyncAssetPtr made = asset();
@@ -271,7 +271,7 @@ TEST_F(InstallQueue, failedRestoreCountsAsRecoverableWhateverItsError) {
   EXPECT_EQ(phone.trace.count("BackupManager.cancelApplicationRestore"), 0u);
 }
 
-TEST_F(InstallQueue, restoreStateIsClearedWhateverTheOutcome) {
+TEST_F(InstallQueue, RestoreStateIsClearedWhateverTheOutcome) {
   for (const bool fails : {false, true}) {
     phone.files.putPlist(
         RestoreStatePath,
@@ -282,7 +282,7 @@ TEST_F(InstallQueue, restoreStateIsClearedWhateverTheOutcome) {
   }
 }
 
-TEST_F(InstallQueue, countsTheAttemptsThatReachedTheInstaller) {
+TEST_F(InstallQueue, CountsTheAttemptsThatReachedTheInstaller) {
   prepare();
   phone.appRegistry.failInstall("com.b", Refused);
   phone.homeScreen.queueOutcomes("com.c", {static_cast<AssertionOutcome>(3)});
@@ -293,7 +293,7 @@ TEST_F(InstallQueue, countsTheAttemptsThatReachedTheInstaller) {
   EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 0u);
 }
 
-TEST_F(InstallQueue, tenInstallsOverlapAndTheEleventhWaits) {
+TEST_F(InstallQueue, TenInstallsOverlapAndTheEleventhWaits) {
   prepare();
   phone.appRegistry.blockInstalls();
   for (int index = 0; index < 11; ++index) {
@@ -311,7 +311,7 @@ TEST_F(InstallQueue, tenInstallsOverlapAndTheEleventhWaits) {
   EXPECT_EQ(phone.appRegistry.installedIdentifiers().size(), 11u);
 }
 
-TEST_F(InstallQueue, destroyedClientFinishesRunningInstallsAndDropsWaitingRetries) {
+TEST_F(InstallQueue, DestroyedClientFinishesRunningInstallsAndDropsWaitingRetries) {
   phone.homeScreen.launch("com.waiting");
   prepare();
   client()._enqueueAssetInstall(asset("com.waiting"));
@@ -328,7 +328,7 @@ TEST_F(InstallQueue, destroyedClientFinishesRunningInstallsAndDropsWaitingRetrie
   EXPECT_FALSE(phone.appRegistry.installed("com.waiting"));
 }
 
-TEST_F(InstallQueue, errorsAreSortedByTheHostAndByTwoDomains) {
+TEST_F(InstallQueue, ErrorsAreSortedByTheHostAndByTwoDomains) {
   prepare();
   EXPECT_TRUE(client()._isRecoverableError(Passing));
   // The host would try these again.
@@ -339,7 +339,7 @@ TEST_F(InstallQueue, errorsAreSortedByTheHostAndByTwoDomains) {
   EXPECT_FALSE(client()._isRecoverableError(std::nullopt));
 }
 
-TEST_F(InstallQueue, withCoordinationNoErrorIsRecoverable) {
+TEST_F(InstallQueue, WithCoordinationNoErrorIsRecoverable) {
   phone.installCoordination.setEnabled(true);
   prepare();
   EXPECT_FALSE(client()._isRecoverableError(Passing));
@@ -348,7 +348,7 @@ TEST_F(InstallQueue, withCoordinationNoErrorIsRecoverable) {
        "as install coordination is enabled"});
 }
 
-TEST_F(InstallQueue, withCoordinationAFailedInstallIsUninstalledThroughTheService) {
+TEST_F(InstallQueue, WithCoordinationAFailedInstallIsUninstalledThroughTheService) {
   phone.installCoordination.setEnabled(true);
   prepare();
   client().assetInstallFailed(asset(), Passing);

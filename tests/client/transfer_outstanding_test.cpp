@@ -49,7 +49,7 @@ using testing::IsEmpty;
 
 const std::string IconsPath = SyncRootPath + "/Icons";
 
-TEST_F(OutstandingTransfers, wholeTraceOfOneNewApplication) {
+TEST_F(OutstandingTransfers, WholeTraceOfOneNewApplication) {
   stage("com.a", "Alpha");
   putEntries({install("com.a")});
   const std::vector<SyncAssetPtr> assets = client().outstandingAssetTransfers();
@@ -116,7 +116,7 @@ TEST_F(OutstandingTransfers, wholeTraceOfOneNewApplication) {
   EXPECT_TRUE(phone.appRegistry.placeholder("com.a"));
 }
 
-TEST_F(OutstandingTransfers, missingTodoListConsidersOnlyExistingPlaceholders) {
+TEST_F(OutstandingTransfers, MissingTodoListConsidersOnlyExistingPlaceholders) {
   seedRestore("com.r");
   EXPECT_THAT(requested(), IsEmpty());
   EXPECT_TRUE(
@@ -126,7 +126,7 @@ TEST_F(OutstandingTransfers, missingTodoListConsidersOnlyExistingPlaceholders) {
              "starting with todoList (null)"));
 }
 
-TEST_F(OutstandingTransfers, entriesOfAnotherOperationContributeNothing) {
+TEST_F(OutstandingTransfers, EntriesOfAnotherOperationContributeNothing) {
   putEntries({Dictionary{{"operation", "remove"}, {"identifier", "com.a"}},
               Dictionary{{"operation", "INSTALLED"}, {"identifier", "com.b"}},
               Dictionary{{"operation", 1}, {"identifier", "com.c"}},
@@ -135,7 +135,7 @@ TEST_F(OutstandingTransfers, entriesOfAnotherOperationContributeNothing) {
   EXPECT_THAT(phone.host.made(), IsEmpty());
 }
 
-TEST_F(OutstandingTransfers, unsafeIdentifiersAreLoggedAndContributeNothing) {
+TEST_F(OutstandingTransfers, UnsafeIdentifiersAreLoggedAndContributeNothing) {
   putEntries({install("com.x/../y"), install(7), Dictionary{{"operation", "install"}}});
   EXPECT_THAT(requested(), IsEmpty());
   EXPECT_TRUE(loggedMessage("Ignoring invalid path: com.x/../y"));
@@ -143,7 +143,7 @@ TEST_F(OutstandingTransfers, unsafeIdentifiersAreLoggedAndContributeNothing) {
   EXPECT_TRUE(loggedMessage("Ignoring invalid path: (null)"));
 }
 
-TEST_F(OutstandingTransfers, applicationWithAPlaceholderIsWantedButNotRequestedAgain) {
+TEST_F(OutstandingTransfers, ApplicationWithAPlaceholderIsWantedButNotRequestedAgain) {
   phone.appRegistry.seedPlaceholder("com.a", InstallType::Sync);
   putEntries({install("com.a")});
   EXPECT_THAT(requested(), IsEmpty());
@@ -152,7 +152,7 @@ TEST_F(OutstandingTransfers, applicationWithAPlaceholderIsWantedButNotRequestedA
       loggedMessage("Not creating a placeholder app for com.a because we already have one"));
 }
 
-TEST_F(OutstandingTransfers, inProgressIsMissingFromTheResultAndRestoringIsNot) {
+TEST_F(OutstandingTransfers, InProgressIsMissingFromTheResultAndRestoringIsNot) {
   stage("com.busy", "Busy");
   stage("com.back", "Back");
   putEntries({install("com.busy"), install("com.back")});
@@ -170,14 +170,14 @@ TEST_F(OutstandingTransfers, inProgressIsMissingFromTheResultAndRestoringIsNot) 
   EXPECT_TRUE(loggedMessage("lastly com.back"));
 }
 
-TEST_F(OutstandingTransfers, comeInHomeScreenOrderThenTheRest) {
+TEST_F(OutstandingTransfers, ComeInHomeScreenOrderThenTheRest) {
   for (const char* identifier : {"com.a", "com.b", "com.c"}) stage(identifier, identifier);
   putEntries({install("com.a"), install("com.b"), install("com.c")});
   phone.homeScreen.setOrder({"com.c", "com.other", "com.b"});
   EXPECT_THAT(requested(), ElementsAre("com.c", "com.b", "com.a"));
 }
 
-TEST_F(OutstandingTransfers, installationDisabledSkipsASyncEntryAndNotARestore) {
+TEST_F(OutstandingTransfers, InstallationDisabledSkipsASyncEntryAndNotARestore) {
   phone.policy.set(PolicySetting::AppInstallationAllowed, PolicyValue::ExplicitlyNo);
   stage("com.a", "Alpha");
   seedRestore("com.r");
@@ -187,7 +187,7 @@ TEST_F(OutstandingTransfers, installationDisabledSkipsASyncEntryAndNotARestore) 
   EXPECT_TRUE(loggedMessage("Asset com.r (pretty="));
 }
 
-TEST_F(OutstandingTransfers, restoreWithoutRememberedPackageAsksForBothParts) {
+TEST_F(OutstandingTransfers, RestoreWithoutRememberedPackageAsksForBothParts) {
   seedRestore("com.r");
   requested();
   ASSERT_EQ(phone.host.made().size(), 1u);
@@ -196,7 +196,7 @@ TEST_F(OutstandingTransfers, restoreWithoutRememberedPackageAsksForBothParts) {
             (Dictionary{{"AssetParts", 3}, {"Version", "1.0"}}));
 }
 
-TEST_F(OutstandingTransfers, restoreWhoseRememberedPackageIsThereAsksForDataOnly) {
+TEST_F(OutstandingTransfers, RestoreWhoseRememberedPackageIsThereAsksForDataOnly) {
   seedRestore("com.r");
   phone.files.putFile("/var/mobile/Media/r.pkg", "package");
   rememberPath("com.r", "/var/mobile/Media/r.pkg");
@@ -206,7 +206,7 @@ TEST_F(OutstandingTransfers, restoreWhoseRememberedPackageIsThereAsksForDataOnly
             (Dictionary{{"AssetParts", 2}, {"Version", "1.0"}}));
 }
 
-TEST_F(OutstandingTransfers, restoreWhoseRememberedPackageIsGoneAsksForBothParts) {
+TEST_F(OutstandingTransfers, RestoreWhoseRememberedPackageIsGoneAsksForBothParts) {
   seedRestore("com.r");
   rememberPath("com.r", "/var/mobile/Media/gone.pkg");
   requested();
@@ -216,7 +216,7 @@ TEST_F(OutstandingTransfers, restoreWhoseRememberedPackageIsGoneAsksForBothParts
             (Dictionary{{"AssetParts", 3}, {"Version", "1.0"}}));
 }
 
-TEST_F(OutstandingTransfers, nameFallsBackToTheDesktopsAndThenToTheIdentifier) {
+TEST_F(OutstandingTransfers, NameFallsBackToTheDesktopsAndThenToTheIdentifier) {
   Dictionary named = install("com.named");
   named.emplace("name", "From Desktop");
   putEntries({named, install("com.nameless")});
@@ -226,14 +226,14 @@ TEST_F(OutstandingTransfers, nameFallsBackToTheDesktopsAndThenToTheIdentifier) {
   EXPECT_EQ(assets[1]->prettyName, "com.nameless");
 }
 
-TEST_F(OutstandingTransfers, failedIconRenderingFallsBackToTheContainersArtwork) {
+TEST_F(OutstandingTransfers, FailedIconRenderingFallsBackToTheContainersArtwork) {
   putEntries({install("com.a")});
   const std::vector<SyncAssetPtr> assets = client().outstandingAssetTransfers();
   ASSERT_EQ(assets.size(), 1u);
   EXPECT_EQ(assets[0]->icon, FileLocation::file(WorkAreaPath + "/com.a/HalvoArtwork"));
 }
 
-TEST_F(OutstandingTransfers, entryWithoutAVersionIsAskedForWithoutOne) {
+TEST_F(OutstandingTransfers, EntryWithoutAVersionIsAskedForWithoutOne) {
   stage("com.a", "Alpha");
   putEntries({Dictionary{{"operation", "install"}, {"identifier", "com.a"}}});
   const std::vector<SyncAssetPtr> assets = client().outstandingAssetTransfers();
@@ -243,7 +243,7 @@ TEST_F(OutstandingTransfers, entryWithoutAVersionIsAskedForWithoutOne) {
   EXPECT_TRUE(phone.appRegistry.placeholder("com.a"));
 }
 
-TEST_F(OutstandingTransfers, missingIconScratchDirectoryIsLoggedAndIconsFallBack) {
+TEST_F(OutstandingTransfers, MissingIconScratchDirectoryIsLoggedAndIconsFallBack) {
   stage("com.a", "Alpha");
   putEntries({install("com.a")});
   phone.faults.failWhere("FileManager.createDirectory", "/Icons", Error::posix(28));
@@ -256,21 +256,21 @@ TEST_F(OutstandingTransfers, missingIconScratchDirectoryIsLoggedAndIconsFallBack
   EXPECT_EQ(assets[0]->icon, FileLocation::file(WorkAreaPath + "/com.a/HalvoArtwork"));
 }
 
-TEST_F(OutstandingTransfers, iconScratchDirectoryIsEmptiedFirst) {
+TEST_F(OutstandingTransfers, IconScratchDirectoryIsEmptiedFirst) {
   phone.files.putFile(IconsPath + "/com.old.png", "old");
   requested();
   EXPECT_FALSE(phone.files.exists(IconsPath + "/com.old.png"));
   EXPECT_TRUE(phone.files.exists(IconsPath));
 }
 
-TEST_F(OutstandingTransfers, placeholderThatCannotBeMadeDoesNotKeepThePackageBack) {
+TEST_F(OutstandingTransfers, PlaceholderThatCannotBeMadeDoesNotKeepThePackageBack) {
   stage("com.a", "Alpha");
   putEntries({install("com.a")});
   phone.appRegistry.failPlaceholder("com.a", Error{"StartwellError", 1, {}, nullptr});
   EXPECT_THAT(requested(), ElementsAre("com.a"));
 }
 
-TEST_F(OutstandingTransfers, applicationsToBeIgnoredAreThoseOfThisSyncOnly) {
+TEST_F(OutstandingTransfers, ApplicationsToBeIgnoredAreThoseOfThisSyncOnly) {
   EXPECT_TRUE(client().prepareForSyncWithHostAnchor("anchor", {}, nullptr));
   seedRestore("com.r");
   requested();
@@ -285,7 +285,7 @@ class CoordinatedTransfers : public OutstandingTransfers {
   }
 };
 
-TEST_F(CoordinatedTransfers, restoresAreNeverReturned) {
+TEST_F(CoordinatedTransfers, RestoresAreNeverReturned) {
   seedRestore("com.r");
   putEntries({install("com.r")});
   EXPECT_THAT(requested(), IsEmpty());
@@ -293,7 +293,7 @@ TEST_F(CoordinatedTransfers, restoresAreNeverReturned) {
       "com.r is currenlty marked to be restored and will be handled by kioskd - skipping"));
 }
 
-TEST_F(CoordinatedTransfers, demotedPlaceholderIsReturnedOnlyIfTheTodoListNamesIt) {
+TEST_F(CoordinatedTransfers, DemotedPlaceholderIsReturnedOnlyIfTheTodoListNamesIt) {
   phone.appRegistry.seedPlaceholder("com.named", InstallType::Downgrade);
   phone.appRegistry.seedPlaceholder("com.other", InstallType::IntentionalDowngrade);
   putEntries({install("com.named")});
@@ -304,7 +304,7 @@ TEST_F(CoordinatedTransfers, demotedPlaceholderIsReturnedOnlyIfTheTodoListNamesI
   EXPECT_TRUE(loggedMessage("com.other is currenlty demoted (manual:0, auto:1) - skipping"));
 }
 
-TEST_F(CoordinatedTransfers, systemApplicationIsSkipped) {
+TEST_F(CoordinatedTransfers, SystemApplicationIsSkipped) {
   AppRecord record;
   record.applicationIdentifier = "com.system";
   record.applicationType = ApplicationTypeSystem;
@@ -315,7 +315,7 @@ TEST_F(CoordinatedTransfers, systemApplicationIsSkipped) {
       loggedMessage("com.system is auto demoted: 1, manual demoted: 0, system app:1 - skipping"));
 }
 
-TEST_F(CoordinatedTransfers, installedApplicationIsUpdatedThroughAnUpdatingCoordinator) {
+TEST_F(CoordinatedTransfers, InstalledApplicationIsUpdatedThroughAnUpdatingCoordinator) {
   phone.appRegistry.seedInstalled("com.a");
   stage("com.a", "Alpha");
   stage("com.b", "Beta");
@@ -328,7 +328,7 @@ TEST_F(CoordinatedTransfers, installedApplicationIsUpdatedThroughAnUpdatingCoord
   EXPECT_EQ(phone.trace.count("AppRegistry.installApplication"), 0u);
 }
 
-TEST_F(CoordinatedTransfers, failedPreparationMarksTheEntryFailedAndLeavesItOut) {
+TEST_F(CoordinatedTransfers, FailedPreparationMarksTheEntryFailedAndLeavesItOut) {
   stage("com.a", "Alpha");
   stage("com.b", "Beta");
   putEntries({install("com.a"), install("com.b")});

@@ -49,7 +49,7 @@ class TransferResults : public ClientTest {
 const Error Final{"Final", 7, {}, nullptr};
 const Error Passing{"Passing", 8, {}, nullptr};
 
-TEST_F(TransferResults, progressIsForwardedInThousandthsTruncated) {
+TEST_F(TransferResults, ProgressIsForwardedInThousandthsTruncated) {
   phone.appRegistry.seedPlaceholder("com.a");
   const SyncAssetPtr made = asset();
   client();
@@ -66,7 +66,7 @@ TEST_F(TransferResults, progressIsForwardedInThousandthsTruncated) {
                "InstallProgress.setCompletedUnitCount(com.a, 456)"});
 }
 
-TEST_F(TransferResults, totalUnitCountIsSetOnlyOnce) {
+TEST_F(TransferResults, TotalUnitCountIsSetOnlyOnce) {
   phone.appRegistry.seedPlaceholder("com.a");
   client().assetTransferUpdatedProgress(asset(), 0.1);
   client().assetTransferUpdatedProgress(asset(), 1.0);
@@ -74,7 +74,7 @@ TEST_F(TransferResults, totalUnitCountIsSetOnlyOnce) {
   EXPECT_EQ(phone.appRegistry.progress("com.a")->completedUnitCount(), 1000);
 }
 
-TEST_F(TransferResults, progressWithoutARecordIsOnlyLogged) {
+TEST_F(TransferResults, ProgressWithoutARecordIsOnlyLogged) {
   const SyncAssetPtr made = asset();
   client();
   forgetTrace();
@@ -83,7 +83,7 @@ TEST_F(TransferResults, progressWithoutARecordIsOnlyLogged) {
                "log error SyncBundle|Returning (null) progress for com.a"});
 }
 
-TEST_F(TransferResults, relativePathIsCompletedUnderTheStagingRoot) {
+TEST_F(TransferResults, RelativePathIsCompletedUnderTheStagingRoot) {
   putTodo({{"com.a", "install"}});
   const SyncAssetPtr made = received("a.zip");
   succeed(made);
@@ -91,14 +91,14 @@ TEST_F(TransferResults, relativePathIsCompletedUnderTheStagingRoot) {
   EXPECT_EQ(made->path, "/var/mobile/Media/PublicStaging/a.zip");
 }
 
-TEST_F(TransferResults, absolutePathIsKept) {
+TEST_F(TransferResults, AbsolutePathIsKept) {
   const SyncAssetPtr made = received("/var/mobile/Media/elsewhere/a.zip");
   succeed(made);
   settle();
   EXPECT_EQ(made->path, "/var/mobile/Media/elsewhere/a.zip");
 }
 
-TEST_F(TransferResults, receivedPackageIsMarkedDownloadedAndItsInstallEnqueued) {
+TEST_F(TransferResults, ReceivedPackageIsMarkedDownloadedAndItsInstallEnqueued) {
   putTodo({{"com.a", "install"}});
   phone.appRegistry.seedPlaceholder("com.a");
   phone.appRegistry.blockInstalls();
@@ -125,7 +125,7 @@ TEST_F(TransferResults, receivedPackageIsMarkedDownloadedAndItsInstallEnqueued) 
   EXPECT_EQ(todoOperation("com.a"), "INSTALLED");
 }
 
-TEST_F(TransferResults, climbingPathIsIgnored) {
+TEST_F(TransferResults, ClimbingPathIsIgnored) {
   putTodo({{"com.a", "install"}});
   succeed(received("/var/../etc/a.zip"));
   expectTrace(
@@ -137,12 +137,12 @@ TEST_F(TransferResults, climbingPathIsIgnored) {
   EXPECT_EQ(todoOperation("com.a"), "install");
 }
 
-TEST_F(TransferResults, missingPathWithNothingRememberedIsIgnored) {
+TEST_F(TransferResults, MissingPathWithNothingRememberedIsIgnored) {
   succeed(asset());
   EXPECT_THAT(phone.trace.log(), Contains("log default SyncBundle|Ignoring invalid path: (null)"));
 }
 
-TEST_F(TransferResults, assetThatIsNoDownloadIsMarkedSentAndInstallsNothing) {
+TEST_F(TransferResults, AssetThatIsNoDownloadIsMarkedSentAndInstallsNothing) {
   putTodo({{"com.a", "install"}});
   const SyncAssetPtr made = received("a.zip");
   made->isDownload = false;
@@ -152,7 +152,7 @@ TEST_F(TransferResults, assetThatIsNoDownloadIsMarkedSentAndInstallsNothing) {
               testing::Not(Contains(testing::HasSubstr("Enqueue install request"))));
 }
 
-TEST_F(TransferResults, restoreWithBackupDataIsRememberedAndNotInstalled) {
+TEST_F(TransferResults, RestoreWithBackupDataIsRememberedAndNotInstalled) {
   phone.backup.addRestoreData("com.a");
   phone.appRegistry.seedPlaceholder("com.a", InstallType::Restore);
   succeed(restored("/var/mobile/Media/a.zip"));
@@ -164,7 +164,7 @@ TEST_F(TransferResults, restoreWithBackupDataIsRememberedAndNotInstalled) {
   EXPECT_FALSE(phone.appRegistry.installed("com.a"));
 }
 
-TEST_F(TransferResults, laterDataOnlyAssetFindsTheRememberedPackageAndInstallsIt) {
+TEST_F(TransferResults, LaterDataOnlyAssetFindsTheRememberedPackageAndInstallsIt) {
   phone.backup.addRestoreData("com.a");
   succeed(restored("/var/mobile/Media/a.zip"));
   const SyncAssetPtr data = restored(std::nullopt);
@@ -175,7 +175,7 @@ TEST_F(TransferResults, laterDataOnlyAssetFindsTheRememberedPackageAndInstallsIt
   EXPECT_TRUE(phone.appRegistry.installed("com.a"));
 }
 
-TEST_F(TransferResults, restoreWithoutBackupDataIsInstalledAtOnce) {
+TEST_F(TransferResults, RestoreWithoutBackupDataIsInstalledAtOnce) {
   succeed(restored("/var/mobile/Media/a.zip"));
   EXPECT_EQ(phone.trace.count("log default SyncBundle|com.corvane.twc.AppsClient|No restore data "
                               "exists for com.a"),
@@ -184,7 +184,7 @@ TEST_F(TransferResults, restoreWithoutBackupDataIsInstalledAtOnce) {
   EXPECT_TRUE(phone.appRegistry.installed("com.a"));
 }
 
-TEST_F(TransferResults, recoverableFailureOnlyMarksTheProgressFailed) {
+TEST_F(TransferResults, RecoverableFailureOnlyMarksTheProgressFailed) {
   putTodo({{"com.a", "install"}});
   phone.appRegistry.seedPlaceholder("com.a");
   const std::string progress = phone.appRegistry.progress("com.a")->description();
@@ -200,7 +200,7 @@ TEST_F(TransferResults, recoverableFailureOnlyMarksTheProgressFailed) {
   EXPECT_TRUE(phone.appRegistry.placeholder("com.a"));
 }
 
-TEST_F(TransferResults, finalFailureCancelsTheProgressAndRemovesThePlaceholder) {
+TEST_F(TransferResults, FinalFailureCancelsTheProgressAndRemovesThePlaceholder) {
   phone.host.setRecoverable("Final", false);
   phone.appRegistry.seedInstalled("com.a");
   phone.appRegistry.seedPlaceholder("com.a");
@@ -222,7 +222,7 @@ TEST_F(TransferResults, finalFailureCancelsTheProgressAndRemovesThePlaceholder) 
   EXPECT_FALSE(phone.appRegistry.placeholder("com.a"));
 }
 
-TEST_F(TransferResults, finalFailureLeavesAnEndedProgressAlone) {
+TEST_F(TransferResults, FinalFailureLeavesAnEndedProgressAlone) {
   phone.host.setRecoverable("Final", false);
   phone.appRegistry.seedPlaceholder("com.a");
   phone.appRegistry.progress("com.a")->begin(InstallState::Canceled, InstallPhase::Loading);
@@ -230,7 +230,7 @@ TEST_F(TransferResults, finalFailureLeavesAnEndedProgressAlone) {
   EXPECT_EQ(phone.trace.count("InstallProgress.cancel"), 0u);
 }
 
-TEST_F(TransferResults, failedRemovalOfThePlaceholderIsLogged) {
+TEST_F(TransferResults, FailedRemovalOfThePlaceholderIsLogged) {
   phone.host.setRecoverable("Final", false);
   phone.appRegistry.seedPlaceholder("com.a");
   phone.appRegistry.failUninstall("com.a");
@@ -239,7 +239,7 @@ TEST_F(TransferResults, failedRemovalOfThePlaceholderIsLogged) {
               Contains("log default SyncBundle|Uninstalling app using SW com.a failed"));
 }
 
-TEST_F(TransferResults, finalFailureOfAnUnknownApplicationOrARestoreDoesNothingMore) {
+TEST_F(TransferResults, FinalFailureOfAnUnknownApplicationOrARestoreDoesNothingMore) {
   phone.host.setRecoverable("Final", false);
   fail(asset(), Final);
   EXPECT_EQ(phone.trace.count("AppRegistry.uninstallApplication"), 0u);
@@ -249,7 +249,7 @@ TEST_F(TransferResults, finalFailureOfAnUnknownApplicationOrARestoreDoesNothingM
   EXPECT_EQ(phone.trace.count("BackupManager.cancelApplicationRestore"), 0u);
 }
 
-TEST_F(TransferResults, endWithNothingOutstandingOnlyNotifiesTheHomeScreen) {
+TEST_F(TransferResults, EndWithNothingOutstandingOnlyNotifiesTheHomeScreen) {
   client();
   forgetTrace();
   client().assetTransferEndedWithSuccess(true);
@@ -261,7 +261,7 @@ TEST_F(TransferResults, endWithNothingOutstandingOnlyNotifiesTheHomeScreen) {
                "SystemNotifier.post(com.corvane.dashel.twc.wsyncnotify)"});
 }
 
-TEST_F(TransferResults, endWithSuccessWhileTransfersAreOutstandingFinishesThemAndLogsAnError) {
+TEST_F(TransferResults, EndWithSuccessWhileTransfersAreOutstandingFinishesThemAndLogsAnError) {
   phone.appRegistry.seedPlaceholder("com.a");
   client().assetTransferUpdatedProgress(asset(), 0.5);
   client().assetTransferUpdatedProgress(asset("com.gone"), 0.5);
@@ -290,7 +290,7 @@ TEST_F(TransferResults, endWithSuccessWhileTransfersAreOutstandingFinishesThemAn
           "log error SyncBundle|Called with success == YES but with 2 outstanding XFT transfers!"));
 }
 
-TEST_F(TransferResults, endWithFailureMarksOutstandingTransfersFailedAndLogsNoErrorOfItsOwn) {
+TEST_F(TransferResults, EndWithFailureMarksOutstandingTransfersFailedAndLogsNoErrorOfItsOwn) {
   phone.appRegistry.seedPlaceholder("com.a");
   client().assetTransferUpdatedProgress(asset(), 0.5);
   client().assetTransferEndedWithSuccess(false);
@@ -314,7 +314,7 @@ class CoordinatedResults : public TransferResults {
   std::shared_ptr<fakes::FakeInstallCoordinator> coordinator;
 };
 
-TEST_F(CoordinatedResults, progressGoesToTheCoordinatorsPackagePromise) {
+TEST_F(CoordinatedResults, ProgressGoesToTheCoordinatorsPackagePromise) {
   const SyncAssetPtr made = received("/var/mobile/Media/a.zip");
   made->downloadProgress = 0.25;
   client().assetTransferUpdatedProgress(made, 0.25);
@@ -323,7 +323,7 @@ TEST_F(CoordinatedResults, progressGoesToTheCoordinatorsPackagePromise) {
   EXPECT_EQ(phone.trace.count("InstallProgress."), 0u);
 }
 
-TEST_F(CoordinatedResults, noProgressRecordIsLookedUp) {
+TEST_F(CoordinatedResults, NoProgressRecordIsLookedUp) {
   phone.appRegistry.seedPlaceholder("com.a");
   client();
   forgetTrace();
@@ -333,7 +333,7 @@ TEST_F(CoordinatedResults, noProgressRecordIsLookedUp) {
               fakes::TraceAll);
 }
 
-TEST_F(CoordinatedResults, receivedPackageSatisfiesItsPromise) {
+TEST_F(CoordinatedResults, ReceivedPackageSatisfiesItsPromise) {
   putTodo({{"com.a", "install"}});
   succeed(received("a.zip"));
   ASSERT_TRUE(phone.installCoordination.pathPromise("com.a-Asset"));
@@ -343,7 +343,7 @@ TEST_F(CoordinatedResults, receivedPackageSatisfiesItsPromise) {
               testing::Not(Contains(testing::HasSubstr("Enqueue install request"))));
 }
 
-TEST_F(CoordinatedResults, restoreAssetsAreLeftToTheStore) {
+TEST_F(CoordinatedResults, RestoreAssetsAreLeftToTheStore) {
   succeed(restored("/var/mobile/Media/a.zip"));
   EXPECT_THAT(
       phone.trace.log(),
@@ -358,27 +358,27 @@ TEST_F(CoordinatedResults, restoreAssetsAreLeftToTheStore) {
                "asset com.a as coordination is enabled"));
 }
 
-TEST_F(CoordinatedResults, failureCancelsTheCoordinatorOfAnInstalledApplication) {
+TEST_F(CoordinatedResults, FailureCancelsTheCoordinatorOfAnInstalledApplication) {
   phone.appRegistry.seedPlaceholder("com.a");
   fail(asset(), Passing);
   EXPECT_TRUE(coordinator->state().cancellation.has_value());
   EXPECT_EQ(phone.trace.count("AppRegistry.uninstallApplication"), 0u);
 }
 
-TEST_F(CoordinatedResults, failureAfterThePersonCancelledLeavesTheCoordinatorAlone) {
+TEST_F(CoordinatedResults, FailureAfterThePersonCancelledLeavesTheCoordinatorAlone) {
   phone.appRegistry.seedPlaceholder("com.a");
   client().coordinatorCanceledWithReason(*coordinator, Passing, KQClientKiosk);
   fail(asset(), Passing);
   EXPECT_EQ(phone.trace.count("InstallCoordinator.cancel"), 0u);
 }
 
-TEST_F(CoordinatedResults, failedEndCancelsOutstandingCoordinators) {
+TEST_F(CoordinatedResults, FailedEndCancelsOutstandingCoordinators) {
   client().assetTransferUpdatedProgress(asset(), 0.5);
   client().assetTransferEndedWithSuccess(false);
   EXPECT_TRUE(coordinator->state().cancellation.has_value());
 }
 
-TEST_F(CoordinatedResults, endWithNothingOutstandingKeepsWhatThePersonCancelled) {
+TEST_F(CoordinatedResults, EndWithNothingOutstandingKeepsWhatThePersonCancelled) {
   client().coordinatorCanceledWithReason(*coordinator, Passing, KQClientKiosk);
   client().assetTransferEndedWithSuccess(true);
   forgetTrace();

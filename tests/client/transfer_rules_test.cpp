@@ -24,7 +24,7 @@ class TransferRules : public ClientTest {
   std::set<std::string> wanted;
 };
 
-TEST_F(TransferRules, applyInAFixedOrder) {
+TEST_F(TransferRules, ApplyInAFixedOrder) {
   Lines names;
   for (const TransferRule& rule : transferRules()) names.emplace_back(rule.name);
   EXPECT_THAT(names, testing::ElementsAre("installation disabled", "restore to be ignored",
@@ -32,12 +32,12 @@ TEST_F(TransferRules, applyInAFixedOrder) {
                                           "system application's placeholder", "demoted"));
 }
 
-TEST_F(TransferRules, plainCandidateIsWantedSilently) {
+TEST_F(TransferRules, PlainCandidateIsWantedSilently) {
   EXPECT_TRUE(wantedNow());
   expectTrace({});
 }
 
-TEST_F(TransferRules, installationDisabledSkipsSyncEntriesButNotRestores) {
+TEST_F(TransferRules, InstallationDisabledSkipsSyncEntriesButNotRestores) {
   installationAllowed = false;
   EXPECT_FALSE(wantedNow());
   expectTrace(
@@ -48,7 +48,7 @@ TEST_F(TransferRules, installationDisabledSkipsSyncEntriesButNotRestores) {
   expectTrace({});
 }
 
-TEST_F(TransferRules, restoreToBeIgnoredIsSkippedAndASyncEntryIsNot) {
+TEST_F(TransferRules, RestoreToBeIgnoredIsSkippedAndASyncEntryIsNot) {
   ignored = {"com.a"};
   EXPECT_TRUE(wantedNow());
   candidate.isRestore = true;
@@ -58,7 +58,7 @@ TEST_F(TransferRules, restoreToBeIgnoredIsSkippedAndASyncEntryIsNot) {
        "skipping"});
 }
 
-TEST_F(TransferRules, coordinatedRestoreIsLeftToTheStore) {
+TEST_F(TransferRules, CoordinatedRestoreIsLeftToTheStore) {
   candidate.isRestore = true;
   EXPECT_TRUE(wantedNow());
   coordinated = true;
@@ -68,7 +68,7 @@ TEST_F(TransferRules, coordinatedRestoreIsLeftToTheStore) {
        "by kioskd - skipping"});
 }
 
-TEST_F(TransferRules, ignoredRestoreIsNamedBeforeTheStore) {
+TEST_F(TransferRules, IgnoredRestoreIsNamedBeforeTheStore) {
   candidate.isRestore = true;
   coordinated = true;
   ignored = {"com.a"};
@@ -78,7 +78,7 @@ TEST_F(TransferRules, ignoredRestoreIsNamedBeforeTheStore) {
        "skipping"});
 }
 
-TEST_F(TransferRules, systemApplicationIsSkippedOnlyWhenCoordinated) {
+TEST_F(TransferRules, SystemApplicationIsSkippedOnlyWhenCoordinated) {
   candidate.isSystemApp = true;
   candidate.isIntentionallyDemoted = true;
   EXPECT_TRUE(wantedNow());
@@ -89,7 +89,7 @@ TEST_F(TransferRules, systemApplicationIsSkippedOnlyWhenCoordinated) {
        "skipping"});
 }
 
-TEST_F(TransferRules, systemApplicationsPlaceholderIsSkippedInBothModes) {
+TEST_F(TransferRules, SystemApplicationsPlaceholderIsSkippedInBothModes) {
   systemPlaceholders = {"com.a"};
   EXPECT_FALSE(wantedNow());
   expectTrace({"log default SyncBundle|com.a is system app placeholder - skipping"});
@@ -98,7 +98,7 @@ TEST_F(TransferRules, systemApplicationsPlaceholderIsSkippedInBothModes) {
   expectTrace({"log default SyncBundle|com.a is system app placeholder - skipping"});
 }
 
-TEST_F(TransferRules, demotedApplicationIsSkippedUnlessTheDesktopNamesIt) {
+TEST_F(TransferRules, DemotedApplicationIsSkippedUnlessTheDesktopNamesIt) {
   coordinated = true;
   candidate.isAutoDemoted = true;
   EXPECT_FALSE(wantedNow());
@@ -111,14 +111,14 @@ TEST_F(TransferRules, demotedApplicationIsSkippedUnlessTheDesktopNamesIt) {
        "installed as it's requested by client"});
 }
 
-TEST_F(TransferRules, intentionallyDemotedPrintsItsFlagSecond) {
+TEST_F(TransferRules, IntentionallyDemotedPrintsItsFlagSecond) {
   coordinated = true;
   candidate.isIntentionallyDemoted = true;
   EXPECT_FALSE(wantedNow());
   expectTrace({"log default SyncBundle|com.a is currenlty demoted (manual:0, auto:1) - skipping"});
 }
 
-TEST_F(TransferRules, demotedApplicationIsWantedWhenInstallsAreNotCoordinated) {
+TEST_F(TransferRules, DemotedApplicationIsWantedWhenInstallsAreNotCoordinated) {
   candidate.isAutoDemoted = true;
   EXPECT_TRUE(wantedNow());
   expectTrace({});

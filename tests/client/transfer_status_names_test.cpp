@@ -9,7 +9,7 @@ InstallType type(std::uint64_t value) { return static_cast<InstallType>(value); 
 InstallState state(std::uint64_t value) { return static_cast<InstallState>(value); }
 InstallPhase phase(std::uint64_t value) { return static_cast<InstallPhase>(value); }
 
-TEST(StatusNames, everyInstallTypeHasItsName) {
+TEST(StatusNames, EveryInstallTypeHasItsName) {
   const char* const names[] = {"SWInstallTypeNone",      "SWInstallTypeStoreDownload",
                                "SWInstallTypeRestore",   "SWInstallTypeAutomaticDownload",
                                "SWInstallTypeSync",      "SWInstallTypeAutomaticUpdate",
@@ -19,7 +19,7 @@ TEST(StatusNames, everyInstallTypeHasItsName) {
   }
 }
 
-TEST(StatusNames, everyInstallStateHasItsName) {
+TEST(StatusNames, EveryInstallStateHasItsName) {
   const char* const names[] = {"SWInstallStateWaiting", "SWInstallStateActive",
                                "SWInstallStatePaused",  "SWInstallStateCanceled",
                                "SWInstallStateFailed",  "SWInstallStateFinished"};
@@ -28,7 +28,7 @@ TEST(StatusNames, everyInstallStateHasItsName) {
   }
 }
 
-TEST(StatusNames, everyInstallPhaseHasItsName) {
+TEST(StatusNames, EveryInstallPhaseHasItsName) {
   const char* const names[] = {"SWInstallPhaseLoading", "SWInstallPhaseInstalling",
                                "SWInstallPhaseRestoringData",
                                "SWInstallPhaseInstallingPlaceholder"};
@@ -37,7 +37,7 @@ TEST(StatusNames, everyInstallPhaseHasItsName) {
   }
 }
 
-TEST(StatusNames, unknownValuesAreNamedByTheirNumber) {
+TEST(StatusNames, UnknownValuesAreNamedByTheirNumber) {
   EXPECT_EQ(installTypeName(type(9)), "Unknown Install Type: 9");
   // Intentional demotion has no name of its own.
   EXPECT_EQ(installTypeName(type(8)), "Unknown Install Type: 8");
