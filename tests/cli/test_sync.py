@@ -197,6 +197,19 @@ class OddPackages(support.Case):
         self.assertEqual([entry["identifier"] for entry in summary["failed"]], ["com.a"])
         self.assertEqual(self.apps(), {"com.a": "1.0"})
 
+    def test_a_damaged_update_without_a_name_keeps_the_old_version(self):
+        self.offer("com.a")
+        self.sync()
+        described = {**support.info("com.a", "2.0"), "KBBundleDisplayName": ""}
+        self.offer_raw("com.a.zip", {"A.app/Info.plist": plistlib.dumps(described),
+                                     "A.app/body": support.noise(200_000)})
+        package = self.library / "com.a.zip"
+        contents = bytearray(package.read_bytes())
+        contents[100_000:100_100] = b"\0" * 100
+        package.write_bytes(contents)
+        self.assertEqual(list(reasons(self.sync(code=1)["failed"])), ["com.a"])
+        self.assertEqual(self.apps(), {"com.a": "1.0"})
+
     def test_files_that_are_no_packages(self):
         self.offer("com.a")
         (self.library / "broken.zip").write_bytes(b"garbage")

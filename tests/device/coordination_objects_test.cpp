@@ -1,4 +1,5 @@
 #include <future>
+#include <latch>
 
 #include "tests/device/coordination_test.h"
 
@@ -215,6 +216,20 @@ TEST_F(CoordinationObjectsTest, AnUninstallIsToldAboutEvenWhenTheDeviceIsClosed)
   EXPECT_EQ(told, 1);
   reopen();
   EXPECT_EQ(registry(), Lines{});
+}
+
+TEST_F(CoordinationObjectsTest, TheDeviceIsBusyUntilACompletionHasReturned) {
+  ASSERT_TRUE(installPackage(Id, "1.0"));
+  std::latch called(1);
+  std::latch released(1);
+  service().uninstallApp(Id, false, [&](const std::optional<Error>&) {
+    called.count_down();
+    released.wait();
+  });
+  called.wait();
+  EXPECT_TRUE(device->isBusyWith(Id));
+  released.count_down();
+  waitUntilIdle(Id);
 }
 
 TEST_F(CoordinationObjectsTest, APersonWhoUninstallsEndsTheInstall) {

@@ -79,6 +79,16 @@ TEST_F(SessionTest, StagesWhatTheClientTakesOver) {
             PropertyList(PropertyList::Array{entry}));
 }
 
+TEST_F(SessionTest, StagesNoEmptyName) {
+  Entries entries = sampleEntries("com.a", "1.5", "");
+  pack(folder / "a.zip", entries);
+  sync();
+  PropertyList::Dictionary info = appInfo("com.a", "1.5", "");
+  info.erase(std::string(KBBundleDisplayName));
+  EXPECT_EQ(phone.files.plistAt(std::string(exchange::WorkArea) + "/com.a/Info.plist"),
+            PropertyList(info));
+}
+
 TEST_F(SessionTest, ReplacesAStaleStagingArea) {
   offer("com.a");
   phone.files.putFile(std::string(exchange::StagingArea) + "/com.stale/Info.plist", "old");

@@ -10,6 +10,7 @@ using namespace testing;
 using ::testing::Contains;
 using ::testing::Each;
 using ::testing::ElementsAre;
+using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 using ::testing::Not;
 using ::testing::SizeIs;
@@ -240,6 +241,17 @@ TEST_F(SessionTest, EndsWhenThePhoneDoesNotTakeTheStagingArea) {
   EXPECT_FALSE(result.completed);
   EXPECT_THAT(trace("client.reconcileSync"), IsEmpty());
   EXPECT_THAT(result.summary.failed, SizeIs(1));
+}
+
+TEST_F(SessionTest, IsNotCompleteWhenTheApplicationsPresentCannotBeWritten) {
+  offer("com.a");
+  phone.faults.failWhere("FileManager.writeAtomically", exchange::LastSyncState,
+                         Error::posix(ENOSPC));
+  const SyncResult result = sync();
+  EXPECT_FALSE(result.completed);
+  EXPECT_EQ(text(result.summary), "installed: com.a");
+  EXPECT_THAT(reporter.lines("broken"),
+              ElementsAre(HasSubstr("the list of applications present could not be written")));
 }
 
 TEST_F(SessionTest, RefusesAPlugInForSomethingElse) {
