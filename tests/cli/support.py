@@ -76,6 +76,14 @@ class Case(unittest.TestCase):
         return process
 
     @staticmethod
+    def rest(process):
+        """All that it still writes on both outputs, until it ends. communicate() would lose what was
+        read ahead with the lines before."""
+        out, err = process.stdout.read(), process.stderr.read()
+        process.wait(timeout=60)
+        return out, err
+
+    @staticmethod
     def stop(process):
         process.kill()
         process.communicate()

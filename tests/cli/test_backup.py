@@ -229,7 +229,7 @@ class EarlyEnds(BackupCase):
         for number in (signal.SIGINT, signal.SIGTERM):
             process = self.start_backup(5)
             process.send_signal(number)
-            out, err = process.communicate(timeout=60)
+            out, err = self.rest(process)
             events = [json.loads(line) for line in out.splitlines()]
             self.assertEqual((process.returncode, err), (130, ""))
             self.assertIn({"event": "interrupted"}, events)
@@ -242,7 +242,7 @@ class EarlyEnds(BackupCase):
         process = self.start("backup", self.target, "--verbose")
         process.stdout.readline()
         process.send_signal(signal.SIGINT)
-        out, _ = process.communicate(timeout=60)
+        out, _ = self.rest(process)
         self.assertEqual(process.returncode, 130)
         self.assertTrue(out.endswith("stopped    no backup was made\n"), out)
         self.put_data("com.c")
@@ -272,7 +272,7 @@ class EarlyEnds(BackupCase):
         process = self.start_backup(3)
         [error] = self.json_lines("backup", self.folder / "other", code=3)
         self.assertEqual(error["event"], "error")
-        out, _ = process.communicate(timeout=60)
+        out, _ = self.rest(process)
         self.assertEqual(process.returncode, 0, out)
 
     def test_a_reader_that_goes_away_does_not_stop_the_backup(self):

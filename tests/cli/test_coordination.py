@@ -28,8 +28,8 @@ class TapAndCancel(support.Case):
                 return process
         self.fail("the sync sent nothing: " + process.stderr.read())
 
-    def rest(self, process, code):
-        out, err = process.communicate(timeout=100)
+    def rest_of_events(self, process, code):
+        out, err = self.rest(process)
         self.assertEqual((process.returncode, err), (code, ""), out)
         return [json.loads(line) for line in out.splitlines()]
 
@@ -37,7 +37,7 @@ class TapAndCancel(support.Case):
         process = self.sync_until_sending()
         self.assertEqual(self.json_lines("cancel", "com.a-big"),
                          [{"event": "cancelled", "identifier": "com.a-big"}])
-        events = self.rest(process, 1)
+        events = self.rest_of_events(process, 1)
         summary = events[-1]
         self.assertEqual(summary["failed"],
                          [{"identifier": "com.a-big", "reason": "cancelled on the phone"}])
@@ -50,7 +50,7 @@ class TapAndCancel(support.Case):
     def test_a_cancelled_application_that_waits_is_never_sent(self):
         process = self.sync_until_sending()
         self.run_appsync("cancel", "com.c")
-        events = self.rest(process, 1)
+        events = self.rest_of_events(process, 1)
         self.assertEqual([entry["identifier"] for entry in events[-1]["failed"]], ["com.c"])
         self.assertEqual(events[-1]["installed"], ["com.a-big", "com.b", "com.d"])
         self.assertNotIn("com.c", [event["identifier"] for event in events
@@ -60,7 +60,7 @@ class TapAndCancel(support.Case):
         process = self.sync_until_sending()
         self.assertEqual(self.json_lines("tap", "com.d"),
                          [{"event": "tapped", "identifier": "com.d"}])
-        events = self.rest(process, 0)
+        events = self.rest_of_events(process, 0)
         ended = [event["identifier"] for event in events if event["event"] == "transfer-ended"]
         self.assertEqual(ended, ["com.d", "com.a-big", "com.b", "com.c"])
         self.assertEqual(len(self.apps()), 4)
@@ -74,7 +74,7 @@ class TapAndCancel(support.Case):
             if json.loads(line)["event"] == "waiting":
                 break
         self.run_appsync("cancel", "com.b")
-        summary = self.rest(process, 1)[-1]
+        summary = self.rest_of_events(process, 1)[-1]
         self.assertEqual(summary["failed"], [{
             "identifier": "com.b", "reason": "the install of com.b was cancelled on the phone"}])
         self.assertEqual((summary["installed"], summary["updated"]), ([], []))

@@ -141,7 +141,7 @@ class HomeScreen(support.Case):
                 break
         self.assertEqual(self.draw(), {"pages": 1, "icons": 1})
         process.send_signal(signal.SIGINT)
-        process.communicate(timeout=60)
+        self.rest(process)
         self.assertEqual(process.returncode, 130)
 
     def test_pages(self):

@@ -31,8 +31,8 @@ class Interruption(support.Case):
         staging = self.phone / "root/var/mobile/Media/PublicStaging"
         return [path.name for path in staging.iterdir()]
 
-    def rest(self, process):
-        out, err = process.communicate(timeout=60)
+    def rest_of_events(self, process):
+        out, err = self.rest(process)
         return [json.loads(line) for line in out.splitlines()], err
 
     def open_app_with_update(self):
@@ -54,7 +54,7 @@ class Interruption(support.Case):
     def check_interrupted_while_waiting(self, process, signal_number):
         begin = time.monotonic()
         process.send_signal(signal_number)
-        events, _ = self.rest(process)
+        events, _ = self.rest_of_events(process)
         self.assertEqual(process.returncode, 130)
         self.assertLess(time.monotonic() - begin, 10)
         self.assertEqual(events[-1]["event"], "summary")
@@ -89,7 +89,7 @@ class Interruption(support.Case):
         self.await_event(process, lambda event: event["event"] == "install-ended"
                          and event["identifier"] == "com.other")
         process.send_signal(signal.SIGINT)
-        events, _ = self.rest(process)
+        events, _ = self.rest_of_events(process)
         self.assertEqual(events[-1]["installed"], ["com.other"])
 
     def test_interrupt_while_sending(self):
@@ -98,7 +98,7 @@ class Interruption(support.Case):
         process = self.start_sync()
         self.await_event(process, lambda event: event["event"] == "transfer")
         process.send_signal(signal.SIGINT)
-        events, _ = self.rest(process)
+        events, _ = self.rest_of_events(process)
         self.assertEqual(process.returncode, 130)
         self.assertIn("interrupted", [event["event"] for event in events])
         self.assertEqual({entry["identifier"] for entry in events[-1]["failed"]},

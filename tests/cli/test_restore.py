@@ -115,7 +115,7 @@ done       2 installed, 2 skipped
             if event["event"] == "transfer" and event["identifier"] == "com.b":
                 break
         process.send_signal(signal.SIGINT)
-        events = [json.loads(line) for line in process.communicate(timeout=60)[0].splitlines()]
+        events = [json.loads(line) for line in self.rest(process)[0].splitlines()]
         self.assertEqual(process.returncode, 130)
         self.assertEqual(self.reasons(events[-1]["failed"]),
                          {"com.b": "interrupted; the next restore does it"})
