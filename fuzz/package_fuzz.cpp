@@ -1,7 +1,5 @@
 // Unpacks arbitrary bytes as an application package. Whatever they are, only files and folders may
 // come of them, and only in the folder meant for them.
-//
-// With APPSYNC_FUZZ_MAIN this is a program that runs the files given to it once.
 
 #include <fcntl.h>
 #include <stdlib.h>
@@ -81,19 +79,3 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   require(fs::is_empty(arena.path()));
   return 0;
 }
-
-#ifdef APPSYNC_FUZZ_MAIN
-#include <fstream>
-#include <iostream>
-#include <iterator>
-
-int main(int count, char** files) {
-  for (int i = 1; i < count; ++i) {
-    std::ifstream in(files[i], std::ios::binary);
-    if (!in) return std::cerr << files[i] << ": cannot be read\n", 1;
-    const std::string bytes((std::istreambuf_iterator<char>(in)), {});
-    LLVMFuzzerTestOneInput(reinterpret_cast<const std::uint8_t*>(bytes.data()), bytes.size());
-  }
-  std::cout << count - 1 << " files\n";
-}
-#endif

@@ -1,6 +1,4 @@
 // Parses arbitrary bytes; what parses must survive both formats unchanged.
-//
-// With APPSYNC_FUZZ_MAIN this is a program that runs the files given to it once.
 
 #include <algorithm>
 #include <cmath>
@@ -58,19 +56,3 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   }
   return 0;
 }
-
-#ifdef APPSYNC_FUZZ_MAIN
-#include <fstream>
-#include <iostream>
-#include <iterator>
-
-int main(int count, char** files) {
-  for (int i = 1; i < count; ++i) {
-    std::ifstream in(files[i], std::ios::binary);
-    if (!in) return std::cerr << files[i] << ": cannot be read\n", 1;
-    const std::string bytes((std::istreambuf_iterator<char>(in)), {});
-    LLVMFuzzerTestOneInput(reinterpret_cast<const std::uint8_t*>(bytes.data()), bytes.size());
-  }
-  std::cout << count - 1 << " files\n";
-}
-#endif
