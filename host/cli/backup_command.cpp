@@ -5,7 +5,6 @@
 #include "host/cli/cli.h"
 #include "host/cli/plugin_session.h"
 #include "host/phone/plugin_loader.h"
-#include "host/report/report.h"
 
 namespace appsync::host {
 namespace {
@@ -17,8 +16,7 @@ ExitCode exitCode(const BackupSummary& summary, const Interruption& interruption
 
 ExitCode runBackup(const std::string& folder, CommandContext& context) {
   const auto device = context.openDevice(device::Access::Write);
-  const auto reporter =
-      makeReporter(context.out, context.err, {context.json, context.quiet, context.verbose, false});
+  const auto reporter = context.makeReporter();
   Interruption interruption;
   const auto plugin = loadPlugin(context);
   PluginSession loaded(*plugin, SyncHostBundleIdentifier, *device, interruption,

@@ -11,6 +11,7 @@
 #include <system_error>
 
 #include "host/base/text.h"
+#include "host/report/report.h"
 
 namespace appsync::host {
 namespace {
@@ -88,6 +89,10 @@ std::unique_ptr<device::EmbeddedDevice> CommandContext::openDevice(device::Acces
   auto opened = device::EmbeddedDevice::open(deviceFolder(), access, error);
   if (!opened) throw CommandError(ExitCode::DeviceUnusable, printable(error.message));
   return opened;
+}
+
+std::unique_ptr<Reporter> CommandContext::makeReporter(bool showPlan) {
+  return host::makeReporter(out, err, {json, quiet, verbose, showPlan});
 }
 
 void CommandContext::tell(const Json& object, const std::string& text) {

@@ -9,6 +9,7 @@
 #include "device/embedded_device.h"
 #include "host/base/json_line.h"
 #include "host/base/output.h"
+#include "host/library/events.h"
 
 namespace CLI {
 class App;
@@ -50,6 +51,9 @@ struct CommandContext {
   std::filesystem::path deviceFolder() const;
   /// An open device; a CommandError when it cannot be used.
   std::unique_ptr<device::EmbeddedDevice> openDevice(device::Access access) const;
+
+  /// Tells of the work's progress.
+  std::unique_ptr<Reporter> makeReporter(bool showPlan = false);
 
   /// One line of a result: the object with --json, else the text.
   void tell(const Json& object, const std::string& text);

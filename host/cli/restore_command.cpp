@@ -4,7 +4,6 @@
 #include "host/cli/cli.h"
 #include "host/cli/plugin_session.h"
 #include "host/phone/plugin_loader.h"
-#include "host/report/report.h"
 #include "host/restore/restore.h"
 
 namespace appsync::host {
@@ -46,8 +45,7 @@ ExitCode exitCode(const SyncResult& result, bool interrupted) {
 ExitCode runRestore(const RestoreOptions& options, CommandContext& context) {
   const RestoreInput input = readInput(options);
   const auto device = context.openDevice(device::Access::Write);
-  const auto reporter =
-      makeReporter(context.out, context.err, {context.json, context.quiet, context.verbose, false});
+  const auto reporter = context.makeReporter();
   Interruption interruption;
   const auto plugin = loadPlugin(context);
   PluginSession loaded(*plugin, SyncHostBundleIdentifier, *device, interruption,

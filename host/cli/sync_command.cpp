@@ -9,7 +9,6 @@
 #include "host/cli/plugin_session.h"
 #include "host/library/icon_layout.h"
 #include "host/phone/plugin_loader.h"
-#include "host/report/report.h"
 #include "host/sync/session.h"
 
 namespace appsync::host {
@@ -74,8 +73,7 @@ ExitCode runSync(const SyncOptions& options, CommandContext& context) {
   const auto device =
       context.openDevice(options.dryRun ? device::Access::ReadOnly : device::Access::Write);
   plan(input, options.plan, *device);
-  const auto reporter = makeReporter(
-      context.out, context.err, {context.json, context.quiet, context.verbose, options.dryRun});
+  const auto reporter = context.makeReporter(options.dryRun);
   if (options.dryRun) {
     reportPlan(input, *reporter);
     return dryRun(input, *reporter);

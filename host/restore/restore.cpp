@@ -45,9 +45,7 @@ SyncResult Restore::run(const RestoreInput& input) {
 }
 
 bool Restore::callClient(const RestoreInput& input) {
-  const auto dataclasses = client_.supportedDataclasses();
-  if (std::find(dataclasses.begin(), dataclasses.end(), ApplicationDataclass) ==
-      dataclasses.end()) {
+  if (!servesApplications(client_)) {
     return broken("the plug-in does not serve applications", std::nullopt);
   }
   std::optional<Error> error;

@@ -33,6 +33,11 @@ std::set<std::string> identifiersOf(const SyncPlan& plan) {
 
 }  // namespace
 
+bool servesApplications(SyncClient& client) {
+  const auto dataclasses = client.supportedDataclasses();
+  return std::ranges::find(dataclasses, ApplicationDataclass) != dataclasses.end();
+}
+
 Session::Session(SyncClient& client, TransferQueue& queue, Phone phone, Reporter& reporter,
                  Interruption& interruption)
     : client_(client),
@@ -64,9 +69,7 @@ bool Session::callClient(const SyncInput& input, PackageSender& sender) {
 }
 
 bool Session::isServed() {
-  const auto dataclasses = client_.supportedDataclasses();
-  if (std::find(dataclasses.begin(), dataclasses.end(), ApplicationDataclass) ==
-      dataclasses.end()) {
+  if (!servesApplications(client_)) {
     return broken("the plug-in does not serve applications", std::nullopt);
   }
   const std::string hostAnchor = client_.currentSyncAnchor();

@@ -18,6 +18,9 @@
 
 namespace appsync::host {
 
+/// Whether the plug-in is one for applications.
+bool servesApplications(SyncClient& client);
+
 struct SyncInput {
   Library library;
   SyncPlan plan;
