@@ -209,8 +209,8 @@ void CoordinationCore::showProgress(const PromiseRow& promise) {
 
 std::shared_ptr<CoordinatorHandle> CoordinationCore::handleOf(const CoordinatorRow& row) {
   const std::lock_guard lock(mutex_);
-  const auto handle = shared(coordinators_, row.number,
-                             [&] { return std::make_shared<CoordinatorHandle>(gate_, row); });
+  auto handle = shared(coordinators_, row.number,
+                       [&] { return std::make_shared<CoordinatorHandle>(gate_, row); });
   if (!row.isLive()) handle->settle(row);
   return handle;
 }
