@@ -41,7 +41,7 @@ std::map<std::string, std::string> treeOf(const fs::path& folder) {
     struct stat status {};
     EXPECT_EQ(::lstat(item.path().c_str(), &status), 0);
     std::string text = std::to_string(status.st_mode) + " " + std::to_string(status.st_mtime) + " ";
-    if (S_ISREG(status.st_mode)) text += testing::fileContents(item.path());
+    if (S_ISREG(status.st_mode)) text += fakes::fileText(item.path());
     if (S_ISLNK(status.st_mode)) text += fs::read_symlink(item.path()).string();
     tree[item.path().lexically_relative(folder).string()] = text;
   }

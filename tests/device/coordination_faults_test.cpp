@@ -254,8 +254,8 @@ class CoordinationFaultsTest : public CoordinationTest,
       ASSERT_TRUE(recorder.waitFor("placeholder"));
       waitUntilIdle(Id);
     }
-    testing::putFile(onDisk(Package.path),
-                     asText(PackageArchive().addApplication(Id, "2.0").bytes()));
+    fakes::putFile(onDisk(Package.path),
+                   asText(PackageArchive().addApplication(Id, "2.0").bytes()));
     putFile(Icon, "picture");
     device.reset();
     if (course().asCrashed) edit(course().asCrashed);
@@ -327,7 +327,7 @@ class CoordinationFaultsTest : public CoordinationTest,
   }
 
  private:
-  const TemporaryFolder memory_{testing::memoryFolder()};
+  const fakes::TemporaryFolder memory_{fakes::memoryFolder()};
   const fs::path origin_ = memory_.path() / "origin";
 };
 

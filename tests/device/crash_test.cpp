@@ -7,6 +7,7 @@
 #include "platform/bundle.h"
 #include "tests/device/device_parts.h"
 #include "tests/device/device_test.h"
+#include "tests/fakes/stepping_file_manager.h"
 
 namespace appsync::device {
 namespace {
@@ -28,70 +29,14 @@ class Fuse {
   int left_;
 };
 
-/// Passes every call on; each change is a step.
-class FusedFiles final : public FileManager {
- public:
-  FusedFiles(FileManager& files, Fuse& fuse) : files_(files), fuse_(fuse) {}
-
-  std::optional<Bytes> contentsAtPath(std::string_view path,
-                                      std::optional<Error>* error) noexcept override {
-    return files_.contentsAtPath(path, error);
-  }
-  bool writeAtomically(std::string_view path, ByteView bytes,
-                       std::optional<Error>* error) noexcept override {
-    fuse_.burn();
-    return files_.writeAtomically(path, bytes, error);
-  }
-  bool createFile(std::string_view path, ByteView bytes,
-                  const FileAttributes& attributes) noexcept override {
-    fuse_.burn();
-    return files_.createFile(path, bytes, attributes);
-  }
-  bool createDirectory(std::string_view path, bool withIntermediates,
-                       const FileAttributes& attributes,
-                       std::optional<Error>* error) noexcept override {
-    fuse_.burn();
-    return files_.createDirectory(path, withIntermediates, attributes, error);
-  }
-  bool removeItem(std::string_view path, std::optional<Error>* error) noexcept override {
-    fuse_.burn();
-    return files_.removeItem(path, error);
-  }
-  bool moveItem(std::string_view from, std::string_view to,
-                std::optional<Error>* error) noexcept override {
-    fuse_.burn();
-    return files_.moveItem(from, to, error);
-  }
-  bool copyItem(std::string_view from, std::string_view to,
-                std::optional<Error>* error) noexcept override {
-    fuse_.burn();
-    return files_.copyItem(from, to, error);
-  }
-  bool fileExists(std::string_view path) noexcept override { return files_.fileExists(path); }
-  bool directoryExists(std::string_view path) noexcept override {
-    return files_.directoryExists(path);
-  }
-  std::optional<ItemAttributes> attributesOfItem(std::string_view path,
-                                                 std::optional<Error>* error) noexcept override {
-    return files_.attributesOfItem(path, error);
-  }
-  bool touch(std::string_view path, std::optional<Error>* error) noexcept override {
-    return files_.touch(path, error);
-  }
-  std::string temporaryDirectory() noexcept override { return files_.temporaryDirectory(); }
-
- private:
-  FileManager& files_;
-  Fuse& fuse_;
-};
-
 /// The registry of a device whose process dies at a step: a change of a file, or a commit (before
 /// it is made).
 class FusedDevice {
  public:
   FusedDevice(const fs::path& folder, int steps)
-      : fuse_(steps),
-        parts_(folder, [this](auto& files) { return std::make_unique<FusedFiles>(files, fuse_); }) {
+      : fuse_(steps), parts_(folder, [this](auto& files) {
+          return std::make_unique<fakes::SteppingFileManager>(files, [this] { fuse_.burn(); });
+        }) {
     parts_.database().read("", [&](SQLite::Database& connection) {
       sqlite3_commit_hook(
           connection.getHandle(),
@@ -118,11 +63,11 @@ class CrashTest : public DeviceTest {
     Snapshot found;
     for (const AppRecord& each : device->applications()) {
       const std::string name = description(each) + " ";
-      for (const auto& [file, contents] : testing::snapshot(onDisk(*each.bundleContainerPath))) {
+      for (const auto& [file, contents] : fakes::snapshot(onDisk(*each.bundleContainerPath))) {
         found[name + file] = contents;
       }
     }
-    for (const auto& [file, contents] : testing::snapshot(onDisk("/var/mobile/Containers/Data"))) {
+    for (const auto& [file, contents] : fakes::snapshot(onDisk("/var/mobile/Containers/Data"))) {
       found["data " + file] = contents;
     }
     return found;

@@ -35,7 +35,7 @@ class DeviceFolderTest : public ::testing::Test {
     EXPECT_EQ(problemOfOpening(Access::ReadOnly), expected);
   }
 
-  TemporaryFolder temporary;
+  fakes::TemporaryFolder temporary;
   fs::path folder = temporary.path() / "device";
   DeviceError problem;
 };
@@ -61,23 +61,23 @@ TEST_F(DeviceFolderTest, ADeviceIsMadeInAnEmptyFolderAndRemembersItsOptions) {
 }
 
 TEST_F(DeviceFolderTest, AFolderThatHoldsSomethingIsRefusedAndLeftAsItIs) {
-  testing::putFile(folder / "letter.txt", "dear");
+  fakes::putFile(folder / "letter.txt", "dear");
   EXPECT_FALSE(initialize());
   EXPECT_EQ(problem.problem, DeviceProblem::Exists);
   EXPECT_EQ(std::distance(fs::directory_iterator(folder), fs::directory_iterator()), 1);
-  EXPECT_EQ(testing::fileContents(folder / "letter.txt"), "dear");
+  EXPECT_EQ(fakes::fileText(folder / "letter.txt"), "dear");
 }
 
 TEST_F(DeviceFolderTest, AnExistingDeviceIsNotMadeAnew) {
   ASSERT_TRUE(initialize());
-  testing::putFile(folder / "root/var/mobile/Media/photo", "kept");
+  fakes::putFile(folder / "root/var/mobile/Media/photo", "kept");
   EXPECT_FALSE(initialize());
   EXPECT_EQ(problem.problem, DeviceProblem::Exists);
-  EXPECT_EQ(testing::fileContents(folder / "root/var/mobile/Media/photo"), "kept");
+  EXPECT_EQ(fakes::fileText(folder / "root/var/mobile/Media/photo"), "kept");
 }
 
 TEST_F(DeviceFolderTest, AFileInThePlaceOfTheFolderIsRefused) {
-  testing::putFile(folder, "a file");
+  fakes::putFile(folder, "a file");
   EXPECT_FALSE(initialize());
   EXPECT_EQ(problem.problem, DeviceProblem::Exists);
   expectProblem(DeviceProblem::Foreign);
@@ -92,7 +92,7 @@ TEST_F(DeviceFolderTest, AMissingOrEmptyFolderIsNoDeviceYet) {
 }
 
 TEST_F(DeviceFolderTest, AFolderWithOtherThingsIsForeign) {
-  testing::putFile(folder / "letter.txt", "dear");
+  fakes::putFile(folder / "letter.txt", "dear");
   expectProblem(DeviceProblem::Foreign);
   EXPECT_FALSE(fs::exists(folder / "lock")) << "nothing is made in a foreign folder";
 }
@@ -108,7 +108,7 @@ TEST_F(DeviceFolderTest, ADatabaseOfSomethingElseIsForeign) {
 }
 
 TEST_F(DeviceFolderTest, ATextFileCalledLikeTheDatabaseIsForeign) {
-  testing::putFile(folder / "device.db", std::string(4096, 'x'));
+  fakes::putFile(folder / "device.db", std::string(4096, 'x'));
   expectProblem(DeviceProblem::Foreign);
 }
 
@@ -123,24 +123,24 @@ TEST_F(DeviceFolderTest, ADeviceOfANewerVersionIsForeignAndSaysSo) {
 TEST_F(DeviceFolderTest, OverwrittenDatabasePagesAreDamage) {
   ASSERT_TRUE(initialize());
   removeLogFiles();
-  std::string bytes = testing::fileContents(folder / "device.db");
+  std::string bytes = fakes::fileText(folder / "device.db");
   ASSERT_GT(bytes.size(), 8192U);
   std::fill(bytes.begin() + 4096, bytes.end(), '\x5a');
-  testing::putFile(folder / "device.db", bytes);
+  fakes::putFile(folder / "device.db", bytes);
   expectProblem(DeviceProblem::Damaged);
 }
 
 TEST_F(DeviceFolderTest, AnOverwrittenDatabaseHeaderIsDamage) {
   ASSERT_TRUE(initialize());
   removeLogFiles();
-  testing::putFile(folder / "device.db", std::string(8192, 'x'));
+  fakes::putFile(folder / "device.db", std::string(8192, 'x'));
   expectProblem(DeviceProblem::Damaged);
 }
 
 TEST_F(DeviceFolderTest, ATruncatedOrMissingDatabaseIsDamage) {
   ASSERT_TRUE(initialize());
   removeLogFiles();
-  testing::putFile(folder / "device.db", "");
+  fakes::putFile(folder / "device.db", "");
   expectProblem(DeviceProblem::Damaged);
   fs::remove(folder / "device.db");
   expectProblem(DeviceProblem::Damaged);
@@ -154,8 +154,8 @@ TEST_F(DeviceFolderTest, MissingFilesOfThePhoneAreDamage) {
 
 TEST_F(DeviceFolderTest, AMakingThatBrokeOffIsNoDeviceAndIsMadeAgain) {
   ASSERT_TRUE(initialize());
-  testing::putFile(folder / "unfinished", "");
-  testing::putFile(folder / "root/half", "");
+  fakes::putFile(folder / "unfinished", "");
+  fakes::putFile(folder / "root/half", "");
   fs::resize_file(folder / "device.db", 100);
   expectProblem(DeviceProblem::Missing);
   ASSERT_TRUE(initialize()) << problem.message;

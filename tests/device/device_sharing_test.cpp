@@ -21,7 +21,7 @@ std::map<std::string, std::string> pictureOf(const fs::path& folder) {
     lstat(entry.path().c_str(), &status);
     picture[entry.path()] = std::to_string(status.st_mtim.tv_sec) + "." +
                             std::to_string(status.st_mtim.tv_nsec) +
-                            (entry.is_regular_file() ? testing::fileContents(entry.path()) : "");
+                            (entry.is_regular_file() ? fakes::fileText(entry.path()) : "");
   }
   return picture;
 }

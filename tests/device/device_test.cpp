@@ -38,11 +38,11 @@ fs::path DeviceTest::onDisk(std::string_view phonePath) const {
 }
 
 void DeviceTest::putFile(std::string_view phonePath, std::string_view text) {
-  testing::putFile(onDisk(phonePath), text);
+  fakes::putFile(onDisk(phonePath), text);
 }
 
 std::string DeviceTest::textAt(std::string_view phonePath) {
-  return testing::fileContents(onDisk(phonePath));
+  return fakes::fileText(onDisk(phonePath));
 }
 
 FileLocation DeviceTest::stage(const PackageArchive& archive) {

@@ -11,13 +11,13 @@
 
 #include "device/embedded_device.h"
 #include "tests/device/package_archive.h"
-#include "tests/device/temporary_folder.h"
 #include "tests/fakes/call_trace.h"
 #include "tests/fakes/fake_sync_host.h"
+#include "tests/fakes/temporary_folder.h"
 
 namespace appsync::device {
 
-using testing::TemporaryFolder;
+using fakes::TemporaryFolder;
 
 /// Runs `body` in a forked process; its exit status, or 128 and the signal that ended it.
 int inOtherProcess(const std::function<int()>& body);
@@ -54,7 +54,7 @@ class DeviceTest : public ::testing::Test {
   /// The texts of the device's own log lines.
   std::vector<std::string> logTexts();
 
-  TemporaryFolder temporary;
+  fakes::TemporaryFolder temporary;
   std::filesystem::path folder = temporary.path() / "device";
   std::unique_ptr<EmbeddedDevice> device;
   std::optional<Error> error;

@@ -20,7 +20,7 @@ bool becomeOrdinaryUser() {
 }
 
 TEST(DirectoryTree, WithClosedDirectoriesInItIsRemovedByItsOwner) {
-  const TemporaryFolder temporary;
+  const fakes::TemporaryFolder temporary;
   if (geteuid() == 0) {
     ASSERT_EQ(chown(temporary.path().c_str(), Nobody, Nobody), 0);
   }
@@ -29,7 +29,7 @@ TEST(DirectoryTree, WithClosedDirectoriesInItIsRemovedByItsOwner) {
     for (const mode_t mode : {0000, 0100, 0400, 0500}) {
       const auto closed = temporary / "tree" / std::to_string(mode);
       std::filesystem::create_directories(closed / "inner");
-      testing::putFile(closed / "inner" / "file", "text");
+      fakes::putFile(closed / "inner" / "file", "text");
       chmod((closed / "inner").c_str(), mode);
       chmod(closed.c_str(), mode);
     }
@@ -40,9 +40,9 @@ TEST(DirectoryTree, WithClosedDirectoriesInItIsRemovedByItsOwner) {
 }
 
 TEST(DirectoryTree, ALinkInItIsRemovedAndWhatItLeadsToIsNot) {
-  const TemporaryFolder temporary;
+  const fakes::TemporaryFolder temporary;
   const auto outside = temporary / "outside";
-  testing::putFile(outside / "file", "text");
+  fakes::putFile(outside / "file", "text");
   std::filesystem::permissions(outside, std::filesystem::perms(0500));
   std::filesystem::create_directories(temporary / "tree");
   std::filesystem::create_directory_symlink(outside, temporary / "tree/link");

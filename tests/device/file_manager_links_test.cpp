@@ -7,7 +7,7 @@
 
 #include "device/files/file_manager.h"
 #include "device/files/file_receiver.h"
-#include "tests/device/temporary_folder.h"
+#include "tests/fakes/temporary_folder.h"
 
 namespace appsync::device::testing {
 namespace {
@@ -19,8 +19,8 @@ namespace fs = std::filesystem;
 class PlantedLinks : public ::testing::Test {
  protected:
   PlantedLinks() {
-    putFile(folder_ / "outside/secret", "secret");
-    putFile(folder_ / "root/inside/a", "a");
+    fakes::putFile(folder_ / "outside/secret", "secret");
+    fakes::putFile(folder_ / "root/inside/a", "a");
     const fs::path root = folder_ / "root";
     const std::string up = "../../../../../../../../../../..";
     fs::create_symlink(folder_ / "outside", root / "absolute");
@@ -30,14 +30,14 @@ class PlantedLinks : public ::testing::Test {
     fs::create_symlink(folder_ / "outside/secret", root / "file");
     fs::create_symlink("relative", root / "chain");
     fs::create_symlink("loop", root / "loop");
-    before_ = snapshot(folder_ / "outside");
+    before_ = fakes::snapshot(folder_ / "outside");
   }
 
-  void expectOutsideUntouched() const { EXPECT_EQ(snapshot(folder_ / "outside"), before_); }
+  void expectOutsideUntouched() const { EXPECT_EQ(fakes::snapshot(folder_ / "outside"), before_); }
 
   const std::vector<std::string> directoryLinks_{
       "/absolute", "/relative", "/climbing", "/magic", "/chain", "/loop", "/inside/../relative"};
-  const TemporaryFolder folder_;
+  const fakes::TemporaryFolder folder_;
   std::map<std::string, std::string> before_;
   const bool made_ = fs::create_directory(folder_ / "root");
   ConfinedFileManager files_{folder_ / "root"};
@@ -97,7 +97,7 @@ TEST_F(PlantedLinks, ThatStayInsideAreFollowed) {
   EXPECT_EQ(asText(*files_.contentsAtPath("/inner/a")), "a");
   EXPECT_EQ(asText(*files_.contentsAtPath("/inside/around/around/a")), "a");
   EXPECT_TRUE(files_.writeAtomically("/inner/b", asBytes("b")));
-  EXPECT_EQ(fileContents(folder_ / "root/inside/b"), "b");
+  EXPECT_EQ(fakes::fileText(folder_ / "root/inside/b"), "b");
 }
 
 TEST_F(PlantedLinks, ParentStepsEndAtTheRoot) {
@@ -134,9 +134,9 @@ TEST_F(PlantedLinks, ExchangedUnderAWalkNeverLeadItOut) {
 }
 
 TEST(ConfinementBeneath, RefusesLinksAndParentStepsAltogether) {
-  const TemporaryFolder folder;
-  putFile(folder / "target/inner/a", "a");
-  putFile(folder / "witness", "w");
+  const fakes::TemporaryFolder folder;
+  fakes::putFile(folder / "target/inner/a", "a");
+  fakes::putFile(folder / "witness", "w");
   fs::create_symlink("inner", folder / "target/link");
   const ConfinedDirectory target = ConfinedDirectory::open(folder / "target", Confinement::Beneath);
   EXPECT_TRUE(target.openAt("inner/a", O_RDONLY));

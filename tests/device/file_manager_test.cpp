@@ -9,7 +9,7 @@
 #include <csignal>
 #include <thread>
 
-#include "tests/device/temporary_folder.h"
+#include "tests/fakes/temporary_folder.h"
 
 namespace appsync::device::testing {
 namespace {
@@ -21,7 +21,7 @@ class FileManagerTest : public ::testing::Test {
   fs::path onDisk(std::string_view path) const { return folder_ / ("root" + std::string(path)); }
   std::int64_t code() const { return error_ ? error_->code : 0; }
 
-  const TemporaryFolder folder_;
+  const fakes::TemporaryFolder folder_;
   const bool made_ = fs::create_directory(folder_ / "root");
   ConfinedFileManager files_{folder_ / "root"};
   std::optional<Error> error_;
@@ -51,7 +51,7 @@ TEST_F(FileManagerTest, RefusesPathsThatAreNotThePhones) {
 TEST_F(FileManagerTest, WriteLeavesExactlyTheFile) {
   EXPECT_TRUE(files_.writeAtomically("/a", asBytes("one")));
   EXPECT_TRUE(files_.writeAtomically("/a", asBytes("two")));
-  EXPECT_EQ(snapshot(folder_ / "root"),
+  EXPECT_EQ(fakes::snapshot(folder_ / "root"),
             (std::map<std::string, std::string>{{"a", "file 0644 two"}}));
 }
 
@@ -62,7 +62,7 @@ TEST_F(FileManagerTest, FailedWriteLeavesNoTemporaryFileAndTheOldBytes) {
   EXPECT_FALSE(files_.writeAtomically("/missing/a", asBytes("x"), &error_));
   EXPECT_EQ(code(), ENOENT);
 
-  putFile(onDisk("/a"), "old");
+  fakes::putFile(onDisk("/a"), "old");
   rlimit before{};
   ASSERT_EQ(::getrlimit(RLIMIT_FSIZE, &before), 0);
   const auto handler = std::signal(SIGXFSZ, SIG_IGN);
@@ -73,7 +73,7 @@ TEST_F(FileManagerTest, FailedWriteLeavesNoTemporaryFileAndTheOldBytes) {
   std::signal(SIGXFSZ, handler);
   EXPECT_FALSE(written);
   EXPECT_EQ(code(), EFBIG);
-  EXPECT_EQ(snapshot(folder_ / "root"),
+  EXPECT_EQ(fakes::snapshot(folder_ / "root"),
             (std::map<std::string, std::string>{{"a", "file 0644 old"},
                                                 {"directory", "folder 0755"},
                                                 {"directory/inner", "folder 0755"}}));
@@ -104,7 +104,7 @@ TEST_F(FileManagerTest, OnlyRegularFilesAreReadAndAPipeDoesNotBlock) {
 }
 
 TEST_F(FileManagerTest, FilesPastTheLimitAreNotRead) {
-  putFile(onDisk("/large"), "");
+  fakes::putFile(onDisk("/large"), "");
   fs::resize_file(onDisk("/large"), ConfinedFileManager::MaximumContents + 1);
   EXPECT_FALSE(files_.contentsAtPath("/large", &error_));
   EXPECT_EQ(code(), EFBIG);
@@ -144,38 +144,38 @@ TEST_F(FileManagerTest, RootItselfIsNeitherRemovedNorMovedNorReplaced) {
 }
 
 TEST_F(FileManagerTest, CopyTakesATreeWithModesAndLinksAsTheyAre) {
-  putFile(onDisk("/from/inner/script"), "run");
+  fakes::putFile(onDisk("/from/inner/script"), "run");
   ::chmod(onDisk("/from/inner/script").c_str(), 0755);
   fs::create_symlink("../elsewhere", onDisk("/from/link"));
   ASSERT_TRUE(files_.copyItem("/from", "/to", &error_));
-  EXPECT_EQ(snapshot(onDisk("/to")), snapshot(onDisk("/from")));
-  EXPECT_EQ(snapshot(onDisk("/to")).at("link"), "link ../elsewhere");
+  EXPECT_EQ(fakes::snapshot(onDisk("/to")), fakes::snapshot(onDisk("/from")));
+  EXPECT_EQ(fakes::snapshot(onDisk("/to")).at("link"), "link ../elsewhere");
 }
 
 TEST_F(FileManagerTest, FailedCopyLeavesNothing) {
-  putFile(onDisk("/from/a"), "x");
+  fakes::putFile(onDisk("/from/a"), "x");
   ASSERT_EQ(::mkfifo(onDisk("/from/pipe").c_str(), 0644), 0);
-  const auto before = snapshot(folder_ / "root");
+  const auto before = fakes::snapshot(folder_ / "root");
   EXPECT_FALSE(files_.copyItem("/from", "/to", &error_));
   EXPECT_EQ(code(), EINVAL);
-  EXPECT_EQ(snapshot(folder_ / "root"), before);
+  EXPECT_EQ(fakes::snapshot(folder_ / "root"), before);
 }
 
 TEST_F(FileManagerTest, CopyIntoItselfIsRefused) {
-  putFile(onDisk("/a/b/c"), "x");
-  const auto before = snapshot(folder_ / "root");
+  fakes::putFile(onDisk("/a/b/c"), "x");
+  const auto before = fakes::snapshot(folder_ / "root");
   EXPECT_FALSE(files_.copyItem("/a", "/a/copy", &error_));
   EXPECT_EQ(code(), EINVAL);
   EXPECT_FALSE(files_.copyItem("/a", "/a/b/copy", &error_));
   EXPECT_EQ(code(), EINVAL);
-  EXPECT_EQ(snapshot(folder_ / "root"), before);
+  EXPECT_EQ(fakes::snapshot(folder_ / "root"), before);
 }
 
 TEST_F(FileManagerTest, RemovesDeepAndWideTrees) {
   std::string deep = "/d";
   for (int i = 0; i < 200; ++i) deep += "/d";
   ASSERT_TRUE(files_.createDirectory(deep, true, {}));
-  for (int i = 0; i < 500; ++i) putFile(onDisk("/d/f" + std::to_string(i)), "x");
+  for (int i = 0; i < 500; ++i) fakes::putFile(onDisk("/d/f" + std::to_string(i)), "x");
   EXPECT_TRUE(files_.removeItem("/d", &error_));
   EXPECT_TRUE(fs::is_empty(folder_ / "root"));
 }
@@ -197,11 +197,11 @@ TEST_F(FileManagerTest, ManyThreadsMayMakeTheSameFolders) {
 }
 
 TEST_F(FileManagerTest, TemporaryFilesOfKilledProcessesCanBeSwept) {
-  putFile(onDisk("/box/.appsync-0123456789abcdef"), "left over");
-  putFile(onDisk("/box/inner/.appsync-fedcba9876543210"), "left over");
-  putFile(onDisk("/box/.appsync-notes"), "kept");
+  fakes::putFile(onDisk("/box/.appsync-0123456789abcdef"), "left over");
+  fakes::putFile(onDisk("/box/inner/.appsync-fedcba9876543210"), "left over");
+  fakes::putFile(onDisk("/box/.appsync-notes"), "kept");
   files_.removeTemporaries("/box");
-  EXPECT_EQ(snapshot(onDisk("/box")),
+  EXPECT_EQ(fakes::snapshot(onDisk("/box")),
             (std::map<std::string, std::string>{{".appsync-notes", "file 0644 kept"},
                                                 {"inner", "folder 0755"}}));
 }

@@ -2,7 +2,7 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/device/temporary_folder.h"
+#include "tests/fakes/temporary_folder.h"
 
 namespace appsync::device::testing {
 namespace {
@@ -11,7 +11,7 @@ namespace fs = std::filesystem;
 
 class FileReceiverTest : public ::testing::Test {
  protected:
-  const TemporaryFolder folder_;
+  const fakes::TemporaryFolder folder_;
   const bool made_ = fs::create_directory(folder_ / "root");
   ConfinedFileManager files_{folder_ / "root"};
   std::optional<Error> error_;
@@ -25,26 +25,26 @@ TEST_F(FileReceiverTest, FileAppearsWholeWhenItIsFinished) {
   EXPECT_TRUE(receiver->append(asBytes("two"), nullptr));
   EXPECT_FALSE(files_.fileExists("/staging/deep/package"));
   EXPECT_TRUE(receiver->finish(nullptr));
-  EXPECT_EQ(snapshot(folder_ / "root/staging/deep"),
+  EXPECT_EQ(fakes::snapshot(folder_ / "root/staging/deep"),
             (std::map<std::string, std::string>{{"package", "file 0644 one two"}}));
 }
 
 TEST_F(FileReceiverTest, BrokenOffTransferLeavesWhatStoodThere) {
-  putFile(folder_ / "root/staging/package", "old");
+  fakes::putFile(folder_ / "root/staging/package", "old");
   auto receiver = receiveInto(files_, "/staging/package", &error_);
   ASSERT_TRUE(receiver);
   EXPECT_TRUE(receiver->append(asBytes("new"), nullptr));
   receiver.reset();
-  EXPECT_EQ(snapshot(folder_ / "root/staging"),
+  EXPECT_EQ(fakes::snapshot(folder_ / "root/staging"),
             (std::map<std::string, std::string>{{"package", "file 0644 old"}}));
 }
 
 TEST_F(FileReceiverTest, ReplacesAnOlderFile) {
-  putFile(folder_ / "root/package", "old");
+  fakes::putFile(folder_ / "root/package", "old");
   const auto receiver = receiveInto(files_, "/package", &error_);
   EXPECT_TRUE(receiver->append(asBytes("new"), nullptr));
   EXPECT_TRUE(receiver->finish(nullptr));
-  EXPECT_EQ(fileContents(folder_ / "root/package"), "new");
+  EXPECT_EQ(fakes::fileText(folder_ / "root/package"), "new");
 }
 
 TEST_F(FileReceiverTest, NothingComesAfterTheEnd) {
@@ -53,11 +53,11 @@ TEST_F(FileReceiverTest, NothingComesAfterTheEnd) {
   EXPECT_FALSE(receiver->append(asBytes("late"), &error_));
   EXPECT_FALSE(receiver->finish(&error_));
   EXPECT_EQ(error_->code, EBADF);
-  EXPECT_EQ(fileContents(folder_ / "root/package"), "");
+  EXPECT_EQ(fakes::fileText(folder_ / "root/package"), "");
 }
 
 TEST_F(FileReceiverTest, CannotBeginWhereNoFileCanBe) {
-  putFile(folder_ / "root/file", "x");
+  fakes::putFile(folder_ / "root/file", "x");
   fs::create_directory(folder_ / "root/folder");
   for (const auto& [path, code] :
        {std::pair("", EINVAL), std::pair("relative", EINVAL), std::pair("/", EINVAL),
@@ -68,7 +68,7 @@ TEST_F(FileReceiverTest, CannotBeginWhereNoFileCanBe) {
     EXPECT_EQ(error_->code, code) << path;
   }
   EXPECT_FALSE(receiveInto(files_, "/file/inner", &error_));
-  EXPECT_EQ(fileContents(folder_ / "root/file"), "x");
+  EXPECT_EQ(fakes::fileText(folder_ / "root/file"), "x");
 }
 
 TEST_F(FileReceiverTest, OutlivesTheFileManager) {

@@ -8,7 +8,7 @@
 #include <thread>
 
 #include "device/journal/log_format.h"
-#include "tests/device/temporary_folder.h"
+#include "tests/fakes/temporary_folder.h"
 
 namespace appsync::device::testing {
 namespace {
@@ -30,7 +30,7 @@ class LogFilesTest : public ::testing::Test {
     log.write(LogChannel::TWLogCategorySyncBundle, LogLevel::Default, text);
   }
 
-  const TemporaryFolder folder_;
+  const fakes::TemporaryFolder folder_;
   const fs::path newest_ = folder_ / "log/device.log";
 };
 
@@ -58,7 +58,7 @@ TEST_F(LogFilesTest, RecordsComeBackAsTheyWereWritten) {
 TEST_F(LogFilesTest, EveryRecordIsExactlyOneLine) {
   LogFiles log(folder_ / "log", true);
   say(log, "first\nsecond\tthird\r\x1b[31m\\");
-  EXPECT_THAT(fileContents(newest_),
+  EXPECT_THAT(fakes::fileText(newest_),
               MatchesRegex("[0-9]+-[0-9]+-[0-9]+T[0-9]+:[0-9]+:[0-9]+\\.[0-9]+Z\tdefault\t"
                            "TWLogCategorySyncBundle\tfirst.nsecond.tthird.x0d.x1b.31m..\n"));
 }
@@ -109,9 +109,9 @@ TEST_F(LogFilesTest, TornLastLineIsPassedOverAndSpoilsNothingAfterIt) {
     LogFiles log(folder_ / "log", true);
     say(log, "whole");
   }
-  const std::string whole = fileContents(newest_);
+  const std::string whole = fakes::fileText(newest_);
   for (std::size_t size = 1; size < whole.size(); ++size) {
-    putFile(newest_, whole + whole.substr(0, size));
+    fakes::putFile(newest_, whole + whole.substr(0, size));
     EXPECT_THAT(texts(), ElementsAre("whole")) << size;
     LogFiles log(folder_ / "log", true);
     say(log, "after");
@@ -123,8 +123,9 @@ TEST_F(LogFilesTest, TornLastLineIsPassedOverAndSpoilsNothingAfterIt) {
 }
 
 TEST_F(LogFilesTest, LinesThatAreNoRecordsArePassedOver) {
-  putFile(newest_, "nonsense\n\n\t\t\t\n2023-11-14T22:13:20.000042Z\tloud\tTWLog\tx\n" +
-                       formatLogLine({}, LogChannel::TWLogCategoryFramework, LogLevel::Info, "ok"));
+  fakes::putFile(newest_,
+                 "nonsense\n\n\t\t\t\n2023-11-14T22:13:20.000042Z\tloud\tTWLog\tx\n" +
+                     formatLogLine({}, LogChannel::TWLogCategoryFramework, LogLevel::Info, "ok"));
   EXPECT_THAT(texts(), ElementsAre("ok"));
 }
 

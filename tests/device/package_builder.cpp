@@ -138,12 +138,12 @@ namespace {
 
 Outcome unpackFrom(int fd, std::optional<std::string_view> identifier,
                    const PackageLimits& limits) {
-  const TemporaryFolder arena;
+  const fakes::TemporaryFolder arena;
   std::filesystem::create_directories(arena / "outer/target");
-  putFile(arena / "outer/witness", "witness");
-  putFile(arena / "witness", "witness");
+  fakes::putFile(arena / "outer/witness", "witness");
+  fakes::putFile(arena / "witness", "witness");
   const auto beside = [&] {
-    std::map<std::string, std::string> items = snapshot(arena.path());
+    std::map<std::string, std::string> items = fakes::snapshot(arena.path());
     std::erase_if(items, [](const auto& item) { return item.first.starts_with("outer/target/"); });
     return items;
   };
@@ -152,7 +152,7 @@ Outcome unpackFrom(int fd, std::optional<std::string_view> identifier,
       ::open((arena / "outer/target").c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   Outcome outcome;
   outcome.package = extractPackage(fd, target.get(), identifier, limits, &outcome.error);
-  outcome.files = snapshot(arena / "outer/target");
+  outcome.files = fakes::snapshot(arena / "outer/target");
   outcome.outsideTouched = beside() != before;
   return outcome;
 }

@@ -9,7 +9,7 @@
 
 #include "device/base/file_descriptor.h"
 #include "device/packages/package_extractor.h"
-#include "tests/device/temporary_folder.h"
+#include "tests/fakes/temporary_folder.h"
 
 namespace appsync::device::testing {
 

@@ -73,7 +73,7 @@ TEST_F(PackageInstallTest, ARefusedUpdateLeavesTheOldVersionWhole) {
   ASSERT_TRUE(installPackage(Id, "1.0"));
   putFile(joinPath(Data, "notes"), "mine");
   ASSERT_TRUE(installPlaceholder(Id, "2.0"));
-  const auto before = testing::snapshot(onDisk(*record(Id)->bundleContainerPath));
+  const auto before = fakes::snapshot(onDisk(*record(Id)->bundleContainerPath));
   const Lines registered = registry();
 
   EXPECT_FALSE(installPackage(PackageArchive().addApplication("com.example.other", "2.0"), Id));
@@ -83,7 +83,7 @@ TEST_F(PackageInstallTest, ARefusedUpdateLeavesTheOldVersionWhole) {
   EXPECT_FALSE(installPackage(PackageArchive().add("no archive of an application", ""), Id));
 
   EXPECT_EQ(registry(), registered);
-  EXPECT_EQ(testing::snapshot(onDisk(*record(Id)->bundleContainerPath)), before);
+  EXPECT_EQ(fakes::snapshot(onDisk(*record(Id)->bundleContainerPath)), before);
   EXPECT_EQ(textAt(joinPath(Data, "notes")), "mine");
   EXPECT_EQ(containerCount(), 2U) << "nothing of the refused packages stays";
 }
@@ -175,7 +175,7 @@ TEST_F(PackageInstallTest, ARefusedPackageLeavesTheRestoredDataWaiting) {
 
 TEST_F(PackageInstallTest, APackageReachedThroughALinkOutOfThePhoneIsNotFound) {
   const auto outside = temporary.path() / "outside.pkg";
-  testing::putFile(outside, asText(PackageArchive().addApplication(Id, "1.0").bytes()));
+  fakes::putFile(outside, asText(PackageArchive().addApplication(Id, "1.0").bytes()));
   const auto link = onDisk("/var/mobile/Media/PublicStaging/link.pkg");
   std::filesystem::create_symlink(outside, link);
   EXPECT_FALSE(device->appRegistry().installApplication(

@@ -44,8 +44,8 @@ TEST(PackageLimits, LetWellCompressedFilesOfOrdinarySizePass) {
 }
 
 TEST(PackageLimits, CountEmptySpaceBehindTheArchiveToo) {
-  const TemporaryFolder folder;
-  putFile(folder / "package", buildArchive(ArchiveForm::TarGz, sampleEntries()));
+  const fakes::TemporaryFolder folder;
+  fakes::putFile(folder / "package", buildArchive(ArchiveForm::TarGz, sampleEntries()));
   const std::string command =
       "head -c 100000000 /dev/zero | gzip >> '" + (folder / "package").string() + "'";
   ASSERT_EQ(std::system(command.c_str()), 0);
@@ -129,7 +129,7 @@ bool mountSmallDisk(const std::filesystem::path& folder) {
 /// Unpacks into a file system of 64 KiB that only a child process sees; the code of the refusal, 0
 /// for none, -1 where this machine lets nobody make such a file system.
 int refusalOnSmallDisk(const std::string& package) {
-  const TemporaryFolder folder;
+  const fakes::TemporaryFolder folder;
   const FileDescriptor file = memoryFile(package);
   const pid_t child = ::fork();
   if (child == 0) {

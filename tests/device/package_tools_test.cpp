@@ -58,22 +58,22 @@ std::vector<Tool> tools() {
 }
 
 void makeSample(const fs::path& folder) {
-  putFile(folder / "Sample.app/Info.plist", infoPlist());
-  putFile(folder / "Sample.app/run.sh", "#!/bin/sh\necho hello\n");
-  putFile(folder / "Sample.app/not-marked", "x");
-  putFile(folder / "Sample.app/empty", "");
-  putFile(folder / "Sample.app/with space/Gr\xc3\xbc\xc3\x9f \xe4\xb8\xad\xf0\x9f\x98\x80",
-          "names");
-  putFile(folder / "Sample.app/holes", std::string(200'000, '\0') + "middle");
+  fakes::putFile(folder / "Sample.app/Info.plist", infoPlist());
+  fakes::putFile(folder / "Sample.app/run.sh", "#!/bin/sh\necho hello\n");
+  fakes::putFile(folder / "Sample.app/not-marked", "x");
+  fakes::putFile(folder / "Sample.app/empty", "");
+  fakes::putFile(folder / "Sample.app/with space/Gr\xc3\xbc\xc3\x9f \xe4\xb8\xad\xf0\x9f\x98\x80",
+                 "names");
+  fakes::putFile(folder / "Sample.app/holes", std::string(200'000, '\0') + "middle");
   fs::resize_file(folder / "Sample.app/holes", 500'000);
-  putFile(folder / "Sample.app/large", [] {
+  fakes::putFile(folder / "Sample.app/large", [] {
     std::string text;
     for (int i = 0; i < 60'000; ++i) text += std::to_string(i * 7919);
     return text;
   }());
   fs::create_directories(folder / "Sample.app/Empty folder");
-  putFile(folder / "HalvoMetadata.plist", "metadata");
-  putFile(folder / "HalvoArtwork", "picture");
+  fakes::putFile(folder / "HalvoMetadata.plist", "metadata");
+  fakes::putFile(folder / "HalvoArtwork", "picture");
   ::chmod((folder / "Sample.app/run.sh").c_str(), 0755);
   ::chmod((folder / "Sample.app/not-marked").c_str(), 0640);
 }
@@ -81,7 +81,7 @@ void makeSample(const fs::path& folder) {
 class PackageOfTool : public ::testing::TestWithParam<Tool> {};
 
 TEST_P(PackageOfTool, UnpacksToWhatWentIn) {
-  const TemporaryFolder folder;
+  const fakes::TemporaryFolder folder;
   const fs::path source = folder / "source";
   makeSample(source);
   const std::string command = "cd '" + source.string() + "' && { " + GetParam().command + "; }";
@@ -91,7 +91,7 @@ TEST_P(PackageOfTool, UnpacksToWhatWentIn) {
   ASSERT_EQ(outcome.result(), "ok") << outcome.reason();
   EXPECT_FALSE(outcome.outsideTouched);
   ::chmod((source / "Sample.app/not-marked").c_str(), 0644);
-  std::map<std::string, std::string> expected = snapshot(source);
+  std::map<std::string, std::string> expected = fakes::snapshot(source);
   if (GetParam().name == "InfoZipWithoutFolders") expected.erase("Sample.app/Empty folder");
   EXPECT_EQ(outcome.files, expected);
   EXPECT_EQ(outcome.package->bundleName, "Sample.app");
@@ -109,7 +109,7 @@ TEST(PackageOfTool, EncryptedIsRefusedAsSuch) {
   for (const std::string how : {"zip -q -P secret -r ../package.zip",
                                 "7zz a -bso0 -bsp0 -tzip "
                                 "-psecret -mem=AES256 ../package.zip"}) {
-    const TemporaryFolder folder;
+    const fakes::TemporaryFolder folder;
     makeSample(folder / "source");
     const std::string command =
         "cd '" + (folder / "source").string() + "' && " + how + " Sample.app";
@@ -120,7 +120,7 @@ TEST(PackageOfTool, EncryptedIsRefusedAsSuch) {
 }
 
 TEST(PackageOfTool, ThatCompressedInAWayNobodyReadsIsRefusedWithTheReason) {
-  const TemporaryFolder folder;
+  const fakes::TemporaryFolder folder;
   makeSample(folder / "source");
   const std::string command = "cd '" + (folder / "source").string() +
                               "' && 7zz a -bso0 -bsp0 -tzip -mm=Deflate64 ../p.zip Sample.app";
@@ -131,7 +131,7 @@ TEST(PackageOfTool, ThatCompressedInAWayNobodyReadsIsRefusedWithTheReason) {
 }
 
 TEST(PackageOfTool, OfTheFormatsNotTakenIsNoArchive) {
-  const TemporaryFolder folder;
+  const fakes::TemporaryFolder folder;
   makeSample(folder / "source");
   const std::string command = "cd '" + (folder / "source").string() +
                               "' && 7zz a -bso0 -bsp0 -t7z ../package.7z Sample.app && "

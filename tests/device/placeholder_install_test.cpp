@@ -36,8 +36,8 @@ TEST_F(PlaceholderInstallTest, ThePlaceholderIsACopyOfItsBundle) {
   EXPECT_EQ(placeholder->installType, InstallType::Sync);
   EXPECT_GT(placeholder->staticDiskUsage, 0U);
   EXPECT_EQ(*placeholder->bundlePath, *placeholder->bundleContainerPath + "/com.example.a.app");
-  EXPECT_EQ(testing::snapshot(onDisk(*placeholder->bundlePath)),
-            testing::snapshot(onDisk(BundleInTmp)));
+  EXPECT_EQ(fakes::snapshot(onDisk(*placeholder->bundlePath)),
+            fakes::snapshot(onDisk(BundleInTmp)));
 }
 
 TEST_F(PlaceholderInstallTest, ItsStoreMetadataIsKeptAsReceived) {
@@ -85,10 +85,10 @@ TEST_F(PlaceholderInstallTest, ABundleWithoutAUsableInfoPlistIsRefusedByName) {
 
 TEST_F(PlaceholderInstallTest, ARefusedPlaceholderLeavesTheFormerOneWhole) {
   ASSERT_TRUE(installPlaceholder(Id, "1.0"));
-  const auto before = testing::snapshot(onDisk(*record(Id, true)->bundleContainerPath));
+  const auto before = fakes::snapshot(onDisk(*record(Id, true)->bundleContainerPath));
   EXPECT_FALSE(installBundle("no property list"));
   EXPECT_EQ(registry(), Lines{"com.example.a 1.0 (placeholder)"});
-  EXPECT_EQ(testing::snapshot(onDisk(*record(Id, true)->bundleContainerPath)), before);
+  EXPECT_EQ(fakes::snapshot(onDisk(*record(Id, true)->bundleContainerPath)), before);
 }
 
 }  // namespace

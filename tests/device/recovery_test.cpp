@@ -52,12 +52,12 @@ TEST_F(RecoveryTest, AFileThatWasBeingReceivedIsRemoved) {
 
 TEST_F(RecoveryTest, ALinkInThePlaceOfAContainerIsRemovedAndNotFollowed) {
   const auto outside = temporary.path() / "outside";
-  testing::putFile(outside / "precious", "kept");
+  fakes::putFile(outside / "precious", "kept");
   std::filesystem::create_directory_symlink(outside,
                                             onDisk("/var/mobile/Containers/Applications/LINK"));
   reopen();
   EXPECT_EQ(containerCount(), 0U);
-  EXPECT_EQ(testing::fileContents(outside / "precious"), "kept");
+  EXPECT_EQ(fakes::fileText(outside / "precious"), "kept");
 }
 
 TEST_F(RecoveryTest, InstallsThatNobodyCarriesOnArePausedAndCanBeTakenUpAgain) {

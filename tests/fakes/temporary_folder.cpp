@@ -1,4 +1,4 @@
-#include "tests/device/temporary_folder.h"
+#include "tests/fakes/temporary_folder.h"
 
 #include <stdlib.h>
 #include <unistd.h>
@@ -8,7 +8,7 @@
 #include <iterator>
 #include <stdexcept>
 
-namespace appsync::device::testing {
+namespace appsync::fakes {
 
 namespace fs = std::filesystem;
 
@@ -33,7 +33,7 @@ void putFile(const fs::path& path, std::string_view contents) {
   std::ofstream(path, std::ios::binary) << contents;
 }
 
-std::string fileContents(const fs::path& path) {
+std::string fileText(const fs::path& path) {
   std::ifstream file(path, std::ios::binary);
   return {std::istreambuf_iterator<char>(file), {}};
 }
@@ -51,7 +51,7 @@ std::map<std::string, std::string> snapshot(const fs::path& folder) {
     } else if (fs::is_directory(status)) {
       item = std::string("folder ") + permissions;
     } else if (fs::is_regular_file(status)) {
-      item = std::string("file ") + permissions + " " + fileContents(entry.path());
+      item = std::string("file ") + permissions + " " + fileText(entry.path());
     } else {
       item = "special";
     }
@@ -59,4 +59,4 @@ std::map<std::string, std::string> snapshot(const fs::path& folder) {
   return items;
 }
 
-}  // namespace appsync::device::testing
+}  // namespace appsync::fakes

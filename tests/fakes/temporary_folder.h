@@ -5,7 +5,7 @@
 #include <string>
 #include <string_view>
 
-namespace appsync::device::testing {
+namespace appsync::fakes {
 
 /// A new empty folder that disappears with the object.
 class TemporaryFolder {
@@ -28,9 +28,9 @@ std::filesystem::path memoryFolder();
 
 /// Makes missing folders on the way.
 void putFile(const std::filesystem::path& path, std::string_view contents);
-std::string fileContents(const std::filesystem::path& path);
+std::string fileText(const std::filesystem::path& path);
 
 /// Everything below a folder: relative path to "<type><permissions> <contents or link target>".
 std::map<std::string, std::string> snapshot(const std::filesystem::path& folder);
 
-}  // namespace appsync::device::testing
+}  // namespace appsync::fakes

@@ -16,32 +16,6 @@
 namespace appsync::host::testing {
 namespace fs = std::filesystem;
 
-Folder::Folder(const fs::path& parent) {
-  std::string name = (parent / "host-test.XXXXXX").string();
-  if (!::mkdtemp(name.data())) throw std::runtime_error("no temporary folder");
-  path_ = name;
-}
-
-Folder::~Folder() {
-  std::error_code ignored;
-  fs::remove_all(path_, ignored);
-}
-
-std::filesystem::path memoryFolder() {
-  constexpr char Memory[] = "/dev/shm";
-  return ::access(Memory, W_OK) == 0 ? Memory : std::filesystem::temp_directory_path();
-}
-
-void putFile(const fs::path& path, std::string_view contents) {
-  fs::create_directories(path.parent_path());
-  std::ofstream(path, std::ios::binary) << contents;
-}
-
-std::string fileText(const fs::path& path) {
-  std::ifstream file(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(file), {}};
-}
-
 void pack(const fs::path& file, const Entries& entries) {
   const Folder sources;
   const int fd = ::open(file.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);

@@ -6,30 +6,14 @@
 #include <string_view>
 
 #include "platform/property_list.h"
+#include "tests/fakes/temporary_folder.h"
 
 namespace appsync::host::testing {
 
-/// A new empty folder that disappears with the object.
-class Folder {
- public:
-  explicit Folder(const std::filesystem::path& parent = std::filesystem::temp_directory_path());
-  ~Folder();
-  Folder(const Folder&) = delete;
-  Folder& operator=(const Folder&) = delete;
-  const std::filesystem::path& path() const { return path_; }
-  std::filesystem::path operator/(std::string_view name) const { return path_ / name; }
-
- private:
-  std::filesystem::path path_;
-};
-
-/// Where a test that would wait for the disk ten thousand times keeps its folder; what it shows
-/// must need no disk.
-std::filesystem::path memoryFolder();
-
-/// Makes missing folders on the way.
-void putFile(const std::filesystem::path& path, std::string_view contents);
-std::string fileText(const std::filesystem::path& path);
+using Folder = fakes::TemporaryFolder;
+using fakes::fileText;
+using fakes::memoryFolder;
+using fakes::putFile;
 
 /// What an archive holds: entry name to contents.
 using Entries = std::map<std::string, std::string>;

@@ -13,8 +13,8 @@
 namespace appsync::host {
 namespace {
 
+using fakes::memoryFolder;
 using testing::Folder;
-using testing::memoryFolder;
 using Dictionary = PropertyList::Dictionary;
 
 constexpr std::size_t ManyApplications = 500;
@@ -193,7 +193,7 @@ class BrokenRestoreTest : public ::testing::TestWithParam<bool> {
     return paths;
   }
 
-  const Folder folder_{memoryFolder()};
+  const Folder folder_{fakes::memoryFolder()};
   std::unique_ptr<device::EmbeddedDevice> device_;
 };
 

@@ -15,8 +15,8 @@
 namespace appsync::host {
 namespace {
 
+using fakes::memoryFolder;
 using testing::Folder;
-using testing::memoryFolder;
 
 enum class Wish {
   Install,
@@ -59,7 +59,7 @@ class Shelf {
     if (task.wish == Wish::InstallTruncated) std::filesystem::resize_file(file, 2000);
   }
 
-  const Folder folder_{memoryFolder()};
+  const Folder folder_{fakes::memoryFolder()};
 };
 
 /// Calls with the identifier of each package that has been sent in part.
@@ -189,7 +189,7 @@ class ModePhone {
     EXPECT_TRUE(device_->setPolicy(setting, value, nullptr));
   }
 
-  const Folder folder_{memoryFolder()};
+  const Folder folder_{fakes::memoryFolder()};
   std::unique_ptr<device::EmbeddedDevice> device_;
   std::set<std::string> cancelled_;  ///< that are still to be cancelled in this sync
 };

@@ -6,6 +6,7 @@
 #include "client/apps_client.h"
 #include "host/backup/backup_folder.h"
 #include "platform/property_list_codec.h"
+#include "tests/fakes/stepping_file_manager.h"
 #include "tests/test_pch.h"
 
 namespace appsync::host::testing {
@@ -73,63 +74,6 @@ class StepReporter : public Reporter {
   const std::function<void(const Event&)> step_;
 };
 
-/// Passes every call on, with a step before each change.
-class StepFiles : public FileManager {
- public:
-  StepFiles(FileManager& files, const RestoringPhone::Step& step) : files_(files), step_(step) {}
-
-  std::optional<Bytes> contentsAtPath(std::string_view path,
-                                      std::optional<Error>* error) noexcept override {
-    return files_.contentsAtPath(path, error);
-  }
-  bool writeAtomically(std::string_view path, ByteView bytes,
-                       std::optional<Error>* error) noexcept override {
-    step_();
-    return files_.writeAtomically(path, bytes, error);
-  }
-  bool createFile(std::string_view path, ByteView bytes,
-                  const FileAttributes& attributes) noexcept override {
-    step_();
-    return files_.createFile(path, bytes, attributes);
-  }
-  bool createDirectory(std::string_view path, bool withIntermediates,
-                       const FileAttributes& attributes,
-                       std::optional<Error>* error) noexcept override {
-    step_();
-    return files_.createDirectory(path, withIntermediates, attributes, error);
-  }
-  bool removeItem(std::string_view path, std::optional<Error>* error) noexcept override {
-    step_();
-    return files_.removeItem(path, error);
-  }
-  bool moveItem(std::string_view from, std::string_view to,
-                std::optional<Error>* error) noexcept override {
-    step_();
-    return files_.moveItem(from, to, error);
-  }
-  bool copyItem(std::string_view from, std::string_view to,
-                std::optional<Error>* error) noexcept override {
-    step_();
-    return files_.copyItem(from, to, error);
-  }
-  bool fileExists(std::string_view path) noexcept override { return files_.fileExists(path); }
-  bool directoryExists(std::string_view path) noexcept override {
-    return files_.directoryExists(path);
-  }
-  std::optional<ItemAttributes> attributesOfItem(std::string_view path,
-                                                 std::optional<Error>* error) noexcept override {
-    return files_.attributesOfItem(path, error);
-  }
-  bool touch(std::string_view path, std::optional<Error>* error) noexcept override {
-    return files_.touch(path, error);
-  }
-  std::string temporaryDirectory() noexcept override { return files_.temporaryDirectory(); }
-
- private:
-  FileManager& files_;
-  const RestoringPhone::Step& step_;
-};
-
 Platform withFilesAndLog(const Platform& all, FileManager& files, Log& log) {
   return {log,
           files,
@@ -188,7 +132,7 @@ void SampleBackup::addEntry(const std::string& identifier, PropertyList entry) {
 }
 
 void SampleBackup::write() {
-  const Folder elsewhere{memoryFolder()};
+  const Folder elsewhere{fakes::memoryFolder()};
   device::DeviceError error;
   EXPECT_TRUE(device::EmbeddedDevice::initialize(elsewhere / "phone", {}, error));
   const auto device = openDevice(elsewhere / "phone");
@@ -257,7 +201,7 @@ std::string RestoringPhone::restore(const RestoreInput& input, const Step& step)
   });
   HostProcess host(SyncHostBundleIdentifier, "com.corvane.twc.AppsClient", interruption);
   StepLog log(device_->log(), every);
-  StepFiles files(device_->files(), every);
+  fakes::SteppingFileManager files(device_->files(), every);
   AppsClient client(withFilesAndLog(device_->platform(host), files, log));
   device_->systemNotifier().post(TWStartupCompleteNotification);
   const RestorePhone phone = stepping(restorePhoneOf(*device_), files, every);

@@ -29,7 +29,7 @@ class SampleBackup {
  private:
   void write();
 
-  const Folder folder_{memoryFolder()};
+  const Folder folder_{fakes::memoryFolder()};
   PropertyList::Dictionary entries_;
   PropertyList::Array automatic_;
   PropertyList::Array intentional_;
@@ -46,7 +46,7 @@ class Shelf {
   Library library() const;
 
  private:
-  const Folder folder_{memoryFolder()};
+  const Folder folder_{fakes::memoryFolder()};
 };
 
 /// A new device that lives through restores, each with a new host process and client.
@@ -77,7 +77,7 @@ class RestoringPhone {
   std::vector<std::string> placeholdersTold;  ///< in the last restore; "demoted" before such
 
  private:
-  const Folder folder_{memoryFolder()};
+  const Folder folder_{fakes::memoryFolder()};
   std::unique_ptr<device::EmbeddedDevice> device_;
 };
 
