@@ -46,6 +46,18 @@ inline Trace upTo(const Trace& trace, std::string_view beginning) {
   return head;
 }
 
+/// The lines from the first one that begins with `beginning`.
+inline Trace onwards(const Trace& trace, std::string_view beginning) {
+  return {trace.begin() + static_cast<std::ptrdiff_t>(upTo(trace, beginning).size()), trace.end()};
+}
+
+/// Leaves out `count` lines, from the first one that begins with `beginning`.
+inline Trace without(Trace trace, std::string_view beginning, std::size_t count) {
+  const auto first = trace.begin() + static_cast<std::ptrdiff_t>(upTo(trace, beginning).size());
+  trace.erase(first, first + static_cast<std::ptrdiff_t>(count));
+  return trace;
+}
+
 inline Trace joined(std::initializer_list<Trace> parts) {
   Trace whole;
   for (const Trace& part : parts) whole.insert(whole.end(), part.begin(), part.end());

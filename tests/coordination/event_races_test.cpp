@@ -1,5 +1,5 @@
-// Events of coordinators that arrive on other threads while the host ends transfers, starts up or
-// lets the client go.
+// Events of coordinators that arrive on other threads while the host begins a sync, ends transfers,
+// starts up or lets the client go.
 
 #include <atomic>
 #include <latch>
@@ -68,7 +68,7 @@ class EventRaceTest : public CoordinationTest {
                                    succeeds ? std::nullopt : std::optional(Refused));
   }
 
-  std::size_t said(std::string_view beginning) const {
+  std::size_t timesSaid(std::string_view beginning) const {
     return phone.trace.count("log default SyncBundle|com.corvane.twc.AppsClient|" +
                              std::string(beginning));
   }
@@ -108,9 +108,9 @@ TEST_F(EventRaceTest, EventsOfOtherApplicationsLoseNoEntryWhileTransfersEnd) {
     const auto restoreState = phone.files.plistAt(paths::RestoreState);
     ASSERT_TRUE(restoreState && restoreState->asDictionary());
     EXPECT_EQ(restoreState->asDictionary()->size(), 4u) << "those of both that completed are gone";
-    EXPECT_EQ(said("coordinatorDidInstallPlaceholder for "), ids.size());
-    EXPECT_EQ(said("Prioritize com."), 2 * ids.size()) << "each is asked for and answered";
-    EXPECT_EQ(said("Cancelling asset sync for com.5"), 1u);
+    EXPECT_EQ(timesSaid("coordinatorDidInstallPlaceholder for "), ids.size());
+    EXPECT_EQ(timesSaid("Prioritize com."), 2 * ids.size()) << "each is asked for and answered";
+    EXPECT_EQ(timesSaid("Cancelling asset sync for com.5"), 1u);
     for (const std::string& id : ids) service().coordinator(id)->cancel(Refused, SyncHostClientID);
     // Empties what the person cancelled, for the next round.
     transfer(idOf(5), false);
@@ -140,7 +140,7 @@ TEST_F(EventRaceTest, EventsOfTheSameApplicationBesideTheEndOfItsTransfer) {
     const auto operation = client->_operationStateForIdentifier("com.a");
     EXPECT_THAT((Trace{succeeds ? "INSTALLED" : "FAILED", succeeds ? "DOWNLOADED" : "FAILED"}),
                 Contains(operation));
-    const std::size_t reported = said("Cancelling asset sync for com.a");
+    const std::size_t reported = timesSaid("Cancelling asset sync for com.a");
     EXPECT_EQ(reported + refusedCancels(), 2u) << "each cancel is reported or known already";
     EXPECT_GE(reported, 1u);
     EXPECT_LE(phone.trace.count("InstallCoordinator.cancel(com.a"), 1u);
@@ -158,7 +158,7 @@ TEST_F(EventRaceTest, OfCancelsAtOnceOneReachesTheHost) {
       client->coordinatorCanceledWithReason(*coordinator, Refused, KQClientKiosk);
     };
     atOnce({cancel, cancel, cancel});
-    EXPECT_EQ(said("Cancelling asset sync for com.a"), 1u);
+    EXPECT_EQ(timesSaid("Cancelling asset sync for com.a"), 1u);
     EXPECT_EQ(refusedCancels(), 2u);
     EXPECT_EQ(phone.trace.count("SyncHostService.cancelAssetAsFailed(com.a)"), 1u);
     transfer("com.a", false);
@@ -182,6 +182,50 @@ TEST_F(EventRaceTest, CompletionsAtOnceLoseNoEntry) {
       service().coordinator(id)->cancel(Refused, SyncHostClientID);
     }
     EXPECT_FALSE(phone.files.exists(paths::RestoreState)) << "its last entry has gone";
+  }
+}
+
+/// A todo list of one sync: every entry bears its mark.
+PropertyList::Array markedTodo(const std::vector<std::string>& identifiers, int mark) {
+  PropertyList::Array todo;
+  for (const std::string& id : identifiers) {
+    todo.push_back(PropertyList::Dictionary{
+        {"identifier", id}, {"operation", "install"}, {"mark", mark}, {"name", "App " + id}});
+  }
+  return todo;
+}
+
+TEST_F(EventRaceTest, ChangesWhileANewSyncBeginsNeverBringTheOldTodoListBack) {
+  const std::vector<std::string> ids = {idOf(0), idOf(1), idOf(2)};
+  const std::string staged = std::string(paths::StagingArea) + "/ApplicationsSync.plist";
+  for (int round = 0; round < Rounds; ++round) {
+    prepare(ids);
+    phone.files.putPlist(paths::TodoList, markedTodo(ids, round));
+    phone.files.putPlist(staged, markedTodo(ids, round + 1));
+    std::atomic<bool> begun = false;
+    const auto host = [&] {
+      EXPECT_TRUE(client->reconcileSync({}, "anchor", {}, nullptr));
+      begun = true;
+    };
+    const auto changes = [&] {
+      while (!begun) client->changeAssetID(idOf(0), "DOWNLOADED");
+    };
+    const auto completions = [&] {
+      while (!begun) service().fireDidComplete(*service().coordinator(idOf(1)));
+    };
+    atOnce({host, changes, changes, completions});
+
+    const auto todo = phone.files.plistAt(paths::TodoList);
+    ASSERT_TRUE(todo && todo->asArray());
+    // Only a change that came after the new list may show in it.
+    PropertyList::Array expected = markedTodo(ids, round + 1);
+    for (std::size_t changed : {0u, 1u}) {
+      const PropertyList& operation = *todo->asArray()->at(changed).find("operation");
+      if (operation == PropertyList("install")) continue;
+      (*expected[changed].asDictionary())["operation"] = changed == 0 ? "DOWNLOADED" : "INSTALLED";
+    }
+    ASSERT_EQ(*todo, PropertyList(expected));
+    for (const std::string& id : ids) service().coordinator(id)->cancel(Refused, SyncHostClientID);
   }
 }
 

@@ -6,10 +6,8 @@
 namespace appsync::fakes {
 namespace {
 
-using testing::Contains;
 using testing::ElementsAre;
 using testing::IsEmpty;
-using testing::Not;
 
 class CoordinatorEventTest : public CoordinationTest {
  protected:
@@ -49,6 +47,28 @@ TEST_F(CoordinatorEventTest, OneListenerIsMadeHoweverOftenTheHostStarts) {
   EXPECT_THAT(other.trace.calls(), ElementsAre("InstallCoordination.createEventListener("
                                                "com.corvane.twc.ipx.icappobserverdelegate, (3))"));
   EXPECT_EQ(other.installCoordination.listenerCount(), 1u);
+}
+
+TEST_F(CoordinatorEventTest, AServiceWithoutAListenerIsAskedAgainAtTheNextStart) {
+  FakePlatform other;
+  other.installCoordination.setEnabled(true);
+  AppsClient fresh(other.platform());
+  const auto kept = other.installCoordination.seedCoordinator(CoordinatorKind::Initiating, "com.a",
+                                                              SyncHostClientID);
+  other.faults.failCall("InstallCoordination.createEventListener", 1, Refused);
+  other.trace.clear();
+  fresh.setupInstallCoordinatorObserver();
+  other.installCoordination.fireDidBeginFulfillment(*kept, 7);
+  EXPECT_THAT(other.trace.readable(TraceEffects),
+              ElementsAre("fault InstallCoordination.createEventListener("
+                          "com.corvane.twc.ipx.icappobserverdelegate)"));
+  other.trace.clear();
+  fresh.setupInstallCoordinatorObserver();
+  other.installCoordination.waitForEvents();
+  EXPECT_THAT(other.trace.readable(TraceEffects),
+              ElementsAre("InstallCoordination.createEventListener("
+                          "com.corvane.twc.ipx.icappobserverdelegate, (3))",
+                          said("promiseDidBeginFulfillmentWithIdentifier 7")));
 }
 
 TEST_F(CoordinatorEventTest, TheListenerGoesWithTheClient) {
@@ -184,18 +204,25 @@ class RegistryEventTest : public CoordinationTest {
 };
 
 TEST_F(RegistryEventTest, CancelledRestoresEndTheirTransfersAsFailed) {
+  phone.appRegistry.seedPlaceholder(recordOf("com.a", InstallType::Restore));
   phone.appRegistry.reportCancellation({recordOf("com.a", InstallType::Restore),
                                         recordOf("com.b", InstallType::Sync),
                                         recordOf("com.c", InstallType::Restore)});
-  EXPECT_EQ(phone.host.made().size(), 2u);
-  const Trace log = phone.trace.log();
-  const auto ended = [](const std::string& identifier) {
-    return said("transfer for asset " + identifier +
-                " ended with success n error Error Domain=TWError Code=2 existingApp:0");
-  };
-  EXPECT_THAT(log, Contains(ended("com.a")));
-  EXPECT_THAT(log, Not(Contains(ended("com.b"))));
-  EXPECT_THAT(log, Contains(ended("com.c")));
+  const std::string cancelled = "Error Domain=TWError Code=2";
+  EXPECT_THAT(
+      effects(),
+      ElementsAre(said("transfer for asset com.a ended with success n error " + cancelled +
+                       " existingApp:0"),
+                  complained("Returning <InstallProgress com.a> progress for com.a"),
+                  said("failed to transfer asset com.a. err=" + cancelled + ", recoverable=1"),
+                  "InstallProgress.setInstallState(com.a, 4)",
+                  said("transfer for asset com.c ended with success n error " + cancelled +
+                       " existingApp:0"),
+                  complained("Returning (null) progress for com.c"),
+                  said("failed to transfer asset com.c. err=" + cancelled + ", recoverable=1")));
+  ASSERT_EQ(phone.host.made().size(), 2u);
+  EXPECT_EQ(phone.host.made().front()->dataclass, "Application");
+  EXPECT_EQ(phone.host.made().front()->prettyName, std::nullopt);
 }
 
 TEST_F(RegistryEventTest, WithoutCoordinationNothingIsSaidOfIt) {

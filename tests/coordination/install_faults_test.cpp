@@ -1,5 +1,7 @@
 // One platform call after another refuses while an install is prepared.
 
+#include <cerrno>
+
 #include "tests/coordination/install_trace.h"
 
 namespace appsync::fakes {
@@ -17,20 +19,6 @@ struct FaultCase {
 
 void PrintTo(const FaultCase& fault, std::ostream* out) { *out << fault.operation; }
 
-/// The good run's lines from the one that begins so.
-Trace onwards(std::string_view beginning) {
-  Trace tail = preparedInstall();
-  const Trace head = upTo(tail, beginning);
-  tail.erase(tail.begin(), tail.begin() + static_cast<std::ptrdiff_t>(head.size()));
-  return tail;
-}
-
-Trace without(Trace trace, std::string_view beginning, std::size_t count) {
-  const auto first = trace.begin() + static_cast<std::ptrdiff_t>(upTo(trace, beginning).size());
-  trace.erase(first, first + static_cast<std::ptrdiff_t>(count));
-  return trace;
-}
-
 /// The placeholder is handed over; the preparation succeeds although a step left an error.
 Trace handedOver(const std::string& error) {
   return {"InstallCoordinator.setPlaceholderPromise(com.a, <Placeholder com.a>)",
@@ -39,10 +27,10 @@ Trace handedOver(const std::string& error) {
           R"(transaction step 1 party 1 phase 2 ok com.a "Install app")"};
 }
 
-const Trace PlaceholderOnwards = onwards("transaction step 4 party 1 phase 1");
-/// The same without the five lines of the icon's promise.
+/// The good run's lines from the placeholder on, without the five of the icon's promise.
 const Trace PlaceholderWithoutIcon =
-    without(PlaceholderOnwards, "InstallCoordination.createPathTransferPromise", 5);
+    without(onwards(preparedInstall(), "transaction step 4 party 1 phase 1"),
+            "InstallCoordination.createPathTransferPromise", 5);
 
 const FaultCase FaultCases[] = {
     {"ARefusedCoordinatorEndsItWithNothingToCancel", "InstallCoordination.coordinatorFor", 1,
@@ -171,6 +159,42 @@ TEST_P(InstallFaultTest, LeavesItsWholeTrace) {
 
   EXPECT_EQ(effects(), joined({upTo(preparedInstall(), fault.firstLineLost), fault.instead}));
 }
+
+TEST_P(InstallFaultTest, LeavesTheSameTraceOfAnUpdate) {
+  const FaultCase& fault = GetParam();
+  const SyncAssetPtr asset = syncedAsset(phone);
+  phone.faults.failCall(fault.operation, fault.call, Refused);
+
+  EXPECT_EQ(client->prepareAppForInstallUsingCoordination(asset, true), fault.prepared);
+
+  EXPECT_EQ(effects(),
+            asUpdate(joined({upTo(preparedInstall(), fault.firstLineLost), fault.instead})));
+}
+
+class OldIconTest : public CoordinationTest, public testing::WithParamInterface<bool> {};
+
+TEST_P(OldIconTest, ThatCannotBeRemovedCostsTheNewOne) {
+  const std::string icon = "/tmp/com.corvane.twc.Apps/com.a.app/Icon.png";
+  const SyncAssetPtr asset = syncedAsset(phone);
+  phone.files.putFile(icon, "an old icon");
+  phone.faults.failCall("FileManager.removeItem", 1, Refused);
+
+  EXPECT_TRUE(client->prepareAppForInstallUsingCoordination(asset, GetParam()));
+
+  const Trace install =
+      joined({upTo(preparedInstall(), "FileManager.removeItem"),
+              {"fault FileManager.removeItem(" + icon + ")",
+               "FileManager.copyItem(/icons/com.a.png, " + icon + ")",
+               said("Copied icon from /icons/com.a.png to " + icon + " with error " +
+                    description(Error::posix(EEXIST, icon)) + " for 'com.a', sizeOnDisk:0"),
+               R"(transaction step 5 party 1 phase 2 ok com.a "Copying icon")"},
+              PlaceholderWithoutIcon});
+  EXPECT_EQ(effects(), GetParam() ? asUpdate(install) : install);
+  EXPECT_EQ(phone.files.textAt(icon), "an old icon");
+}
+
+INSTANTIATE_TEST_SUITE_P(InstallAndUpdate, OldIconTest, testing::Bool(),
+                         [](const auto& given) { return given.param ? "Update" : "Install"; });
 
 INSTANTIATE_TEST_SUITE_P(OneRefusal, InstallFaultTest, testing::ValuesIn(FaultCases),
                          [](const auto& given) { return std::string(given.param.name); });

@@ -39,8 +39,9 @@ TEST_F(InstallPreparationTest, LeavesThePlaceOfThePackageOpen) {
 TEST_F(InstallPreparationTest, AnUpdateUsesAnUpdatingCoordinatorAndIsRecordedAsUpdate) {
   EXPECT_TRUE(prepare(true));
   const Trace trace = effects();
-  EXPECT_THAT(trace, Contains(R"(transaction step 1 party 1 phase 1 ok com.a "Update app")"));
-  EXPECT_THAT(trace, Contains("InstallCoordination.coordinatorFor(com.a, updating, 3, create)"));
+  EXPECT_EQ(trace, asUpdate(preparedInstall()));
+  EXPECT_EQ(trace.at(1), R"(transaction step 1 party 1 phase 1 ok com.a "Update app")");
+  EXPECT_EQ(trace.at(3), "InstallCoordination.coordinatorFor(com.a, updating, 3, create)");
   EXPECT_EQ(trace.back(), R"(transaction step 1 party 1 phase 2 ok com.a "Install app")");
 }
 
@@ -54,6 +55,23 @@ TEST_F(InstallPreparationTest, ACoordinatorOfTheStoreIsLeftUntouched) {
           {upTo(preparedInstall(), "log default SyncBundle|Created initiating"),
            {said("IC returned initiating coordinator <Coordinator com.a> (createIfNotExisting:1, "
                  "existingApp:0, creatorIdentifier=1) for com.a with error (null) - Will not "
+                 "perform install/update for this bundle"),
+            R"(transaction step 3 party 1 phase 2 failed com.a "Finished creating coordinator")"},
+           installGivenUp("(null)")}));
+  EXPECT_EQ(coordinator->state().cancellation, std::nullopt);
+  EXPECT_EQ(coordinator->state().observer, nullptr);
+}
+
+TEST_F(InstallPreparationTest, ACoordinatorOfTheStoreIsLeftUntouchedByAnUpdateToo) {
+  const auto coordinator =
+      phone.installCoordination.seedCoordinator(CoordinatorKind::Updating, "com.a", KQClientKiosk);
+  EXPECT_FALSE(prepare(true));
+  EXPECT_EQ(
+      effects(),
+      joined(
+          {asUpdate(upTo(preparedInstall(), "log default SyncBundle|Created initiating")),
+           {said("IC returned updating coordinator <Coordinator com.a> (createIfNotExisting:1, "
+                 "existingApp:1, creatorIdentifier=1) for com.a with error (null) - Will not "
                  "perform install/update for this bundle"),
             R"(transaction step 3 party 1 phase 2 failed com.a "Finished creating coordinator")"},
            installGivenUp("(null)")}));

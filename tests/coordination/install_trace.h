@@ -58,6 +58,21 @@ inline Trace preparedInstall() {
   };
 }
 
+/// The same lines when an installed "com.a" is updated.
+inline Trace asUpdate(Trace lines) {
+  const std::pair<std::string_view, std::string_view> changes[] = {
+      {"\"Install App\"", "\"Update app\""},  // its end is recorded as an install all the same
+      {"initiating", "updating"},
+      {"existingApp:0", "existingApp:1"}};
+  for (std::string& line : lines) {
+    for (const auto& [install, update] : changes) {
+      const std::size_t at = line.find(install);
+      if (at != std::string::npos) line.replace(at, install.size(), update);
+    }
+  }
+  return lines;
+}
+
 /// How preparing ends when it fails.
 inline Trace installGivenUp(const std::string& error) {
   return {said("processing app install for bundle com.a finished with status 0 error " + error),

@@ -22,6 +22,37 @@ Trace lookedUp(std::string_view kind = "initiating", int existing = 0) {
           R"(transaction step 3 party 1 phase 2 ok com.a "Finished creating coordinator")"};
 }
 
+/// The same when another client made it.
+Trace lookedUpInVain() {
+  return {R"(transaction step 3 party 1 phase 1 ok com.a "Create coordinator")",
+          "InstallCoordination.coordinatorFor(com.a, initiating, 3, look up)",
+          said("IC returned initiating coordinator <Coordinator com.a> (createIfNotExisting:0, "
+               "existingApp:0, creatorIdentifier=1) for com.a with error (null) - Will not perform "
+               "install/update for this bundle"),
+          R"(transaction step 3 party 1 phase 2 failed com.a "Finished creating coordinator")"};
+}
+
+/// A promise is made for the package where it lies.
+Trace promiseMade() {
+  return {"InstallCoordination.createPathTransferPromise(com.a-Asset, 3, " + std::string(Package) +
+              ", 0)",
+          "InstallCoordinator.setAppAssetPromise(com.a, com.a-Asset)",
+          said("Added app asset promise to coordinator for 'com.a'")};
+}
+
+/// The coordinator does not take it.
+Trace promiseRefused() {
+  return joined({upTo(promiseMade(), "InstallCoordinator.setAppAssetPromise"),
+                 {"fault InstallCoordinator.setAppAssetPromise(com.a)",
+                  complained("Error Error Domain=Fault Code=7 adding app asset promise at " +
+                             std::string(Package) + " to 'com.a'"),
+                  complained("Cancelling asset promise for 'com.a'"),
+                  "DataPromise.cancel(com.a-Asset, Error Domain=TWError Code=30, 3)"}});
+}
+
+/// The promise cannot be had from the coordinator.
+const Trace PromiseWithheld = {"fault InstallCoordinator.appAssetPromise(com.a)"};
+
 class PackageTransferTest : public CoordinationTest {
  protected:
   PackageTransferTest() { asset->path = Package; }
@@ -69,11 +100,8 @@ TEST_F(PackageTransferTest, ProgressMakesAMissingPromise) {
   EXPECT_EQ(
       effects(),
       joined({lookedUp(),
-              {"InstallCoordination.createPathTransferPromise(com.a-Asset, 3, " +
-                   std::string(Package) + ", 0)",
-               "InstallCoordinator.setAppAssetPromise(com.a, com.a-Asset)",
-               said("Added app asset promise to coordinator for 'com.a'"),
-               said("Updating download progress: 0.250000 install progress:0.000000 for com.a"),
+              promiseMade(),
+              {said("Updating download progress: 0.250000 install progress:0.000000 for com.a"),
                "DataPromise.setPercentComplete(com.a-Asset, 0.25)"}}));
 }
 
@@ -82,6 +110,42 @@ TEST_F(PackageTransferTest, ProgressWithoutAPromiseIsNotPassedOn) {
   phone.faults.failEvery("InstallCoordination.createPathTransferPromise", Refused);
   EXPECT_FALSE(client->updateTransferProgressForApp(asset, false));
   EXPECT_EQ(effects().back(), complained("Error creating asset promise for 'com.a'"));
+}
+
+TEST_F(PackageTransferTest, ProgressReplacesAPromiseThatTheCoordinatorDoesNotGive) {
+  const auto coordinator = seedPromised();
+  const auto withheld = promise();
+  phone.faults.failEvery("InstallCoordinator.appAssetPromise", Refused);
+  asset->downloadProgress = 0.25;
+  EXPECT_TRUE(client->updateTransferProgressForApp(asset, false));
+  EXPECT_EQ(
+      effects(),
+      joined({lookedUp(),
+              PromiseWithheld,
+              promiseMade(),
+              {said("Updating download progress: 0.250000 install progress:0.000000 for com.a"),
+               "DataPromise.setPercentComplete(com.a-Asset, 0.25)"}}));
+  EXPECT_EQ(coordinator->state().appAssetPromise, promise());
+  EXPECT_EQ(withheld->percentComplete(), 0);
+}
+
+TEST_F(PackageTransferTest, ProgressForARefusedPromiseIsNotPassedOn) {
+  const auto coordinator = seed();
+  phone.faults.failEvery("InstallCoordinator.setAppAssetPromise", Refused);
+  EXPECT_FALSE(client->updateTransferProgressForApp(asset, false));
+  EXPECT_EQ(effects(), joined({lookedUp(), promiseRefused()}));
+  EXPECT_EQ(coordinator->state().cancellation, std::nullopt);
+}
+
+TEST_F(PackageTransferTest, ACoordinatorOfAnotherClientHearsNothingOfTheTransfer) {
+  const auto coordinator = phone.installCoordination.seedCoordinator(CoordinatorKind::Initiating,
+                                                                     "com.a", KQClientKiosk);
+  EXPECT_FALSE(client->updateTransferProgressForApp(asset, false));
+  client->transferCompleteForApp(asset, std::nullopt, false);
+  client->transferCompleteForApp(asset, Refused, false);
+  EXPECT_EQ(effects(), joined({lookedUpInVain(), lookedUpInVain(), lookedUpInVain()}));
+  EXPECT_EQ(coordinator->state().appAssetPromise, nullptr);
+  EXPECT_EQ(coordinator->state().cancellation, std::nullopt);
 }
 
 TEST_F(PackageTransferTest, ProgressOfASatisfiedPromiseIsNotPassedOn) {
@@ -120,11 +184,8 @@ TEST_F(PackageTransferTest, AReceivedPackageMakesAMissingPromise) {
   seed(CoordinatorKind::Updating);
   client->transferCompleteForApp(asset, std::nullopt, true);
   EXPECT_EQ(effects(), joined({lookedUp("updating", 1),
-                               {"InstallCoordination.createPathTransferPromise(com.a-Asset, 3, " +
-                                    std::string(Package) + ", 0)",
-                                "InstallCoordinator.setAppAssetPromise(com.a, com.a-Asset)",
-                                said("Added app asset promise to coordinator for 'com.a'"),
-                                said("Satisfying asset promise for com.a"),
+                               promiseMade(),
+                               {said("Satisfying asset promise for com.a"),
                                 "DataPromise.setPercentComplete(com.a-Asset, 1)",
                                 "DataPromise.setComplete(com.a-Asset, true)"}}));
 }
@@ -134,6 +195,30 @@ TEST_F(PackageTransferTest, AReceivedPackageThatCannotBePromisedSatisfiesNothing
   phone.faults.failEvery("InstallCoordination.createPathTransferPromise", Refused);
   client->transferCompleteForApp(asset, std::nullopt, false);
   EXPECT_EQ(effects().back(), complained("Error creating asset promise for 'com.a'"));
+}
+
+TEST_F(PackageTransferTest, AReceivedPackageReplacesAPromiseThatTheCoordinatorDoesNotGive) {
+  const auto coordinator = seedPromised();
+  const auto withheld = promise();
+  phone.faults.failEvery("InstallCoordinator.appAssetPromise", Refused);
+  client->transferCompleteForApp(asset, std::nullopt, false);
+  EXPECT_EQ(effects(), joined({lookedUp(),
+                               PromiseWithheld,
+                               promiseMade(),
+                               {said("Satisfying asset promise for com.a"),
+                                "DataPromise.setPercentComplete(com.a-Asset, 1)",
+                                "DataPromise.setComplete(com.a-Asset, true)"}}));
+  EXPECT_EQ(coordinator->state().appAssetPromise, promise());
+  EXPECT_FALSE(withheld->isComplete());
+}
+
+TEST_F(PackageTransferTest, AReceivedPackageWhosePromiseIsRefusedSatisfiesNothing) {
+  const auto coordinator = seed();
+  phone.faults.failEvery("InstallCoordinator.setAppAssetPromise", Refused);
+  client->transferCompleteForApp(asset, std::nullopt, false);
+  EXPECT_EQ(effects(), joined({lookedUp(), promiseRefused()}));
+  EXPECT_FALSE(promise()->isComplete());
+  EXPECT_EQ(coordinator->state().cancellation, std::nullopt);
 }
 
 TEST_F(PackageTransferTest, ASatisfiedPromiseIsNotSatisfiedAgain) {
@@ -182,6 +267,18 @@ TEST_F(SyncEndTest, AFailedSyncCancelsWhatIsLeft) {
                   "InstallCoordination.coordinatorFor(com.c, any, 3, look up)",
                   said("Cancelling coordinator with error Error Domain=TWError Code=30 for com.c"),
                   "InstallCoordinator.cancel(com.c, Error Domain=TWError Code=30, 3)"));
+}
+
+TEST_F(SyncEndTest, AFailedSyncCancelsTheCoordinatorOfAnotherClientToo) {
+  const auto coordinator =
+      phone.installCoordination.seedCoordinator(CoordinatorKind::Restoring, "com.a", KQClientKiosk);
+  client->assetSyncFinishedWithStatus(false, {"com.a"});
+  EXPECT_THAT(
+      effects(),
+      ElementsAre("InstallCoordination.coordinatorFor(com.a, any, 3, look up)",
+                  said("Cancelling coordinator with error Error Domain=TWError Code=30 for com.a"),
+                  "InstallCoordinator.cancel(com.a, Error Domain=TWError Code=30, 3)"));
+  EXPECT_EQ(coordinator->state().cancellation, (Cancellation{errorOf("TWError", 30), 3}));
 }
 
 TEST_F(SyncEndTest, ASuccessfulSyncCancelsNothing) {

@@ -55,6 +55,56 @@ TEST_F(CoordinatorLookupTest, ACoordinatorOfAnotherClientIsDroppedAndLeftAlone) 
                                "this bundle")));
 }
 
+TEST_F(CoordinatorLookupTest, ACoordinatorOfAnotherClientIsDroppedAlsoWhenOneIsOnlyLookedFor) {
+  const auto coordinator = phone.installCoordination.seedCoordinator(CoordinatorKind::Initiating,
+                                                                     "com.a", KQClientKiosk);
+  EXPECT_EQ(find(false, false), nullptr);
+  EXPECT_EQ(coordinator->state().cancellation, std::nullopt);
+  EXPECT_THAT(effects(),
+              ElementsAre(R"(transaction step 3 party 1 phase 1 ok com.a "Create coordinator")",
+                          "InstallCoordination.coordinatorFor(com.a, initiating, 3, look up)",
+                          said("IC returned initiating coordinator <Coordinator com.a> "
+                               "(createIfNotExisting:0, existingApp:0, creatorIdentifier=1) for "
+                               "com.a with error (null) - Will not perform install/update for "
+                               "this bundle"),
+                          R"(transaction step 3 party 1 phase 2 failed com.a )"
+                          R"("Finished creating coordinator")"));
+}
+
+TEST_F(CoordinatorLookupTest, ACoordinatorThatComesWithAnErrorIsReturnedWithIt) {
+  phone.installCoordination.giveErrorWithEveryLookup(Refused);
+  EXPECT_NE(find(false, true), nullptr);
+  EXPECT_EQ(error, Refused);
+  error.reset();
+  EXPECT_NE(findRestoring(false), nullptr);
+  EXPECT_EQ(error, Refused);
+  EXPECT_THAT(
+      effects(),
+      ElementsAre(R"(transaction step 3 party 1 phase 1 ok com.a "Create coordinator")",
+                  "InstallCoordination.coordinatorFor(com.a, initiating, 3, create)",
+                  said("Created initiating coordinator <Coordinator com.a> (createIfNotExisting:1, "
+                       "existingApp:0) for com.a with error Error Domain=Fault Code=7"),
+                  R"(transaction step 3 party 1 phase 2 ok com.a "Finished creating coordinator")",
+                  R"(transaction step 3 party 1 phase 1 ok com.a "Create restore coordinator")",
+                  "InstallCoordination.coordinatorFor(com.a, restoring, 3, look up)",
+                  said("Created restore coordinator <Coordinator com.a> (createIfNotExisting:0) "
+                       "for com.a with error Error Domain=Fault Code=7"),
+                  R"(transaction step 3 party 1 phase 2 ok com.a )"
+                  R"("Finished creating restore coordinator")"));
+}
+
+TEST_F(CoordinatorLookupTest, ACoordinatorOfAnotherClientThatComesWithAnErrorIsNamedWithIt) {
+  phone.installCoordination.seedCoordinator(CoordinatorKind::Updating, "com.a", KQClientKiosk);
+  phone.installCoordination.giveErrorWithEveryLookup(Refused);
+  EXPECT_EQ(find(true, true), nullptr);
+  EXPECT_EQ(error, Refused);
+  EXPECT_THAT(phone.trace.log(),
+              ElementsAre(said("IC returned updating coordinator <Coordinator com.a> "
+                               "(createIfNotExisting:1, existingApp:1, creatorIdentifier=1) for "
+                               "com.a with error Error Domain=Fault Code=7 - Will not perform "
+                               "install/update for this bundle")));
+}
+
 TEST_F(CoordinatorLookupTest, HandsOnTheReasonOfTheService) {
   phone.faults.failEvery("InstallCoordination.coordinatorFor", Refused);
   EXPECT_EQ(find(false, true), nullptr);

@@ -1,6 +1,6 @@
 // Each call that a restore makes of the phone fails once. Whatever it is, the restore goes on: up
-// to there nothing changes, the other applications leave the trace they always leave, and the list
-// is used up.
+// to there nothing changes, applications that it does not name leave the trace they always leave,
+// and the list is used up.
 
 #include <algorithm>
 
@@ -11,12 +11,16 @@ namespace {
 
 const char* const Applications[] = {"com.q", "com.r", "com.s"};
 
-/// A phone that restores three applications, the second of them demoted.
+constexpr const char* Demoted = "com.r";
+
+/// A phone that restores three applications, the second of them demoted if any is.
 class RestoringPhone : public RestoredBackupTest {
  public:
-  explicit RestoringPhone(bool coordinated) : RestoredBackupTest(coordinated) {
-    phone.files.putPlist(DemotedApps, PropertyList::Dictionary{
-                                          {"AutomaticDowngrades", PropertyList::Array{"com.r"}}});
+  explicit RestoringPhone(bool coordinated, bool demotes = true) : RestoredBackupTest(coordinated) {
+    if (demotes) {
+      phone.files.putPlist(DemotedApps, PropertyList::Dictionary{
+                                            {"AutomaticDowngrades", PropertyList::Array{Demoted}}});
+    }
     PropertyList::Dictionary list;
     for (const char* identifier : Applications) {
       list.emplace(identifier, entryWith(plainMetadata()));
@@ -29,6 +33,7 @@ class RestoringPhone : public RestoredBackupTest {
   void fail(const std::string& operation, unsigned call) {
     phone.faults.failCall(operation, call, Refused);
   }
+  void refuseNotifications() { phone.notifier.setRegistrationStatus(1); }
   /// The whole trace, with what was only asked.
   Trace restore() {
     std::optional<Error> error = Refused;
@@ -62,24 +67,35 @@ Trace partOf(const Trace& trace, const std::string& identifier) {
 
 class EveryRestoreFaultTest : public testing::TestWithParam<bool> {
  protected:
-  /// What concerns no application in particular concerns the list, which is then not read.
-  void expectOthersUntouched(const Trace& calm, const Trace& trace, const std::string& fault) {
-    const auto concerned = std::find_if(
-        std::begin(Applications), std::end(Applications),
-        [&](const char* identifier) { return fault.find(identifier) != std::string::npos; });
-    if (concerned == std::end(Applications)) return;
+  /// What each application is to leave in the trace, but for the one that the fault itself names.
+  Trace expectedPartOf(const std::string& identifier, const std::string& fault) const {
+    const std::string list(RestoreList);
+    // A list that is not found, or cannot be read, names nobody.
+    if (fault == "fault FileManager.fileExists(" + list + ")" ||
+        fault == "fault FileManager.contentsAtPath(" + list + ")") {
+      return {};
+    }
+    // Without the list of demotions nobody is demoted.
+    const bool unknown =
+        fault == "fault FileManager.contentsAtPath(" + std::string(DemotedApps) + ")";
+    return partOf(unknown && identifier == Demoted ? nobodyDemoted_ : calm_, identifier);
+  }
+  /// The sync root and what becomes of the used list concern no application.
+  void expectOthersUntouched(const Trace& trace, const std::string& fault) const {
     for (const char* identifier : Applications) {
-      if (identifier == *concerned) continue;
-      EXPECT_EQ(partOf(trace, identifier), partOf(calm, identifier));
+      if (fault.find(identifier) != std::string::npos) continue;
+      EXPECT_EQ(partOf(trace, identifier), expectedPartOf(identifier, fault)) << identifier;
     }
   }
+
+  const Trace calm_ = RestoringPhone(GetParam()).restore();
+  const Trace nobodyDemoted_ = RestoringPhone(GetParam(), false).restore();
 };
 
 TEST_P(EveryRestoreFaultTest, ConcernsOneApplicationAtMost) {
-  const Trace calm = RestoringPhone(GetParam()).restore();
   std::map<std::string, unsigned> calls;
   unsigned struck = 0;
-  for (const std::string& line : calm) {
+  for (const std::string& line : calm_) {
     const std::string operation = operationOf(line);
     if (operation.empty()) continue;
     const unsigned call = ++calls[operation];
@@ -91,15 +107,23 @@ TEST_P(EveryRestoreFaultTest, ConcernsOneApplicationAtMost) {
     const Trace before = upTo(trace, "fault ");
     if (before.size() == trace.size()) continue;  // an operation that cannot fail
     ++struck;
-    ASSERT_LE(before.size(), calm.size());
-    EXPECT_TRUE(std::equal(before.begin(), before.end(), calm.begin()));
+    ASSERT_LE(before.size(), calm_.size());
+    EXPECT_TRUE(std::equal(before.begin(), before.end(), calm_.begin()));
     const std::string& fault = trace[before.size()];
-    expectOthersUntouched(calm, trace, fault);
+    expectOthersUntouched(trace, fault);
     const bool notMoved = fault.starts_with("fault FileManager.moveItem") ||
                           fault == "fault FileManager.fileExists(" + std::string(RestoreList) + ")";
     EXPECT_EQ(phone.listIsUsedUp(), !notMoved);
   }
   EXPECT_GT(struck, GetParam() ? 40u : 20u);
+}
+
+TEST_P(EveryRestoreFaultTest, ARefusedNotificationConcernsNoApplication) {
+  RestoringPhone phone(GetParam());
+  phone.refuseNotifications();
+  const std::string next = "FileManager.createDirectory(/var/mobile/Library/ApplicationSync";
+  EXPECT_EQ(onwards(phone.restore(), next), onwards(calm_, next));
+  EXPECT_TRUE(phone.listIsUsedUp());
 }
 
 INSTANTIATE_TEST_SUITE_P(BothModes, EveryRestoreFaultTest, testing::Bool(), [](const auto& given) {

@@ -113,7 +113,81 @@ INSTANTIATE_TEST_SUITE_P(OneRefusal, RestorePlaceholderFaultTest,
                          testing::ValuesIn(PlaceholderFaults),
                          [](const auto& given) { return std::string(given.param.name); });
 
+const std::string IconPath = "/tmp/com.corvane.twc.Apps/com.r.app/Icon.png";
+
+/// What is left of an icon whose file fails.
+struct IconFault {
+  const char* name;
+  const char* operation;
+  Trace lines;
+};
+
+void PrintTo(const IconFault& fault, std::ostream* out) { *out << fault.operation; }
+
+const IconFault IconFaults[] = {
+    {"ThatCannotBeWritten",
+     "FileManager.createFile",
+     {"fault FileManager.createFile(" + IconPath + ")",
+      said("icon data for 'com.r' was writen to " + IconPath + " with status:0 fileSize:0")}},
+    {"OfUnknownSize",
+     "FileManager.attributesOfItem",
+     {"FileManager.createFile(" + IconPath + ", mobile:mobile)",
+      "fault FileManager.attributesOfItem(" + IconPath + ")",
+      said("icon data for 'com.r' was writen to " + IconPath + " with status:1 fileSize:0")}},
+};
+
+/// The good run with these lines for the icon's file, and without the five of its promise.
+Trace withIconLines(const Trace& calm, const Trace& lines) {
+  return joined({upTo(calm, "FileManager.createFile"), lines,
+                 without(onwards(calm, "transaction step 4 party 1 phase 1"),
+                         "InstallCoordination.createPathTransferPromise", 5)});
+}
+
+class RestoredIconTest : public RestoreTest, public testing::WithParamInterface<IconFault> {
+ protected:
+  RestoredIconTest() { phone.faults.failCall(GetParam().operation, 1, Refused); }
+};
+
+TEST_P(RestoredIconTest, IsDoneWithout) {
+  EXPECT_TRUE(restore());
+  EXPECT_EQ(effects(), withIconLines(restored(), GetParam().lines));
+}
+
+TEST_P(RestoredIconTest, OfADemotedApplicationIsDoneWithout) {
+  EXPECT_TRUE(restore(DemotionStatus::Automatic));
+  EXPECT_EQ(effects(), withIconLines(restoredDemoted(), GetParam().lines));
+}
+
+INSTANTIATE_TEST_SUITE_P(OneRefusal, RestoredIconTest, testing::ValuesIn(IconFaults),
+                         [](const auto& given) { return std::string(given.param.name); });
+
 using RestoreFaultTest = RestoreTest;
+
+TEST_F(RestoreFaultTest, RefusedMetadataCancelThePlaceholderAlsoWithoutABlob) {
+  sinf = std::nullopt;
+  phone.faults.failEvery("InstallPlaceholder.setMetadata", Refused);
+  const Trace refused = {
+      "fault InstallPlaceholder.setMetadata(com.r)",
+      complained("Error Error Domain=Fault Code=7 setting store metadata for 'com.r'"),
+      "InstallPlaceholder.cancel(com.r, Error Domain=TWError Code=29, 3)"};
+  EXPECT_FALSE(restore());
+  EXPECT_EQ(effects(),
+            joined({restoreBegun(),
+                    {"InstallCoordination.coordinatorFor(com.r, restoring, 3, create)"},
+                    promisedUserData(),
+                    {"InstallCoordinator.setInstallOptions(com.r, type 2 target 1 metadata "
+                     "{bundleVersion = 3; title = Rho})",
+                     said("added install options for com.r")},
+                    upTo(restoredPlaceholder("2"), "InstallPlaceholder.setMetadata"),
+                    refused,
+                    restoreEnded(false, "(null)"),
+                    restoreCoordinatorCancelled()}));
+  forget();
+  EXPECT_FALSE(restore(DemotionStatus::Automatic));
+  EXPECT_EQ(effects(),
+            joined({upTo(restoredDemoted(), "InstallPlaceholder.setMetadata"), refused,
+                    demotedRestoreEnded(false, "(null)"), restoreCoordinatorCancelled()}));
+}
 
 TEST_F(RestoreFaultTest, MetadataThatDoNotParseEndIt) {
   metadata = toBytes("no property list");

@@ -2,6 +2,8 @@
 
 #include "tests/coordination/restore_list.h"
 
+#include <cerrno>
+
 namespace appsync::fakes {
 namespace {
 
@@ -84,6 +86,27 @@ TEST_F(RestoreListTest, AListThatCannotBePutAsideIsReported) {
   EXPECT_TRUE(process());
   EXPECT_EQ(effects().back(), said("failed to copy halvo metadata. err=Error Domain=Fault Code=7"));
   EXPECT_TRUE(phone.files.exists(RestoreList));
+}
+
+TEST_F(RestoreListTest, AKeptCopyThatCannotBeRemovedKeepsTheListWhereItIs) {
+  phone.files.putFile(KeptCopy, "an earlier list");
+  putList({});
+  phone.faults.failCall("FileManager.removeItem", 1, Refused);
+  EXPECT_FALSE(process());
+  const std::string kept(KeptCopy);
+  const std::string list(RestoreList);
+  EXPECT_EQ(
+      effects(),
+      (Trace{
+          said("processing halvo restore info"), "log default Oversize|Demoted Apps: (null)",
+          "fault FileManager.removeItem(" + kept + ")",
+          "FileManager.moveItem(" + list + ", " + kept + ")",
+          said("failed to copy halvo metadata. err=" + description(Error::posix(EEXIST, kept)))}));
+  EXPECT_EQ(phone.files.textAt(KeptCopy), "an earlier list");
+  EXPECT_EQ(phone.files.plistAt(RestoreList), PropertyList(PropertyList::Dictionary{}));
+  // The next restore finds it again, and may put it aside.
+  process();
+  EXPECT_TRUE(listIsKept());
 }
 
 TEST_F(RestoreListTest, ASecondRunFindsNoList) {

@@ -83,13 +83,6 @@ TEST_F(RestoreTest, AnApplicationWithoutBlobAndIconGetsNone) {
   EXPECT_THAT(effects(), Contains(complained("no icon data for 'com.r'")));
 }
 
-TEST_F(RestoreTest, AnIconThatCannotBeWrittenIsDoneWithout) {
-  phone.faults.failEvery("FileManager.createFile", Refused);
-  EXPECT_TRUE(restore());
-  EXPECT_EQ(placeholder().iconPromise, nullptr);
-  EXPECT_TRUE(placeholder().configurationComplete);
-}
-
 struct NameCase {
   PropertyList::Dictionary metadata;
   const char* name;

@@ -36,14 +36,18 @@ Trace recorded(bool success, const std::string& text) {
           " com.r \"" + text + "\""};
 }
 
-Trace begun() {
-  return {said("processing app restore info for 'com.r'"),
-          "FileManager.createDirectory(" + BundlePath + ", true, mobile:mobile)",
-          said("Created app directory for 'com.r' at " + BundlePath + " with err=(null)"),
-          "FileManager.createFile(" + BundlePath + "/Icon.png, mobile:mobile)",
+Trace iconWritten() {
+  return {"FileManager.createFile(" + BundlePath + "/Icon.png, mobile:mobile)",
           said("icon data for 'com.r' was writen to " + BundlePath +
-               "/Icon.png with status:1 fileSize:4"),
-          said("creating placeholder for 'com.r'. info.plist=" + std::string(Info))};
+               "/Icon.png with status:1 fileSize:4")};
+}
+
+Trace begun(const std::string& info = Info, const Trace& icon = iconWritten()) {
+  return joined({{said("processing app restore info for 'com.r'"),
+                  "FileManager.createDirectory(" + BundlePath + ", true, mobile:mobile)",
+                  said("Created app directory for 'com.r' at " + BundlePath + " with err=(null)")},
+                 icon,
+                 {said("creating placeholder for 'com.r'. info.plist=" + info)}});
 }
 
 Trace infoWritten() { return {"FileManager.writeAtomically(" + BundlePath + "/Info.plist)"}; }
@@ -53,20 +57,22 @@ Trace gaveUp(const std::string& metadata = "{bundleVersion = 3; title = Rho}") {
       said("failed to process app restore info for 'com.r'. halvoMetadataDictionary=" + metadata)};
 }
 
-TEST_F(RestoredAppTest, IsInstalledAsAPlaceholderWithBlobAndMetadata) {
-  EXPECT_TRUE(process(plainMetadata()));
+Trace installed(const Bytes& metadata) {
   const PropertyList::Dictionary options{{"SWPackageTypeKey", SWPackageTypePlaceholder},
                                          {"KBBundleIdentifier", "com.r"},
                                          {"SWInstallType", 2},
                                          {"SWHalvoMetadataKey", metadata},
                                          {"SWApplicationSINFKey", toBytes("sinf")}};
-  EXPECT_EQ(effects(), joined({begun(),
-                               infoWritten(),
-                               {callText("AppRegistry.installApplication",
-                                         FileLocation::directory(BundlePath), options),
-                                said("Installed Placeholder app from path " + BundlePath +
-                                     ": Rho [com.r 3] [isPeriodix: 0]")},
-                               recorded(true, "Installed placeholder")}));
+  return joined(
+      {{callText("AppRegistry.installApplication", FileLocation::directory(BundlePath), options),
+        said("Installed Placeholder app from path " + BundlePath +
+             ": Rho [com.r 3] [isPeriodix: 0]")},
+       recorded(true, "Installed placeholder")});
+}
+
+TEST_F(RestoredAppTest, IsInstalledAsAPlaceholderWithBlobAndMetadata) {
+  EXPECT_TRUE(process(plainMetadata()));
+  EXPECT_EQ(effects(), joined({begun(), infoWritten(), installed(metadata)}));
   EXPECT_EQ(phone.appRegistry.placeholder("com.r")->installType, InstallType::Restore);
 }
 
@@ -137,19 +143,92 @@ TEST_F(RestoredAppTest, AnIconIsNotNeeded) {
   EXPECT_FALSE(phone.files.exists(BundlePath + "/Icon.png"));
 }
 
-TEST_F(RestoredAppTest, MetadataWithoutVersionOrNamesMakeNoInfo) {
-  EXPECT_FALSE(process({{"title", "Rho"}}));
-  EXPECT_EQ(phone.trace.transactions(), recorded(false, "Failed to create placeholder info"));
-  EXPECT_EQ(effects().back(), gaveUp("{title = Rho}").front());
-  forget();
-  EXPECT_FALSE(process({{"bundleVersion", "3"}}));
-  EXPECT_EQ(phone.trace.transactions(), recorded(false, "Failed to create placeholder info"));
+TEST_F(RestoredAppTest, AnIconThatCannotBeWrittenIsDoneWithout) {
+  const std::string path = BundlePath + "/Icon.png";
+  phone.faults.failEvery("FileManager.createFile", Refused);
+  EXPECT_TRUE(process(plainMetadata()));
+  const Trace lines = {
+      "fault FileManager.createFile(" + path + ")",
+      said("icon data for 'com.r' was writen to " + path + " with status:0 fileSize:0")};
+  EXPECT_EQ(effects(), joined({begun(Info, lines), infoWritten(), installed(metadata)}));
 }
+
+TEST_F(RestoredAppTest, AnIconOfUnknownSizeIsUsed) {
+  const std::string path = BundlePath + "/Icon.png";
+  phone.faults.failEvery("FileManager.attributesOfItem", Refused);
+  EXPECT_TRUE(process(plainMetadata()));
+  const Trace lines = {
+      "FileManager.createFile(" + path + ", mobile:mobile)",
+      "fault FileManager.attributesOfItem(" + path + ")",
+      said("icon data for 'com.r' was writen to " + path + " with status:1 fileSize:0")};
+  EXPECT_EQ(effects(), joined({begun(Info, lines), infoWritten(), installed(metadata)}));
+  EXPECT_EQ(phone.files.textAt(path), "icon");
+}
+
+struct MissingCase {
+  const char* name;
+  PropertyList::Dictionary metadata;
+  const char* shown;
+  const char* info;
+};
+
+void PrintTo(const MissingCase& missing, std::ostream* out) { *out << missing.shown; }
+
+const MissingCase MissingCases[] = {
+    {"Version",
+     {{"title", "Rho"}},
+     "{title = Rho}",
+     "{KBBundleDisplayName = Rho; KBBundleExecutable = Rho; KBBundleIconFile = Icon.png; "
+     "KBBundleIdentifier = com.r; KBBundleVersion = (null); SWApplicationLaunchProhibited = 0; "
+     "UIPeriodixApp = 0}"},
+    {"BothNames",
+     {{"bundleVersion", "3"}},
+     "{bundleVersion = 3}",
+     "{KBBundleDisplayName = (null); KBBundleExecutable = (null); KBBundleIconFile = Icon.png; "
+     "KBBundleIdentifier = com.r; KBBundleVersion = 3; SWApplicationLaunchProhibited = 0; "
+     "UIPeriodixApp = 0}"},
+};
+
+class MissingMetadataTest : public RestoredAppTest,
+                            public testing::WithParamInterface<MissingCase> {};
+
+TEST_P(MissingMetadataTest, IsPutInAsNullWhichNoFileCanHold) {
+  const MissingCase& missing = GetParam();
+  EXPECT_FALSE(process(missing.metadata));
+  EXPECT_EQ(effects(), joined({begun(missing.info),
+                               {said("failed to create placeholder info at " + BundlePath +
+                                     "/Info.plist with info " + missing.info)},
+                               recorded(false, "Failed to create placeholder info"),
+                               gaveUp(missing.shown)}));
+  EXPECT_FALSE(phone.files.exists(BundlePath + "/Info.plist"));
+}
+
+INSTANTIATE_TEST_SUITE_P(Without, MissingMetadataTest, testing::ValuesIn(MissingCases),
+                         [](const auto& given) { return std::string(given.param.name); });
 
 TEST_F(RestoredAppTest, TheItemNameServesAsBothNames) {
   EXPECT_TRUE(process({{"bundleVersion", "3"}, {"itemName", "Item"}}));
   EXPECT_EQ(infoValue(KBBundleExecutable), PropertyList("Item"));
   EXPECT_EQ(infoValue(KBBundleDisplayName), PropertyList("Item"));
+}
+
+TEST_F(RestoredAppTest, LaunchingIsProhibitedByEitherKeyTheFirstOneWinning) {
+  struct {
+    PropertyList::Dictionary flags;
+    bool prohibited;
+  } const cases[] = {
+      {{}, false},
+      {{{"SWApplicationLaunchProhibited", true}}, true},
+      {{{"launchProhibited", "yes"}}, true},
+      {{{"SWApplicationLaunchProhibited", false}, {"launchProhibited", true}}, false},
+      {{{"SWApplicationLaunchProhibited", true}, {"launchProhibited", false}}, true},
+  };
+  for (const auto& given : cases) {
+    PropertyList::Dictionary from = plainMetadata();
+    from.insert(given.flags.begin(), given.flags.end());
+    EXPECT_TRUE(process(from));
+    EXPECT_EQ(infoValue("SWApplicationLaunchProhibited"), PropertyList(given.prohibited));
+  }
 }
 
 TEST_F(RestoredAppTest, PeriodicalFlagAndLaunchProhibitionAreCarriedOn) {

@@ -54,6 +54,7 @@ std::shared_ptr<InstallCoordinator> FakeInstallCoordination::coordinatorFor(
   context_.trace.add(TraceCall, callText(operation, bundleId, kindName(kind), client,
                                          createIfNotExisting ? "create" : "look up"));
   const std::scoped_lock lock(mutex_);
+  if (lookupError_) setError(error, *lookupError_);
   for (const auto& coordinator : coordinators_) {
     const FakeInstallCoordinator::State state = coordinator->state();
     if (state.bundleIdentifier == bundleId && state.isLive()) return coordinator;
@@ -133,6 +134,7 @@ std::unique_ptr<CoordinatorEventListener> FakeInstallCoordination::createEventLi
     std::string_view serviceName, const std::set<CoordinationClientId>& clients,
     CoordinatorObserver& delegate) noexcept {
   constexpr std::string_view operation = "InstallCoordination.createEventListener";
+  if (context_.faults.next(operation, serviceName)) return nullptr;
   PropertyList::Array shown(clients.begin(), clients.end());
   context_.trace.add(TraceCall, callText(operation, serviceName, description(shown)));
   auto listener = std::make_unique<Listener>(*this, clients, delegate);
@@ -251,6 +253,11 @@ void FakeInstallCoordination::fireCanceled(FakeInstallCoordinator& coordinator, 
 void FakeInstallCoordination::setEnabled(bool enabled) {
   const std::scoped_lock lock(mutex_);
   enabled_ = enabled;
+}
+
+void FakeInstallCoordination::giveErrorWithEveryLookup(Error error) {
+  const std::scoped_lock lock(mutex_);
+  lookupError_ = std::move(error);
 }
 
 std::shared_ptr<FakeInstallCoordinator> FakeInstallCoordination::seedCoordinator(

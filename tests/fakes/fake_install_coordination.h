@@ -55,6 +55,8 @@ class FakeInstallCoordination : public InstallCoordination, private CoordinatorO
 
   /// Off at first.
   void setEnabled(bool enabled);
+  /// From now on lookups give this error as well, whether or not a coordinator comes with it.
+  void giveErrorWithEveryLookup(Error error);
   /// A coordinator that somebody made before; none: one whose application is not known any more.
   std::shared_ptr<FakeInstallCoordinator> seedCoordinator(CoordinatorKind kind,
                                                           std::optional<std::string> bundleId,
@@ -130,6 +132,7 @@ class FakeInstallCoordination : public InstallCoordination, private CoordinatorO
   mutable std::mutex mutex_;
   std::condition_variable delivered_;
   bool enabled_ = false;
+  std::optional<Error> lookupError_;
   std::uint64_t nextPromise_ = 1;
   std::vector<std::shared_ptr<FakeInstallCoordinator>> coordinators_;
   std::vector<std::shared_ptr<FakePathTransferPromise>> pathPromises_;
