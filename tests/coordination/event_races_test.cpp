@@ -6,6 +6,7 @@
 #include <thread>
 
 #include "client/paths.h"
+#include "tests/client/client_test.h"
 #include "tests/coordination/coordination_fixture.h"
 
 namespace appsync::fakes {
@@ -185,23 +186,60 @@ TEST_F(EventRaceTest, CompletionsAtOnceLoseNoEntry) {
   }
 }
 
-/// A todo list of one sync: every entry bears its mark.
-PropertyList::Array markedTodo(const std::vector<std::string>& identifiers, int mark) {
-  PropertyList::Array todo;
-  for (const std::string& id : identifiers) {
-    todo.push_back(PropertyList::Dictionary{
-        {"identifier", id}, {"operation", "install"}, {"mark", mark}, {"name", "App " + id}});
-  }
-  return todo;
-}
+/// Gives other threads time between a reading of the todo list and what the reader makes of it,
+/// until the staging area has been taken over.
+class HesitantFiles : public FaultyFileManager {
+ public:
+  using FaultyFileManager::FaultyFileManager;
 
-TEST_F(EventRaceTest, ChangesWhileANewSyncBeginsNeverBringTheOldTodoListBack) {
-  const std::vector<std::string> ids = {idOf(0), idOf(1), idOf(2)};
+  std::optional<Bytes> contentsAtPath(std::string_view path,
+                                      std::optional<Error>* error) noexcept override {
+    std::optional<Bytes> bytes = FaultyFileManager::contentsAtPath(path, error);
+    if (path != paths::TodoList) return bytes;
+    for (int turn = 0; turn < 100 && !moved_; ++turn) std::this_thread::yield();
+    return bytes;
+  }
+  bool moveItem(std::string_view from, std::string_view to,
+                std::optional<Error>* error) noexcept override {
+    const bool moved = FaultyFileManager::moveItem(from, to, error);
+    moved_ = true;
+    return moved;
+  }
+  void beginRound() { moved_ = false; }
+
+ private:
+  std::atomic<bool> moved_ = false;
+};
+
+class ReconcileRaceTest : public EventRaceTest {
+ protected:
+  ReconcileRaceTest() {
+    client = nullptr;
+    client = std::make_unique<AppsClient>(with(phone.platform(), files));
+    phone.notifier.post(TWStartupCompleteNotification);
+  }
+  ~ReconcileRaceTest() override { client = nullptr; }
+
+  /// A todo list of one sync: every entry bears its mark.
+  static PropertyList::Array todoOf(int sync) {
+    PropertyList::Array todo;
+    for (int number = 0; number < 3; ++number) {
+      todo.push_back(PropertyList::Dictionary{
+          {"identifier", idOf(number)}, {"operation", "install"}, {"sync", sync}});
+    }
+    return todo;
+  }
+
+  HesitantFiles files{phone.files, phone.faults};
+};
+
+TEST_F(ReconcileRaceTest, ChangesWhileANewSyncBeginsNeverBringTheOldTodoListBack) {
   const std::string staged = std::string(paths::StagingArea) + "/ApplicationsSync.plist";
   for (int round = 0; round < Rounds; ++round) {
-    prepare(ids);
-    phone.files.putPlist(paths::TodoList, markedTodo(ids, round));
-    phone.files.putPlist(staged, markedTodo(ids, round + 1));
+    prepare({idOf(0), idOf(1)});
+    phone.files.putPlist(paths::TodoList, todoOf(round));
+    phone.files.putPlist(staged, todoOf(round + 1));
+    files.beginRound();
     std::atomic<bool> begun = false;
     const auto host = [&] {
       EXPECT_TRUE(client->reconcileSync({}, "anchor", {}, nullptr));
@@ -216,16 +254,15 @@ TEST_F(EventRaceTest, ChangesWhileANewSyncBeginsNeverBringTheOldTodoListBack) {
     atOnce({host, changes, changes, completions});
 
     const auto todo = phone.files.plistAt(paths::TodoList);
-    ASSERT_TRUE(todo && todo->asArray());
-    // Only a change that came after the new list may show in it.
-    PropertyList::Array expected = markedTodo(ids, round + 1);
-    for (std::size_t changed : {0u, 1u}) {
-      const PropertyList& operation = *todo->asArray()->at(changed).find("operation");
-      if (operation == PropertyList("install")) continue;
-      (*expected[changed].asDictionary())["operation"] = changed == 0 ? "DOWNLOADED" : "INSTALLED";
+    ASSERT_TRUE(todo && todo->asArray() && todo->asArray()->size() == 3);
+    // The staged list, in which the changes that came after it may show.
+    PropertyList::Array expected = todoOf(round + 1);
+    const char* const outcomes[] = {"DOWNLOADED", "INSTALLED"};
+    for (std::size_t number : {0u, 1u}) {
+      if (*todo->asArray()->at(number).find("operation") == PropertyList("install")) continue;
+      (*expected[number].asDictionary())["operation"] = outcomes[number];
     }
     ASSERT_EQ(*todo, PropertyList(expected));
-    for (const std::string& id : ids) service().coordinator(id)->cancel(Refused, SyncHostClientID);
   }
 }
 
