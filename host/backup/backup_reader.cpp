@@ -45,9 +45,12 @@ bool readContents(const fs::path& folder, Backup& backup, std::string& problem) 
   for (const auto& [name, entry] : manifest->files) {
     auto bytes = wholeList({folder / name, entry.size, entry.digest}, problem);
     if (!bytes) return false;
-    if (name == BackupApplicationsFile) backup.applications = std::move(*bytes);
-    if (name == BackupDemotionsFile) backup.demotions = std::move(*bytes);
-    if (name == BackupIconLayoutFile) backup.iconLayout = std::move(*bytes);
+    if (name == BackupApplicationsFile)
+      backup.applications = std::move(*bytes);
+    else if (name == BackupDemotionsFile)
+      backup.demotions = std::move(*bytes);
+    else if (name == BackupIconLayoutFile)
+      backup.iconLayout = std::move(*bytes);
   }
   for (const auto& [identifier, entry] : manifest->data) {
     const fs::path path = folder / BackupDataFolder / backupDataName(identifier);

@@ -59,7 +59,7 @@ std::string foreignItem(const fs::path& folder) {
   std::error_code failure;
   for (fs::directory_iterator item(folder, failure), end; !failure && item != end;
        item.increment(failure)) {
-    const std::string name = item->path().filename().string();
+    std::string name = item->path().filename().string();
     if (name != BackupManifestFile && name != BackupApplicationsFile &&
         name != BackupDemotionsFile && name != BackupIconLayoutFile && name != BackupDataFolder) {
       return name;
