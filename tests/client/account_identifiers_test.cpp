@@ -81,6 +81,16 @@ TEST_F(AccountIdentifiers, AnApplicationWithoutReadableMetadataIsUnknown) {
                unknown + "com.c (plist at " + metadataOf("com.c") + ")", end("()")});
 }
 
+TEST_F(AccountIdentifiers, AnApplicationWithoutAContainerIsUnknownAndNothingIsReadForIt) {
+  phone.appRegistry.seedInstalled("com.a");
+  phone.appRegistry.edit("com.a", [](AppRecord& record) { record.bundleContainerPath.reset(); });
+  phone.files.putPlist("/HalvoMetadata.plist", Dictionary{{"corvaneId", "nobody"}});
+  EXPECT_THAT(client().corvaneIDsForAssets(), IsEmpty());
+  expectTrace({Start, "AppRegistry.enumerateBundles(1)",
+               "log default SyncBundle|unknown CorvaneID for com.a (plist at (null))", end("()")},
+              fakes::TraceAll);
+}
+
 TEST_F(AccountIdentifiers, ANumberAsOwnIdentifierIsReportedAndOnlyTheNestedOneCounts) {
   putApplication("com.a", Dictionary{{"corvaneId", 7}, {DownloadInfo, nested("ann")}});
   EXPECT_THAT(client().corvaneIDsForAssets(), ElementsAre("ann"));

@@ -97,6 +97,25 @@ TEST_F(BackupPreparation, SkipsAnApplicationWithoutMetadataSilently) {
   EXPECT_FALSE(phone.files.exists(metadataOf("com.a")));
 }
 
+TEST_F(BackupPreparation, SkipsAnApplicationWithoutAContainerAndReadsNothingForIt) {
+  putApplication("com.a", true, Dictionary{});
+  phone.appRegistry.edit("com.a", [](AppRecord& record) { record.bundleContainerPath.reset(); });
+  phone.files.putPlist("/HalvoMetadata.plist", Dictionary{{Automatic, true}});
+  putApplication("com.b", false, Dictionary{});
+  client().prepareForBackup();
+  expectTrace({Begin, "AppRegistry.enumerateBundles(1)",
+               "FileManager.contentsAtPath(" + metadataOf("com.b") + ")", End},
+              fakes::TraceAll);
+}
+
+TEST_F(BackupPreparation, NamesAnApplicationWithoutABundleIdentifierAsTheRegistryDoes) {
+  putApplication("com.a", true, Dictionary{{Automatic, true}});
+  phone.appRegistry.edit("com.a", [](AppRecord& record) { record.bundleIdentifier.reset(); });
+  client().prepareForBackup();
+  expectTrace({Begin, "log default SyncBundle|" + On, "log default SyncBundle|" + Cleared,
+               "FileManager.writeAtomically(" + metadataOf("com.a") + ")", End});
+}
+
 TEST_F(BackupPreparation, SkipsMetadataThatIsNoDictionarySilently) {
   putApplication("com.a", true, Array{"title"});
   putApplication("com.b", true, std::nullopt);

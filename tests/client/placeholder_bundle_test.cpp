@@ -228,6 +228,34 @@ TEST_F(PlaceholderDirectory, ThatCannotBeMadeIsRecordedAsARestoreWhoeverAsked) {
                CreatedLine + description(Error::posix(20, BundlePath))});
 }
 
+const Error Afterthought{"Afterthought", 3, {}, nullptr};
+
+/// Makes directories, but not without a complaint.
+class ComplainingFileManager : public fakes::FaultyFileManager {
+ public:
+  using FaultyFileManager::FaultyFileManager;
+  bool createDirectory(std::string_view path, bool withIntermediates,
+                       const FileAttributes& attributes,
+                       std::optional<Error>* error) noexcept override {
+    const bool made =
+        FaultyFileManager::createDirectory(path, withIntermediates, attributes, error);
+    setError(error, Afterthought);
+    return made;
+  }
+};
+
+TEST_F(PlaceholderDirectory, ThatIsMadeWithAnErrorIsRecordedAsAFailureButUsed) {
+  ComplainingFileManager files(phone.files, phone.faults);
+  AppsClient making(with(phone.platform(), files));
+  forgetTrace();
+  EXPECT_TRUE(making.createPlaceHolderPath(BundlePath, "com.a", {"ann", "staff"}));
+  expectTrace({"FileManager.createDirectory(" + BundlePath + ", true, ann:staff)",
+               "transaction scenario \"Halvo App Restore\" failed com.a \"Failed to create app "
+               "directory\"",
+               CreatedLine + description(Afterthought)});
+  EXPECT_TRUE(phone.files.exists(BundlePath));
+}
+
 class IconData : public ClientTest {
  protected:
   bool write(const std::optional<Bytes>& data, std::uint64_t* size) {

@@ -41,12 +41,31 @@ TEST_F(PlaceholderQueries, OnlyTheExactIdentifierIsFound) {
   expectTrace({});
 }
 
-TEST_F(PlaceholderQueries, ARecordWithoutABundleIdentifierIsNotFound) {
-  AppRecord unnamed = record("com.a");
-  unnamed.bundleIdentifier = "com.other";
-  phone.appRegistry.seedPlaceholder(unnamed);
+TEST_F(PlaceholderQueries, TheBundleIdentifierDecidesNotTheApplications) {
+  AppRecord other = record("com.a");
+  other.bundleIdentifier = "com.other";
+  phone.appRegistry.seedPlaceholder(other);
   EXPECT_FALSE(client()._placeholderExistsForApplication("com.a"));
   EXPECT_TRUE(client()._placeholderExistsForApplication("com.other"));
+}
+
+TEST_F(PlaceholderQueries, ARecordWithoutABundleIdentifierIsNotFound) {
+  phone.appRegistry.seedPlaceholder(record("com.a", ApplicationTypeSystem));
+  phone.appRegistry.seedPlaceholder("com.b");
+  for (const char* identifier : {"com.a", "com.b"}) {
+    phone.appRegistry.edit(identifier, [](AppRecord& found) { found.bundleIdentifier.reset(); });
+  }
+  EXPECT_FALSE(client()._placeholderExistsForApplication("com.b"));
+  EXPECT_FALSE(client()._placeholderExistsForApplication(""));
+  EXPECT_THAT(client()._getSystemAppPlaceholders(), IsEmpty());
+}
+
+TEST_F(PlaceholderQueries, AnInstalledApplicationCountsAsOneThatHasItsPlaceholder) {
+  // Either way the identifier is taken, so that a restore makes no placeholder over it.
+  phone.appRegistry.seedInstalled("com.a");
+  ASSERT_FALSE(phone.appRegistry.placeholder("com.a"));
+  EXPECT_TRUE(client()._placeholderExistsForApplication("com.a"));
+  expectTrace({"log default SyncBundle|Found placeholder for bundle com.a"});
 }
 
 TEST_F(PlaceholderQueries, TheSearchEndsAtTheFirstRecordThatFits) {

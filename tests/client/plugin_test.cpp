@@ -4,10 +4,27 @@
 #include <dlfcn.h>
 #include <gtest/gtest.h>
 
+#include <limits>
+#include <new>
 #include <typeinfo>
 
-#include "client/apps_client.h"
-#include "tests/fakes/fake_platform.h"
+#include "tests/client/client_test.h"
+
+namespace {
+
+constexpr unsigned Endless = std::numeric_limits<unsigned>::max();
+/// After so many more allocations the memory of this thread is used up.
+thread_local unsigned allocationsLeft = Endless;
+
+}  // namespace
+
+// Stands in front of the one that everything here uses, the plug-in's object too.
+void* operator new(std::size_t size) {
+  static auto* const next = reinterpret_cast<void* (*)(std::size_t)>(dlsym(RTLD_NEXT, "_Znwm"));
+  if (allocationsLeft == 0) throw std::bad_alloc();
+  if (allocationsLeft != Endless) --allocationsLeft;
+  return next(size);
+}
 
 namespace appsync {
 namespace {
@@ -63,6 +80,59 @@ TEST_F(PluginObject, KeepsNoReferenceToTheCallersListOfServices) {
 }
 
 TEST_F(PluginObject, MakesNoClientWithoutServices) { EXPECT_EQ(create()(nullptr), nullptr); }
+
+/// Services have memory of their own.
+class OwnMemory {
+ public:
+  OwnMemory() { allocationsLeft = Endless; }
+  ~OwnMemory() { allocationsLeft = kept_; }
+
+ private:
+  const unsigned kept_ = allocationsLeft;
+};
+
+class HostWithMemory : public fakes::FakeSyncHost {
+ public:
+  using FakeSyncHost::FakeSyncHost;
+  std::string mainBundleIdentifier() noexcept override {
+    const OwnMemory own;
+    return FakeSyncHost::mainBundleIdentifier();
+  }
+  std::string pluginBundleIdentifier() noexcept override {
+    const OwnMemory own;
+    return FakeSyncHost::pluginBundleIdentifier();
+  }
+};
+
+class RegistryWithMemory : public fakes::FaultyAppRegistry {
+ public:
+  using FaultyAppRegistry::FaultyAppRegistry;
+  void addObserver(AppRegistryObserver* observer) noexcept override {
+    allocationsLeft = Endless;  // from here on others borrow the client
+    FaultyAppRegistry::addObserver(observer);
+  }
+};
+
+TEST_F(PluginObject, MakesNoClientWhenMakingItFailsAtAnyPoint) {
+  HostWithMemory host(phone.trace);
+  RegistryWithMemory registry(phone.appRegistry, phone.faults);
+  const Platform platform = with(with(phone.platform(), host), registry);
+  auto* const make = create();
+  SyncClient* client = nullptr;
+  unsigned failures = 0;
+  while (failures < 1000) {
+    allocationsLeft = failures;
+    client = make(&platform);
+    allocationsLeft = Endless;
+    if (client) break;
+    ++failures;
+    ASSERT_EQ(phone.appRegistry.observerCount(), 0u);
+    ASSERT_THAT(phone.trace.calls(), testing::IsEmpty());
+  }
+  EXPECT_GT(failures, 0u);
+  ASSERT_NE(client, nullptr);
+  destroy()(client);
+}
 
 TEST_F(PluginObject, PassesOverAClientThatIsNone) { destroy()(nullptr); }
 

@@ -117,6 +117,29 @@ TEST_F(RestoreState, CleaningTheLastIdentifierDeletesTheFile) {
   EXPECT_FALSE(phone.files.exists(RestoreStatePath));
 }
 
+TEST_F(RestoreState, CleaningThatCannotWriteTheRestKeepsTheFileAsItWas) {
+  const Dictionary both{{"com.a", Dictionary{{"1.0", Dictionary{{"path", "/a"}}}}},
+                        {"com.b", Dictionary{{"1.0", Dictionary{{"path", "/b"}}}}}};
+  put(both);
+  phone.faults.failEvery("FileManager.writeAtomically", Error::posix(28));
+  client().cleanRestoreStateForIdentifier("com.a");
+  expectTrace({"fault " + Write});
+  EXPECT_EQ(state(), PropertyList(both));
+}
+
+TEST_F(RestoreState, CleaningThatCannotDeleteTheFileKeepsItForTheNextTime) {
+  const Dictionary last{{"com.a", Dictionary{{"1.0", Dictionary{{"path", "/a"}}}}}};
+  put(last);
+  phone.faults.failEvery("FileManager.removeItem", Error::posix(13));
+  client().cleanRestoreStateForIdentifier("com.a");
+  expectTrace({"fault " + Remove});
+  EXPECT_EQ(state(), PropertyList(last));
+  phone.faults.clear();
+  client().cleanRestoreStateForIdentifier("com.a");
+  expectTrace({Remove});
+  EXPECT_FALSE(phone.files.exists(RestoreStatePath));
+}
+
 TEST_F(RestoreState, CleaningWithoutAFileDoesNothing) {
   client().cleanRestoreStateForIdentifier("com.a");
   expectTrace({});

@@ -175,6 +175,19 @@ TEST_F(ClearSyncData, AFailedUninstallDoesNotStopTheOthers) {
        "InstallerService.clearUninstalled(())"}));
 }
 
+TEST_F(ClearSyncData, RemovesAPlaceholderWithoutABundleIdentifierUnderItsOtherOne) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  phone.appRegistry.edit("com.a", [](AppRecord& record) { record.bundleIdentifier.reset(); });
+  phone.appRegistry.seedPlaceholder("com.b");
+  phone.appRegistry.edit("com.b", [](AppRecord& record) { record.bundleContainerPath.reset(); });
+  client().clearSyncData();
+  expectTrace(begun(
+      {"AppRegistry.uninstallApplication(com.a, {})", "log default SyncBundle|Uninstall com.a = y",
+       "AppRegistry.uninstallApplication(com.b, {})", "log default SyncBundle|Uninstall com.b = y",
+       "InstallerService.clearUninstalled(())"}));
+  EXPECT_TRUE(phone.appRegistry.placeholderIdentifiers().empty());
+}
+
 TEST_F(ClearSyncData, LeavesRecordsThatAreNoApplicationsAlone) {
   AppRecord extension;
   extension.applicationIdentifier = "com.extension";

@@ -178,7 +178,15 @@ TEST_P(UnusableTodoList, HoldsNoOperation) {
   expectTrace(GetParam().lines);
 }
 
-TEST_P(UnusableTodoList, LoadsAsNone) {
+TEST_P(UnusableTodoList, LoadsAsNoneAndOnlyAReadErrorGoesToTheCaller) {
+  std::optional<Error> error;
+  EXPECT_EQ(client()._loadPlist(TodoListPath, &error), std::nullopt);
+  expectTrace(GetParam().lines);
+  const bool couldBeRead = GetParam().contents.has_value();
+  EXPECT_EQ(error.has_value(), !couldBeRead);
+}
+
+TEST_P(UnusableTodoList, LoadsAsNoneForACallerWhoWantsNoError) {
   EXPECT_EQ(client()._loadPlist(TodoListPath), std::nullopt);
   expectTrace(GetParam().lines);
 }
@@ -247,15 +255,29 @@ TEST_F(DemotedAppsList, IsNoneWithoutALineWhenTheFileIsMissingOrEmpty) {
   expectTrace({});
 }
 
-TEST_F(DemotedAppsList, IsNoneWithALineWhenTheFileIsDamaged) {
+TEST_F(DemotedAppsList, GivesAReadErrorToTheCallerWithoutALine) {
+  phone.files.putPlist(Path, Dictionary{});
+  const Error failure = Error::posix(5, Path);
+  phone.faults.failEvery("FileManager.contentsAtPath", failure);
+  std::optional<Error> error;
+  EXPECT_EQ(client()._loadDemotedAppsPlist(Path, &error), std::nullopt);
+  EXPECT_EQ(error, failure);
+  expectTrace({}, fakes::TraceLog);
+}
+
+TEST_F(DemotedAppsList, IsNoneWithALineButNoErrorWhenTheFileIsDamaged) {
   phone.files.putFile(Path, "no property list");
-  EXPECT_EQ(client()._loadDemotedAppsPlist(Path), std::nullopt);
+  std::optional<Error> error;
+  EXPECT_EQ(client()._loadDemotedAppsPlist(Path, &error), std::nullopt);
+  EXPECT_EQ(error, std::nullopt);
   expectTrace({"log error SyncBundle|couldn't parse demoted apps list"});
 }
 
-TEST_F(DemotedAppsList, IsNoneWithALineWhenTheTopLevelIsAnArray) {
+TEST_F(DemotedAppsList, IsNoneWithALineButNoErrorWhenTheTopLevelIsAnArray) {
   phone.files.putPlist(Path, Array{"com.a"});
-  EXPECT_EQ(client()._loadDemotedAppsPlist(Path), std::nullopt);
+  std::optional<Error> error;
+  EXPECT_EQ(client()._loadDemotedAppsPlist(Path, &error), std::nullopt);
+  EXPECT_EQ(error, std::nullopt);
   expectTrace({"log error SyncBundle|demoted apps list is not a dictionary"});
 }
 

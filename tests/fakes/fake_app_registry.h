@@ -49,6 +49,8 @@ class FakeAppRegistry : public AppRegistry {
   void seedPlaceholder(AppRecord record);
   void seedPlaceholder(std::string_view identifier, InstallType installType = InstallType::Sync,
                        std::string_view version = "1.0");
+  /// Changes the records of an application as they stand, also what was filled in.
+  void edit(std::string_view identifier, const std::function<void(AppRecord&)>& change);
   /// The application and its placeholder are gone, as if the person had removed them.
   void removeAll(std::string_view identifier);
   /// What uninstallApplication takes away, untraced; false when there is nothing.
@@ -118,6 +120,7 @@ class FakeAppRegistry : public AppRegistry {
   // The lock is held.
   void placePlaceholder(AppRecord record);
   void placeInstalled(AppRecord record);
+  void eraseContainer(const AppRecord& record);
   Report currentReport() const;
   std::optional<AppRecord> packageRecord(const std::string& identifier, std::string_view path,
                                          std::optional<Error>* error) const;

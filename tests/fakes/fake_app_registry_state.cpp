@@ -59,6 +59,10 @@ void FakeAppRegistry::placeInstalled(AppRecord record) {
   applications_[identifier].installed = std::move(record);
 }
 
+void FakeAppRegistry::eraseContainer(const AppRecord& record) {
+  if (record.bundleContainerPath) files_.erase(*record.bundleContainerPath);
+}
+
 void FakeAppRegistry::seedInstalled(AppRecord record) {
   const std::scoped_lock lock(mutex_);
   placeInstalled(std::move(record));
@@ -80,13 +84,23 @@ void FakeAppRegistry::seedPlaceholder(std::string_view identifier, InstallType i
   seedPlaceholder(std::move(record));
 }
 
+void FakeAppRegistry::edit(std::string_view identifier,
+                           const std::function<void(AppRecord&)>& change) {
+  const std::scoped_lock lock(mutex_);
+  const auto found = applications_.find(identifier);
+  if (found == applications_.end()) return;
+  for (std::optional<AppRecord>* record : {&found->second.installed, &found->second.placeholder}) {
+    if (*record) change(**record);
+  }
+}
+
 void FakeAppRegistry::removeAll(std::string_view identifier) {
   const std::scoped_lock lock(mutex_);
   const auto found = applications_.find(identifier);
   if (found == applications_.end()) return;
   Application& application = found->second;
   for (const auto& record : {application.installed, application.placeholder}) {
-    if (record) files_.erase(*record->bundleContainerPath);
+    if (record) eraseContainer(*record);
   }
   if (application.installed) installerService_.addUninstalled(identifier);
   if (application.progress) application.progress->end(application.progress->installState());
@@ -103,7 +117,7 @@ bool FakeAppRegistry::remove(std::string_view identifier, bool placeholderOnly) 
   const bool hadPlaceholder = application.placeholder.has_value();
   if (!hadPlaceholder && (placeholderOnly || !application.installed)) return false;
   const AppRecord& gone = hadPlaceholder ? *application.placeholder : *application.installed;
-  files_.erase(*gone.bundleContainerPath);
+  eraseContainer(gone);
   if (hadPlaceholder) {
     application.placeholder.reset();
     if (application.progress) application.progress->end(application.progress->installState());
