@@ -1,3 +1,4 @@
+#include <latch>
 #include <thread>
 
 #include "client/queues.h"
@@ -174,16 +175,30 @@ TEST_F(InstallQueue, KeepsRetryingForAsLongAsTheHomeScreenRefuses) {
   EXPECT_TRUE(phone.appRegistry.installed("com.a"));
 }
 
+/// Tells when the end of the transfers has begun.
+class EndNoticingLog : public fakes::FakeLog {
+ public:
+  using FakeLog::FakeLog;
+  void write(LogChannel channel, LogLevel level, std::string_view text) noexcept override {
+    FakeLog::write(channel, level, text);
+    if (text.ends_with("asset transfer ended withsuccess: y")) endBegan.count_down();
+  }
+
+  std::latch endBegan{1};
+};
+
 TEST_F(InstallQueue, EndOfTheTransfersWaitsForARetryThatWaits) {
   phone.homeScreen.queueOutcomes("com.a", {AssertionOutcome::Denied});
-  prepare();
-  client()._enqueueAssetInstall(asset());
+  EndNoticingLog noticing(phone.trace);
+  AppsClient ending(with(phone.platform(), noticing));
+  ending._enqueueAssetInstall(asset());
   ASSERT_TRUE(phone.backgroundQueue.waitForPending(1));
   std::atomic<bool> ended = false;
   std::thread host([&] {
-    client().assetTransferEndedWithSuccess(true);
+    ending.assetTransferEndedWithSuccess(true);
     ended = true;
   });
+  noticing.endBegan.wait();
   // It has not ended while the retry is pending: only the clock can let it.
   EXPECT_FALSE(ended);
   phone.backgroundQueue.advance(30s);
@@ -217,6 +232,60 @@ TEST_F(InstallQueue, UnknownAssertionErrorFailsWithPosix22AndRemovesTheFile) {
            "TerminationAssertion.release(com.a)", "FileManager.removeItem(" + PackagePath + ")",
            "log default SyncBundle|Finished install for com.a"})));
   EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 0u);
+}
+
+TEST_F(InstallQueue, UnknownAssertionErrorThatTheHostWouldTryAgainKeepsTheTodoEntry) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  phone.homeScreen.queueOutcomes("com.a", {static_cast<AssertionOutcome>(3)});
+  install(asset());
+  EXPECT_THAT(
+      installTrace(),
+      testing::ElementsAreArray(joined(
+          begun(),
+          {"log error SyncBundle|Unknown error 3 getting assertion for com.a",
+           "transaction scenario \"Asset install\" step 0 failed com.a \"unknown error grabbing "
+           "assertion\"",
+           "log default SyncBundle|com.a install failed but was recoverable: Error Domain=POSIX "
+           "Code=22",
+           "transaction scenario \"Aerix restore\" step 0 failed com.a \"install failed "
+           "recoverably\"",
+           "FileManager.removeItem(" + PackagePath + ")",
+           "log default SyncBundle|Finished install for com.a"})));
+  EXPECT_EQ(todoOperation("com.a"), "DOWNLOADED");
+  EXPECT_TRUE(phone.appRegistry.placeholder("com.a"));
+  EXPECT_FALSE(phone.files.exists(PackagePath));
+}
+
+/// Refuses every package without a reason.
+class SilentRegistry : public fakes::FaultyAppRegistry {
+ public:
+  using FaultyAppRegistry::FaultyAppRegistry;
+  bool installApplication(const FileLocation&, const PropertyList::Dictionary&,
+                          std::optional<Error>*) noexcept override {
+    return false;
+  }
+};
+
+TEST_F(InstallQueue, PackageRefusedWithoutAReasonIsSortedByTheHostLikeAnyOther) {
+  phone.appRegistry.seedPlaceholder("com.a");
+  SilentRegistry registry(phone.appRegistry, phone.faults);
+  AppsClient installing(with(phone.platform(), registry));
+  for (const bool recoverable : {true, false}) {
+    phone.host.setRecoverable("", recoverable);
+    phone.files.putFile(PackagePath, "package");
+    forgetTrace();
+    installing._enqueueAssetInstall(asset());
+    installing.assetTransferEndedWithSuccess(false);
+    EXPECT_EQ(todoOperation("com.a"), recoverable ? "DOWNLOADED" : "FAILED");
+    EXPECT_EQ(phone.appRegistry.placeholder("com.a").has_value(), recoverable);
+    EXPECT_THAT(phone.trace.log(),
+                Contains(testing::StartsWith(
+                    recoverable ? "log default SyncBundle|com.a install failed but was "
+                                  "recoverable: "
+                                : "log default SyncBundle|com.a install failed "
+                                  "unrecoverably: ")));
+    EXPECT_FALSE(phone.files.exists(PackagePath));
+  }
 }
 
 TEST_F(InstallQueue, RefusedPackageIsFailedForGoodAndItsPlaceholderRemoved) {

@@ -1,53 +1,10 @@
-#include "tests/client/client_test.h"
+#include "tests/client/outstanding_transfers.h"
 
 namespace appsync {
 namespace {
 
-class OutstandingTransfers : public ClientTest {
- protected:
-  void SetUp() override {
-    phone.files.putDirectory(WorkAreaPath);
-    phone.homeScreen.setOrder({});
-  }
-
-  static Dictionary install(const PropertyList& identifier) {
-    return {{"operation", "install"}, {"identifier", identifier}, {"version", "2.0"}};
-  }
-  void putEntries(const Array& entries) { phone.files.putPlist(TodoListPath, entries); }
-
-  /// What the desktop staged for an application.
-  void stage(const std::string& identifier, const std::string& displayName) {
-    const std::string path = WorkAreaPath + "/" + identifier;
-    phone.files.putPlist(path + "/Info.plist", Dictionary{{"KBBundleDisplayName", displayName},
-                                                          {"KBBundleIconFile", "Icon.png"}});
-    phone.files.putFile(path + "/Icon.png", "picture");
-    phone.files.putFile(path + "/HalvoArtwork", "artwork");
-  }
-
-  Lines identifiersOf(const std::vector<SyncAssetPtr>& assets) {
-    Lines identifiers;
-    for (const SyncAssetPtr& asset : assets) identifiers.push_back(asset->identifier);
-    return identifiers;
-  }
-  Lines requested() { return identifiersOf(client().outstandingAssetTransfers()); }
-
-  void seedRestore(const std::string& identifier) {
-    phone.appRegistry.seedPlaceholder(identifier, InstallType::Restore);
-  }
-  void rememberPath(const std::string& identifier, const std::string& path) {
-    phone.files.putPlist(RestoreStatePath,
-                         Dictionary{{identifier, Dictionary{{"1.0", Dictionary{{"path", path}}}}}});
-  }
-  bool logged(const std::string& line) { return phone.trace.count(line) > 0; }
-  bool loggedMessage(const std::string& message) {
-    return logged("log default SyncBundle|com.corvane.twc.AppsClient|" + message);
-  }
-};
-
 using testing::ElementsAre;
 using testing::IsEmpty;
-
-const std::string IconsPath = SyncRootPath + "/Icons";
 
 TEST_F(OutstandingTransfers, WholeTraceOfOneNewApplication) {
   stage("com.a", "Alpha");
@@ -270,20 +227,12 @@ TEST_F(OutstandingTransfers, PlaceholderThatCannotBeMadeDoesNotKeepThePackageBac
   EXPECT_THAT(requested(), ElementsAre("com.a"));
 }
 
-TEST_F(OutstandingTransfers, ApplicationsToBeIgnoredAreThoseOfThisSyncOnly) {
+TEST_F(OutstandingTransfers, PreparingForASyncKeepsNoRestoreBack) {
   EXPECT_TRUE(client().prepareForSyncWithHostAnchor("anchor", {}, nullptr));
   seedRestore("com.r");
   requested();
   EXPECT_EQ(phone.host.made().size(), 1u);
 }
-
-class CoordinatedTransfers : public OutstandingTransfers {
- protected:
-  void SetUp() override {
-    OutstandingTransfers::SetUp();
-    phone.installCoordination.setEnabled(true);
-  }
-};
 
 TEST_F(CoordinatedTransfers, RestoresAreNeverReturned) {
   seedRestore("com.r");

@@ -175,6 +175,42 @@ TEST_F(TransferResults, LaterDataOnlyAssetFindsTheRememberedPackageAndInstallsIt
   EXPECT_TRUE(phone.appRegistry.installed("com.a"));
 }
 
+TEST_F(TransferResults, LaterDataOnlyAssetOfAnotherVersionDoesNotFindTheRememberedPackage) {
+  putTodo({{"com.a", "install"}});
+  phone.backup.addRestoreData("com.a");
+  succeed(restored("/var/mobile/Media/a.zip"));
+  const auto before = phone.files.files();
+  const SyncAssetPtr data = restored(std::nullopt);
+  data->variantOptions = {{"Version", "2.0"}};
+  data->completedAssetParts = kTWAssetPartApplicationData;
+  succeed(data);
+  expectTrace(
+      {"log default SyncBundle|transfer for asset com.a ended with success y error (null) "
+       "existingApp:0",
+       "log error SyncBundle|Returning (null) progress for com.a",
+       "log default SyncBundle|asset transfer succeeded for com.a",
+       "log default SyncBundle|Ignoring invalid path: (null)"});
+  EXPECT_EQ(phone.files.files(), before);
+}
+
+TEST_F(TransferResults, RestoreIsNamedByItsShortDescription) {
+  const SyncAssetPtr made = restored("/var/mobile/Media/a.zip");
+  made->shortDescription = "Alpha of Ann";
+  phone.backup.addRestoreData("com.a");
+  succeed(made);
+  EXPECT_EQ(phone.trace.count("log default SyncBundle|com.corvane.twc.AppsClient|Restore data "
+                              "exists for Alpha of Ann"),
+            1u);
+  const SyncAssetPtr other = restored("/var/mobile/Media/a.zip");
+  other->identifier = "com.b";
+  other->shortDescription = "Beta of Ann";
+  succeed(other);
+  EXPECT_EQ(phone.trace.count("log default SyncBundle|com.corvane.twc.AppsClient|No restore data "
+                              "exists for Beta of Ann"),
+            1u);
+  settle();
+}
+
 TEST_F(TransferResults, RestoreWithoutBackupDataIsInstalledAtOnce) {
   succeed(restored("/var/mobile/Media/a.zip"));
   EXPECT_EQ(phone.trace.count("log default SyncBundle|com.corvane.twc.AppsClient|No restore data "
@@ -222,12 +258,21 @@ TEST_F(TransferResults, FinalFailureCancelsTheProgressAndRemovesThePlaceholder) 
   EXPECT_FALSE(phone.appRegistry.placeholder("com.a"));
 }
 
-TEST_F(TransferResults, FinalFailureLeavesAnEndedProgressAlone) {
+TEST_F(TransferResults, FinalFailureCancelsAnUnfinishedProgressAndLeavesAnEndedOneAlone) {
   phone.host.setRecoverable("Final", false);
-  phone.appRegistry.seedPlaceholder("com.a");
-  phone.appRegistry.progress("com.a")->begin(InstallState::Canceled, InstallPhase::Loading);
-  fail(asset(), Final);
-  EXPECT_EQ(phone.trace.count("InstallProgress.cancel"), 0u);
+  const std::pair<InstallState, std::size_t> cancellations[] = {
+      {InstallState::Waiting, 1},  {InstallState::Active, 1}, {InstallState::Paused, 1},
+      {InstallState::Canceled, 0}, {InstallState::Failed, 0}, {InstallState::Finished, 0}};
+  for (const auto& [state, expected] : cancellations) {
+    phone.appRegistry.seedPlaceholder("com.a");
+    const auto progress = phone.appRegistry.progress("com.a");
+    progress->begin(state, InstallPhase::Loading);
+    fail(asset(), Final);
+    EXPECT_EQ(phone.trace.count("InstallProgress.cancel(com.a)"), expected)
+        << static_cast<int>(state);
+    EXPECT_EQ(progress->installState(), expected ? InstallState::Canceled : state);
+    EXPECT_FALSE(phone.appRegistry.placeholder("com.a"));
+  }
 }
 
 TEST_F(TransferResults, FailedRemovalOfThePlaceholderIsLogged) {
@@ -259,6 +304,13 @@ TEST_F(TransferResults, EndWithNothingOutstandingOnlyNotifiesTheHomeScreen) {
                "HomeScreenService.serverPort()",
                "SystemNotifier.setState(com.corvane.dashel.twc.wsyncnotify, 0)",
                "SystemNotifier.post(com.corvane.dashel.twc.wsyncnotify)"});
+}
+
+TEST_F(TransferResults, EndForgetsHowManyInstallsWereAttempted) {
+  succeed(received("a.zip"));
+  settle();
+  EXPECT_EQ(phone.appRegistry.installsStarted(), 1u);
+  EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 0u);
 }
 
 TEST_F(TransferResults, EndWithSuccessWhileTransfersAreOutstandingFinishesThemAndLogsAnError) {
