@@ -1,6 +1,7 @@
 #include "host/base/version.h"
 
 #include <algorithm>
+#include <compare>
 
 namespace appsync::host {
 namespace {
@@ -25,8 +26,8 @@ std::string_view takeNumber(std::string_view& part) {
 std::weak_ordering compareParts(std::string_view left, std::string_view right) {
   const std::string_view leftNumber = takeNumber(left);
   const std::string_view rightNumber = takeNumber(right);
-  if (const auto order = leftNumber.size() <=> rightNumber.size(); order != 0) return order;
-  if (const auto order = leftNumber <=> rightNumber; order != 0) return order;
+  if (const auto order = leftNumber.size() <=> rightNumber.size(); std::is_neq(order)) return order;
+  if (const auto order = leftNumber <=> rightNumber; std::is_neq(order)) return order;
   return left <=> right;
 }
 
@@ -36,7 +37,7 @@ std::weak_ordering compareVersions(std::string_view left, std::string_view right
   if (left.empty() || right.empty()) return !left.empty() <=> !right.empty();
   while (!left.empty() || !right.empty()) {
     const auto order = compareParts(takePart(left), takePart(right));
-    if (order != 0) return order;
+    if (std::is_neq(order)) return order;
   }
   return std::weak_ordering::equivalent;
 }
