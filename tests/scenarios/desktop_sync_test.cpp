@@ -144,7 +144,7 @@ bool isFromReport(const std::string& line) {
 
 const Error Damaged{"InstallerServiceErrorDomain", 2, {}, nullptr};
 
-TEST_F(DesktopSync, newUpdatedDamagedAndRemovedApplicationsAsOneTrace) {
+TEST_F(DesktopSync, NewUpdatedDamagedAndRemovedApplicationsAsOneTrace) {
   phone.appRegistry.seedInstalled("com.old", "1.0");
   phone.appRegistry.seedInstalled("com.unwanted", "1.0");
   phone.appRegistry.failInstall("com.damaged", Damaged);
@@ -246,7 +246,7 @@ TEST_F(DesktopSync, newUpdatedDamagedAndRemovedApplicationsAsOneTrace) {
   EXPECT_THAT(phone.appRegistry.placeholderIdentifiers(), testing::IsEmpty());
 }
 
-TEST_F(DesktopSync, applicationUninstalledOnThePhoneIsReportedByTheNextInventory) {
+TEST_F(DesktopSync, AnApplicationUninstalledOnThePhoneIsReportedByTheNextInventory) {
   sync({{"com.a", "install"}, {"com.b", "install"}});
   phone.appRegistry.uninstallApplication("com.a", {});
   const PropertyList::Dictionary inventory = sync({});
@@ -255,7 +255,7 @@ TEST_F(DesktopSync, applicationUninstalledOnThePhoneIsReportedByTheNextInventory
   EXPECT_EQ(sync({}), (Dictionary{{"_Deleted", Array{}}}));
 }
 
-TEST_F(DesktopSync, failedApplicationIsAskedForAgainByTheNextSync) {
+TEST_F(DesktopSync, AFailedApplicationIsAskedForAgainByTheNextSync) {
   // The first call installs the placeholder, the second the package.
   phone.faults.failCall("AppRegistry.installApplication", 2, Damaged);
   sync({{"com.a", "install"}});
