@@ -1,6 +1,7 @@
 """Whole syncs of real packages with a real device and the real plug-in."""
 
 import os
+import pathlib
 import plistlib
 import shutil
 import subprocess
@@ -162,10 +163,15 @@ class Sync(support.Case):
         if os.getuid() != 0:
             self.skipTest("only root can become somebody else")
         self.offer("com.a")
+        # A copy, since that account may not get at a clone in a home folder.
+        built = pathlib.Path(support.APPSYNC)
+        command = shutil.copy(built, self.folder)
+        shutil.copytree(built.parent / "AppsClient.syncplugin",
+                        self.folder / "AppsClient.syncplugin")
         shutil.chown(self.folder, 65534)
         for path in self.folder.rglob("*"):
             os.chown(path, 65534, 65534)
-        out, _ = self.run_appsync("sync", self.library, user=65534, group=65534)
+        out, _ = self.run_appsync("sync", self.library, executable=command, user=65534, group=65534)
         self.assertIn("1 installed", out)
 
 
