@@ -102,7 +102,7 @@ SyncAssetPtr AppsClient::_prepareAsset(const TransferCandidate& app) {
   const std::string bundlePath = app.bundlePath.value_or(std::string());
   const bool rendered = _makeIconFromBundlePath(app.bundlePath, app.iconPath);
 
-  const SyncAssetPtr asset =
+  SyncAssetPtr asset =
       _platform.syncHost.makeDownload(app.identifier, ApplicationDataclass, prettyName);
   asset->icon = FileLocation::file(rendered ? app.iconPath : paths::artworkIn(container));
   asset->isRestore = app.isRestore;

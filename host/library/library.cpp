@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <compare>
 #include <system_error>
 
 #include "host/base/text.h"
@@ -20,7 +21,7 @@ void add(Library& library, const fs::path& file) {
     return;
   }
   const auto [place, isNew] = library.packages.try_emplace(package->identifier, *package);
-  if (!isNew && compareVersions(package->version, place->second.version) > 0) {
+  if (!isNew && std::is_gt(compareVersions(package->version, place->second.version))) {
     place->second = std::move(*package);
   }
 }

@@ -96,7 +96,7 @@ bool isUsableIconName(std::string_view name) {
 /// Pictures met before the Info.plist that says which of them is the icon.
 class IconCandidates {
  public:
-  void add(std::string name, Bytes bytes) {
+  void add(std::string name, Bytes&& bytes) {
     total_ += bytes.size();
     if (total_ <= 4 * MaximumPart) found_.try_emplace(std::move(name), std::move(bytes));
   }

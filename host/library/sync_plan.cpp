@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <compare>
 #include <map>
 #include <set>
 
@@ -111,8 +112,10 @@ class Planner {
     Action action = Action::Install;
     if (isInstalled) {
       const auto order = compareVersions(package.version, current);
-      action = order > 0 ? Action::Update : order < 0 ? Action::Downgrade : Action::Reinstall;
-      if (order <= 0 && wanted_.empty()) {
+      action = std::is_gt(order)   ? Action::Update
+               : std::is_lt(order) ? Action::Downgrade
+                                   : Action::Reinstall;
+      if (std::is_lteq(order) && wanted_.empty()) {
         return skip(package.identifier, versionText(current) + " is installed", true);
       }
     }
@@ -158,6 +161,7 @@ std::vector<InstalledApplication> installedApplications(AppRegistry& registry) {
                      record.isPlaceholder};
   });
   std::vector<InstalledApplication> result;
+  result.reserve(found.size());
   for (auto& [identifier, application] : found) result.push_back(std::move(application));
   return result;
 }

@@ -63,8 +63,7 @@ std::vector<AppRecord> RestorePackages::wanted(const std::set<std::string>& exce
 SyncAssetPtr RestorePackages::makeAsset(const AppRecord& record, std::uint32_t parts) const {
   const std::string& name =
       record.displayName.empty() ? record.applicationIdentifier : record.displayName;
-  const SyncAssetPtr asset =
-      host_.makeDownload(record.applicationIdentifier, ApplicationDataclass, name);
+  SyncAssetPtr asset = host_.makeDownload(record.applicationIdentifier, ApplicationDataclass, name);
   asset->isRestore = true;
   asset->variantOptions.emplace(AssetPartsKey, static_cast<std::int64_t>(parts));
   if (record.bundleVersion) asset->variantOptions.emplace(AssetVersionKey, *record.bundleVersion);

@@ -21,7 +21,7 @@ std::optional<Bytes> withoutEmptyName(std::optional<Bytes> infoPlist) {
   const std::string* name = info ? findString(*info, KBBundleDisplayName) : nullptr;
   if (!name || !name->empty()) return infoPlist;
   info->erase(std::string(KBBundleDisplayName));
-  return serializePropertyList(std::move(*parsed), PropertyListFormat::Binary);
+  return serializePropertyList(*parsed, PropertyListFormat::Binary);
 }
 
 class Stage {
