@@ -16,9 +16,11 @@ constexpr std::string_view PlainEnding = ".package";
 /// no placeholder, which an update needs: a refused one takes the placeholder away, or else the
 /// installed application.
 std::optional<Bytes> withoutEmptyName(std::optional<Bytes> infoPlist) {
-  auto parsed = infoPlist ? parsePropertyList(*infoPlist) : std::nullopt;
-  PropertyList::Dictionary* const info = parsed ? parsed->asDictionary() : nullptr;
-  const std::string* name = info ? findString(*info, KBBundleDisplayName) : nullptr;
+  if (!infoPlist) return infoPlist;
+  std::optional<PropertyList> parsed = parsePropertyList(*infoPlist);
+  if (!parsed) return infoPlist;
+  PropertyList::Dictionary* const info = parsed->asDictionary();
+  const std::string* const name = info ? findString(*info, KBBundleDisplayName) : nullptr;
   if (!name || !name->empty()) return infoPlist;
   info->erase(std::string(KBBundleDisplayName));
   return serializePropertyList(*parsed, PropertyListFormat::Binary);
