@@ -40,7 +40,9 @@ bool AppsClient::writeIconData(const std::optional<Bytes>& iconData, std::string
   std::uint64_t size = 0;
   const bool created = _platform.files.createFile(path, *iconData, attributes);
   if (created) {
-    if (const auto item = _platform.files.attributesOfItem(path)) {
+    std::optional<Error> error;
+    const auto item = _platform.files.attributesOfItem(path, &error);
+    if (item && !error) {
       size = item->size;
       if (fileSize) *fileSize = size;
     }
