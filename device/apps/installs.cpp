@@ -2,6 +2,8 @@
 
 #include <fmt/format.h>
 
+#include <unordered_map>
+
 #include "device/state/application_rows.h"
 
 namespace appsync::device {
@@ -127,16 +129,19 @@ bool isInstalling(SQLite::Database& database, std::string_view identifier) {
 RegistryObservers::Report reportInstalls(Database& database) {
   RegistryObservers::Report report;
   database.read("the installs under way could not be read", [&](SQLite::Database& connection) {
+    // All at once: one by one would take as long as a sync with thousands of placeholders.
+    const std::vector<ApplicationRow> rows = allApplications(connection);
+    std::unordered_map<std::string_view, const ApplicationRow*> shown;
+    for (const ApplicationRow& row : rows) shown[row.identifier] = &row;  // placeholders come last
     Query query(connection,
                 "SELECT identifier, state FROM installs WHERE NOT over AND state IN (?, ?, ?) "
                 "ORDER BY number",
                 InstallState::Waiting, InstallState::Active, InstallState::Paused);
     while (query.next()) {
-      const ApplicationRows rows = findApplication(connection, query.text(0));
-      if (!rows.any()) continue;
+      const auto row = shown.find(query.text(0));
+      if (row == shown.end()) continue;
       const bool paused = query.as<InstallState>(1) == InstallState::Paused;
-      const ApplicationRow& row = rows.placeholder ? *rows.placeholder : *rows.installed;
-      (paused ? report.paused : report.prioritized).push_back(row.record());
+      (paused ? report.paused : report.prioritized).push_back(row->second->record());
     }
   });
   return report;

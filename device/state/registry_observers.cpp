@@ -1,10 +1,18 @@
 #include "device/state/registry_observers.h"
 
+#include <algorithm>
+#include <chrono>
 #include <condition_variable>
 #include <deque>
 #include <thread>
 
 namespace appsync::device {
+namespace {
+
+/// Between two reports; one that waited long for the registry shall not keep the next one away.
+constexpr std::chrono::seconds LongestPause{1};
+
+}  // namespace
 
 class RegistryObservers::Service {
  public:
@@ -41,6 +49,8 @@ class RegistryObservers::Service {
   }
 
  private:
+  using Clock = std::chrono::steady_clock;
+
   void run() {
     std::unique_lock lock(mutex_);
     while (!stopping_) {
@@ -50,10 +60,12 @@ class RegistryObservers::Service {
         lock.unlock();
         observer_.applicationInstallsDidCancel(records);
         lock.lock();
+      } else if (reportDue_ && Clock::now() < nextReport_) {
+        changed_.wait_until(lock, nextReport_);
       } else if (reportDue_) {
         reportDue_ = false;
         lock.unlock();
-        const Report report = report_();
+        const Report report = timedReport();
         observer_.applicationInstallsArePrioritized(report.prioritized, report.paused);
         lock.lock();
       } else {
@@ -64,8 +76,19 @@ class RegistryObservers::Service {
     changed_.notify_all();
   }
 
+  /// Those who change installs wait for the registry that a report reads: it may take a tenth of
+  /// the time and no more.
+  Report timedReport() {
+    const Clock::time_point begin = Clock::now();
+    Report report = report_();
+    const Clock::time_point end = Clock::now();
+    nextReport_ = end + std::min<Clock::duration>(9 * (end - begin), LongestPause);
+    return report;
+  }
+
   AppRegistryObserver& observer_;
   const std::function<Report()>& report_;
+  Clock::time_point nextReport_;  ///< only used by the thread
   std::mutex mutex_;
   std::condition_variable changed_;
   // Guarded by mutex_.

@@ -27,7 +27,8 @@ class RegistryObservers {
   void add(AppRegistryObserver* observer);
   void remove(AppRegistryObserver* observer);
 
-  /// Each observer gets a new report; changes that come while one is on its way are joined.
+  /// Each observer gets a new report; changes that come while one is on its way are joined,
+  /// and those of up to a second after one that took long.
   void installsChanged();
   void installsCancelled(const std::vector<AppRecord>& records);
 
