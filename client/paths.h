@@ -3,6 +3,8 @@
 #include <string>
 #include <string_view>
 
+#include "platform/file_manager.h"
+
 namespace appsync::paths {
 
 /// Root of all sync state.
@@ -19,20 +21,20 @@ inline constexpr std::string_view TodoList =
 inline constexpr std::string_view TodoDebugCopy =
     "/var/mobile/Library/ApplicationSync/HalvoStuff/ApplicationsSync.plist-debug.plist";
 /// The applications that were on the device at the last sync; written by the host.
-inline constexpr std::string_view LastSyncState =
-    "/var/mobile/Library/ApplicationSync/LastSyncAppState.plist";
-inline constexpr std::string_view RestoreState =
-    "/var/mobile/Library/ApplicationSync/RestoreState.plist";
+inline const std::string LastSyncState = joinPath(SyncRoot, "LastSyncAppState.plist");
+inline const std::string RestoreState = joinPath(SyncRoot, "RestoreState.plist");
 /// The home screen's order as last received; kept for diagnosis.
-inline constexpr std::string_view SortOrder =
-    "/var/mobile/Library/ApplicationSync/AssetSortOrder.plist";
+inline const std::string SortOrder = joinPath(SyncRoot, "AssetSortOrder.plist");
 inline constexpr std::string_view IconScratch = "/var/mobile/Library/ApplicationSync/Icons";
 
 /// The icon layout that the desktop wants.
 inline constexpr std::string_view IconLayout =
     "/var/mobile/Library/ApplicationSync/HalvoStuff/DashelIconState.plist";
 
-// Files of an application's container and of its bundle.
+/// The store's metadata in an application's container.
+inline constexpr std::string_view MetadataName = "HalvoMetadata.plist";
+
+// Files of a container and of a bundle as an asset names them: without either, in the phone's root.
 inline std::string metadataIn(std::string_view container) {
   return std::string(container) + "/HalvoMetadata.plist";
 }

@@ -51,7 +51,7 @@ using DictionaryOf = const PropertyList::Dictionary* (PropertyList::*)() const;
 void addAccounts(const ClientLog& log, FileManager& files, const AppRecord& record,
                  std::set<std::string>& accounts) {
   std::optional<std::string> path;
-  if (record.bundleContainerPath) path = paths::metadataIn(*record.bundleContainerPath);
+  if (record.bundleContainerPath) path = joinPath(*record.bundleContainerPath, paths::MetadataName);
   const auto metadata = path ? loadDictionary(files, *path) : std::nullopt;
   const PropertyList::Dictionary* root = metadata ? &*metadata : nullptr;
   const DictionaryOf dictionary = &PropertyList::asDictionary;

@@ -91,7 +91,7 @@ void AppsClient::prepareForBackup() noexcept {
   _log.normal("preparing for backup");
   _platform.appRegistry.enumerateBundles(BundleKind::User, [this](const AppRecord& record, bool&) {
     if (!record.bundleContainerPath) return;
-    const std::string path = paths::metadataIn(*record.bundleContainerPath);
+    const std::string path = joinPath(*record.bundleContainerPath, paths::MetadataName);
     std::optional<PropertyList::Dictionary> metadata = loadDictionary(_platform.files, path);
     if (!metadata || !tidyMetadata(record, *metadata, _log)) return;
     const std::optional<Bytes> bytes =
