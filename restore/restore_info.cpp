@@ -8,19 +8,15 @@
 namespace appsync {
 namespace {
 
-constexpr std::string_view RestoreListPath =
-    "/var/mobile/Media/HalvoRestore/RestoreApplications.plist";
 constexpr std::string_view KeptCopyPath =
     "/var/mobile/Library/Logs/Vellum/RestoreApplications.plist";
-constexpr std::string_view DemotedAppsPath =
-    "/var/mobile/Library/Preferences/com.corvane.Safekeep.DemotedApps.plist";
 
 /// The applications that were demoted when the backup was made.
 class DemotedApps {
  public:
   explicit DemotedApps(const PropertyList::Dictionary& lists)
-      : automatic_(namesUnder(lists, "AutomaticDowngrades")),
-        intentional_(namesUnder(lists, "IntentionalDowngrades")) {}
+      : automatic_(namesUnder(lists, exchange::AutomaticDowngradesKey)),
+        intentional_(namesUnder(lists, exchange::IntentionalDowngradesKey)) {}
 
   DemotionStatus statusOf(const std::string& bundleId) const {
     if (automatic_.contains(bundleId)) return DemotionStatus::Automatic;
@@ -65,18 +61,18 @@ std::optional<RestoreEntry> readEntry(const ClientLog& log, std::string_view bun
     log.normal("no halvo restore info for '%{public}@' - skipping", bundleId);
     return std::nullopt;
   }
-  std::optional<Bytes> metadata = dataUnder(*entry, "HalvoMetadata");
+  std::optional<Bytes> metadata = dataUnder(*entry, exchange::RestoreMetadataKey);
   if (!metadata) {
     log.normal("no HalvoMetadata for '%{public}@' - ignoring", bundleId);
     return std::nullopt;
   }
-  return RestoreEntry{std::move(*metadata), dataUnder(*entry, "ApplicationSINF"),
-                      dataUnder(*entry, "PlaceholderIcon")};
+  return RestoreEntry{std::move(*metadata), dataUnder(*entry, exchange::RestoreSinfKey),
+                      dataUnder(*entry, exchange::RestoreIconKey)};
 }
 
 std::optional<PropertyList::Dictionary> loadRestoreList(FileManager& files, const ClientLog& log) {
   std::optional<Error> error;
-  const std::optional<Bytes> bytes = files.contentsAtPath(RestoreListPath, &error);
+  const std::optional<Bytes> bytes = files.contentsAtPath(exchange::RestoreList, &error);
   if (!bytes) {
     log.normal("failed to read halvo app restore info. err=%{public}@", error);
     return std::nullopt;
@@ -95,7 +91,7 @@ void record(TransactionLog& log, bool success, std::string_view bundleId,
 }  // namespace
 
 bool AppsClient::_processHalvoRestoreInfo() {
-  if (!_platform.files.fileExists(RestoreListPath)) {
+  if (!_platform.files.fileExists(exchange::RestoreList)) {
     _log.normal("no halvo restore plist found - skipping processing of halvo restored apps");
     return true;
   }
@@ -105,14 +101,15 @@ bool AppsClient::_processHalvoRestoreInfo() {
   // The list is used once, whatever came of it.
   _platform.files.removeItem(KeptCopyPath);
   std::optional<Error> error;
-  if (!_platform.files.moveItem(RestoreListPath, KeptCopyPath, &error)) {
+  if (!_platform.files.moveItem(exchange::RestoreList, KeptCopyPath, &error)) {
     _log.normal("failed to copy halvo metadata. err=%{public}@", error);
   }
   return result;
 }
 
 bool AppsClient::_restoreApplications(const PropertyList::Dictionary& restoreList) {
-  const std::optional<PropertyList::Dictionary> lists = _loadDemotedAppsPlist(DemotedAppsPath);
+  const std::optional<PropertyList::Dictionary> lists =
+      _loadDemotedAppsPlist(exchange::DemotedApplications);
   _log.oversize("Demoted Apps: %{public}@", lists);
   const DemotedApps demoted(lists.value_or(PropertyList::Dictionary{}));
   bool result = false;

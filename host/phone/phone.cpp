@@ -65,7 +65,7 @@ void claimDownloads(AppRegistry& apps, const std::set<std::string>& except) {
 }
 
 std::vector<TodoEntry> readTodoList(FileManager& files, std::string_view directory) {
-  const auto bytes = files.contentsAtPath(joinPath(directory, exchange::TodoName));
+  const auto bytes = files.contentsAtPath(joinPath(directory, exchange::TodoListName));
   const auto list = bytes ? parsePropertyList(*bytes) : std::nullopt;
   if (!list || !list->asArray()) return {};
   std::vector<TodoEntry> entries;

@@ -12,6 +12,7 @@
 #include "platform/app_registry.h"
 #include "platform/file_manager.h"
 #include "platform/install_coordination.h"
+#include "platform/sync_files.h"
 
 namespace appsync::host {
 
@@ -62,26 +63,6 @@ ApplicationsPresent applicationsPresent(AppRegistry& registry);
 /// for them: the client asks the host for the package of every other placeholder, and takes it away
 /// when the host has none.
 void claimDownloads(AppRegistry& apps, const std::set<std::string>& except);
-
-// Where host and client exchange files on the phone.
-namespace exchange {
-inline constexpr std::string_view StagingRoot = "/var/mobile/Media/PublicStaging";
-inline constexpr std::string_view StagingArea = "/var/mobile/Media/PublicStaging/ApplicationSync";
-inline constexpr std::string_view SyncRoot = "/var/mobile/Library/ApplicationSync";
-inline constexpr std::string_view WorkArea = "/var/mobile/Library/ApplicationSync/HalvoStuff";
-inline constexpr std::string_view LastSyncState =
-    "/var/mobile/Library/ApplicationSync/LastSyncAppState.plist";
-inline constexpr std::string_view RestoreState =
-    "/var/mobile/Library/ApplicationSync/RestoreState.plist";
-inline constexpr std::string_view RestoreList =
-    "/var/mobile/Media/HalvoRestore/RestoreApplications.plist";
-inline constexpr std::string_view WaitingData = "/var/mobile/Media/HalvoRestore/Data";
-inline constexpr std::string_view DemotedApplications =
-    "/var/mobile/Library/Preferences/com.corvane.Safekeep.DemotedApps.plist";
-inline constexpr std::string_view Downloads = "/var/mobile/Media/Downloads";
-inline constexpr std::string_view TodoName = "ApplicationsSync.plist";
-inline constexpr std::string_view IconLayoutName = "DashelIconState.plist";
-}  // namespace exchange
 
 /// One entry of the todo list that the desktop gives the phone.
 struct TodoEntry {

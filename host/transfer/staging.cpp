@@ -86,7 +86,7 @@ bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
   const auto todo = serializePropertyList(todoList(plan), PropertyListFormat::Binary, error);
   // The list comes last: without it the client does nothing with what else lies here.
   return todo && area.write(exchange::StagingArea, exchange::IconLayoutName, iconLayout) &&
-         area.write(exchange::StagingArea, exchange::TodoName, todo);
+         area.write(exchange::StagingArea, exchange::TodoListName, todo);
 }
 
 std::string stagedPackageName(const LibraryPackage& package) {

@@ -142,7 +142,7 @@ void RecordingClient::install(const SyncAsset& asset) {
 }
 
 void RecordingClient::setOperation(const std::string& identifier, const std::string& operation) {
-  const std::string path = joinPath(exchange::WorkArea, exchange::TodoName);
+  const std::string path = joinPath(exchange::WorkArea, exchange::TodoListName);
   auto list = phone_.files.plistAt(path);
   if (!list || !list->asArray()) return;
   for (PropertyList& item : *list->asArray()) {
@@ -242,7 +242,7 @@ void SessionTest::putTodo(const std::vector<TodoEntry>& entries) {
     list.emplace_back(
         PropertyList::Dictionary{{"identifier", entry.identifier}, {"operation", entry.operation}});
   }
-  phone.files.putPlist(joinPath(exchange::WorkArea, exchange::TodoName), list);
+  phone.files.putPlist(joinPath(exchange::WorkArea, exchange::TodoListName), list);
 }
 
 std::shared_ptr<InstallCoordinator> SessionTest::makeCoordinator(std::string_view identifier) {
