@@ -8,19 +8,18 @@
 #include "device/apps/application_data.h"
 #include "device/apps/installer_service.h"
 #include "device/apps/installs.h"
+#include "device/apps/launching.h"
 #include "device/base/identifiers.h"
 #include "device/coordination/install_coordination_service.h"
 #include "device/coordination/no_coordination.h"
-#include "device/device_folder.h"
 #include "device/files/file_receiver.h"
 #include "device/home/home_screen.h"
 #include "device/icons/icon_renderer.h"
 #include "device/icons/image_encoder.h"
-#include "device/journal/log_files.h"
 #include "device/journal/transaction_log.h"
+#include "device/open_folder.h"
 #include "device/person_socket.h"
 #include "device/recovery.h"
-#include "device/schema.h"
 #include "device/services/background_queue.h"
 #include "device/services/backup_manager.h"
 #include "device/services/system_notifier.h"
@@ -29,33 +28,6 @@
 
 namespace appsync::device {
 namespace {
-
-/// A folder that has been found to be a device, open. `lock` is there only for writing.
-struct OpenFolder {
-  DevicePaths paths;
-  std::unique_ptr<WriteLock> lock;
-  std::unique_ptr<LogFiles> log;
-  std::unique_ptr<Database> database;
-};
-
-std::optional<OpenFolder> openFolder(const std::filesystem::path& folder, Access access,
-                                     DeviceError& error) {
-  OpenFolder opened{DevicePaths(folder), nullptr, nullptr, nullptr};
-  const DevicePaths& paths = opened.paths;
-  if (!checkDeviceFolder(paths, error)) return std::nullopt;
-  if (access == Access::Write) {
-    opened.lock = WriteLock::take(paths, error);
-    if (!opened.lock) return std::nullopt;
-  }
-  opened.log = std::make_unique<LogFiles>(paths.log, access == Access::Write);
-  opened.database = openDatabase(paths.folder, paths.database, access, *opened.log, error);
-  if (!opened.database) return std::nullopt;
-  if (!std::filesystem::is_directory(paths.root)) {
-    error = damagedDevice(paths.folder, "its files are missing");
-    return std::nullopt;
-  }
-  return opened;
-}
 
 Error notInstalling(std::string_view bundleId) {
   return Error::withDescription(POSIXErrorDomain, ENOENT,
@@ -263,23 +235,6 @@ class FolderDevice final : public EmbeddedDevice {
 DeviceError unusable(const std::filesystem::path& folder, std::string_view reason) {
   return deviceError(DeviceProblem::Unusable, folder, reason,
                      "check the permissions of the folder and the free space");
-}
-
-/// Why a person cannot bring the application to the foreground; none if they can.
-std::optional<Error> objectionToLaunch(Database& database, std::string_view bundleId) {
-  ApplicationRows rows;
-  std::optional<Error> error;
-  const bool read = database.read(
-      "the registry could not be read",
-      [&](SQLite::Database& connection) { rows = findApplication(connection, bundleId); }, &error);
-  if (!read) return error;
-  const auto refuse = [&](int code, std::string_view reason) {
-    return Error::withDescription(POSIXErrorDomain, code, fmt::format("{} {}", bundleId, reason));
-  };
-  if (!rows.any()) return refuse(ENOENT, "is not installed");
-  if (!rows.installed) return refuse(ENOENT, "is not installed yet");
-  if (rows.installed->launchProhibited) return refuse(EPERM, "may not be launched");
-  return std::nullopt;
 }
 
 std::unique_ptr<FolderDevice> openDevice(const std::filesystem::path& folder, Access access,

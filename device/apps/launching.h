@@ -1,0 +1,13 @@
+#pragma once
+
+#include <optional>
+#include <string_view>
+
+#include "device/state/database.h"
+
+namespace appsync::device {
+
+/// Why a person cannot bring the application to the foreground; none if they can.
+std::optional<Error> objectionToLaunch(Database& database, std::string_view identifier);
+
+}  // namespace appsync::device
