@@ -12,7 +12,7 @@
 namespace appsync::device {
 namespace {
 
-/// Where files are written piece by piece; what lies in containers goes with them.
+/// Where files are written piece by piece.
 constexpr std::string_view WrittenDirectories[] = {"/tmp", "/var/mobile/Library",
                                                    "/var/mobile/Media"};
 
@@ -108,6 +108,19 @@ void clearForeground(const Foreground& foreground, const std::set<std::string>& 
   }
 }
 
+/// Of an application's own data only what stands beside it is the device's; and what a package
+/// holds was written before its container was named.
+void removeTemporaries(DeviceCore& core, const std::vector<ApplicationRow>& rows) {
+  for (const std::string_view directory : WrittenDirectories) {
+    core.handles.removeTemporaries(directory, Reach::AllBelow);
+  }
+  core.handles.removeTemporaries(Containers::DataDirectory, Reach::Here);
+  for (const ApplicationRow& row : rows) {
+    core.handles.removeTemporaries(row.container, Reach::Here);
+    core.handles.removeTemporaries(row.bundlePath(), Reach::Here);
+  }
+}
+
 }  // namespace
 
 void finishInterruptedWork(DeviceCore& core) {
@@ -121,9 +134,7 @@ void finishInterruptedWork(DeviceCore& core) {
   removeUnusedData(core, installed);
   pauseInstalls(core);
   clearForeground(core.foreground, installed);
-  for (const std::string_view directory : WrittenDirectories) {
-    core.handles.removeTemporaries(directory);
-  }
+  removeTemporaries(core, rows);
 }
 
 }  // namespace appsync::device

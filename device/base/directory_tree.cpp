@@ -121,14 +121,15 @@ bool copyLevel(int fromDirectory, const std::string& from, int toDirectory, cons
   return true;
 }
 
-void removeTemporariesBelow(int directory, int depth) {
+void removeTemporaries(int directory, Reach reach, int depth) {
   std::vector<std::string> names;
   if (depth > MaximumDepth || !listNames(directory, names)) return;
   for (const std::string& name : names) {
     if (isTemporaryName(name)) {
       removeLevel(directory, name, depth);
-    } else if (const FileDescriptor child = openChild(directory, name)) {
-      removeTemporariesBelow(child.get(), depth + 1);
+    } else if (reach == Reach::AllBelow) {
+      const FileDescriptor child = openChild(directory, name);
+      if (child) removeTemporaries(child.get(), reach, depth + 1);
     }
   }
 }
@@ -171,6 +172,8 @@ bool copyTree(int fromDirectory, const std::string& from, int toDirectory,
   return failWith(failure);
 }
 
-void removeTemporaryFiles(int directory) noexcept { removeTemporariesBelow(directory, 0); }
+void removeTemporaryFiles(int directory, Reach reach) noexcept {
+  removeTemporaries(directory, reach, 0);
+}
 
 }  // namespace appsync::device

@@ -20,8 +20,10 @@ bool removeTree(int directory, const std::string& name) noexcept;
 bool copyTree(int fromDirectory, const std::string& from, int toDirectory,
               const std::string& to) noexcept;
 
-/// Removes every item with a temporary name from the directory and all below it, as far as that can
-/// be done.
-void removeTemporaryFiles(int directory) noexcept;
+enum class Reach { Here, AllBelow };
+
+/// Removes every item with a temporary name from the directory, or from it and all below it, as far
+/// as that can be done.
+void removeTemporaryFiles(int directory, Reach reach) noexcept;
 
 }  // namespace appsync::device

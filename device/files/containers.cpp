@@ -12,7 +12,6 @@ namespace appsync::device {
 namespace {
 
 constexpr std::string_view ApplicationsDirectory = "/var/mobile/Containers/Applications";
-constexpr std::string_view DataDirectory = "/var/mobile/Containers/Data";
 constexpr std::string_view WaitingDataDirectory = "/var/mobile/Media/HalvoRestore/Data";
 
 /// A random UUID, as the names of containers are.

@@ -14,6 +14,9 @@ namespace appsync::device {
 /// to give back. All paths are the phone's. Identifiers must be usable. Thread-safe.
 class Containers {
  public:
+  /// Each application's data lies here in a folder of its identifier.
+  static constexpr std::string_view DataDirectory = "/var/mobile/Containers/Data";
+
   /// Changes go through `files`, handles come from `handles`; both show the same phone.
   Containers(FileManager& files, ConfinedFileManager& handles, Log& log)
       : files_(files), handles_(handles), log_(log) {}

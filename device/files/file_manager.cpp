@@ -11,7 +11,6 @@
 #include <cerrno>
 #include <new>
 
-#include "device/base/directory_tree.h"
 #include "device/base/temporary_file.h"
 
 namespace appsync::device {
@@ -250,8 +249,9 @@ FileDescriptor ConfinedFileManager::openDirectory(std::string_view path,
   return directory;
 }
 
-void ConfinedFileManager::removeTemporaries(std::string_view directory) noexcept {
-  if (const FileDescriptor opened = openDirectory(directory)) removeTemporaryFiles(opened.get());
+void ConfinedFileManager::removeTemporaries(std::string_view directory, Reach reach) noexcept {
+  const FileDescriptor opened = openDirectory(directory);
+  if (opened) removeTemporaryFiles(opened.get(), reach);
 }
 
 bool ConfinedFileManager::usable(std::string_view path,

@@ -5,6 +5,7 @@
 #include <filesystem>
 
 #include "device/base/confined_directory.h"
+#include "device/base/directory_tree.h"
 #include "platform/file_manager.h"
 
 namespace appsync::device {
@@ -52,9 +53,9 @@ class ConfinedFileManager final : public FileManager {
   FileDescriptor openDirectory(std::string_view path,
                                std::optional<Error>* error = nullptr) noexcept;
 
-  /// Removes what killed processes left under temporary names in the directory and below it. Only
-  /// for a time when nobody writes there.
-  void removeTemporaries(std::string_view directory) noexcept;
+  /// Removes what killed processes left under temporary names in the directory. Only for a time
+  /// when nobody writes there.
+  void removeTemporaries(std::string_view directory, Reach reach) noexcept;
 
  private:
   /// The directory that holds the path's last component, and that component.

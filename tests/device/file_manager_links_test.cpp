@@ -68,7 +68,7 @@ TEST_F(PlantedLinks, AreNeverWrittenThrough) {
     EXPECT_FALSE(files_.moveItem(link + "/secret", "/stolen")) << link;
     EXPECT_FALSE(files_.copyItem("/inside", path)) << link;
     EXPECT_FALSE(receiveInto(files_, path, nullptr)) << link;
-    files_.removeTemporaries(link);
+    files_.removeTemporaries(link, Reach::AllBelow);
   }
   expectOutsideUntouched();
 }

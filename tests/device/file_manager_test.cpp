@@ -200,7 +200,7 @@ TEST_F(FileManagerTest, TemporaryFilesOfKilledProcessesCanBeSwept) {
   fakes::putFile(onDisk("/box/.appsync-0123456789abcdef"), "left over");
   fakes::putFile(onDisk("/box/inner/.appsync-fedcba9876543210"), "left over");
   fakes::putFile(onDisk("/box/.appsync-notes"), "kept");
-  files_.removeTemporaries("/box");
+  files_.removeTemporaries("/box", Reach::AllBelow);
   EXPECT_EQ(fakes::snapshot(onDisk("/box")),
             (std::map<std::string, std::string>{{".appsync-notes", "file 0644 kept"},
                                                 {"inner", "folder 0755"}}));

@@ -50,6 +50,21 @@ TEST_F(RecoveryTest, AFileThatWasBeingReceivedIsRemoved) {
   EXPECT_TRUE(std::filesystem::is_empty(staging));
 }
 
+TEST_F(RecoveryTest, TemporariesOfTheDeviceInContainersGoAndThoseOfApplicationsStay) {
+  ASSERT_TRUE(installPackage(Id));
+  const std::string left = "/.appsync-0123456789abcdef";
+  const std::string data = "/var/mobile/Containers/Data";
+  const auto [container, bundle] =
+      std::pair(*record(Id)->bundleContainerPath, *record(Id)->bundlePath);
+  const Lines swept = {container + left, bundle + left, data + left + "/half"};
+  const Lines kept = {bundle + "/inner" + left, data + "/com.example.a" + left};
+  for (const std::string& path : swept) putFile(path, "half");
+  for (const std::string& path : kept) putFile(path, "whole");
+  reopen();
+  for (const std::string& path : swept) EXPECT_FALSE(device->files().fileExists(path)) << path;
+  for (const std::string& path : kept) EXPECT_EQ(textAt(path), "whole") << path;
+}
+
 TEST_F(RecoveryTest, ALinkInThePlaceOfAContainerIsRemovedAndNotFollowed) {
   const auto outside = temporary.path() / "outside";
   fakes::putFile(outside / "precious", "kept");
