@@ -166,11 +166,12 @@ class FolderDevice final : public EmbeddedDevice {
 
   bool restoreData(std::string_view bundleId, const DataSource& source,
                    std::optional<Error>* error) noexcept override {
-    if (isUsableIdentifier(bundleId) && database_->writable()) {
-      return restoreApplicationData(core_, bundleId, source, error);
-    }
-    setError(error, Error::posix(database_->writable() ? EINVAL : EROFS, bundleId));
-    return false;
+    return takesData(bundleId, error) && restoreApplicationData(core_, bundleId, source, error);
+  }
+
+  bool overwriteData(std::string_view bundleId, const DataSource& source,
+                     std::optional<Error>* error) noexcept override {
+    return takesData(bundleId, error) && overwriteApplicationData(core_, bundleId, source, error);
   }
 
   DeviceOptions options() noexcept override { return {readsCoordination(*database_)}; }
@@ -204,6 +205,12 @@ class FolderDevice final : public EmbeddedDevice {
   }
 
  private:
+  bool takesData(std::string_view bundleId, std::optional<Error>* error) const {
+    if (isUsableIdentifier(bundleId) && database_->writable()) return true;
+    setError(error, Error::posix(database_->writable() ? EINVAL : EROFS, bundleId));
+    return false;
+  }
+
   // In the order in which they need one another: what works on threads of its own goes first.
   const DevicePaths paths_;
   const std::unique_ptr<WriteLock> lock_;

@@ -97,6 +97,13 @@ class EmbeddedDevice {
   virtual bool restoreData(std::string_view bundleId, const DataSource& source,
                            std::optional<Error>* error) noexcept = 0;
 
+  /// Takes such an archive and gives it to an installed application in the place of its data, in
+  /// one step and on the disk; no bytes at all leave it without any. Until then the old data is
+  /// whole. False (with an error, POSIX 2 when it is not installed, 16 when it is open or being
+  /// updated) as above; nothing has changed then. It cannot be brought to the foreground meanwhile.
+  virtual bool overwriteData(std::string_view bundleId, const DataSource& source,
+                             std::optional<Error>* error) noexcept = 0;
+
   // Bringing an application to the foreground and ending it need no device lock, so that a person
   // can do both while a sync runs in another process.
 

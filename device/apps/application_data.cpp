@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <new>
 
+#include "device/apps/idle_application.h"
 #include "device/base/directory_tree.h"
 #include "device/base/temporary_file.h"
 #include "device/packages/data_archive.h"
@@ -19,6 +20,7 @@ namespace appsync::device {
 namespace {
 
 std::string parentOf(const std::string& path) { return path.substr(0, path.rfind('/')); }
+std::string nameOf(const std::string& path) { return path.substr(path.rfind('/') + 1); }
 
 /// Whether what a restore has still to give back is the application's data.
 bool ownsWaitingData(DeviceCore& core, std::string_view identifier, bool& waiting,
@@ -69,39 +71,66 @@ class UnfinishedFolder {
 
   int fd() const { return folder_.get(); }
 
-  /// False with errno set; what has this name is then as it was.
+  /// Takes the name, in one step and on the disk; what had it disappears with this object. False
+  /// with errno set; what has this name is then as it was.
   bool takePlaceOf(const std::string& name) {
-    return (::renameat2(parent_, name_.c_str(), parent_, name.c_str(), RENAME_NOREPLACE) == 0 ||
-            (errno == EEXIST &&
-             ::renameat2(parent_, name_.c_str(), parent_, name.c_str(), RENAME_EXCHANGE) == 0)) &&
-           syncToDisk(parent_);
+    unsigned way = RENAME_NOREPLACE;
+    if (!move(name_, name, way)) {
+      way = RENAME_EXCHANGE;
+      if (errno != EEXIST || !move(name_, name, way)) return false;
+    }
+    if (syncToDisk(parent_)) return true;
+    const int failure = errno;
+    move(name, name_, way);
+    errno = failure;
+    return false;
   }
 
  private:
+  bool move(const std::string& from, const std::string& to, unsigned way) const {
+    return ::renameat2(parent_, from.c_str(), parent_, to.c_str(), way) == 0;
+  }
+
   const int parent_;
   const std::string name_;
   FileDescriptor folder_;
 };
 
-std::optional<Error> restore(DeviceCore& core, const std::string& identifier,
-                             const DataSource& source) {
-  const KeyedMutex::Guard guard(core.applicationLocks, identifier);
+/// Lays an archive out in the place of the folder that bears the application's name; `entries`
+/// tells how much that was. One without entries takes the place only of what is to stay a folder.
+std::optional<Error> layOut(DeviceCore& core, const std::string& path, const DataSource& source,
+                            bool evenEmpty, std::uint64_t& entries) {
   std::optional<Error> error;
-  const std::string path = Containers::waitingDataPath(identifier);
   if (!core.files.createDirectory(parentOf(path), true, {}, &error)) return error;
   const FileDescriptor parent = core.handles.openDirectory(parentOf(path), &error);
   if (!parent) return error;
   UnfinishedFolder folder(parent.get());
   if (folder.fd() < 0) return Error::posix(errno, path);
-  std::uint64_t entries = 0;
   if (auto refusal = readDataArchive(source, folder.fd(), entries)) return refusal;
-  if (entries == 0) {
-    if (core.containers.removeWaitingData(identifier)) return std::nullopt;
-    return Error::posix(EIO, path);
-  }
+  if (entries == 0 && !evenEmpty) return std::nullopt;
   // One flush for all of it, before it can be seen.
-  if (syncFileSystem(folder.fd()) && folder.takePlaceOf(identifier)) return std::nullopt;
+  if (syncFileSystem(folder.fd()) && folder.takePlaceOf(nameOf(path))) return std::nullopt;
   return Error::posix(errno, path);
+}
+
+std::optional<Error> restore(DeviceCore& core, const std::string& identifier,
+                             const DataSource& source) {
+  const KeyedMutex::Guard guard(core.applicationLocks, identifier);
+  const std::string path = Containers::waitingDataPath(identifier);
+  std::uint64_t entries = 0;
+  if (auto error = layOut(core, path, source, false, entries)) return error;
+  if (entries > 0 || core.containers.removeWaitingData(identifier)) return std::nullopt;
+  return Error::posix(EIO, path);
+}
+
+std::optional<Error> overwrite(DeviceCore& core, const std::string& identifier,
+                               const DataSource& source) {
+  const KeyedMutex::Guard guard(core.applicationLocks, identifier);
+  std::optional<Error> error;
+  const std::optional<IdleApplication> idle = holdIdle(core, identifier, &error);
+  if (!idle) return error;
+  std::uint64_t entries = 0;
+  return layOut(core, Containers::dataPath(identifier), source, true, entries);
 }
 
 /// Runs the work, which must not throw.
@@ -128,6 +157,11 @@ bool saveApplicationData(DeviceCore& core, std::string_view identifier, const Da
 bool restoreApplicationData(DeviceCore& core, std::string_view identifier, const DataSource& source,
                             std::optional<Error>* error) {
   return guarded(error, [&] { return restore(core, std::string(identifier), source); });
+}
+
+bool overwriteApplicationData(DeviceCore& core, std::string_view identifier,
+                              const DataSource& source, std::optional<Error>* error) {
+  return guarded(error, [&] { return overwrite(core, std::string(identifier), source); });
 }
 
 }  // namespace appsync::device

@@ -10,8 +10,11 @@ namespace appsync::device {
 
 bool saveApplicationData(DeviceCore& core, std::string_view identifier, const DataSink& sink,
                          std::optional<Error>* error);
-/// The device is open for writing.
+// The device is open for writing.
+
 bool restoreApplicationData(DeviceCore& core, std::string_view identifier, const DataSource& source,
                             std::optional<Error>* error);
+bool overwriteApplicationData(DeviceCore& core, std::string_view identifier,
+                              const DataSource& source, std::optional<Error>* error);
 
 }  // namespace appsync::device

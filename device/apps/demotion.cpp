@@ -4,8 +4,8 @@
 
 #include <cerrno>
 
+#include "device/apps/idle_application.h"
 #include "device/apps/installers.h"
-#include "device/state/application_rows.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 
@@ -14,21 +14,6 @@ namespace {
 
 constexpr std::string_view IconFile = "Icon.png";
 constexpr std::string_view BundleParts = "/tmp/com.corvane.demotion";
-
-Error objection(int code, std::string_view identifier, std::string_view reason) {
-  return Error::withDescription(POSIXErrorDomain, code, fmt::format("{} {}", identifier, reason));
-}
-
-std::optional<Error> objectionTo(const std::string& identifier, const ApplicationRows& rows) {
-  if (!rows.installed) return objection(ENOENT, identifier, "is not installed");
-  if (rows.installed->type == ApplicationTypeSystem) {
-    return objection(EPERM, identifier, "belongs to the system");
-  }
-  const bool isUpdating =
-      rows.placeholder && rows.placeholder->installType != InstallType::IntentionalDowngrade;
-  if (isUpdating) return objection(EBUSY, identifier, "is just being updated");
-  return std::nullopt;
-}
 
 std::string iconOf(FileManager& files, const ApplicationRow& installed) {
   const auto info = loadDictionary(files, joinPath(installed.bundlePath(), "Info.plist"));
@@ -81,21 +66,13 @@ bool takePackage(DeviceCore& core, const ApplicationRow& installed, std::optiona
 }  // namespace
 
 bool demoteForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error) {
-  ApplicationRows rows;
-  const bool read = core.database.read(
-      "the registry could not be read",
-      [&](SQLite::Database& database) { rows = findApplication(database, identifier); }, error);
-  if (!read) return false;
-  std::optional<Error> reason = objectionTo(identifier, rows);
-  const Foreground::HoldResult held =
-      reason ? Foreground::HoldResult{} : core.foreground.hold(identifier);
-  if (held.isRunning) reason = objection(EBUSY, identifier, "is open; close it first");
-  if (!reason && !held.hold) reason = Error::posix(EIO, identifier);
-  if (reason) {
-    setError(error, *reason);
+  const std::optional<IdleApplication> idle = holdIdle(core, identifier, error);
+  if (!idle) return false;
+  if (idle->row.type == ApplicationTypeSystem) {
+    setError(error, objection(EPERM, identifier, "belongs to the system"));
     return false;
   }
-  return layPlaceholder(core, *rows.installed, error) && takePackage(core, *rows.installed, error);
+  return layPlaceholder(core, idle->row, error) && takePackage(core, idle->row, error);
 }
 
 }  // namespace appsync::device

@@ -8,6 +8,7 @@
 #include "device/base/temporary_file.h"
 #include "device/files/containers.h"
 #include "device/packages/data_archive.h"
+#include "tests/device/data_trees.h"
 #include "tests/device/device_test.h"
 #include "tests/device/package_builder.h"
 
@@ -22,31 +23,6 @@ using testing::RawEntry;
 constexpr const char* App = "com.example.app";
 const std::string Data = Containers::dataPath(App);
 const std::string Waiting = Containers::waitingDataPath(App);
-
-/// Gives the text in pieces of a few bytes.
-DataSource piecesOf(std::string_view text, std::size_t piece = 1000) {
-  return [text, piece](std::uint8_t* bytes, std::size_t size) mutable {
-    const std::string_view next = text.substr(0, std::min(piece, size));
-    std::copy(next.begin(), next.end(), bytes);
-    text.remove_prefix(next.size());
-    return static_cast<std::int64_t>(next.size());
-  };
-}
-
-/// Everything below a folder: relative path to type, permissions, whole seconds, and contents or
-/// link target.
-std::map<std::string, std::string> treeOf(const fs::path& folder) {
-  std::map<std::string, std::string> tree;
-  for (const auto& item : fs::recursive_directory_iterator(folder)) {
-    struct stat status {};
-    EXPECT_EQ(::lstat(item.path().c_str(), &status), 0);
-    std::string text = std::to_string(status.st_mode) + " " + std::to_string(status.st_mtime) + " ";
-    if (S_ISREG(status.st_mode)) text += fakes::fileText(item.path());
-    if (S_ISLNK(status.st_mode)) text += fs::read_symlink(item.path()).string();
-    tree[item.path().lexically_relative(folder).string()] = text;
-  }
-  return tree;
-}
 
 class ApplicationDataTest : public DeviceTest {
  protected:
