@@ -1,7 +1,5 @@
 #include "host/cli/plugin_session.h"
 
-#include <future>
-
 namespace appsync::host {
 namespace {
 
@@ -20,19 +18,6 @@ Platform withLog(const Platform& services, Log& log) {
           services.systemNotifier,
           services.syncHost,
           services.backgroundQueue};
-}
-
-/// Returns when the client has heard of it: only then does it get the events that a killed sync
-/// left over, and only then can the phone be seen to have some for it.
-void announceStartUp(SystemNotifier& notifier) {
-  std::promise<void> heard;
-  const auto hear = [](void* observer) noexcept {
-    static_cast<std::promise<void>*>(observer)->set_value();
-  };
-  notifier.addObserver(&heard, TWStartupCompleteNotification, hear);
-  notifier.post(TWStartupCompleteNotification);
-  heard.get_future().wait();
-  notifier.removeObserver(&heard, TWStartupCompleteNotification);
 }
 
 }  // namespace

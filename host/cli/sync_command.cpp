@@ -8,6 +8,7 @@
 #include "host/cli/cli.h"
 #include "host/cli/plugin_session.h"
 #include "host/library/icon_layout.h"
+#include "host/phone/installed_applications.h"
 #include "host/phone/plugin_loader.h"
 #include "host/sync/session.h"
 
@@ -44,8 +45,7 @@ void plan(SyncInput& input, PlanOptions options, device::EmbeddedDevice& device)
   options.installingAllowed = allowed(device, PolicySetting::AppInstallationAllowed);
   options.removingAllowed = allowed(device, PolicySetting::AppRemovalAllowed);
   std::string problem;
-  auto made =
-      makePlan(input.library, installedApplications(device.appRegistry()), options, problem);
+  auto made = makePlan(input.library, installedApplications(phoneOf(device)), options, problem);
   if (!made) throw CommandError(ExitCode::WrongUsage, problem);
   input.plan = std::move(*made);
 }
@@ -87,8 +87,7 @@ ExitCode runSync(const SyncOptions& options, CommandContext& context) {
   const SignalWatcher signals(interruption);
   SyncResult result;
   {
-    Session session(loaded.client(), loaded.host().transfers(), phoneOf(*device), *reporter,
-                    interruption);
+    Session session(loaded.client(), loaded.host(), phoneOf(*device), *reporter, interruption);
     result = session.run(input);
   }
   const ExitCode code = finish(result, interruption.requested(), *reporter);

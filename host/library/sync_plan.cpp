@@ -109,6 +109,9 @@ class Planner {
     if (application && application->isSystem) {
       return skip(package.identifier, "it is a system application");
     }
+    if (application && application->isDemoted && wanted_.empty()) {
+      return skip(package.identifier, StaysDemoted);
+    }
     Action action = Action::Install;
     if (isInstalled) {
       const auto order = compareVersions(package.version, current);
@@ -120,7 +123,8 @@ class Planner {
       }
     }
     if (!options_.installingAllowed) return skip(package.identifier, InstallingForbidden);
-    plan_.entries.push_back({action, package.identifier, package.version, current, package.name});
+    plan_.entries.push_back({action, package.identifier, package.version, current, package.name,
+                             application && application->waits});
   }
 
   const Library& library_;
@@ -147,23 +151,6 @@ std::string_view name(Action action) {
       return "remove";
   }
   return "install";
-}
-
-std::vector<InstalledApplication> installedApplications(AppRegistry& registry) {
-  std::map<std::string, InstalledApplication> found;
-  registry.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
-    const bool leftOver = record.isPlaceholder && record.installType == InstallType::Sync;
-    if (!record.isApplication || leftOver) return;
-    const auto [place, isNew] = found.try_emplace(record.applicationIdentifier);
-    if (!isNew && record.isPlaceholder) return;
-    place->second = {record.applicationIdentifier, record.bundleVersion.value_or(""),
-                     record.displayName, record.applicationType == ApplicationTypeSystem,
-                     record.isPlaceholder};
-  });
-  std::vector<InstalledApplication> result;
-  result.reserve(found.size());
-  for (auto& [identifier, application] : found) result.push_back(std::move(application));
-  return result;
 }
 
 std::optional<SyncPlan> makePlan(const Library& library,

@@ -6,7 +6,6 @@
 #include <vector>
 
 #include "host/library/library.h"
-#include "platform/app_registry.h"
 
 namespace appsync::host {
 
@@ -21,7 +20,11 @@ struct PlannedEntry {
   std::string version;           ///< of the package; of the installed application for a removal
   std::string installedVersion;  ///< empty for a new application
   std::string name;
+  bool byHost = false;  ///< its placeholder waits, and the client does not ask for its package
 };
+
+/// Why a demoted application stays as it is.
+inline constexpr std::string_view StaysDemoted = "stays a placeholder until it is asked for";
 
 struct SkippedEntry {
   std::string identifier;
@@ -42,11 +45,9 @@ struct InstalledApplication {
   std::string name;
   bool isSystem = false;
   bool isPlaceholder = false;  ///< no version of it is installed yet
+  bool isDemoted = false;      ///< and is to stay so until somebody asks for it
+  bool waits = false;          ///< for a package that the client does not ask the host for
 };
-
-/// One per application, sorted by identifier. Placeholders that a broken-off sync left do not
-/// count.
-std::vector<InstalledApplication> installedApplications(AppRegistry& registry);
 
 struct PlanOptions {
   std::vector<std::string> install;  ///< only these; empty: every package that is new or newer

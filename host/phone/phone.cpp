@@ -21,18 +21,18 @@ Phone phoneOf(device::EmbeddedDevice& device) {
           [&device](device::DeviceWatcher* watcher) { device.setWatcher(watcher); },
           [&device] { device.hurry(); },
           [&device](std::string_view bundleId) { return device.isBusyWith(bundleId); },
+          [&device](std::string_view bundleId, const device::DataSink& sink,
+                    std::optional<Error>* error) { return device.saveData(bundleId, sink, error); },
+          [&device](CoordinationClientId client) { return device.packagesOwedBy(client); },
           device.options().coordination ? &device.installCoordination() : nullptr};
 }
 
 RestorePhone restorePhoneOf(device::EmbeddedDevice& device) {
   return {phoneOf(device), device.homeScreen(),
-          [&device](std::string_view bundleId, const device::DataSink& sink,
-                    std::optional<Error>* error) { return device.saveData(bundleId, sink, error); },
           [&device](std::string_view bundleId, const device::DataSource& source,
                     std::optional<Error>* error) {
             return device.restoreData(bundleId, source, error);
-          },
-          [&device](CoordinationClientId client) { return device.packagesOwedBy(client); }};
+          }};
 }
 
 void waitUntilIdle(const Phone& phone, const std::set<std::string>& identifiers) {

@@ -1,6 +1,7 @@
 #include "host/phone/sync_host.h"
 
 #include <cerrno>
+#include <future>
 
 namespace appsync::host {
 
@@ -47,6 +48,17 @@ bool HostProcess::TWIsRecoverableError(const Error& error) noexcept {
     default:
       return false;
   }
+}
+
+void announceStartUp(SystemNotifier& notifier) {
+  std::promise<void> heard;
+  const auto hear = [](void* observer) noexcept {
+    static_cast<std::promise<void>*>(observer)->set_value();
+  };
+  notifier.addObserver(&heard, TWStartupCompleteNotification, hear);
+  notifier.post(TWStartupCompleteNotification);
+  heard.get_future().wait();
+  notifier.removeObserver(&heard, TWStartupCompleteNotification);
 }
 
 }  // namespace appsync::host

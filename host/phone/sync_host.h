@@ -5,6 +5,7 @@
 #include "host/base/interruption.h"
 #include "host/phone/transfer_queue.h"
 #include "platform/sync_host.h"
+#include "platform/system_notifier.h"
 
 namespace appsync::host {
 
@@ -35,5 +36,10 @@ class HostProcess : public SyncHost {
   const Interruption& interruption_;
   TransferQueue transfers_;
 };
+
+/// Tells the plug-in's clients that the sync host is ready, and returns when they have heard of it:
+/// only then do they get the events that a killed sync left over, and only then can the phone be
+/// seen to have some for them.
+void announceStartUp(SystemNotifier& notifier);
 
 }  // namespace appsync::host

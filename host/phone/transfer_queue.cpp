@@ -11,6 +11,11 @@ void TransferQueue::add(const std::vector<SyncAssetPtr>& assets) {
   for (const SyncAssetPtr& asset : assets) finished_.erase(asset->identifier);
 }
 
+void TransferQueue::forgetCancelled() {
+  const std::lock_guard lock(mutex_);
+  cancelled_.clear();
+}
+
 TransferQueue::Next TransferQueue::next() {
   const std::lock_guard lock(mutex_);
   if (waiting_.empty()) return {};

@@ -16,6 +16,9 @@ class TransferQueue : public SyncHostService {
  public:
   void add(const std::vector<SyncAssetPtr>& assets);
 
+  /// What was cancelled before a sync or a restore began does not concern it.
+  void forgetCancelled();
+
   struct Next {
     SyncAssetPtr asset;
     bool cancelled = false;  ///< report it as failed instead of sending on

@@ -6,9 +6,10 @@
 
 #include "host/base/text.h"
 #include "host/phone/demotions.h"
+#include "host/restore/restore_data.h"
 #include "host/restore/restore_packages.h"
 #include "host/restore/restore_settlement.h"
-#include "host/restore/store.h"
+#include "host/transfer/store.h"
 
 namespace appsync::host {
 namespace {
@@ -35,6 +36,7 @@ Restore::Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Repo
 
 SyncResult Restore::run(const RestoreInput& input) {
   handover_ = handOver(phone_, input.backup, input.list, reporter_, interruption_);
+  host_.transfers().forgetCancelled();
   failures_ = handover_.failures;
   const bool given = !handover_.broken || broken(*handover_.broken, std::nullopt);
   SyncResult result;
@@ -87,8 +89,10 @@ void Restore::bringPackages(const Library& library) {
 }
 
 void Restore::bringFromStore(const Library& catalogue) {
-  Store store(host_, phone_, reporter_, interruption_, catalogue);
-  store.deliver(leftOut());
+  Store store(host_, phone_, reporter_, interruption_, catalogue, InterruptedReason);
+  std::set<std::string> wanted = waitingForStore(phone_);
+  for (const std::string& identifier : leftOut()) wanted.erase(identifier);
+  store.deliver(wanted);
   note(store.failures());
 }
 

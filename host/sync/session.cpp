@@ -8,6 +8,7 @@
 
 #include "host/base/text.h"
 #include "host/transfer/staging.h"
+#include "host/transfer/store.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 
@@ -31,6 +32,15 @@ std::set<std::string> identifiersOf(const SyncPlan& plan) {
   return identifiers;
 }
 
+/// Of the plan's applications those that the host brings by itself, or the others.
+std::set<std::string> identifiersOf(const SyncPlan& plan, bool byHost) {
+  std::set<std::string> identifiers;
+  for (const PlannedEntry& entry : plan.entries) {
+    if (entry.byHost == byHost) identifiers.insert(entry.identifier);
+  }
+  return identifiers;
+}
+
 }  // namespace
 
 bool servesApplications(SyncClient& client) {
@@ -38,19 +48,20 @@ bool servesApplications(SyncClient& client) {
   return std::ranges::find(dataclasses, ApplicationDataclass) != dataclasses.end();
 }
 
-Session::Session(SyncClient& client, TransferQueue& queue, Phone phone, Reporter& reporter,
+Session::Session(SyncClient& client, HostProcess& host, Phone phone, Reporter& reporter,
                  Interruption& interruption)
     : client_(client),
-      queue_(queue),
+      host_(host),
       phone_(std::move(phone)),
       reporter_(reporter),
       interruption_(interruption),
       watch_(phone_, reporter, interruption) {}
 
 SyncResult Session::run(const SyncInput& input) {
-  PackageSender sender(client_, queue_, phone_, reporter_, interruption_, input.library);
-  // What the client hears late of a killed sync must not reach this sync's todo list.
+  PackageSender sender(client_, host_.transfers(), phone_, reporter_, interruption_, input.library);
+  // What the client hears late, of a killed sync or of a person's cancel, must not reach this sync.
   waitUntilIdle(phone_, identifiersOf(input.plan));
+  host_.transfers().forgetCancelled();
   sweepPlaceholders();
   removeLeftOverPackages(phone_.files);
   SyncResult result;
@@ -62,7 +73,7 @@ SyncResult Session::run(const SyncInput& input) {
 bool Session::callClient(const SyncInput& input, PackageSender& sender) {
   if (!isServed()) return !broken_;
   bool success = reconcile(input);
-  if (reconciled_) success = transfer(input.plan, sender);
+  if (reconciled_) success = transfer(input, sender);
   client_.syncEndedWithSuccess(success);
   if (success) writeApplicationsPresent();
   return success && !broken_;
@@ -96,18 +107,26 @@ bool Session::reconcile(const SyncInput& input) {
   return reconciled_;
 }
 
-bool Session::transfer(const SyncPlan& plan, PackageSender& sender) {
+bool Session::transfer(const SyncInput& input, PackageSender& sender) {
   if (!interruption_.requested()) {
-    claimDownloads(phone_.apps, identifiersOf(plan));
+    claimDownloads(phone_.apps, identifiersOf(input.plan, false));
     const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
     if (phone_.coordination) findCoordinators(assets);
     sender.send(assets);
   }
-  if (phone_.coordination) waitForCoordination(plan, sender.outcome().sent);
+  bringWhatWaits(input);
+  if (phone_.coordination) waitForCoordination(input.plan, sender.outcome().sent);
   client_.assetTransferEndedWithSuccess(!interruption_.requested());
   // A coordinated install takes its package away itself, perhaps later.
   if (!phone_.coordination) sender.removeSentPackages();
   return !interruption_.requested();
+}
+
+/// Restored, demoted and asked-for applications whose packages the client leaves to the store.
+void Session::bringWhatWaits(const SyncInput& input) {
+  Store store(host_, phone_, reporter_, interruption_, input.library, InterruptedSync);
+  store.deliver(identifiersOf(input.plan, true));
+  failures_.insert(store.failures().begin(), store.failures().end());
 }
 
 /// Before anything is sent, so that an install that is over by then can only have been cancelled.
@@ -124,7 +143,7 @@ bool Session::isSettled(const std::string& identifier, const std::vector<TodoEnt
   const auto& coordinator = coordinators_.at(identifier);
   const std::optional<Error> error = coordinator ? coordinator->error() : std::nullopt;
   if (!coordinator || error) {
-    cancelled_[identifier] = error ? oneLine(error->localizedDescription()) : CancelledOnPhone;
+    failures_[identifier] = error ? oneLine(error->localizedDescription()) : CancelledOnPhone;
     return true;
   }
   if (!isDownloaded(identifier, todo)) return true;
@@ -194,12 +213,10 @@ void Session::writeApplicationsPresent() {
 SyncEnd Session::end(const PackageSender& sender) const {
   SyncEnd end;
   if (reconciled_) end.todo = readTodoList(phone_.files, exchange::WorkArea);
-  phone_.apps.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
-    end.present.insert(record.applicationIdentifier);
-  });
+  end.present = applicationsPresent(phone_.apps);
   end.transfers = sender.outcome();
   end.installFailures = watch_.failures();
-  end.installFailures.insert(cancelled_.begin(), cancelled_.end());
+  end.installFailures.insert(failures_.begin(), failures_.end());
   end.disabled = disabled_;
   end.interrupted = interruption_.requested();
   end.broken = broken_;

@@ -10,7 +10,7 @@
 #include "host/base/interruption.h"
 #include "host/library/events.h"
 #include "host/phone/phone.h"
-#include "host/phone/transfer_queue.h"
+#include "host/phone/sync_host.h"
 #include "host/transfer/install_watch.h"
 #include "host/transfer/package_sender.h"
 #include "host/transfer/settlement.h"
@@ -38,7 +38,7 @@ struct SyncResult {
 /// Borrows everything; used once, by one thread.
 class Session {
  public:
-  Session(SyncClient& client, TransferQueue& queue, Phone phone, Reporter& reporter,
+  Session(SyncClient& client, HostProcess& host, Phone phone, Reporter& reporter,
           Interruption& interruption);
 
   SyncResult run(const SyncInput& input);
@@ -47,7 +47,8 @@ class Session {
   bool callClient(const SyncInput& input, PackageSender& sender);
   bool isServed();
   bool reconcile(const SyncInput& input);
-  bool transfer(const SyncPlan& plan, PackageSender& sender);
+  bool transfer(const SyncInput& input, PackageSender& sender);
+  void bringWhatWaits(const SyncInput& input);
   void findCoordinators(const std::vector<SyncAssetPtr>& assets);
   bool isSettled(const std::string& identifier, const std::vector<TodoEntry>& todo);
   void waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent);
@@ -60,13 +61,14 @@ class Session {
   bool broken(std::string_view what, const std::optional<Error>& error);
 
   SyncClient& client_;
-  TransferQueue& queue_;
+  HostProcess& host_;
   const Phone phone_;
   Reporter& reporter_;
   Interruption& interruption_;
   InstallWatch watch_;
   std::map<std::string, std::shared_ptr<InstallCoordinator>> coordinators_;  ///< by identifier
-  std::map<std::string, std::string> cancelled_;  ///< reason by identifier, of those sent
+  /// Reason by identifier: those sent that were cancelled, and those that the host could not bring.
+  std::map<std::string, std::string> failures_;
   bool disabled_ = false;
   bool reconciled_ = false;
   std::optional<std::string> broken_;

@@ -23,13 +23,15 @@ std::string failureReason(const std::string& identifier, const SyncEnd& end) {
   if (const auto* reason = reasonFor(identifier, end.installFailures)) return *reason;
   if (const auto* reason = reasonFor(identifier, end.transfers.failures)) return *reason;
   if (end.broken) return *end.broken;
-  if (end.interrupted) return "interrupted; the next sync does it";
+  if (end.interrupted) return InterruptedSync;
   return "the phone did not carry it out (appsync log tells more)";
 }
 
 void settleRemoval(const PlannedEntry& entry, const SyncEnd& end, Summary& summary) {
   const bool taken = operationOf(end.todo, entry.identifier) == "remove";
-  if (taken && end.present.count(entry.identifier) == 0) {
+  const bool there = end.present.installed.contains(entry.identifier) ||
+                     end.present.placeholders.contains(entry.identifier);
+  if (taken && !there) {
     summary.deleted.push_back(entry.identifier);
   } else {
     summary.failed.push_back({entry.identifier, failureReason(entry.identifier, end)});
@@ -39,7 +41,9 @@ void settleRemoval(const PlannedEntry& entry, const SyncEnd& end, Summary& summa
 void settleInstall(const PlannedEntry& entry, const SyncEnd& end, Summary& summary) {
   const std::string operation = operationOf(end.todo, entry.identifier);
   const bool asked = end.transfers.asked.count(entry.identifier) > 0;
-  if (operation == "INSTALLED") {
+  const bool brought = entry.byHost && end.present.installed.contains(entry.identifier) &&
+                       !end.installFailures.contains(entry.identifier);
+  if (brought || operation == "INSTALLED") {
     auto& list = entry.action == Action::Install ? summary.installed : summary.updated;
     list.push_back(entry.identifier);
   } else if (operation == "install" && !asked && !end.broken && !end.interrupted) {

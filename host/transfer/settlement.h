@@ -12,10 +12,13 @@
 
 namespace appsync::host {
 
+/// Why what a sync did not get to was not done.
+inline constexpr const char* InterruptedSync = "interrupted; the next sync does it";
+
 /// What is known when a sync is over.
 struct SyncEnd {
   std::vector<TodoEntry> todo;  ///< as the client left it; empty when it never took the list over
-  std::set<std::string, std::less<>> present;  ///< applications on the phone, placeholders included
+  ApplicationsPresent present;
   TransferOutcome transfers;
   std::map<std::string, std::string> installFailures;  ///< reason by identifier
   bool disabled = false;                               ///< by the phone's restrictions

@@ -61,6 +61,7 @@ class Stage {
 PropertyList todoList(const SyncPlan& plan) {
   PropertyList::Array list;
   for (const PlannedEntry& entry : plan.entries) {
+    if (entry.byHost) continue;
     const bool removes = entry.action == Action::Remove;
     PropertyList::Dictionary todo{{"identifier", entry.identifier},
                                   {"operation", removes ? "remove" : "install"},
@@ -80,7 +81,7 @@ bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
   if (!area.makeDirectory(exchange::StagingArea)) return false;
   for (const PlannedEntry& entry : plan.entries) {
     const LibraryPackage* package = library.find(entry.identifier);
-    if (entry.action == Action::Remove || !package) continue;
+    if (entry.action == Action::Remove || entry.byHost || !package) continue;
     if (!area.writeApplication(*package)) return false;
   }
   const auto todo = serializePropertyList(todoList(plan), PropertyListFormat::Binary, error);

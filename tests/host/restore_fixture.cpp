@@ -112,11 +112,6 @@ RestorePhone RestoreTest::restorePhone() {
   Phone base = phoneForHost();
   base.setWatcher = [this](device::DeviceWatcher* watcher) { client.watcher = watcher; };
   return {std::move(base), phone.homeScreen,
-          [this](std::string_view identifier, const device::DataSink& sink, std::optional<Error>*) {
-            const auto& all = waiting.contains(std::string(identifier)) ? waiting : owned;
-            const auto found = all.find(std::string(identifier));
-            return found == all.end() || sink(toBytes(found->second));
-          },
           [this](std::string_view identifier, const device::DataSource& source,
                  std::optional<Error>* error) {
             if (phone.faults.strikes("phone.restoreData", identifier, error)) return false;
@@ -135,17 +130,6 @@ RestorePhone RestoreTest::restorePhone() {
             waiting.erase(std::string(identifier));
             if (!bytes.empty()) waiting.emplace(identifier, bytes);
             return true;
-          },
-          [this](CoordinationClientId responsible) {
-            std::vector<std::string> owed;
-            for (const std::string& identifier : phone.appRegistry.placeholderIdentifiers()) {
-              const auto coordinator = phone.installCoordination.coordinator(identifier);
-              if (!coordinator || coordinator->error()) continue;
-              const auto state = coordinator->state();
-              const bool came = state.appAssetPromise && state.appAssetPromise->isComplete();
-              if (state.responsibleClient == responsible && !came) owed.push_back(identifier);
-            }
-            return owed;
           }};
 }
 

@@ -56,9 +56,6 @@ class RestoreTest : public SessionTest {
   PropertyList::Dictionary entries;  ///< of the restore list
   PropertyList::Array intentional;
   std::map<std::string, std::string> data;
-  /// What waits on the phone, by identifier.
-  RestoringClient::Waiting waiting;
-  std::map<std::string, std::string> owned;  ///< data of applications without a package
   RestoringClient client{phone, host, waiting, coordination};
   bool packages = false;                        ///< from `folder`
   bool store = false;                           ///< from `folder`

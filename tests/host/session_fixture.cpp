@@ -4,6 +4,7 @@
 
 #include <algorithm>
 
+#include "host/phone/installed_applications.h"
 #include "platform/bundle.h"
 
 namespace appsync::host::testing {
@@ -219,15 +220,33 @@ Phone SessionTest::phoneForHost() {
           [this](device::DeviceWatcher* watcher) { client.watcher = watcher; },
           [this] { phone.trace.add(fakes::TraceCall, "phone.hurry"); },
           [this](std::string_view bundleId) { return isBusyWith && isBusyWith(bundleId); },
+          [this](std::string_view identifier, const device::DataSink& sink, std::optional<Error>*) {
+            const auto& all = waiting.contains(std::string(identifier)) ? waiting : owned;
+            const auto found = all.find(std::string(identifier));
+            return found == all.end() || sink(toBytes(found->second));
+          },
+          [this](CoordinationClientId responsible) { return owedBy(responsible); },
           coordination ? &phone.installCoordination : nullptr};
+}
+
+std::vector<std::string> SessionTest::owedBy(CoordinationClientId responsible) {
+  std::vector<std::string> owed;
+  for (const std::string& identifier : phone.appRegistry.placeholderIdentifiers()) {
+    const auto coordinator = phone.installCoordination.coordinator(identifier);
+    if (!coordinator || coordinator->error()) continue;
+    const auto state = coordinator->state();
+    const bool came = state.appAssetPromise && state.appAssetPromise->isComplete();
+    if (state.responsibleClient == responsible && !came) owed.push_back(identifier);
+  }
+  return owed;
 }
 
 SyncResult SessionTest::sync() {
   std::string problem;
   SyncInput input{readLibrary(folder.path(), problem).value(), {}, iconLayout, "NEW"};
   input.plan =
-      makePlan(input.library, installedApplications(phone.appRegistry), options, problem).value();
-  Session session(client, host.transfers(), phoneForHost(), reporter, interruption);
+      makePlan(input.library, installedApplications(phoneForHost()), options, problem).value();
+  Session session(client, host, phoneForHost(), reporter, interruption);
   return session.run(input);
 }
 

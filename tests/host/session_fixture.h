@@ -131,8 +131,13 @@ class SessionTest : public ::testing::Test {
   PlanOptions options;
   std::optional<Bytes> iconLayout;
   bool coordination = false;
+  std::map<std::string, std::string> waiting;  ///< restored data, by identifier
+  std::map<std::string, std::string> owned;    ///< data of applications without a package
   /// none: the phone never is.
   std::function<bool(std::string_view)> isBusyWith;
+
+ private:
+  std::vector<std::string> owedBy(CoordinationClientId responsible);
 };
 
 }  // namespace appsync::host::testing

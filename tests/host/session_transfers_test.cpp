@@ -81,6 +81,17 @@ TEST_F(SessionTest, AnswersAWishForAPackageThatDoesNotWait) {
   host.service().cancelAssetAsFailed(host.makeDownload("com.a", "Application", std::nullopt));
 }
 
+TEST_F(SessionTest, WhatWasCancelledBeforeItBeganDoesNotConcernIt) {
+  offer("com.a");
+  bool told = false;
+  isBusyWith = [&](std::string_view identifier) {
+    if (told) return false;
+    host.service().cancelAssetAsFailed(host.makeDownload(identifier, "Application", std::nullopt));
+    return told = true;
+  };
+  EXPECT_EQ(text(sync().summary), "installed: com.a");
+}
+
 TEST_F(SessionTest, StopsAPackageThatIsCancelledOnThePhone) {
   offer("com.a", "1.0", ThreeChunks);
   offer("com.b");

@@ -1,6 +1,5 @@
 #include "host/library/sync_plan.h"
 
-#include "tests/fakes/fake_platform.h"
 #include "tests/test_pch.h"
 
 namespace appsync::host {
@@ -30,7 +29,7 @@ class Planning : public ::testing::Test {
       const std::string from =
           entry.installedVersion.empty() ? "" : " over " + entry.installedVersion;
       entries.push_back(std::string(name(entry.action)) + " " + entry.identifier + " " +
-                        entry.version + from);
+                        entry.version + from + (entry.byHost ? " by host" : ""));
     }
     for (const SkippedEntry& entry : made->skipped) {
       skipped.push_back(entry.identifier + ": " + entry.reason + (entry.upToDate ? " (fine)" : ""));
@@ -168,29 +167,28 @@ TEST_F(Planning, InstallsWhatIsOnlyAPlaceholder) {
   EXPECT_THAT(entries, ElementsAre("install com.a 1.0"));
 }
 
-TEST(InstalledApplications, AreOnePerIdentifierWithoutLeftOverPlaceholders) {
-  fakes::FakePlatform phone;
-  phone.appRegistry.seedInstalled("com.a", "1.0");
-  phone.appRegistry.seedPlaceholder("com.a", InstallType::Restore, "2.0");
-  phone.appRegistry.seedPlaceholder("com.left", InstallType::Sync);
-  phone.appRegistry.seedPlaceholder("com.restoring", InstallType::Restore);
-  AppRecord extension;
-  extension.applicationIdentifier = "com.extension";
-  extension.isApplication = false;
-  phone.appRegistry.seedOther(extension);
-  AppRecord system;
-  system.applicationIdentifier = "com.system";
-  system.applicationType = ApplicationTypeSystem;
-  phone.appRegistry.seedInstalled(system);
+TEST_F(Planning, BringsByItselfWhatTheClientDoesNotAskFor) {
+  offer("com.a", "1.0");
+  offer("com.b", "2.0");
+  have("com.a", "1.0", false, true);
+  have("com.b", "1.0");
+  installed[0].waits = installed[1].waits = true;
+  plan();
+  EXPECT_THAT(entries,
+              ElementsAre("install com.a 1.0 by host", "update com.b 2.0 over 1.0 by host"));
+}
 
-  std::vector<std::string> found;
-  for (const auto& application : installedApplications(phone.appRegistry)) {
-    found.push_back(application.identifier + " " + application.version +
-                    (application.isSystem ? " system" : "") +
-                    (application.isPlaceholder ? " placeholder" : ""));
-  }
-  EXPECT_THAT(found,
-              ElementsAre("com.a 1.0", "com.restoring 1.0 placeholder", "com.system  system"));
+TEST_F(Planning, LeavesADemotedApplicationUnlessItIsNamed) {
+  offer("com.a", "1.0");
+  have("com.a", "1.0", false, true);
+  installed[0].isDemoted = true;
+  plan();
+  EXPECT_THAT(entries, IsEmpty());
+  EXPECT_THAT(skipped, ElementsAre("com.a: stays a placeholder until it is asked for"));
+  options.install = {"com.a"};
+  plan();
+  EXPECT_THAT(entries, ElementsAre("install com.a 1.0"));
+  EXPECT_THAT(skipped, IsEmpty());
 }
 
 }  // namespace

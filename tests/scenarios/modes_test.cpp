@@ -7,6 +7,7 @@
 
 #include "client/apps_client.h"
 #include "device/embedded_device.h"
+#include "host/phone/installed_applications.h"
 #include "host/phone/sync_host.h"
 #include "host/sync/session.h"
 #include "tests/host/host_files.h"
@@ -142,11 +143,11 @@ class ModePhone {
     Interruption interruption;
     HostProcess host(SyncHostBundleIdentifier, "com.corvane.twc.AppsClient", interruption);
     AppsClient client(device_->platform(host));
-    device_->systemNotifier().post(TWStartupCompleteNotification);
+    announceStartUp(device_->systemNotifier());
     PartReporter reporter([&](const std::string& identifier) {
       if (cancelled_.erase(identifier) > 0) cancel(identifier, host);
     });
-    Session session(client, host.transfers(), phoneOf(*device_), reporter, interruption);
+    Session session(client, host, phoneOf(*device_), reporter, interruption);
     const SyncResult result = session.run(input);
     EXPECT_TRUE(result.completed);
     return text(result.summary);
@@ -179,8 +180,7 @@ class ModePhone {
     }
     std::string problem;
     input.plan =
-        makePlan(input.library, installedApplications(device_->appRegistry()), options, problem)
-            .value();
+        makePlan(input.library, installedApplications(phoneOf(*device_)), options, problem).value();
     return input;
   }
 

@@ -8,6 +8,7 @@
 
 #include "client/apps_client.h"
 #include "device/embedded_device.h"
+#include "host/phone/installed_applications.h"
 #include "host/phone/sync_host.h"
 #include "host/sync/session.h"
 #include "tests/host/host_files.h"
@@ -42,9 +43,9 @@ class PersonRacesTest : public ::testing::Test {
     Interruption interruption;
     HostProcess host(SyncHostBundleIdentifier, "com.corvane.twc.AppsClient", interruption);
     AppsClient client(device_->platform(host));
-    device_->systemNotifier().post(TWStartupCompleteNotification);
+    announceStartUp(device_->systemNotifier());
     Quiet reporter;
-    Session session(client, host.transfers(), phoneOf(*device_), reporter, interruption);
+    Session session(client, host, phoneOf(*device_), reporter, interruption);
     std::atomic<bool> over = false;
     std::set<std::string> cancelled;
     std::thread person([&] {
@@ -96,8 +97,7 @@ class PersonRacesTest : public ::testing::Test {
     }
     std::string problem;
     input.plan =
-        makePlan(input.library, installedApplications(device_->appRegistry()), options, problem)
-            .value();
+        makePlan(input.library, installedApplications(phoneOf(*device_)), options, problem).value();
     return input;
   }
 

@@ -5,6 +5,8 @@
 
 #include "client/apps_client.h"
 #include "host/backup/backup_folder.h"
+#include "host/phone/installed_applications.h"
+#include "host/sync/session.h"
 #include "platform/property_list_codec.h"
 #include "tests/fakes/stepping_file_manager.h"
 #include "tests/test_pch.h"
@@ -47,6 +49,7 @@ std::string text(const Summary& summary) {
     result += (result.empty() ? "" : "; ") + std::string(what) + " " + entry;
   };
   for (const auto& identifier : summary.installed) add("installed", identifier);
+  for (const auto& identifier : summary.updated) add("updated", identifier);
   for (const auto& entry : summary.failed) add("failed", entry.identifier + ": " + entry.reason);
   for (const auto& entry : summary.skipped) add("skipped", entry.identifier + ": " + entry.reason);
   return result;
@@ -107,11 +110,9 @@ RestorePhone stepping(const RestorePhone& phone, FileManager& files,
     return phone.restoreData(identifier, stepped, error);
   };
   return {{files, phone.apps, receive, phone.setWatcher, phone.hurry, phone.isBusyWith,
-           phone.coordination},
+           phone.saveData, phone.packagesOwedBy, phone.coordination},
           phone.homeScreen,
-          phone.saveData,
-          restoreData,
-          phone.packagesOwedBy};
+          restoreData};
 }
 
 }  // namespace
@@ -203,10 +204,26 @@ std::string RestoringPhone::restore(const RestoreInput& input, const Step& step)
   StepLog log(device_->log(), every);
   fakes::SteppingFileManager files(device_->files(), every);
   AppsClient client(withFilesAndLog(device_->platform(host), files, log));
-  device_->systemNotifier().post(TWStartupCompleteNotification);
+  announceStartUp(device_->systemNotifier());
   const RestorePhone phone = stepping(restorePhoneOf(*device_), files, every);
   Restore restore(client, host, phone, reporter, interruption);
   return text(restore.run(input).summary);
+}
+
+std::string RestoringPhone::sync(const Library& library, const PlanOptions& options) {
+  Interruption interruption;
+  StepReporter reporter([&](const Event& event) {
+    if (onEvent) onEvent(event, interruption);
+  });
+  std::string problem;
+  SyncInput input{library, {}, {}, "NEW"};
+  input.plan =
+      makePlan(library, installedApplications(phoneOf(*device_)), options, problem).value();
+  HostProcess host(SyncHostBundleIdentifier, "com.corvane.twc.AppsClient", interruption);
+  AppsClient client(device_->platform(host));
+  announceStartUp(device_->systemNotifier());
+  Session session(client, host, phoneOf(*device_), reporter, interruption);
+  return text(session.run(input).summary);
 }
 
 bool RestoringPhone::restoreAndDie(const RestoreInput& input, int step) {

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "device/embedded_device.h"
+#include "host/library/sync_plan.h"
 #include "host/restore/restore.h"
 #include "tests/host/host_files.h"
 
@@ -58,7 +59,9 @@ class RestoringPhone {
   using Step = std::function<void()>;
   /// The summary as text.
   std::string restore(const RestoreInput& input, const Step& step = {});
-  /// The same in a process that dies at the given step; false when the restore ended before.
+  /// A whole desktop sync as the command plans it; the summary as text.
+  std::string sync(const Library& library, const PlanOptions& options = {});
+  /// A restore in a process that dies at the given step; false when it ended before.
   bool restoreAndDie(const RestoreInput& input, int step);
 
   /// All that a person would find, a line each: applications, their data, the home screen.

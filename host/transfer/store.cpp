@@ -1,14 +1,27 @@
-#include "host/restore/store.h"
+#include "host/transfer/store.h"
+
+#include <algorithm>
 
 #include "host/base/text.h"
 #include "host/phone/demotions.h"
-#include "host/restore/restore_data.h"
 #include "host/transfer/staging.h"
 
 namespace appsync::host {
 
-void Store::deliver(const std::set<std::string>& except) {
-  takeOrders(except);
+std::set<std::string> waitingForStore(const Phone& phone) {
+  const std::vector<std::string> owed = phone.packagesOwedBy(KQClientKiosk);
+  std::set<std::string> waiting(owed.begin(), owed.end());
+  const Demotions demotions(phone.files);
+  for (const auto& [identifier, record] : applicationsPresent(phone.apps).placeholders) {
+    const bool isStores = record.installType == InstallType::StoreDownload ||
+                          record.installType == InstallType::Restore;
+    if (isStores && !demotions.holdBack(record)) waiting.insert(identifier);
+  }
+  return waiting;
+}
+
+void Store::deliver(const std::set<std::string>& identifiers) {
+  takeOrders(identifiers);
   send();
   for (const auto& [identifier, order] : orders_) {
     if (!order->arrived) continue;
@@ -16,35 +29,28 @@ void Store::deliver(const std::set<std::string>& except) {
   }
 }
 
-void Store::takeOrders(const std::set<std::string>& except) {
+void Store::takeOrders(const std::set<std::string>& identifiers) {
   const ApplicationsPresent present = applicationsPresent(phone_.apps);
-  const auto nameOf = [&](const std::string& identifier) {
-    const auto placeholder = present.placeholders.find(identifier);
-    const bool named =
-        placeholder != present.placeholders.end() && !placeholder->second.displayName.empty();
-    return named ? placeholder->second.displayName : identifier;
-  };
-  const auto coordinatorOf = [&](const std::string& identifier) {
-    return phone_.coordination
-               ? phone_.coordination->coordinatorFor(CoordinatorKind::Any, identifier,
-                                                     KQClientKiosk, false, nullptr, nullptr)
-               : nullptr;
-  };
-  for (const std::string& identifier : phone_.packagesOwedBy(KQClientKiosk)) {
-    const auto coordinator = coordinatorOf(identifier);
-    if (!coordinator || except.contains(identifier)) continue;
-    order(identifier, nameOf(identifier), deliverToCoordinator(phone_, identifier, coordinator));
-  }
-  const Demotions demotions(phone_.files);
-  for (const auto& [identifier, record] : present.placeholders) {
-    const bool isStores = record.installType == InstallType::StoreDownload ||
-                          record.installType == InstallType::Restore;
-    if (!isStores || demotions.holdBack(record) || except.contains(identifier) ||
-        coordinatorOf(identifier)) {
-      continue;
+  const std::vector<std::string> owed = phone_.packagesOwedBy(KQClientKiosk);
+  for (const std::string& identifier : identifiers) {
+    const auto found = present.placeholders.find(identifier);
+    const AppRecord* placeholder = found == present.placeholders.end() ? nullptr : &found->second;
+    const bool named = placeholder && !placeholder->displayName.empty();
+    auto delivery = deliveryFor(identifier, placeholder, std::ranges::count(owed, identifier) > 0);
+    if (delivery) {
+      order(identifier, named ? placeholder->displayName : identifier, std::move(delivery));
     }
-    order(identifier, nameOf(identifier), deliverToRegistry(phone_, record));
   }
+}
+
+std::unique_ptr<PackageDelivery> Store::deliveryFor(const std::string& identifier,
+                                                    const AppRecord* placeholder, bool owed) const {
+  const auto coordinator = phone_.coordination ? phone_.coordination->coordinatorFor(
+                                                     CoordinatorKind::Any, identifier,
+                                                     KQClientKiosk, false, nullptr, nullptr)
+                                               : nullptr;
+  if (coordinator && owed) return deliverToCoordinator(phone_, identifier, coordinator);
+  return placeholder && !coordinator ? deliverToRegistry(phone_, *placeholder) : nullptr;
 }
 
 void Store::order(const std::string& identifier, const std::string& name,
@@ -63,7 +69,7 @@ void Store::send() {
   for (auto next = queue.next(); next.asset; next = queue.next()) {
     Order& order = *orders_.at(next.asset->identifier);
     if (interruption_.requested()) {
-      finish(order, InterruptedReason);
+      finish(order, ifInterrupted_);
     } else if (next.cancelled) {
       finish(order, "cancelled on the phone");
     } else {

@@ -14,24 +14,29 @@
 
 namespace appsync::host {
 
-/// The store: brings the packages of applications that have only a placeholder, from a catalogue.
+/// The applications that wait for a package of the store's. Demoted ones do not until a person asks
+/// for them.
+std::set<std::string> waitingForStore(const Phone& phone);
+
+/// The store's part: brings the packages of applications that have a placeholder, from a catalogue.
 ///
 /// Packages that install coordinators expect of it go to them. Every other one goes to the registry
 /// by itself: a coordinator that fails takes its placeholder along, which here is all that is left
-/// of the application. Demoted applications are left alone until a person asks for them. Borrows
-/// everything; used once, by one thread.
+/// of the application. Borrows everything; used once, by one thread.
 class Store {
  public:
-  Store(HostProcess& host, const RestorePhone& phone, Reporter& reporter,
-        const Interruption& interruption, const Library& catalogue)
+  /// `ifInterrupted` is the reason, for people, why a package was not sent.
+  Store(HostProcess& host, const Phone& phone, Reporter& reporter, const Interruption& interruption,
+        const Library& catalogue, std::string ifInterrupted)
       : host_(host),
         phone_(phone),
         reporter_(reporter),
         interruption_(interruption),
-        catalogue_(catalogue) {}
+        catalogue_(catalogue),
+        ifInterrupted_(std::move(ifInterrupted)) {}
 
-  /// Brings what is wanted but `except`, and returns when the phone has installed or refused it.
-  void deliver(const std::set<std::string>& except);
+  /// Returns when the phone has installed or refused what the catalogue has of these.
+  void deliver(const std::set<std::string>& identifiers);
 
   /// Why what the catalogue has was not brought, by identifier.
   const std::map<std::string, std::string>& failures() const { return failures_; }
@@ -45,7 +50,9 @@ class Store {
     bool arrived = false;
   };
 
-  void takeOrders(const std::set<std::string>& except);
+  void takeOrders(const std::set<std::string>& identifiers);
+  std::unique_ptr<PackageDelivery> deliveryFor(const std::string& identifier,
+                                               const AppRecord* placeholder, bool owed) const;
   void order(const std::string& identifier, const std::string& name,
              std::unique_ptr<PackageDelivery> delivery);
   void send();
@@ -53,10 +60,11 @@ class Store {
   void finish(Order& order, const std::optional<std::string>& failure);
 
   HostProcess& host_;
-  const RestorePhone& phone_;
+  const Phone& phone_;
   Reporter& reporter_;
   const Interruption& interruption_;
   const Library& catalogue_;
+  const std::string ifInterrupted_;
   std::map<std::string, std::unique_ptr<Order>> orders_;  ///< by identifier
   std::map<std::string, std::string> failures_;
 };

@@ -1,0 +1,56 @@
+#include "host/phone/installed_applications.h"
+
+#include "host/phone/demotions.h"
+
+namespace appsync::host {
+namespace {
+
+/// What the client asks the host for.
+class ClientsWishes {
+ public:
+  explicit ClientsWishes(const Phone& phone) : coordinated_(phone.coordination != nullptr) {
+    const std::vector<std::string> owed = phone.packagesOwedBy(KQClientKiosk);
+    owedByStore_.insert(owed.begin(), owed.end());
+  }
+
+  /// Without coordination never for a package whose placeholder stands already; with it for none
+  /// that is the store's.
+  bool leaveOut(const AppRecord& placeholder) const {
+    return !coordinated_ || placeholder.installType == InstallType::Restore ||
+           owedByStore_.contains(placeholder.applicationIdentifier);
+  }
+
+ private:
+  const bool coordinated_;
+  std::set<std::string, std::less<>> owedByStore_;
+};
+
+}  // namespace
+
+std::vector<InstalledApplication> installedApplications(const Phone& phone) {
+  const Demotions demotions(phone.files);
+  const ClientsWishes wishes(phone);
+  std::map<std::string, InstalledApplication> found;
+  phone.apps.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
+    const bool leftOver = record.isPlaceholder && record.installType == InstallType::Sync;
+    if (!record.isApplication || leftOver) return;
+    const auto [place, isNew] = found.try_emplace(record.applicationIdentifier);
+    InstalledApplication& application = place->second;
+    if (isNew || !record.isPlaceholder) {
+      application = {record.applicationIdentifier,
+                     record.bundleVersion.value_or(""),
+                     record.displayName,
+                     record.applicationType == ApplicationTypeSystem,
+                     record.isPlaceholder,
+                     record.isPlaceholder && demotions.holdBack(record),
+                     application.waits};
+    }
+    if (record.isPlaceholder) application.waits = wishes.leaveOut(record);
+  });
+  std::vector<InstalledApplication> result;
+  result.reserve(found.size());
+  for (auto& [identifier, application] : found) result.push_back(std::move(application));
+  return result;
+}
+
+}  // namespace appsync::host

@@ -1,0 +1,67 @@
+// What a sync finds on a fake phone.
+#include "host/phone/installed_applications.h"
+
+#include "tests/host/restore_fixture.h"
+
+namespace appsync::host {
+namespace {
+
+using namespace testing;
+using ::testing::ElementsAre;
+
+class InstalledApplicationsTest : public RestoreTest {
+ protected:
+  std::vector<std::string> found() {
+    std::vector<std::string> lines;
+    for (const auto& application : installedApplications(phoneForHost())) {
+      lines.push_back(application.identifier + " " + application.version +
+                      (application.isSystem ? " system" : "") +
+                      (application.isPlaceholder ? " placeholder" : "") +
+                      (application.isDemoted ? " demoted" : "") +
+                      (application.waits ? " waits" : ""));
+    }
+    return lines;
+  }
+};
+
+TEST_F(InstalledApplicationsTest, AreOnePerIdentifierWithoutLeftOverPlaceholders) {
+  phone.appRegistry.seedInstalled("com.a", "1.0");
+  phone.appRegistry.seedPlaceholder("com.a", InstallType::Restore, "2.0");
+  phone.appRegistry.seedPlaceholder("com.left", InstallType::Sync);
+  phone.appRegistry.seedPlaceholder("com.restoring", InstallType::Restore);
+  AppRecord extension;
+  extension.applicationIdentifier = "com.extension";
+  extension.isApplication = false;
+  phone.appRegistry.seedOther(extension);
+  AppRecord system;
+  system.applicationIdentifier = "com.system";
+  system.applicationType = ApplicationTypeSystem;
+  phone.appRegistry.seedInstalled(system);
+  EXPECT_THAT(found(), ElementsAre("com.a 1.0 waits", "com.restoring 1.0 placeholder waits",
+                                   "com.system  system"));
+}
+
+TEST_F(InstalledApplicationsTest, EveryPlaceholderWaitsForTheHostWithoutCoordination) {
+  seedRestoring("com.a", InstallType::StoreDownload);
+  seedRestoring("com.b", InstallType::IntentionalDowngrade);
+  seedRestoring("com.c");
+  EXPECT_THAT(found(),
+              ElementsAre("com.a 1.0 placeholder waits", "com.b 1.0 placeholder demoted waits",
+                          "com.c 1.0 placeholder waits"));
+}
+
+TEST_F(InstalledApplicationsTest, TheClientAsksForWhatIsNotTheStoresWithCoordination) {
+  coordination = true;
+  seedRestoring("com.a", InstallType::StoreDownload);
+  seedRestoring("com.b", InstallType::IntentionalDowngrade);
+  seedRestoring("com.c");
+  seedRestoring("com.d");
+  auto tapped = *phone.appRegistry.recordForIdentifier("com.d", true);
+  tapped.installType = InstallType::StoreDownload;
+  phone.appRegistry.seedPlaceholder(tapped);
+  EXPECT_THAT(found(), ElementsAre("com.a 1.0 placeholder", "com.b 1.0 placeholder demoted",
+                                   "com.c 1.0 placeholder waits", "com.d 1.0 placeholder waits"));
+}
+
+}  // namespace
+}  // namespace appsync::host
