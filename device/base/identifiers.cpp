@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "device/base/temporary_file.h"
+
 namespace appsync::device {
 namespace {
 
@@ -17,7 +19,7 @@ bool isAllowed(char c) { return isAlphanumeric(c) || c == '.' || c == '_' || c =
 
 bool isUsableIdentifier(std::string_view identifier) {
   return identifier.size() <= MaximumLength && std::ranges::all_of(identifier, isAllowed) &&
-         std::ranges::any_of(identifier, isAlphanumeric);
+         std::ranges::any_of(identifier, isAlphanumeric) && !isTemporaryName(identifier);
 }
 
 }  // namespace appsync::device

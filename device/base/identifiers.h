@@ -5,7 +5,8 @@
 namespace appsync::device {
 
 /// Whether a bundle identifier from outside may become the name of a file or directory: letters,
-/// digits, '.', '_' and '-', at least one of them a letter or digit, at most 200 bytes.
+/// digits, '.', '_' and '-', at least one of them a letter or digit, at most 200 bytes, and no
+/// temporary name, which is swept.
 bool isUsableIdentifier(std::string_view identifier);
 
 }  // namespace appsync::device

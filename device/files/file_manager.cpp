@@ -25,11 +25,19 @@ std::string_view withoutSlashesAtEnd(std::string_view path) {
   return last == std::string_view::npos ? path.substr(0, 1) : path.substr(0, last + 1);
 }
 
-std::size_t componentsOf(std::string_view path) {
+/// 0 or an errno value. No path leads up: a name that somebody else chose and that was joined to a
+/// directory stays in it.
+int objectionTo(std::string_view path) {
+  if (!path.starts_with('/') || path.find('\0') != std::string_view::npos) return EINVAL;
   std::size_t count = 0;
-  for (std::size_t i = 0; i < path.size(); ++i)
-    count += path[i] != '/' && (i == 0 || path[i - 1] == '/') ? 1 : 0;
-  return count;
+  for (std::string_view rest = path; !rest.empty();) {
+    const std::size_t end = std::min(rest.find('/'), rest.size());
+    const std::string_view component = rest.substr(0, end);
+    rest.remove_prefix(std::min(end + 1, rest.size()));
+    if (component == "." || component == "..") return EINVAL;
+    if (!component.empty() && ++count > MaximumComponents) return ENAMETOOLONG;
+  }
+  return 0;
 }
 
 double secondsOf(const timespec& time) {
@@ -75,9 +83,7 @@ bool fail(std::optional<Error>* error, int reason, std::string_view path) {
 }
 
 /// Nobody looks for a temporary file after a power failure, so none waits for the disk.
-bool isTemporary(std::string_view path) {
-  return path.starts_with("/tmp/") && path.find("/..") == std::string_view::npos;
-}
+bool isTemporary(std::string_view path) { return path.starts_with("/tmp/"); }
 
 }  // namespace
 
@@ -257,9 +263,8 @@ void ConfinedFileManager::removeTemporaries(std::string_view directory, Reach re
 bool ConfinedFileManager::usable(std::string_view path,
                                  std::optional<Error>* error) const noexcept {
   if (!root_.isOpen()) return fail(error, openErrno_, path);
-  if (!path.starts_with('/') || path.find('\0') != std::string_view::npos)
-    return fail(error, EINVAL, path);
-  return componentsOf(path) <= MaximumComponents || fail(error, ENAMETOOLONG, path);
+  const int objection = objectionTo(path);
+  return objection == 0 || fail(error, objection, path);
 }
 
 std::optional<ConfinedFileManager::Place> ConfinedFileManager::placeOf(
@@ -268,8 +273,8 @@ std::optional<ConfinedFileManager::Place> ConfinedFileManager::placeOf(
   const std::string_view item = withoutSlashesAtEnd(path);
   const std::size_t slash = item.rfind('/');
   const std::string_view name = item.substr(slash + 1);
-  if (name.empty() || name == "." || name == "..") {
-    fail(error, name.empty() ? EBUSY : EINVAL, path);
+  if (name.empty()) {
+    fail(error, EBUSY, path);
     return std::nullopt;
   }
   FileDescriptor directory = root_.openDirectoryAt(slash == 0 ? "/" : item.substr(0, slash));

@@ -341,7 +341,7 @@ TEST_F(ApplicationDataTest, ASinkThatFailsEndsTheSaving) {
 }
 
 TEST_F(ApplicationDataTest, IdentifiersThatCannotBeNamesAreRefused) {
-  for (const char* identifier : {"", "..", "a/b", "../x"}) {
+  for (const char* identifier : {"", ".", "..", "a/b", "../x", ".appsync-0123456789abcdef"}) {
     EXPECT_FALSE(device->saveData(
         identifier, [](ByteView) { return true; }, &error));
     EXPECT_FALSE(device->restoreData(identifier, piecesOf(""), &error));

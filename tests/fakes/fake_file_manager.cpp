@@ -9,24 +9,23 @@ namespace {
 
 constexpr std::string_view defaultOwner = "root";
 
-/// Fails unless the path is one that a file manager takes.
-bool isUsable(std::string_view path, std::optional<Error>* error) {
-  if (path.starts_with('/') && path.find('\0') == std::string_view::npos) return true;
-  setError(error, Error::posix(EINVAL, path));
-  return false;
-}
-
-std::string parentOf(std::string_view path) {
-  const auto slash = path.rfind('/');
-  return slash == 0 ? "/" : std::string(path.substr(0, slash));
-}
-
 /// Cuts the next name off the front; empty at the end.
 std::string_view takeName(std::string_view& rest) {
   rest.remove_prefix(std::min(rest.find_first_not_of('/'), rest.size()));
   const std::string_view name = rest.substr(0, rest.find('/'));
   rest.remove_prefix(name.size());
   return name;
+}
+
+/// Fails unless the path is one that a file manager takes.
+bool isUsable(std::string_view path, std::optional<Error>* error) {
+  bool usable = path.starts_with('/') && path.find('\0') == std::string_view::npos;
+  std::string_view rest = path;
+  for (auto name = takeName(rest); usable && !name.empty(); name = takeName(rest)) {
+    usable = name != "." && name != "..";
+  }
+  if (!usable) setError(error, Error::posix(EINVAL, path));
+  return usable;
 }
 
 bool isBelow(std::string_view path, const std::string& directory) {
@@ -82,8 +81,7 @@ bool FakeFileManager::createDirectory(std::string_view path, bool withIntermedia
   std::string_view rest = path;
   bool made = false;
   for (std::string_view name = takeName(rest); !name.empty(); name = takeName(rest)) {
-    if (name == ".") continue;
-    current = name == ".." ? parentOf(current) : joinPath(current, name);
+    current = joinPath(current, name);
     made = false;
     const auto found = tree_.find(current);
     const bool last = rest.find_first_not_of('/') == std::string_view::npos;
@@ -186,8 +184,7 @@ std::optional<std::string> FakeFileManager::resolve(std::string_view path,
       setError(error, Error::posix(tree_.contains(current) ? ENOTDIR : ENOENT, path));
       return std::nullopt;
     }
-    if (name == ".") continue;
-    current = name == ".." ? parentOf(current) : joinPath(current, name);
+    current = joinPath(current, name);
   }
   return current;
 }
