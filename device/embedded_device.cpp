@@ -34,15 +34,6 @@ Error notInstalling(std::string_view bundleId) {
                                 fmt::format("{} is not being installed", bundleId));
 }
 
-bool readsCoordination(Database& database) {
-  bool coordination = false;
-  database.read("the device's options could not be read", [&](SQLite::Database& connection) {
-    Query query(connection, "SELECT value FROM settings WHERE key = 'coordination'");
-    coordination = query.next() && query.boolean(0);
-  });
-  return coordination;
-}
-
 class FolderDevice final : public EmbeddedDevice {
  public:
   explicit FolderDevice(OpenFolder opened)
@@ -50,11 +41,12 @@ class FolderDevice final : public EmbeddedDevice {
         lock_(std::move(opened.lock)),
         log_(std::move(opened.log)),
         database_(std::move(opened.database)),
+        options_(opened.options),
         files_(paths_.root),
         foreground_(paths_.foreground) {
-    if (!database_->writable()) return;
+    if (!database_->writable() || !files_.isOpen()) return;
     finishInterruptedWork(core_);
-    if (options().coordination) coordination_.emplace(core_, registry_);
+    if (options_.coordination) coordination_.emplace(core_, registry_);
     personSocket_ = PersonSocket::open(paths_, [this](PersonWish wish, std::string_view bundleId) {
       return carryOut(wish, bundleId);
     });
@@ -174,7 +166,7 @@ class FolderDevice final : public EmbeddedDevice {
     return takesData(bundleId, error) && overwriteApplicationData(core_, bundleId, source, error);
   }
 
-  DeviceOptions options() noexcept override { return {readsCoordination(*database_)}; }
+  DeviceOptions options() noexcept override { return options_; }
 
   std::vector<AppRecord> applications() noexcept override { return registry_.records(); }
 
@@ -216,6 +208,7 @@ class FolderDevice final : public EmbeddedDevice {
   const std::unique_ptr<WriteLock> lock_;
   const std::unique_ptr<LogFiles> log_;
   const std::unique_ptr<Database> database_;
+  const DeviceOptions options_;
   ConfinedFileManager files_;
   Foreground foreground_;
   Containers containers_{files_, files_, *log_};

@@ -4,9 +4,29 @@
 
 namespace appsync::device {
 
+namespace {
+
+/// False with an error. Nobody guesses: with the other answer the phone would work in another way.
+bool readOptions(OpenFolder& opened, DeviceError& error) {
+  std::optional<Error> reason;
+  const bool read = opened.database->read(
+      "the device's options could not be read",
+      [&](SQLite::Database& connection) {
+        Query query(connection, "SELECT value FROM settings WHERE key = 'coordination'");
+        opened.options.coordination = query.next() && query.boolean(0);
+      },
+      &reason);
+  if (read) return true;
+  error = deviceError(DeviceProblem::Unusable, opened.paths.folder, reason->localizedDescription(),
+                      "try again, or check the disk");
+  return false;
+}
+
+}  // namespace
+
 std::optional<OpenFolder> openFolder(const std::filesystem::path& folder, Access access,
                                      DeviceError& error) {
-  OpenFolder opened{DevicePaths(folder), nullptr, nullptr, nullptr};
+  OpenFolder opened{DevicePaths(folder), nullptr, nullptr, nullptr, {}};
   const DevicePaths& paths = opened.paths;
   if (!checkDeviceFolder(paths, error)) return std::nullopt;
   if (access == Access::Write) {
@@ -20,6 +40,7 @@ std::optional<OpenFolder> openFolder(const std::filesystem::path& folder, Access
     error = damagedDevice(paths.folder, "its files are missing");
     return std::nullopt;
   }
+  if (!readOptions(opened, error)) return std::nullopt;
   return opened;
 }
 

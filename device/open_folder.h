@@ -15,6 +15,7 @@ struct OpenFolder {
   std::unique_ptr<WriteLock> lock;
   std::unique_ptr<LogFiles> log;
   std::unique_ptr<Database> database;
+  DeviceOptions options;
 };
 
 std::optional<OpenFolder> openFolder(const std::filesystem::path& folder, Access access,

@@ -2,11 +2,11 @@
 
 #include <fmt/format.h>
 
-#include <cerrno>
 #include <set>
 
 #include "device/apps/installs.h"
 #include "device/apps/removal.h"
+#include "device/files/existence.h"
 #include "device/state/application_rows.h"
 
 namespace appsync::device {
@@ -29,33 +29,30 @@ std::vector<ApplicationRow> readRows(DeviceCore& core, bool& read) {
 
 /// Only what is known to be missing counts: a bundle that cannot be looked at is left alone.
 bool isGone(DeviceCore& core, const ApplicationRow& row) {
-  std::optional<Error> error;
-  if (core.files.attributesOfItem(joinPath(row.bundlePath(), "Info.plist"), &error)) return false;
-  return error && error->domain == POSIXErrorDomain && error->code == ENOENT;
+  return isThere(core.files, joinPath(row.bundlePath(), "Info.plist"), nullptr) == false;
 }
 
 /// The rows that remain.
 std::vector<ApplicationRow> dropRowsWithoutBundle(DeviceCore& core,
                                                   std::vector<ApplicationRow> rows) {
-  std::vector<ApplicationRow> gone;
   std::erase_if(rows, [&](const ApplicationRow& row) {
-    const bool isMissing = isGone(core, row);
-    if (isMissing) gone.push_back(row);
-    return isMissing;
-  });
-  for (const ApplicationRow& row : gone) {
+    if (!isGone(core, row)) return false;
     note(core, fmt::format("{} is dropped from the registry: {} is gone", row.identifier,
                            row.bundlePath()));
-    core.database.change("a row without a bundle could not be dropped", Database::Commit::Ordinary,
-                         [&](SQLite::Database& database) { eraseApplication(database, row); });
-  }
+    return core.database.change(
+        "a row without a bundle could not be dropped", Database::Commit::Ordinary,
+        [&](SQLite::Database& database) { eraseApplication(database, row); });
+  });
   return rows;
 }
 
 void removeUnnamedContainers(DeviceCore& core, const std::vector<ApplicationRow>& rows) {
   std::set<std::string> named;
   for (const ApplicationRow& row : rows) named.insert(row.container);
-  for (const std::string& container : core.containers.list()) {
+  std::optional<Error> error;
+  const auto containers = core.containers.list(&error);
+  if (!containers) return note(core, error->localizedDescription());
+  for (const std::string& container : *containers) {
     if (named.contains(container)) continue;
     note(core, fmt::format("{} is removed: nothing in the registry names it", container));
     core.containers.remove(container);
@@ -70,14 +67,6 @@ void removeAllAbandonedData(DeviceCore& core) {
                        while (query.next()) identifiers.push_back(query.text(0));
                      });
   for (const std::string& identifier : identifiers) removeAbandonedData(core, identifier, nullptr);
-}
-
-/// What a first install left that did not come to its end. Data with something in it is never
-/// removed without an order to do so.
-void removeUnusedData(DeviceCore& core, const std::set<std::string>& installed) {
-  for (const std::string& identifier : core.containers.emptyData()) {
-    if (!installed.contains(identifier)) core.containers.removeData(identifier);
-  }
 }
 
 void pauseInstalls(DeviceCore& core) {
@@ -131,7 +120,9 @@ void finishInterruptedWork(DeviceCore& core) {
   removeUnnamedContainers(core, rows);
   const std::set<std::string> installed = installedAmong(rows);
   removeAllAbandonedData(core);
-  removeUnusedData(core, installed);
+  // What a first install left that did not come to its end. Data with something in it is never
+  // removed without an order to do so.
+  core.containers.removeEmptyData(installed);
   pauseInstalls(core);
   clearForeground(core.foreground, installed);
   removeTemporaries(core, rows);

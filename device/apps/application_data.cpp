@@ -22,26 +22,27 @@ namespace {
 std::string parentOf(const std::string& path) { return path.substr(0, path.rfind('/')); }
 std::string nameOf(const std::string& path) { return path.substr(path.rfind('/') + 1); }
 
-/// Whether what a restore has still to give back is the application's data.
-bool ownsWaitingData(DeviceCore& core, std::string_view identifier, bool& waiting,
-                     std::optional<Error>* error) {
+/// Whether what a restore has still to give back is the application's data; nullopt with an error.
+std::optional<bool> ownsWaitingData(DeviceCore& core, std::string_view identifier,
+                                    std::optional<Error>* error) {
+  bool installed = false;
   const bool read = core.database.read(
       "the registry could not be read",
       [&](SQLite::Database& database) {
-        waiting = !findApplication(database, identifier).installed;
+        installed = findApplication(database, identifier).installed.has_value();
       },
       error);
-  waiting = waiting && core.containers.dataWaits(identifier);
-  return read;
+  if (!read) return std::nullopt;
+  return installed ? false : core.containers.dataWaits(identifier, error);
 }
 
 std::optional<Error> save(DeviceCore& core, const std::string& identifier, const DataSink& sink) {
   const KeyedMutex::Guard guard(core.applicationLocks, identifier);
   std::optional<Error> error;
-  bool waiting = false;
-  if (!ownsWaitingData(core, identifier, waiting, &error)) return error;
+  const std::optional<bool> waiting = ownsWaitingData(core, identifier, &error);
+  if (!waiting) return error;
   const std::string path =
-      waiting ? Containers::waitingDataPath(identifier) : Containers::dataPath(identifier);
+      *waiting ? Containers::waitingDataPath(identifier) : Containers::dataPath(identifier);
   const FileDescriptor parent = core.handles.openDirectory(parentOf(path), &error);
   const FileDescriptor directory(parent ? ::openat(parent.get(), identifier.c_str(),
                                                    O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC)

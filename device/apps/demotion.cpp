@@ -6,6 +6,7 @@
 
 #include "device/apps/idle_application.h"
 #include "device/apps/installers.h"
+#include "device/files/existence.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 
@@ -45,10 +46,9 @@ bool buildBundle(FileManager& files, const ApplicationRow& installed, const std:
 bool layPlaceholder(DeviceCore& core, const ApplicationRow& installed,
                     std::optional<Error>* error) {
   const std::string bundle = joinPath(BundleParts, installed.identifier + ".app");
-  const PlaceholderOptions options{
-      InstallType::IntentionalDowngrade,
-      core.files.contentsAtPath(joinPath(installed.container, "HalvoMetadata.plist")),
-      installed.sinf};
+  PlaceholderOptions options{InstallType::IntentionalDowngrade, std::nullopt, installed.sinf};
+  const std::string metadata = joinPath(installed.container, "HalvoMetadata.plist");
+  if (!readIfThere(core.files, metadata, options.metadata, error)) return false;
   const bool laid = buildBundle(core.files, installed, bundle, error) &&
                     installPlaceholder(core, bundle, installed.identifier, options, error);
   core.files.removeItem(bundle);

@@ -4,8 +4,10 @@
 #include "device/apps/installers.h"
 #include "device/apps/installs.h"
 #include "device/apps/removal.h"
+#include "device/files/existence.h"
 #include "device/home/icon_order.h"
 #include "platform/bundle.h"
+#include "platform/property_list_codec.h"
 
 namespace appsync::device {
 namespace {
@@ -19,8 +21,9 @@ bool carryOver(DeviceCore& core, std::string_view file, const ApplicationRows& b
   for (const std::optional<ApplicationRow>& row : {before.placeholder, before.installed}) {
     if (!row) continue;
     const std::string source = joinPath(row->container, file);
-    if (!core.files.fileExists(source)) continue;
-    return core.files.copyItem(source, joinPath(container, file), error);
+    const std::optional<bool> there = isThere(core.files, source, error);
+    if (!there) return false;
+    if (*there) return core.files.copyItem(source, joinPath(container, file), error);
   }
   return true;
 }
@@ -34,9 +37,10 @@ bool prepareData(DeviceCore& core, const std::string& identifier, const Applicat
   const bool comesBack =
       !before.installed ||
       (before.placeholder && before.placeholder->installType == InstallType::Restore);
-  return comesBack && core.containers.dataWaits(identifier)
-             ? core.containers.adoptWaitingData(identifier, error)
-             : core.containers.makeData(identifier, error);
+  const auto waits = comesBack ? core.containers.dataWaits(identifier, error) : false;
+  if (!waits) return false;
+  return *waits ? core.containers.adoptWaitingData(identifier, error)
+                : core.containers.makeData(identifier, error);
 }
 
 bool extractInto(DeviceCore& core, const std::string& package, const std::string& container,
@@ -56,10 +60,15 @@ bool extractInto(DeviceCore& core, const std::string& package, const std::string
          (extracted->hasArtwork || carryOver(core, ArtworkFile, before, container, error));
 }
 
-bool isDeviceBased(DeviceCore& core, const std::string& container) {
-  const auto metadata = loadDictionary(core.files, joinPath(container, MetadataFile));
-  const PropertyList* flag = metadata ? find(*metadata, "DeviceBasedQLP") : nullptr;
-  return flag && flag->booleanValue();
+/// What the metadata says; of one that does not parse nothing is expected.
+bool readMetadata(DeviceCore& core, ApplicationRow& row, std::optional<Error>* error) {
+  std::optional<Bytes> contents;
+  const std::string file = joinPath(row.container, MetadataFile);
+  if (!readIfThere(core.files, file, contents, error)) return false;
+  const auto metadata = contents ? parsePropertyList(*contents) : std::nullopt;
+  const PropertyList* flag = metadata ? metadata->find("DeviceBasedQLP") : nullptr;
+  row.deviceBased = flag && flag->booleanValue();
+  return true;
 }
 
 void inherit(ApplicationRow& row, const ApplicationRows& before) {
@@ -93,11 +102,10 @@ bool replaceApplication(DeviceCore& core, const std::string& package, const std:
   row.identifier = identifier;
   row.container = staged.path();
   inherit(row, before);
-  if (!extractInto(core, package, staged.path(), identifier, row, before, error)) return false;
-  row.deviceBased = isDeviceBased(core, staged.path());
   // One flush for all files of the package, before a row of the registry names them.
-  if (!prepareData(core, identifier, before, error) || !core.containers.flush(error) ||
-      !switchTo(core, row, before, error)) {
+  if (!extractInto(core, package, staged.path(), identifier, row, before, error) ||
+      !readMetadata(core, row, error) || !prepareData(core, identifier, before, error) ||
+      !core.containers.flush(error) || !switchTo(core, row, before, error)) {
     return false;
   }
   staged.keep();

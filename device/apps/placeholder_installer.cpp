@@ -4,6 +4,7 @@
 
 #include "device/apps/installers.h"
 #include "device/apps/installs.h"
+#include "device/files/existence.h"
 #include "device/home/icon_order.h"
 #include "platform/bundle.h"
 #include "platform/installer_service.h"
@@ -18,6 +19,10 @@ std::optional<PropertyList::Dictionary> readInfo(DeviceCore& core, const std::st
                                                  std::optional<Error>* error) {
   std::optional<Error> cause;
   auto info = loadDictionary(core.files, joinPath(bundle, "Info.plist"), &cause);
+  if (!info && cause && cause->domain == POSIXErrorDomain && !isMissing(cause)) {
+    setError(error, *cause);  // the phone's failure is no fault of the bundle
+    return std::nullopt;
+  }
   if (!info) {
     setError(error, refusal(PackageRefusal::BadInfo,
                             cause ? cause->localizedDescription() : "Info.plist is missing"));

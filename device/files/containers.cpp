@@ -1,12 +1,15 @@
 #include "device/files/containers.h"
 
-#include <dirent.h>
+#include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/random.h>
+#include <unistd.h>
 
 #include <array>
 #include <cerrno>
-#include <memory>
+
+#include "device/base/temporary_file.h"
+#include "device/files/existence.h"
 
 namespace appsync::device {
 namespace {
@@ -57,31 +60,28 @@ void Containers::remove(const std::string& container) { removeIfThere(container)
 
 bool Containers::removeIfThere(const std::string& path) {
   std::optional<Error> error;
-  if (files_.removeItem(path, &error)) return true;
-  if (error && error->domain == POSIXErrorDomain && error->code == ENOENT) return true;
+  if (files_.removeItem(path, &error) || isMissing(error)) return true;
   log_.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
              fmt::format("{} could not be removed: {}", path,
                          error ? error->localizedDescription() : "unknown reason"));
   return false;
 }
 
-std::vector<std::string> Containers::namesIn(std::string_view directory) {
+std::optional<std::vector<std::string>> Containers::namesIn(std::string_view directory,
+                                                            std::optional<Error>* error) {
   std::vector<std::string> names;
-  FileDescriptor opened = handles_.openDirectory(directory);
-  if (!opened) return names;
-  const std::unique_ptr<DIR, int (*)(DIR*)> stream(fdopendir(opened.get()), closedir);
-  if (!stream) return names;
-  opened.release();
-  while (const dirent* entry = readdir(stream.get())) {
-    const std::string_view name = entry->d_name;
-    if (name != "." && name != "..") names.emplace_back(name);
-  }
-  return names;
+  std::optional<Error> reason;
+  const FileDescriptor opened = handles_.openDirectory(directory, &reason);
+  if (!opened && isMissing(reason)) return names;
+  if (opened && listNames(opened.get(), names)) return names;
+  setError(error, opened ? Error::posix(errno, directory) : *reason);
+  return std::nullopt;
 }
 
-std::vector<std::string> Containers::list() {
-  std::vector<std::string> paths = namesIn(ApplicationsDirectory);
-  for (std::string& path : paths) path = joinPath(ApplicationsDirectory, path);
+std::optional<std::vector<std::string>> Containers::list(std::optional<Error>* error) {
+  std::optional<std::vector<std::string>> paths = namesIn(ApplicationsDirectory, error);
+  if (!paths) return paths;
+  for (std::string& path : *paths) path = joinPath(ApplicationsDirectory, path);
   return paths;
 }
 
@@ -93,17 +93,28 @@ bool Containers::flush(std::optional<Error>* error) {
   return false;
 }
 
-bool Containers::dataWaits(std::string_view identifier) {
-  return !namesIn(waitingDataPath(identifier)).empty();
+std::optional<bool> Containers::dataWaits(std::string_view identifier,
+                                          std::optional<Error>* error) {
+  const auto names = namesIn(waitingDataPath(identifier), error);
+  return names ? std::optional(!names->empty()) : std::nullopt;
 }
 
 bool Containers::adoptWaitingData(std::string_view identifier, std::optional<Error>* error) {
-  if (!removeData(identifier)) {
-    setError(error, Error::posix(EIO, dataPath(identifier)));
+  const std::string data = dataPath(identifier);
+  // Out of the way rather than removed: until the new data is there, the old may have to return.
+  const std::string aside = joinPath(DataDirectory, makeTemporaryName());
+  if (!files_.createDirectory(DataDirectory, true, {}, error)) return false;
+  std::optional<Error> reason;
+  const bool hadData = files_.moveItem(data, aside, &reason);
+  const bool adopted =
+      (hadData || isMissing(reason)) && files_.moveItem(waitingDataPath(identifier), data, &reason);
+  if (!adopted) {
+    if (hadData) files_.moveItem(aside, data);
+    setError(error, reason.value_or(Error::posix(EIO, data)));
     return false;
   }
-  return files_.createDirectory(DataDirectory, true, {}, error) &&
-         files_.moveItem(waitingDataPath(identifier), dataPath(identifier), error);
+  if (hadData) removeIfThere(aside);
+  return true;
 }
 
 bool Containers::removeWaitingData(std::string_view identifier) {
@@ -114,12 +125,14 @@ bool Containers::makeData(std::string_view identifier, std::optional<Error>* err
   return files_.createDirectory(dataPath(identifier), true, {}, error);
 }
 
-std::vector<std::string> Containers::emptyData() {
-  std::vector<std::string> identifiers = namesIn(DataDirectory);
-  std::erase_if(identifiers, [&](const std::string& identifier) {
-    return !namesIn(dataPath(identifier)).empty();
-  });
-  return identifiers;
+void Containers::removeEmptyData(const std::set<std::string>& besides) {
+  const FileDescriptor directory = handles_.openDirectory(DataDirectory);
+  std::vector<std::string> names;
+  if (!directory || !listNames(directory.get(), names)) return;
+  for (const std::string& name : names) {
+    // The system itself refuses when there is something in it.
+    if (!besides.contains(name)) ::unlinkat(directory.get(), name.c_str(), AT_REMOVEDIR);
+  }
 }
 
 bool Containers::removeData(std::string_view identifier) {

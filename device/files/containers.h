@@ -1,6 +1,7 @@
 #pragma once
 
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -28,24 +29,28 @@ class Containers {
   std::optional<std::string> make(std::optional<Error>* error);
   /// Removes a container. What cannot be removed is logged, and swept when the device is opened.
   void remove(const std::string& container);
-  std::vector<std::string> list();
+  /// nullopt (with a reason) when they cannot be looked at.
+  std::optional<std::vector<std::string>> list(std::optional<Error>* error);
 
   /// Puts all of the phone's files on disk.
   bool flush(std::optional<Error>* error);
 
-  /// Whether a restore left data that is still to be given back to the application.
-  bool dataWaits(std::string_view identifier);
-  /// Gives the waiting data to the application in the place of what it has.
+  /// Whether a restore left data that is still to be given back to the application; nullopt (with
+  /// a reason) when it cannot be looked at.
+  std::optional<bool> dataWaits(std::string_view identifier, std::optional<Error>* error);
+  /// Gives the waiting data to the application in the place of what it has. On failure both are as
+  /// they were.
   bool adoptWaitingData(std::string_view identifier, std::optional<Error>* error);
   bool removeWaitingData(std::string_view identifier);
   bool makeData(std::string_view identifier, std::optional<Error>* error);
-  /// The applications that have a data directory with nothing in it.
-  std::vector<std::string> emptyData();
+  /// Removes the data directories that have nothing in them, but for those of these applications.
+  void removeEmptyData(const std::set<std::string>& besides);
   /// True when the application has no data any more.
   bool removeData(std::string_view identifier);
 
  private:
-  std::vector<std::string> namesIn(std::string_view directory);
+  std::optional<std::vector<std::string>> namesIn(std::string_view directory,
+                                                  std::optional<Error>* error);
   bool removeIfThere(const std::string& path);
 
   FileManager& files_;

@@ -5,7 +5,8 @@
 namespace appsync::device {
 
 bool DeviceBackupManager::restoreDataExists(std::string_view bundleId) noexcept {
-  return isUsableIdentifier(bundleId) && core_.containers.dataWaits(bundleId);
+  return isUsableIdentifier(bundleId) &&
+         core_.containers.dataWaits(bundleId, nullptr).value_or(true);
 }
 
 void DeviceBackupManager::cancelApplicationRestore(std::string_view bundleId) noexcept {

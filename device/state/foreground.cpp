@@ -1,6 +1,5 @@
 #include "device/state/foreground.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/file.h>
@@ -9,6 +8,8 @@
 
 #include <algorithm>
 #include <cerrno>
+
+#include "device/base/directory_tree.h"
 
 namespace appsync::device {
 namespace {
@@ -29,15 +30,20 @@ FileDescriptor lockDirectory(const std::filesystem::path& path) {
   return directory;
 }
 
-bool exists(const FileDescriptor& directory, const std::string& file) {
+// nullopt, with errno set, when that cannot be told.
+
+std::optional<bool> exists(const FileDescriptor& directory, const std::string& file) {
   struct stat status {};
-  return fstatat(directory.get(), file.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0;
+  if (fstatat(directory.get(), file.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0) return true;
+  return errno == ENOENT ? std::optional(false) : std::nullopt;
 }
 
-bool isHeld(const FileDescriptor& directory, const std::string& identifier) {
+std::optional<bool> isHeld(const FileDescriptor& directory, const std::string& identifier) {
   const FileDescriptor file(openat(directory.get(), fileFor(identifier, HeldSuffix).c_str(),
                                    O_RDONLY | O_CLOEXEC | O_NOFOLLOW));
-  return file && flock(file.get(), LOCK_EX | LOCK_NB) != 0;
+  if (!file) return errno == ENOENT ? std::optional(false) : std::nullopt;
+  if (flock(file.get(), LOCK_EX | LOCK_NB) == 0) return false;
+  return errno == EWOULDBLOCK ? std::optional(true) : std::nullopt;
 }
 
 class Hold final : public TerminationAssertion {
@@ -61,13 +67,12 @@ class Hold final : public TerminationAssertion {
 /// The identifiers of all files with this suffix, sorted.
 std::vector<std::string> identifiersWith(const std::filesystem::path& directory,
                                          std::string_view suffix) {
-  std::vector<std::string> identifiers;
-  const std::unique_ptr<DIR, int (*)(DIR*)> stream(opendir(directory.c_str()), closedir);
-  if (!stream) return identifiers;
-  while (const dirent* entry = readdir(stream.get())) {
-    const std::string_view name = entry->d_name;
+  std::vector<std::string> names, identifiers;
+  const FileDescriptor opened(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!opened || !listNames(opened.get(), names)) return identifiers;
+  for (const std::string& name : names) {
     if (!name.ends_with(suffix)) continue;
-    identifiers.emplace_back(name.substr(0, name.size() - suffix.size()));
+    identifiers.push_back(name.substr(0, name.size() - suffix.size()));
   }
   std::ranges::sort(identifiers);
   return identifiers;
@@ -91,7 +96,12 @@ bool Foreground::launch(const std::string& identifier,
     setError(error, std::move(*reason));
     return false;
   }
-  if (isHeld(directory, identifier)) {
+  const std::optional<bool> held = isHeld(directory, identifier);
+  if (!held) {
+    setError(error, Error::posix(errno, directory_.native()));
+    return false;
+  }
+  if (*held) {
     setError(error, Error::withDescription(
                         POSIXErrorDomain, EBUSY,
                         fmt::format("{} is being installed; try again later", identifier)));
@@ -116,7 +126,8 @@ bool Foreground::quit(const std::string& identifier, std::optional<Error>* error
 Foreground::HoldResult Foreground::hold(const std::string& identifier) const {
   const FileDescriptor directory = lockDirectory(directory_);
   if (!directory) return {};
-  if (exists(directory, fileFor(identifier, RunningSuffix))) return {nullptr, true};
+  const std::optional<bool> running = exists(directory, fileFor(identifier, RunningSuffix));
+  if (!running || *running) return {nullptr, running.has_value()};
   const std::string name = fileFor(identifier, HeldSuffix);
   FileDescriptor file(
       openat(directory.get(), name.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644));
@@ -128,7 +139,7 @@ void Foreground::sweep() const {
   const FileDescriptor directory = lockDirectory(directory_);
   if (!directory) return;
   for (const std::string& identifier : identifiersWith(directory_, HeldSuffix)) {
-    if (isHeld(directory, identifier)) continue;
+    if (isHeld(directory, identifier) != false) continue;
     unlinkat(directory.get(), fileFor(identifier, HeldSuffix).c_str(), 0);
   }
 }

@@ -1,3 +1,5 @@
+#include <cerrno>
+
 #include "platform/bundle.h"
 #include "tests/device/device_test.h"
 
@@ -47,6 +49,15 @@ TEST_F(DemotionTest, KeepsTheIconAndTheNameUnderIt) {
   ASSERT_TRUE(demote());
   EXPECT_EQ(record(Id)->displayName, name);
   EXPECT_EQ(textAt(joinPath(*record(Id)->bundlePath, "Icon.png")), "the picture");
+}
+
+TEST_F(DemotionTest, ThatCannotReadTheMetadataLeavesTheApplication) {
+  ASSERT_TRUE(installPackage(Id, "1.0"));
+  std::filesystem::create_directory(
+      onDisk(joinPath(*record(Id)->bundleContainerPath, "HalvoMetadata.plist")));
+  EXPECT_FALSE(demote());
+  EXPECT_EQ(error->code, EISDIR);
+  EXPECT_EQ(registry(), Lines{"com.example.a 1.0"});
 }
 
 TEST_F(DemotionTest, GoesWithoutAnIconThatIsNotThere) {

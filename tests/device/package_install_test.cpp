@@ -1,3 +1,5 @@
+#include <cerrno>
+
 #include "device/packages/package_extractor.h"
 #include "platform/installer_service.h"
 #include "tests/device/device_test.h"
@@ -171,6 +173,35 @@ TEST_F(PackageInstallTest, ARefusedPackageLeavesTheRestoredDataWaiting) {
   putFile(waiting, "from the backup");
   EXPECT_FALSE(installPackage(PackageArchive(), Id));
   EXPECT_EQ(textAt(waiting), "from the backup");
+}
+
+TEST_F(PackageInstallTest, AnInstallThatCannotTellWhetherDataWaitsFailsAndChangesNothing) {
+  const std::string waiting = "/var/mobile/Media/HalvoRestore/Data/com.example.a";
+  ASSERT_TRUE(installRestorePlaceholder(Id));
+  putFile(waiting, "what is no folder cannot be looked into");
+  EXPECT_TRUE(platform().backupManager.restoreDataExists(Id));
+  EXPECT_FALSE(device->saveData(
+      Id, [](ByteView) { return true; }, &error));
+  EXPECT_FALSE(installPackage(Id));
+  EXPECT_EQ(error->code, ENOTDIR);
+  EXPECT_EQ(registry(), Lines{"com.example.a 1.0 (placeholder)"});
+  EXPECT_TRUE(device->files().fileExists(waiting));
+}
+
+TEST_F(PackageInstallTest, AnUpdateThatCannotLookForTheStoreFilesFails) {
+  ASSERT_TRUE(installPackage(Id, "1.0"));
+  std::filesystem::create_symlink("HalvoArtwork",
+                                  onDisk(*record(Id)->bundleContainerPath + "/HalvoArtwork"));
+  EXPECT_FALSE(installPackage(Id, "2.0"));
+  EXPECT_EQ(error->code, ELOOP);
+  EXPECT_EQ(registry(), Lines{"com.example.a 1.0"});
+}
+
+TEST_F(PackageInstallTest, APackageWithoutTheExecutableThatItNamesIsRefused) {
+  PackageArchive package;
+  package.add("Sample.app/", "").add("Sample.app/Info.plist", xml(infoOf(Id, "1.0")));
+  EXPECT_FALSE(installPackage(package, Id));
+  EXPECT_EQ(error->localizedDescription(), "bad information: the executable \"run.sh\" is missing");
 }
 
 TEST_F(PackageInstallTest, APackageReachedThroughALinkOutOfThePhoneIsNotFound) {

@@ -1,0 +1,29 @@
+#include "device/files/existence.h"
+
+#include <cerrno>
+
+namespace appsync::device {
+
+bool isMissing(const std::optional<Error>& error) {
+  return error && error->domain == POSIXErrorDomain && error->code == ENOENT;
+}
+
+std::optional<bool> isThere(FileManager& files, std::string_view path,
+                            std::optional<Error>* error) {
+  std::optional<Error> reason;
+  if (files.attributesOfItem(path, &reason)) return true;
+  if (isMissing(reason)) return false;
+  setError(error, reason.value_or(Error::posix(EIO, path)));
+  return std::nullopt;
+}
+
+bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>& contents,
+                 std::optional<Error>* error) {
+  std::optional<Error> reason;
+  contents = files.contentsAtPath(path, &reason);
+  if (contents || isMissing(reason)) return true;
+  setError(error, reason.value_or(Error::posix(EIO, path)));
+  return false;
+}
+
+}  // namespace appsync::device

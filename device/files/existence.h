@@ -1,0 +1,23 @@
+#pragma once
+
+#include <optional>
+#include <string_view>
+
+#include "platform/file_manager.h"
+
+namespace appsync::device {
+
+// What cannot be looked at is not missing: whoever removes, replaces or leaves out what is "not
+// there" must know that it is not.
+
+/// Whether an operation failed because the item is not there.
+bool isMissing(const std::optional<Error>& error);
+
+/// nullopt (with a reason) when the item cannot be looked at.
+std::optional<bool> isThere(FileManager& files, std::string_view path, std::optional<Error>* error);
+
+/// The whole file, none when it is not there. False (with a reason) when it cannot be read.
+bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>& contents,
+                 std::optional<Error>* error);
+
+}  // namespace appsync::device
