@@ -118,9 +118,13 @@ std::int64_t pragma(SQLite::Database& database, const char* name) {
 }
 
 /// Empty when the database is whole.
-std::string damage(SQLite::Database& database) {
-  std::string found = database.execAndGet("PRAGMA quick_check(1)").getString();
-  if (found != "ok") return found;
+std::string damage(SQLite::Database& database, Log& log) {
+  const std::string found = database.execAndGet("PRAGMA quick_check(1)").getString();
+  if (found != "ok") {
+    log.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
+              fmt::format("the device's database is damaged: {}", found));
+    return "its database is not whole";
+  }
   const auto tables = database.execAndGet(
       "SELECT count(*) FROM sqlite_schema WHERE type = 'table' AND name IN ('settings', "
       "'applications', 'installs', 'uninstalled', 'abandoned_data', 'policies', 'icon_order', "
@@ -128,7 +132,7 @@ std::string damage(SQLite::Database& database) {
   return tables.getInt() == 8 ? "" : "tables are missing";
 }
 
-bool isCurrentDevice(SQLite::Database& database, const std::filesystem::path& folder,
+bool isCurrentDevice(SQLite::Database& database, const std::filesystem::path& folder, Log& log,
                      DeviceError& error) {
   if (pragma(database, "application_id") != ApplicationId) {
     error = file_size(DevicePaths(folder).database) == 0
@@ -144,7 +148,8 @@ bool isCurrentDevice(SQLite::Database& database, const std::filesystem::path& fo
                         "use the version of appsync that made it");
     return false;
   }
-  const std::string found = version < FormatVersion ? "it has no format version" : damage(database);
+  const std::string found =
+      version < FormatVersion ? "it has no format version" : damage(database, log);
   if (!found.empty()) error = damagedDevice(folder, found);
   return found.empty();
 }
@@ -162,10 +167,9 @@ DeviceError problemOf(const SQLite::Exception& exception, const std::filesystem:
       if (!std::filesystem::is_directory(DevicePaths(folder).root)) return foreignFolder(folder);
       [[fallthrough]];
     case SQLITE_CORRUPT:
-      return damagedDevice(folder, exception.what());
+      return damagedDevice(folder, "its database cannot be read");
     default:
-      return deviceError(DeviceProblem::Unusable, folder,
-                         fmt::format("its database cannot be opened ({})", exception.what()),
+      return deviceError(DeviceProblem::Unusable, folder, errorOf(exception).localizedDescription(),
                          "check the permissions of the folder and the free space");
   }
 }
@@ -191,11 +195,13 @@ std::unique_ptr<Database> openDatabase(const std::filesystem::path& folder,
                                        DeviceError& error) {
   try {
     SQLite::Database connection = connect(file, access);
-    if (!isCurrentDevice(connection, folder, error)) return nullptr;
+    if (!isCurrentDevice(connection, folder, log, error)) return nullptr;
     if (access == Access::Write) prune(connection);
     if (access == Access::Write) makeCoordinationTables(connection);  // missing in older devices
     return std::make_unique<Database>(std::move(connection), access == Access::Write, log);
   } catch (const SQLite::Exception& exception) {
+    log.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
+              fmt::format("the device's database cannot be opened: {}", exception.what()));
     error = problemOf(exception, folder);
     return nullptr;
   }

@@ -8,22 +8,32 @@
 namespace appsync::device {
 namespace {
 
-int systemError(int code) {
+struct Reason {
+  int errnoValue;
+  std::string_view text;
+};
+
+Reason reasonOf(int code) {
   switch (code) {
     case SQLITE_FULL:
-      return ENOSPC;
+      return {ENOSPC, "the disk is full"};
     case SQLITE_READONLY:
-      return EROFS;
+      return {EROFS, "it can only be read"};
     case SQLITE_BUSY:
     case SQLITE_LOCKED:
-      return EBUSY;
+      return {EBUSY, "another process is using it"};
     case SQLITE_NOMEM:
-      return ENOMEM;
+      return {ENOMEM, "there is not enough memory"};
     case SQLITE_PERM:
     case SQLITE_AUTH:
-      return EACCES;
+      return {EACCES, "it may not be used"};
+    case SQLITE_CANTOPEN:
+      return {EIO, "it cannot be opened"};
+    case SQLITE_CORRUPT:
+    case SQLITE_NOTADB:
+      return {EIO, "it is damaged"};
     default:
-      return EIO;
+      return {EIO, "it cannot be read or written"};
   }
 }
 
@@ -56,13 +66,15 @@ std::optional<Bytes> Query::optionalBytes(int column) const {
 }
 
 Error errorOf(const SQLite::Exception& exception) {
-  return Error::withDescription(POSIXErrorDomain, systemError(exception.getErrorCode()),
-                                fmt::format("the device's database: {}", exception.what()));
+  const Reason reason = reasonOf(exception.getErrorCode());
+  return Error::withDescription(POSIXErrorDomain, reason.errnoValue,
+                                fmt::format("the phone's database: {}", reason.text));
 }
 
 bool Database::attempt(std::string_view purpose, const std::function<void()>& work,
                        std::optional<Error>* error) noexcept {
   Error reason;
+  std::string cause;
   try {
     const std::lock_guard lock(mutex_);
     work();
@@ -72,11 +84,13 @@ bool Database::attempt(std::string_view purpose, const std::function<void()>& wo
     return false;
   } catch (const SQLite::Exception& exception) {
     reason = errorOf(exception);
+    cause = exception.what();
   } catch (const std::exception& exception) {
     reason = Error::withDescription(POSIXErrorDomain, EIO, exception.what());
+    cause = exception.what();
   }
   log_.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
-             fmt::format("{} ({})", purpose, reason.localizedDescription()));
+             fmt::format("{} (the device's database: {})", purpose, cause));
   setError(error, std::move(reason));
   return false;
 }

@@ -102,7 +102,7 @@ class Database {
   Log& log_;
 };
 
-/// The system's error number that says best what SQLite found, with SQLite's text.
+/// What SQLite found, in plain words, with the system's error number that says it best.
 Error errorOf(const SQLite::Exception& exception);
 
 }  // namespace appsync::device

@@ -94,6 +94,7 @@ TEST_F(DeviceServicesTest, ADatabaseThatFailsGivesTheDocumentedFailureAndALogLin
       << "what may be forbidden is not done";
   EXPECT_FALSE(device->setPolicy(PolicySetting::AppInstallationAllowed, PolicyValue::Yes, &error));
   EXPECT_EQ(error->code, EIO);
+  EXPECT_EQ(error->localizedDescription(), "the phone's database: it cannot be read or written");
   EXPECT_FALSE(platform().installerService.lookupUninstalled());
   EXPECT_NE(platform().installerService.clearUninstalled({"com.example.a"}), 0);
   EXPECT_FALSE(record("com.example.a"));
@@ -103,7 +104,21 @@ TEST_F(DeviceServicesTest, ADatabaseThatFailsGivesTheDocumentedFailureAndALogLin
   EXPECT_FALSE(device->homeScreen().getFlattenedIconState(device->homeScreen().serverPort(), 1));
   EXPECT_EQ(containerCount(), 1U) << "nothing is removed on the word of a broken registry";
   EXPECT_GE(logTexts().size(), 8U);
-  EXPECT_NE(logTexts().front().find("the policies could not be read"), std::string::npos);
+  EXPECT_EQ(logTexts().front(),
+            "the policies could not be read (the device's database: no such table: policies)");
+}
+
+TEST_F(DeviceServicesTest, APhoneThatDoesNotTellHowItWorksIsNotOpened) {
+  device.reset();
+  SQLite::Database((folder / "device.db").string(), SQLite::OPEN_READWRITE)
+      .exec("ALTER TABLE settings RENAME COLUMN value TO worth");
+  DeviceError problem;
+  EXPECT_FALSE(EmbeddedDevice::open(folder, Access::Write, problem));
+  EXPECT_EQ(problem.problem, DeviceProblem::Unusable);
+  EXPECT_EQ(
+      problem.message,
+      folder.string() +
+          ": the phone's database: it cannot be read or written; try again, or check the disk");
 }
 
 TEST_F(DeviceServicesTest, AReceivedFileArrivesInsideThePhone) {
