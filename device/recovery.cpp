@@ -113,9 +113,11 @@ void removeTemporaries(DeviceCore& core, const std::vector<ApplicationRow>& rows
 }  // namespace
 
 void finishInterruptedWork(DeviceCore& core) {
-  bool read = false;
-  std::vector<ApplicationRow> rows = readRows(core, read);
-  if (!read) return;  // nothing is removed on the word of a registry that cannot be read
+  // Nothing is removed on the word of a registry that cannot be read, or may take it back.
+  bool read = core.database.settle();
+  std::vector<ApplicationRow> rows;
+  if (read) rows = readRows(core, read);
+  if (!read) return;
   rows = dropRowsWithoutBundle(core, std::move(rows));
   removeUnnamedContainers(core, rows);
   const std::set<std::string> installed = installedAmong(rows);

@@ -4,6 +4,7 @@
 #include "device/apps/installers.h"
 #include "device/apps/installs.h"
 #include "device/apps/removal.h"
+#include "device/apps/staged_container.h"
 #include "device/files/existence.h"
 #include "device/home/icon_order.h"
 #include "platform/bundle.h"
@@ -96,7 +97,7 @@ bool switchTo(DeviceCore& core, const ApplicationRow& row, const ApplicationRows
 
 bool replaceApplication(DeviceCore& core, const std::string& package, const std::string& identifier,
                         const ApplicationRows& before, std::optional<Error>* error) {
-  StagedContainer staged(core.containers, error);
+  StagedContainer staged(core, error);
   if (!staged.isMade()) return false;
   ApplicationRow row;
   row.identifier = identifier;

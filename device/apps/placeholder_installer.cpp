@@ -4,6 +4,7 @@
 
 #include "device/apps/installers.h"
 #include "device/apps/installs.h"
+#include "device/apps/staged_container.h"
 #include "device/files/existence.h"
 #include "device/home/icon_order.h"
 #include "platform/bundle.h"
@@ -85,7 +86,7 @@ bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
                         std::optional<Error>* error) {
   const auto info = readInfo(core, bundleDirectory, identifier, error);
   if (!info) return false;
-  StagedContainer staged(core.containers, error);
+  StagedContainer staged(core, error);
   if (!staged.isMade()) return false;
   ApplicationRow row;
   row.identifier = identifier;
@@ -109,7 +110,7 @@ bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
 bool installSystemApplication(DeviceCore& core, const std::string& identifier,
                               const std::string& displayName, const std::string& version,
                               std::optional<Error>* error) {
-  StagedContainer staged(core.containers, error);
+  StagedContainer staged(core, error);
   if (!staged.isMade()) return false;
   ApplicationRow row;
   row.identifier = identifier;

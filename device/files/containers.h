@@ -58,24 +58,4 @@ class Containers {
   Log& log_;
 };
 
-/// A container that disappears with the object unless it is kept.
-class StagedContainer {
- public:
-  StagedContainer(Containers& containers, std::optional<Error>* error)
-      : containers_(containers), path_(containers.make(error)) {}
-  ~StagedContainer() {
-    if (path_) containers_.remove(*path_);
-  }
-  StagedContainer(const StagedContainer&) = delete;
-  StagedContainer& operator=(const StagedContainer&) = delete;
-
-  bool isMade() const { return path_.has_value(); }
-  const std::string& path() const { return *path_; }
-  void keep() { path_.reset(); }
-
- private:
-  Containers& containers_;
-  std::optional<std::string> path_;
-};
-
 }  // namespace appsync::device

@@ -4,6 +4,7 @@
 #include <sqlite3.h>
 
 #include <cerrno>
+#include <utility>
 
 namespace appsync::device {
 namespace {
@@ -110,9 +111,27 @@ bool Database::change(std::string_view purpose, Commit commit, const Work& work,
         if (commit == Commit::OnDisk && writable_) full.emplace(connection_);
         SQLite::Transaction transaction(connection_, SQLite::TransactionBehavior::IMMEDIATE);
         work(connection_);
+        const bool wasSettled = std::exchange(settled_, false);
         transaction.commit();
+        settled_ = wasSettled;  // not more: a change may write nothing
       },
       error);
+}
+
+bool Database::settle() noexcept {
+  return attempt(
+      "it is not sure what the database will hold when it is next opened",
+      [&] {
+        if (settled_) return;
+        const FullSynchronisation full(connection_);
+        SQLite::Transaction transaction(connection_, SQLite::TransactionBehavior::IMMEDIATE);
+        // Any page will do. This one is written even with what it holds already.
+        const int version = connection_.execAndGet("PRAGMA user_version").getInt();
+        connection_.exec(fmt::format("PRAGMA user_version={}", version));
+        transaction.commit();
+        settled_ = true;
+      },
+      nullptr);
 }
 
 }  // namespace appsync::device

@@ -88,9 +88,15 @@ class Database {
   /// `purpose` names the work in the log: "the policies could not be read".
   bool read(std::string_view purpose, const Work& work,
             std::optional<Error>* error = nullptr) noexcept;
-  /// Runs the work in one transaction.
+  /// Runs the work in one transaction. False: the change does not hold, and never will once
+  /// `settle` says so.
   bool change(std::string_view purpose, Commit commit, const Work& work,
               std::optional<Error>* error = nullptr) noexcept;
+
+  /// A commit whose last flush fails is undone, but stands in the write-ahead log: whoever opens
+  /// the database next may find it made. Writes over it, if there may be such, and is true when no
+  /// failed change can come back. Until then nothing may be removed that one of them names.
+  bool settle() noexcept;
 
  private:
   bool attempt(std::string_view purpose, const std::function<void()>& work,
@@ -99,6 +105,7 @@ class Database {
   std::mutex mutex_;
   SQLite::Database connection_;
   const bool writable_;
+  bool settled_ = false;  ///< guarded by mutex_; at first not, for a process may have been killed
   Log& log_;
 };
 
