@@ -305,7 +305,8 @@ bool EmbeddedDevice::launch(const std::filesystem::path& folder, std::string_vie
   try {
     const std::optional<OpenFolder> opened = openFolder(folder, Access::ReadOnly, deviceError);
     if (!opened) return false;
-    const auto objection = [&] { return objectionToLaunch(*opened->database, bundleId); };
+    ConfinedFileManager files(opened->paths.root);
+    const auto objection = [&] { return objectionToLaunch(*opened->database, files, bundleId); };
     if (isUsableIdentifier(bundleId)) {
       return Foreground(opened->paths.foreground).launch(std::string(bundleId), objection, error);
     }

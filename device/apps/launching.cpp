@@ -1,14 +1,33 @@
 #include "device/apps/launching.h"
 
-#include <fmt/format.h>
-
 #include <cerrno>
 
+#include "device/apps/idle_application.h"
+#include "device/files/existence.h"
 #include "device/state/application_rows.h"
+#include "platform/bundle.h"
 
 namespace appsync::device {
+namespace {
 
-std::optional<Error> objectionToLaunch(Database& database, std::string_view identifier) {
+/// An application whose information names no executable needs none.
+std::optional<Error> objectionToExecutable(FileManager& files, const ApplicationRow& row) {
+  std::optional<Error> error;
+  const auto info = loadDictionary(files, joinPath(row.bundlePath(), "Info.plist"), &error);
+  if (!info) return error;
+  const std::string* name = findString(*info, KBBundleExecutable);
+  if (!name) return std::nullopt;
+  const std::optional<bool> there = isThere(files, joinPath(row.bundlePath(), *name), &error);
+  if (!there) return error;
+  if (*there) return std::nullopt;
+  return objection(ENOENT, row.identifier,
+                   "cannot be launched: its executable is gone; install it anew");
+}
+
+}  // namespace
+
+std::optional<Error> objectionToLaunch(Database& database, FileManager& files,
+                                       std::string_view identifier) {
   ApplicationRows rows;
   std::optional<Error> error;
   const bool read = database.read(
@@ -16,13 +35,10 @@ std::optional<Error> objectionToLaunch(Database& database, std::string_view iden
       [&](SQLite::Database& connection) { rows = findApplication(connection, identifier); },
       &error);
   if (!read) return error;
-  const auto refuse = [&](int code, std::string_view reason) {
-    return Error::withDescription(POSIXErrorDomain, code, fmt::format("{} {}", identifier, reason));
-  };
-  if (!rows.any()) return refuse(ENOENT, "is not installed");
-  if (!rows.installed) return refuse(ENOENT, "is not installed yet");
-  if (rows.installed->launchProhibited) return refuse(EPERM, "may not be launched");
-  return std::nullopt;
+  if (!rows.any()) return objection(ENOENT, identifier, "is not installed");
+  if (!rows.installed) return objection(ENOENT, identifier, "is not installed yet");
+  if (rows.installed->launchProhibited) return objection(EPERM, identifier, "may not be launched");
+  return objectionToExecutable(files, *rows.installed);
 }
 
 }  // namespace appsync::device

@@ -4,10 +4,12 @@
 #include <string_view>
 
 #include "device/state/database.h"
+#include "platform/file_manager.h"
 
 namespace appsync::device {
 
 /// Why a person cannot bring the application to the foreground; none if they can.
-std::optional<Error> objectionToLaunch(Database& database, std::string_view identifier);
+std::optional<Error> objectionToLaunch(Database& database, FileManager& files,
+                                       std::string_view identifier);
 
 }  // namespace appsync::device

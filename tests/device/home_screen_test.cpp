@@ -1,6 +1,7 @@
 #include <signal.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <thread>
 
 #include "platform/property_list_codec.h"
@@ -175,6 +176,26 @@ TEST_F(HomeScreenTest, WhatIsNotInstalledOrMayNotRunCannotBeLaunched) {
     EXPECT_TRUE(quit(identifier)) << identifier;
   }
   EXPECT_TRUE(device->foregroundApplications().empty());
+}
+
+TEST_F(HomeScreenTest, AnApplicationWhoseExecutableIsGoneCannotBeLaunched) {
+  ASSERT_TRUE(installPackage("com.example.a"));
+  std::filesystem::remove(onDisk(*record("com.example.a")->bundlePath + "/run.sh"));
+  EXPECT_FALSE(launch("com.example.a"));
+  EXPECT_EQ(error->localizedDescription(),
+            "com.example.a cannot be launched: its executable is gone; install it anew");
+  ASSERT_TRUE(device->addSystemApplication("com.example.clock", "Clock", "1", &error));
+  EXPECT_TRUE(launch("com.example.clock")) << "it names no executable";
+}
+
+TEST_F(HomeScreenTest, WhatCannotBeLookedAtCountsAsHeldAndAsRunning) {
+  ASSERT_TRUE(installPackage("com.example.a"));
+  std::filesystem::create_symlink("x", folder / "foreground/com.example.a.held");
+  EXPECT_FALSE(launch("com.example.a"));
+  EXPECT_EQ(error->code, ELOOP);
+  reopen();
+  EXPECT_TRUE(std::filesystem::is_symlink(folder / "foreground/com.example.a.held"));
+  EXPECT_EQ(static_cast<int>(outcomeFor("com.example.a")), 3);
 }
 
 TEST_F(HomeScreenTest, LaunchingOnNoDeviceTellsTheDevicesProblem) {
