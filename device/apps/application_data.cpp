@@ -10,6 +10,7 @@
 #include <new>
 
 #include "device/apps/idle_application.h"
+#include "device/apps/removal.h"
 #include "device/base/directory_tree.h"
 #include "device/base/temporary_file.h"
 #include "device/packages/data_archive.h"
@@ -117,6 +118,8 @@ std::optional<Error> layOut(DeviceCore& core, const std::string& path, const Dat
 std::optional<Error> restore(DeviceCore& core, const std::string& identifier,
                              const DataSource& source) {
   const KeyedMutex::Guard guard(core.applicationLocks, identifier);
+  std::optional<Error> failure;
+  if (!removeAbandonedData(core, identifier, &failure)) return failure;
   const std::string path = Containers::waitingDataPath(identifier);
   std::uint64_t entries = 0;
   if (auto error = layOut(core, path, source, false, entries)) return error;

@@ -99,7 +99,6 @@ bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optio
       error);
   if (!erased) return false;
   removeFiles(core, identifier, removed);
-  core.containers.removeWaitingData(identifier);
   if (brokenOff) core.observers.installsCancelled({removed.placeholder->record()});
   core.observers.installsChanged();
   return true;
@@ -116,12 +115,13 @@ bool removeAbandonedData(DeviceCore& core, const std::string& identifier,
       },
       error);
   if (!read || !abandoned) return read;
-  if (!core.containers.removeData(identifier)) {
+  if (!core.containers.removeData(identifier) || !core.containers.removeWaitingData(identifier)) {
     setError(error, Error::posix(EIO, Containers::dataPath(identifier)));
     return false;
   }
   return core.database.change(
-      "the list of abandoned data could not be changed", Database::Commit::Ordinary,
+      // On disk before the application can have new data, which a list come back would name.
+      "the list of abandoned data could not be changed", Database::Commit::OnDisk,
       [&](SQLite::Database& database) {
         Query(database, "DELETE FROM abandoned_data WHERE identifier = ?", identifier).run();
       },

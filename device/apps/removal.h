@@ -18,7 +18,8 @@ bool removeForClient(DeviceCore& core, const std::string& identifier, bool place
 /// had for it. Observers hear of an install that this breaks off.
 bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
 
-/// Ends the removal of an application's data that was begun earlier, if there is such.
+/// Ends the removal of an application's data, and of what a restore still had for it, that was
+/// begun earlier, if there is such. Comes before anything new is put in their places.
 bool removeAbandonedData(DeviceCore& core, const std::string& identifier,
                          std::optional<Error>* error);
 

@@ -1,3 +1,4 @@
+#include <SQLiteCpp/SQLiteCpp.h>
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <sys/socket.h>
@@ -198,6 +199,17 @@ TEST_F(ApplicationDataTest, RestoredDataReturnsWithItsPackage) {
   ASSERT_TRUE(installPackage(App));
   EXPECT_EQ(textAt(Data + "/file"), "text");
   EXPECT_EQ(save(), archive);
+}
+
+TEST_F(ApplicationDataTest, WhatIsRestoredAfterARemovalThatBrokeOffIsNotRemovedWithTheOld) {
+  putFile(Data + "/file", "new");
+  const std::string archive = save();
+  SQLite::Database((folder / "device.db").string(), SQLite::OPEN_READWRITE)
+      .exec("INSERT INTO abandoned_data VALUES ('com.example.app')");
+  restore(archive);
+  EXPECT_FALSE(fs::exists(onDisk(Data))) << "the old data";
+  reopen();
+  EXPECT_EQ(textAt(Waiting + "/file"), "new");
 }
 
 TEST_F(ApplicationDataTest, WhatWaitedBeforeIsReplaced) {

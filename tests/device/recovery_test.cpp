@@ -107,13 +107,16 @@ TEST_F(RecoveryTest, AFailedOrCancelledInstallStaysSo) {
 }
 
 TEST_F(RecoveryTest, DataOfAnApplicationWhoseRemovalBrokeOffIsRemoved) {
+  const std::string waiting = "/var/mobile/Media/HalvoRestore/Data/com.example.gone";
   putFile("/var/mobile/Containers/Data/com.example.gone/notes", "old");
+  putFile(waiting + "/notes", "older");
   putFile("/var/mobile/Containers/Data/com.example.other/notes", "not named");
   device.reset();
   SQLite::Database((folder / "device.db").string(), SQLite::OPEN_READWRITE)
       .exec("INSERT INTO abandoned_data VALUES ('com.example.gone')");
   reopen();
   EXPECT_FALSE(device->files().fileExists("/var/mobile/Containers/Data/com.example.gone"));
+  EXPECT_FALSE(device->files().fileExists(waiting));
   EXPECT_TRUE(device->files().fileExists("/var/mobile/Containers/Data/com.example.other"));
 }
 
