@@ -73,8 +73,6 @@ std::string_view name(PackageRefusal refusal) {
       return "bad information";
     case PackageRefusal::WrongIdentifier:
       return "wrong identifier";
-    case PackageRefusal::NoSpace:
-      return "no space";
   }
   return "unknown";
 }

@@ -22,7 +22,7 @@ constexpr PropertyListLimits InfoLimits{std::size_t{1} << 20, 20'000, 16};
 
 std::optional<Error> systemError(int reason, std::string_view path) {
   if (reason == ENOSPC || reason == EDQUOT)
-    return refusalError(PackageRefusal::NoSpace, "the device is full");
+    return Error::withDescription(POSIXErrorDomain, reason, "no space: the device is full");
   return Error::posix(reason, path);
 }
 

@@ -31,7 +31,6 @@ enum class PackageRefusal : std::int64_t {
   Encrypted,
   BadInfo,  ///< Info.plist missing, no property list, or without a usable identifier
   WrongIdentifier,
-  NoSpace,
 };
 
 /// "damaged", "too many entries", ...: the named reason.

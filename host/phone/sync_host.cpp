@@ -42,6 +42,10 @@ bool HostProcess::TWIsRecoverableError(const Error& error) noexcept {
     case ENOSPC:
     case EAGAIN:
     case EBUSY:
+    case EIO:
+    case EMFILE:
+    case ENFILE:
+    case ENOMEM:
       return true;
     case EINVAL:
       return interruption_.requested();

@@ -34,10 +34,11 @@ TEST_F(HostProcessTest, MakesDownloads) {
 }
 
 TEST_F(HostProcessTest, TakesWhatMayPassForRecoverable) {
-  for (const int code : {ECONNRESET, ETIMEDOUT, EPIPE, EINTR, ECANCELED, ENOSPC, EDQUOT, EAGAIN}) {
+  for (const int code : {ECONNRESET, ETIMEDOUT, EPIPE, EINTR, ECANCELED, ENOSPC, EDQUOT, EAGAIN,
+                         EIO, EMFILE, ENFILE, ENOMEM}) {
     EXPECT_TRUE(recoverable(POSIXErrorDomain, code)) << code;
   }
-  for (const int code : {ENOENT, EACCES, EIO, EINVAL, 0}) {
+  for (const int code : {ENOENT, EACCES, EINVAL, 0}) {
     EXPECT_FALSE(recoverable(POSIXErrorDomain, code)) << code;
   }
 }
