@@ -1,0 +1,146 @@
+#include "device/files/containers.h"
+#include "platform/bundle.h"
+#include "tests/device/device_test.h"
+#include "tests/device/failing_calls.h"
+
+namespace appsync::device {
+namespace {
+
+namespace fs = std::filesystem;
+using Lines = std::vector<std::string>;
+using Snapshot = std::map<std::string, std::string>;
+
+constexpr std::string_view Id = "com.example.a";
+const std::string Notes = Containers::dataPath(Id) + "/notes";
+const std::string WaitingNotes = Containers::waitingDataPath(Id) + "/notes";
+
+/// Each call to the system fails once.
+class FileFaultsTest : public DeviceTest {
+ protected:
+  /// Begins with the present device over and over, lets one call after another of the work fail,
+  /// and looks at the device that is opened afterwards.
+  void sweep(const std::function<void()>& work, const std::function<void()>& look) {
+    device.reset();
+    const fs::path origin = temporary.path() / "origin";
+    fs::rename(folder, origin);
+    bool struck = true;
+    for (int call = 0; struck; ++call) {
+      SCOPED_TRACE("call " + std::to_string(call));
+      device.reset();
+      fs::remove_all(folder);
+      fs::copy(origin, folder, fs::copy_options::recursive);
+      reopen();
+      {
+        const FailingCalls failing(call);
+        work();
+        struck = failing.struck();
+      }
+      reopen();
+      look();
+      EXPECT_EQ(containerCount(), registry().size());
+      ASSERT_FALSE(HasFailure());
+    }
+  }
+
+  /// As a person's next command does; it may fail.
+  void openAnew() {
+    device.reset();
+    DeviceError problem;
+    device = EmbeddedDevice::open(folder, Access::Write, problem);
+  }
+
+  bool install(const FileLocation& package) {
+    return device->appRegistry().installApplication(
+        package,
+        {{std::string(SWPackageTypeKey), SWPackageTypeCustomer},
+         {std::string(KBBundleIdentifier), Id}},
+        nullptr);
+  }
+  PackageArchive archive(std::string_view version) {
+    return PackageArchive()
+        .addApplication(Id, version)
+        .add("HalvoMetadata.plist", "metadata " + std::string(version));
+  }
+  Snapshot containerOf(std::string_view identifier) {
+    return fakes::snapshot(onDisk(*record(identifier)->bundleContainerPath));
+  }
+};
+
+TEST_F(FileFaultsTest, ADemotedAndTappedApplicationKeepsItsDataAndMetadata) {
+  ASSERT_TRUE(installPackage(archive("1.0"), Id));
+  putFile(Notes, "mine");
+  const Lines whole{"com.example.a 1.0"};
+  const Lines demoted{"com.example.a 1.0 (placeholder)"};
+  const Lines between{whole.front(), demoted.front()};
+  bool done = false;
+  sweep(
+      [&] {
+        done = device->demote(Id, nullptr);
+        device.reset();
+        DeviceError problem;
+        std::optional<Error> reason;
+        EmbeddedDevice::tap(folder, Id, problem, &reason);
+        openAnew();
+      },
+      [&] {
+        EXPECT_EQ(textAt(Notes), "mine");
+        const Lines found = registry();
+        EXPECT_TRUE(done ? found == demoted : found == whole || found == between);
+        for (const AppRecord& each : device->applications()) {
+          EXPECT_EQ(textAt(*each.bundleContainerPath + "/HalvoMetadata.plist"), "metadata 1.0");
+        }
+      });
+  EXPECT_EQ(registry(), demoted);
+  EXPECT_EQ(record(Id)->installType, InstallType::StoreDownload);
+}
+
+TEST_F(FileFaultsTest, WaitingDataComesWithItsPackageInTheEnd) {
+  ASSERT_TRUE(installRestorePlaceholder(Id));
+  putFile(WaitingNotes, "from the backup");
+  const FileLocation package = stage(archive("1.0"));
+  bool done = false;
+  sweep(
+      [&] {
+        done = install(package);
+        openAnew();
+      },
+      [&] {
+        EXPECT_EQ(done, version(Id) == "1.0");
+        EXPECT_TRUE(done || install(package));
+        EXPECT_EQ(textAt(Notes), "from the backup");
+        EXPECT_FALSE(device->files().fileExists(WaitingNotes));
+      });
+  EXPECT_TRUE(done);
+}
+
+TEST_F(FileFaultsTest, AnUpdateLeavesTheOldVersionOrTheNewOneWhole) {
+  ASSERT_TRUE(installPackage(archive("1.0"), Id));
+  putFile(Notes, "mine");
+  ASSERT_TRUE(installPlaceholder(Id, "2.0"));
+  const FileLocation package = stage(PackageArchive().addApplication(Id, "2.0"));
+  const Snapshot old = containerOf(Id);
+  bool done = false;
+  sweep(
+      [&] {
+        done = install(package);
+        openAnew();
+      },
+      [&] {
+        EXPECT_EQ(textAt(Notes), "mine");
+        EXPECT_EQ(done, version(Id) == "2.0");
+        if (done) {
+          EXPECT_EQ(registry(), Lines{"com.example.a 2.0"});
+          EXPECT_EQ(textAt(*record(Id)->bundleContainerPath + "/HalvoMetadata.plist"),
+                    "metadata 1.0")
+              << "carried over";
+          EXPECT_EQ(textAt(*record(Id)->bundlePath + "/run.sh"), "#!/bin/sh\necho hello\n");
+        } else {
+          EXPECT_EQ(registry(), (Lines{"com.example.a 1.0", "com.example.a 2.0 (placeholder)"}));
+          EXPECT_TRUE(containerOf(Id) == old);
+        }
+      });
+  EXPECT_TRUE(done);
+}
+
+}  // namespace
+}  // namespace appsync::device
