@@ -1,7 +1,9 @@
 #include "device/files/containers.h"
 #include "platform/bundle.h"
+#include "tests/device/data_trees.h"
 #include "tests/device/device_test.h"
 #include "tests/device/failing_calls.h"
+#include "tests/device/package_builder.h"
 
 namespace appsync::device {
 namespace {
@@ -109,6 +111,27 @@ TEST_F(FileFaultsTest, WaitingDataComesWithItsPackageInTheEnd) {
         EXPECT_TRUE(done || install(package));
         EXPECT_EQ(textAt(Notes), "from the backup");
         EXPECT_FALSE(device->files().fileExists(WaitingNotes));
+      });
+  EXPECT_TRUE(done);
+}
+
+TEST_F(FileFaultsTest, DataThatIsOverwrittenIsTheOldOrTheNew) {
+  ASSERT_TRUE(installPackage(archive("1.0"), Id));
+  putFile(Notes, "mine");
+  const std::string given = testing::buildArchive(
+      testing::ArchiveForm::Tar, {testing::RawEntry::folder("kept/"), {"kept/notes", "given"}});
+  const Snapshot before = fakes::snapshot(onDisk(Containers::DataDirectory));
+  const Snapshot after = {{"com.example.a", "folder 0755"},
+                          {"com.example.a/kept", "folder 0755"},
+                          {"com.example.a/kept/notes", "file 0644 given"}};
+  bool done = false;
+  sweep(
+      [&] {
+        done = device->overwriteData(Id, piecesOf(given), nullptr);
+        openAnew();
+      },
+      [&] {
+        EXPECT_EQ(fakes::snapshot(onDisk(Containers::DataDirectory)), done ? after : before);
       });
   EXPECT_TRUE(done);
 }
