@@ -186,6 +186,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
 
  private:
   bool _runsInSyncHost() const;
+  /// The list, as _loadPlist gives it; a file that is there but cannot be read is said in the log.
+  std::optional<PropertyList::Array> _loadListOrSay(std::string_view path) const;
   void _performDeletions(const PropertyList::Array& todoList);
   void _sendIconLayout();
   SyncAssetPtr _prepareAsset(const TransferCandidate& candidate);

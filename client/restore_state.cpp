@@ -1,8 +1,8 @@
 // The restore state: values kept per application and version until its install has ended.
 
 #include "client/apps_client.h"
+#include "client/missing.h"
 #include "client/paths.h"
-#include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync {
@@ -13,6 +13,20 @@ PropertyList::Dictionary& dictionaryUnder(PropertyList::Dictionary& parent, std:
   PropertyList& child = parent[std::string(key)];
   if (!child.asDictionary()) child = PropertyList::Dictionary{};
   return *child.asDictionary();
+}
+
+std::optional<Bytes> readState(FileManager& files, const ClientLog& log,
+                               std::optional<Error>& error) {
+  std::optional<Bytes> bytes = files.contentsAtPath(paths::RestoreState, &error);
+  sayUnreadable(log, paths::RestoreState, error);
+  return bytes;
+}
+
+/// What the file holds; none when it is damaged.
+std::optional<PropertyList::Dictionary> stateIn(const Bytes& bytes) {
+  std::optional<PropertyList> parsed = parsePropertyList(bytes);
+  PropertyList::Dictionary* state = parsed ? parsed->asDictionary() : nullptr;
+  return state ? std::optional(std::move(*state)) : std::nullopt;
 }
 
 void writeXml(FileManager& files, PropertyList::Dictionary state) {
@@ -27,8 +41,9 @@ std::optional<PropertyList> AppsClient::_restoreStatePropertyForKey(
     std::string_view key, std::string_view identifier,
     const std::optional<std::string>& version) const {
   if (!version) return std::nullopt;
-  const std::optional<PropertyList::Dictionary> state =
-      loadDictionary(_platform.files, paths::RestoreState);
+  std::optional<Error> error;
+  const std::optional<Bytes> bytes = readState(_platform.files, _log, error);
+  const std::optional<PropertyList::Dictionary> state = bytes ? stateIn(*bytes) : std::nullopt;
   if (!state) return std::nullopt;
   const PropertyList* versions = find(*state, identifier);
   const PropertyList* properties = versions ? versions->find(*version) : nullptr;
@@ -41,27 +56,26 @@ void AppsClient::_setRestoreStatePropertyValue(const PropertyList& value, std::s
                                                const std::optional<std::string>& version) {
   if (!version) return;
   const std::lock_guard lock(_stateFileMutex);
-  PropertyList::Dictionary state;
-  if (_platform.files.fileExists(paths::RestoreState)) {
-    // A file that is there but damaged is left for the next clean-up to delete.
-    std::optional<PropertyList::Dictionary> loaded =
-        loadDictionary(_platform.files, paths::RestoreState);
-    if (!loaded) return;
-    state = std::move(*loaded);
-  }
-  PropertyList::Dictionary& versions = dictionaryUnder(state, identifier);
+  std::optional<Error> error;
+  const std::optional<Bytes> bytes = readState(_platform.files, _log, error);
+  // What cannot be read now holds what other applications wait for.
+  if (!bytes && !isMissing(error)) return;
+  // A damaged file is left for the next clean-up to delete.
+  std::optional<PropertyList::Dictionary> state =
+      bytes ? stateIn(*bytes) : PropertyList::Dictionary{};
+  if (!state) return;
+  PropertyList::Dictionary& versions = dictionaryUnder(*state, identifier);
   dictionaryUnder(versions, *version).insert_or_assign(std::string(key), value);
-  writeXml(_platform.files, std::move(state));
+  writeXml(_platform.files, std::move(*state));
 }
 
 void AppsClient::cleanRestoreStateForIdentifier(std::string_view identifier) {
   const std::lock_guard lock(_stateFileMutex);
-  const std::optional<Bytes> bytes = _platform.files.contentsAtPath(paths::RestoreState);
+  std::optional<Error> error;
+  const std::optional<Bytes> bytes = readState(_platform.files, _log, error);
   if (!bytes) return;
   // A damaged file counts as empty, so that it goes away here; one that cannot be read stays.
-  std::optional<PropertyList> parsed = parsePropertyList(*bytes);
-  PropertyList::Dictionary* entries = parsed ? parsed->asDictionary() : nullptr;
-  PropertyList::Dictionary state = entries ? std::move(*entries) : PropertyList::Dictionary{};
+  PropertyList::Dictionary state = stateIn(*bytes).value_or(PropertyList::Dictionary{});
   state.erase(std::string(identifier));
   if (state.empty()) {
     _platform.files.removeItem(paths::RestoreState);

@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "client/apps_client.h"
+#include "client/missing.h"
 #include "client/paths.h"
 #include "platform/property_list_codec.h"
 
@@ -56,9 +57,16 @@ std::optional<PropertyList::Dictionary> AppsClient::_loadDemotedAppsPlist(
   return std::move(*dictionary);
 }
 
+std::optional<PropertyList::Array> AppsClient::_loadListOrSay(std::string_view path) const {
+  std::optional<Error> error;
+  std::optional<PropertyList::Array> list = _loadPlist(path, &error);
+  sayUnreadable(_log, path, error);
+  return list;
+}
+
 void AppsClient::changeAssetID(std::string_view identifier, std::string_view toDo) {
   const std::lock_guard lock(_stateFileMutex);
-  std::optional<PropertyList::Array> list = _loadPlist(paths::TodoList);
+  std::optional<PropertyList::Array> list = _loadListOrSay(paths::TodoList);
   if (!list) return;
   const auto entry = std::ranges::find_if(
       *list, [identifier](const PropertyList& item) { return names(item, identifier); });
@@ -74,7 +82,7 @@ void AppsClient::changeAssetID(std::string_view identifier, std::string_view toD
 
 std::optional<std::string> AppsClient::_operationStateForIdentifier(
     std::string_view identifier) const {
-  const std::optional<PropertyList::Array> list = _loadPlist(paths::TodoList);
+  const std::optional<PropertyList::Array> list = _loadListOrSay(paths::TodoList);
   if (!list) return std::nullopt;
   const auto entry = std::ranges::find_if(
       *list, [identifier](const PropertyList& item) { return names(item, identifier); });

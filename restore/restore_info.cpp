@@ -1,6 +1,7 @@
 // The applications of a restored backup: each becomes a placeholder or a coordinated restore.
 
 #include "client/apps_client.h"
+#include "client/missing.h"
 #include "client/paths.h"
 #include "restore/halvo_metadata.h"
 #include "restore/placeholder_info.h"
@@ -91,7 +92,13 @@ void record(TransactionLog& log, bool success, std::string_view bundleId,
 }  // namespace
 
 bool AppsClient::_processHalvoRestoreInfo() {
-  if (!_platform.files.fileExists(exchange::RestoreList)) {
+  std::optional<Error> unseen;
+  if (!_platform.files.attributesOfItem(exchange::RestoreList, &unseen)) {
+    if (!isMissing(unseen)) {
+      // It may be there, and the next restore may see it.
+      _log.error("can't look at %{public}@: %{public}@", exchange::RestoreList, unseen);
+      return false;
+    }
     _log.normal("no halvo restore plist found - skipping processing of halvo restored apps");
     return true;
   }
@@ -108,8 +115,10 @@ bool AppsClient::_processHalvoRestoreInfo() {
 }
 
 bool AppsClient::_restoreApplications(const PropertyList::Dictionary& restoreList) {
+  std::optional<Error> error;
   const std::optional<PropertyList::Dictionary> lists =
-      _loadDemotedAppsPlist(exchange::DemotedApplications);
+      _loadDemotedAppsPlist(exchange::DemotedApplications, &error);
+  sayUnreadable(_log, exchange::DemotedApplications, error);
   _log.oversize("Demoted Apps: %{public}@", lists);
   const DemotedApps demoted(lists.value_or(PropertyList::Dictionary{}));
   bool result = false;

@@ -80,8 +80,8 @@ void addAccounts(const ClientLog& log, FileManager& files, const AppRecord& reco
 PropertyList::Dictionary AppsClient::installedAssets() noexcept {
   _log.normal("getting installed assets");
   PropertyList::Array deleted;
-  const std::optional<PropertyList::Array> todoList = _loadPlist(paths::TodoList);
-  const std::optional<PropertyList::Array> lastSynced = _loadPlist(paths::LastSyncState);
+  const std::optional<PropertyList::Array> todoList = _loadListOrSay(paths::TodoList);
+  const std::optional<PropertyList::Array> lastSynced = _loadListOrSay(paths::LastSyncState);
 
   std::set<std::string> candidates;
   if (const auto uninstalled = _platform.installerService.lookupUninstalled()) {

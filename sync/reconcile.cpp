@@ -3,6 +3,7 @@
 
 #include "client/apps_client.h"
 #include "client/identifier_safety.h"
+#include "client/missing.h"
 #include "client/paths.h"
 #include "platform/property_list_codec.h"
 
@@ -26,7 +27,9 @@ std::optional<bool> takeOverStagingArea(FileManager& files, const ClientLog& log
     log.error("can't create work area");
     return false;
   }
-  if (!files.fileExists(paths::StagingArea)) {
+  // One that cannot be looked at may be there: the move will tell.
+  std::optional<Error> reason;
+  if (!files.attributesOfItem(paths::StagingArea, &reason) && isMissing(reason)) {
     log.normal("Nothing to do");
     return true;
   }
@@ -95,7 +98,9 @@ void AppsClient::_performDeletions(const PropertyList::Array& todoList) {
 }
 
 void AppsClient::_sendIconLayout() {
-  const std::optional<Bytes> layout = _platform.files.contentsAtPath(paths::IconLayout);
+  std::optional<Error> error;
+  const std::optional<Bytes> layout = _platform.files.contentsAtPath(paths::IconLayout, &error);
+  sayUnreadable(_log, paths::IconLayout, error);
   if (!layout || layout->empty()) return;
   _log.normal("Sending iconlayout to DS");
   const HomeScreenService::Port port = _platform.homeScreen.serverPort();

@@ -1,6 +1,7 @@
 // Which packages the host must still send, and what is made ready for each of them.
 
 #include "client/apps_client.h"
+#include "client/missing.h"
 #include "client/paths.h"
 #include "transfer/in_progress_query.h"
 #include "transfer/transfer_candidates.h"
@@ -46,12 +47,19 @@ bool packageIsHere(FileManager& files, const std::string& identifier,
                    const std::optional<PropertyList>& rememberedPath, const ClientLog& log) {
   const std::string* path = rememberedPath ? rememberedPath->asString() : nullptr;
   if (!path) return false;
-  if (files.fileExists(*path)) {
+  std::optional<Error> error;
+  if (files.attributesOfItem(*path, &error)) {
     log.normal("Recovered download path for %{public}@ at %{public}@", identifier, *path);
     return true;
   }
-  log.normal("Download path recovered for %{public}@ but the file is missing: %{public}@",
-             identifier, *path);
+  if (isMissing(error)) {
+    log.normal("Download path recovered for %{public}@ but the file is missing: %{public}@",
+               identifier, *path);
+  } else {
+    // Asked for anew, which does no harm if it is there.
+    log.error("Download path recovered for %{public}@ but can't look at %{public}@: %{public}@",
+              identifier, *path, error);
+  }
   return false;
 }
 
@@ -61,7 +69,7 @@ std::vector<SyncAssetPtr> AppsClient::outstandingAssetTransfers() noexcept {
   std::vector<SyncAssetPtr> result;
   result.reserve(16);
   const bool installationAllowed = _appInstallationAllowed();
-  const std::optional<PropertyList::Array> todoList = _loadPlist(paths::TodoList);
+  const std::optional<PropertyList::Array> todoList = _loadListOrSay(paths::TodoList);
   _log.oversize("outstandingAssetTransfers starting with todoList %{public}@", todoList);
 
   CandidateEntries entries;

@@ -189,6 +189,19 @@ TEST_F(Inventory, ADamagedTodoListCountsAsEmpty) {
        "apps (com.b), last synced apps(null)"});
 }
 
+TEST_F(Inventory, AListThatCannotBeReadJustNowIsSaidAndCountsAsEmpty) {
+  putTodo({{"com.a", "install"}});
+  phone.files.putPlist(LastSyncStatePath, Array{"com.a"});
+  const Error failure = Error::posix(24);
+  phone.faults.failEvery("FileManager.contentsAtPath", failure);
+  client().installedAssets();
+  const Lines log = phone.trace.log();
+  for (const std::string& path : {TodoListPath, LastSyncStatePath}) {
+    EXPECT_THAT(log, testing::Contains("log error SyncBundle|can't read " + path + ": " +
+                                       description(failure)));
+  }
+}
+
 TEST_F(Inventory, ChangesNoFile) {
   putTodo({{"com.a", "install"}});
   putLastSync({"com.a", "com.b"});

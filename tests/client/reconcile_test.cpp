@@ -79,7 +79,7 @@ TEST_F(Reconcile, AsksAboutRemovalBeforeItReadsTheTodoList) {
   reconcile();
   const Lines all = phone.trace.lines(fakes::TraceQuery);
   EXPECT_THAT(all, testing::ElementsAre(
-                       "FileManager.fileExists(" + StagingPath + ")",
+                       "FileManager.attributesOfItem(" + StagingPath + ")",
                        "DevicePolicy.effectiveBoolValue(AppRemovalAllowed)",
                        "FileManager.contentsAtPath(" + TodoListPath + ")",
                        "FileManager.contentsAtPath(" + WorkAreaPath + "/DashelIconState.plist)"));
@@ -267,6 +267,28 @@ TEST_F(Reconcile, FailsWhenTheStagingAreaCannotBeMoved) {
                "log error SyncBundle|Can't move staging area", End});
   EXPECT_TRUE(phone.files.exists(StagedTodoPath));
   EXPECT_TRUE(phone.appRegistry.installed("com.a"));
+}
+
+TEST_F(Reconcile, TakesOverAStagingAreaThatCannotBeLookedAtJustNow) {
+  stageTodo({});
+  for (const char* look : {"FileManager.fileExists", "FileManager.attributesOfItem"}) {
+    phone.faults.failWhere(look, StagingPath, Error::posix(24));
+  }
+  EXPECT_TRUE(reconcile());
+  EXPECT_TRUE(phone.files.exists(TodoListPath));
+  EXPECT_FALSE(phone.files.exists(StagingPath));
+}
+
+TEST_F(Reconcile, SaysThatTheIconLayoutCannotBeRead) {
+  stageTodo({});
+  phone.files.putFile(StagedLayoutPath, "layout");
+  const std::string path = WorkAreaPath + "/DashelIconState.plist";
+  phone.faults.failWhere("FileManager.contentsAtPath", path, Error::posix(24));
+  EXPECT_TRUE(reconcile());
+  expectTrace(takenOver(
+      {}, {"fault FileManager.contentsAtPath(" + path + ")",
+           "log error SyncBundle|can't read " + path + ": " + description(Error::posix(24)),
+           WriteDebugCopy}));
 }
 
 TEST_F(Reconcile, FailsWithoutLossWhenThePreviousWorkAreaCannotBeRemoved) {

@@ -13,6 +13,21 @@ class RestoreState : public ClientTest {
 
   void put(const PropertyList& state) { phone.files.putPlist(RestoreStatePath, state); }
   std::optional<PropertyList> state() { return phone.files.plistAt(RestoreStatePath); }
+
+  /// The state is there, but no look at it and no read of it succeeds.
+  void hide(const PropertyList& there) {
+    put(there);
+    for (const char* look : {"contentsAtPath", "fileExists", "attributesOfItem"}) {
+      phone.faults.failWhere(std::string("FileManager.") + look, RestoreStatePath,
+                             Error::posix(24));
+    }
+    client();
+  }
+  void expectOnlySaid() {
+    expectTrace({"fault FileManager.contentsAtPath(" + RestoreStatePath + ")",
+                 "log error SyncBundle|can't read " + RestoreStatePath + ": " +
+                     description(Error::posix(24))});
+  }
 };
 
 TEST_F(RestoreState, SettingTheFirstPropertyCreatesTheFileWithOneOfEachLevel) {
@@ -146,18 +161,23 @@ TEST_F(RestoreState, CleaningWithoutAFileDoesNothing) {
 }
 
 TEST_F(RestoreState, CleaningKeepsAFileThatCannotBeReadJustNow) {
-  put(Dictionary{{"com.b", Dictionary{}}});
-  phone.faults.failEvery("FileManager.contentsAtPath", Error::posix(24));
+  hide(Dictionary{{"com.b", Dictionary{}}});
   client().cleanRestoreStateForIdentifier("com.a");
-  expectTrace({"fault FileManager.contentsAtPath(" + RestoreStatePath + ")"});
+  expectOnlySaid();
   EXPECT_EQ(state(), PropertyList(Dictionary{{"com.b", Dictionary{}}}));
 }
 
 TEST_F(RestoreState, SettingKeepsAFileThatCannotBeReadJustNow) {
-  put(Dictionary{{"com.b", Dictionary{}}});
-  phone.faults.failEvery("FileManager.contentsAtPath", Error::posix(24));
+  hide(Dictionary{{"com.b", Dictionary{}}});
   client()._setRestoreStatePropertyValue("/a", "path", "com.a", "1.0");
-  expectTrace({"fault FileManager.contentsAtPath(" + RestoreStatePath + ")"});
+  expectOnlySaid();
+  EXPECT_EQ(state(), PropertyList(Dictionary{{"com.b", Dictionary{}}}));
+}
+
+TEST_F(RestoreState, AFileThatCannotBeReadJustNowIsSaidAndHoldsNoProperty) {
+  hide(Dictionary{{"com.a", Dictionary{{"1.0", Dictionary{{"path", "/a"}}}}}});
+  EXPECT_EQ(client()._restoreStatePropertyForKey("path", "com.a", "1.0"), std::nullopt);
+  expectOnlySaid();
 }
 
 class DamagedRestoreState : public ClientTest, public testing::WithParamInterface<const char*> {

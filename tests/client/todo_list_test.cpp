@@ -103,6 +103,19 @@ TEST_F(TodoList, IsLeftWholeWhenItCannotBeWritten) {
                "fault FileManager.writeAtomically(" + TodoListPath + ")"});
 }
 
+TEST_F(TodoList, ThatCannotBeReadJustNowIsSaidAndNotChanged) {
+  putTodo({{"com.a", "install"}});
+  const Error failure = Error::posix(24, TodoListPath);
+  phone.faults.failEvery("FileManager.contentsAtPath", failure);
+  const Lines said{"fault FileManager.contentsAtPath(" + TodoListPath + ")",
+                   "log error SyncBundle|can't read " + TodoListPath + ": " + description(failure)};
+  client().changeAssetID("com.a", "SENT");
+  expectTrace(said);
+  EXPECT_EQ(client()._operationStateForIdentifier("com.a"), std::nullopt);
+  expectTrace(said);
+  EXPECT_EQ(todoOperation("com.a"), "install");
+}
+
 TEST_F(TodoList, NoChangeOfTenThreadsIsLost) {
   constexpr int Each = 20;
   Array list;

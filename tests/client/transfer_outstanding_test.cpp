@@ -173,6 +173,32 @@ TEST_F(OutstandingTransfers, RestoreWhoseRememberedPackageIsGoneAsksForBothParts
             (Dictionary{{"AssetParts", 3}, {"Version", "1.0"}}));
 }
 
+TEST_F(OutstandingTransfers, RestoreWhoseRememberedPackageCannotBeLookedAtAsksForBothParts) {
+  const std::string path = "/var/mobile/Media/r.pkg";
+  seedRestore("com.r");
+  phone.files.putFile(path, "package");
+  rememberPath("com.r", path);
+  for (const char* look : {"FileManager.fileExists", "FileManager.attributesOfItem"}) {
+    phone.faults.failWhere(look, path, Error::posix(24));
+  }
+  requested();
+  EXPECT_TRUE(
+      logged("log error SyncBundle|com.corvane.twc.AppsClient|Download path recovered for com.r "
+             "but can't look at " +
+             path + ": " + description(Error::posix(24))));
+  EXPECT_FALSE(loggedMessage("Download path recovered for com.r but the file is missing: " + path));
+  EXPECT_EQ(phone.host.made().front()->variantOptions,
+            (Dictionary{{"AssetParts", 3}, {"Version", "1.0"}}));
+}
+
+TEST_F(OutstandingTransfers, ATodoListThatCannotBeReadJustNowIsSaidAndCountsAsEmpty) {
+  putEntries({install("com.a")});
+  phone.faults.failWhere("FileManager.contentsAtPath", TodoListPath, Error::posix(24));
+  EXPECT_THAT(requested(), IsEmpty());
+  EXPECT_TRUE(logged("log error SyncBundle|com.corvane.twc.AppsClient|can't read " + TodoListPath +
+                     ": " + description(Error::posix(24))));
+}
+
 TEST_F(OutstandingTransfers, NameFallsBackToTheDesktopsAndThenToTheIdentifier) {
   Dictionary named = install("com.named");
   named.emplace("name", "From Desktop");

@@ -71,7 +71,7 @@ class EveryRestoreFaultTest : public testing::TestWithParam<bool> {
   Trace expectedPartOf(const std::string& identifier, const std::string& fault) const {
     const std::string list(RestoreList);
     // A list that is not found, or cannot be read, names nobody.
-    if (fault == "fault FileManager.fileExists(" + list + ")" ||
+    if (fault == "fault FileManager.attributesOfItem(" + list + ")" ||
         fault == "fault FileManager.contentsAtPath(" + list + ")") {
       return {};
     }
@@ -111,8 +111,9 @@ TEST_P(EveryRestoreFaultTest, ConcernsOneApplicationAtMost) {
     EXPECT_TRUE(std::equal(before.begin(), before.end(), calm_.begin()));
     const std::string& fault = trace[before.size()];
     expectOthersUntouched(trace, fault);
-    const bool notMoved = fault.starts_with("fault FileManager.moveItem") ||
-                          fault == "fault FileManager.fileExists(" + std::string(RestoreList) + ")";
+    const bool notMoved =
+        fault.starts_with("fault FileManager.moveItem") ||
+        fault == "fault FileManager.attributesOfItem(" + std::string(RestoreList) + ")";
     EXPECT_EQ(phone.listIsUsedUp(), !notMoved);
   }
   EXPECT_GT(struck, GetParam() ? 40u : 20u);

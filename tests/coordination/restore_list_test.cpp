@@ -35,6 +35,21 @@ TEST_F(RestoreListTest, AnUnreadableListIsPutAside) {
   EXPECT_TRUE(listIsKept());
 }
 
+TEST_F(RestoreListTest, AListThatCannotBeLookedAtJustNowStaysForTheNextRestore) {
+  putList({{"com.r", entryWith(plainMetadata())}});
+  for (const char* look : {"FileManager.fileExists", "FileManager.attributesOfItem"}) {
+    phone.faults.failWhere(look, RestoreList, Refused);
+  }
+  EXPECT_FALSE(process());
+  EXPECT_EQ(effects(),
+            (Trace{"fault FileManager.attributesOfItem(" + std::string(RestoreList) + ")",
+                   "log error SyncBundle|can't look at " + std::string(RestoreList) + ": " +
+                       description(Refused)}));
+  phone.faults.clear();
+  EXPECT_TRUE(process());
+  EXPECT_TRUE(listIsKept());
+}
+
 TEST_F(RestoreListTest, AListThatDoesNotParseIsPutAside) {
   phone.files.putFile(RestoreList, "no property list");
   std::optional<Error> error;
@@ -219,6 +234,16 @@ TEST_F(CoordinatedRestoreListTest, ADamagedListOfDemotionsDemotesNothing) {
   EXPECT_TRUE(process());
   EXPECT_EQ(placeholderType(), InstallType::Restore);
   EXPECT_THAT(effects(), Contains(complained("couldn't parse demoted apps list")));
+}
+
+TEST_F(CoordinatedRestoreListTest, AListOfDemotionsThatCannotBeReadIsSaidAndDemotesNothing) {
+  putDemoted({{"AutomaticDowngrades", PropertyList::Array{"com.r"}}});
+  putList({{"com.r", entryWith(plainMetadata())}});
+  phone.faults.failWhere("FileManager.contentsAtPath", DemotedApps, Refused);
+  EXPECT_TRUE(process());
+  EXPECT_THAT(effects(), Contains("log error SyncBundle|can't read " + std::string(DemotedApps) +
+                                  ": " + description(Refused)));
+  EXPECT_EQ(placeholderType(), InstallType::Restore);
 }
 
 TEST_F(CoordinatedRestoreListTest, APlaceholderThatStandsIsNoReasonToSkip) {
