@@ -1,5 +1,6 @@
 #include "client/queues.h"
 
+#include <map>
 #include <system_error>
 #include <utility>
 
@@ -44,9 +45,13 @@ void OperationQueue::add(std::function<void()> operation) {
   operation();
 }
 
+std::thread OperationQueue::newThread(std::function<void()> work) {
+  return std::thread(std::move(work));
+}
+
 void OperationQueue::addThread() {
   try {
-    threads_.emplace_back([this] { work(); });
+    threads_.push_back(startThread_([this] { work(); }));
   } catch (const std::system_error&) {
     // The system has no thread to spare: those that are there do the work, only later, and without
     // any it is done at once.
@@ -77,44 +82,64 @@ void OperationQueue::work() {
   }
 }
 
-struct DelayedTasks::Task {
-  std::function<void()> run;
-  BackgroundQueue::Token token = 0;
-  bool started = false;
+struct DelayedTasks::Tasks {
+  struct Pending {
+    std::function<void()> run;
+    BackgroundQueue::Token token = 0;
+  };
+
+  /// Runs a task that is still pending. Nothing of it is left when it no longer counts as running.
+  void run(std::uint64_t id) {
+    std::function<void()> task;
+    {
+      const std::lock_guard lock(mutex);
+      const auto found = pending.find(id);
+      if (found == pending.end()) return;
+      task = std::move(found->second.run);
+      running.emplace(id, found->second.token);
+      pending.erase(found);
+    }
+    task();
+    task = nullptr;
+    const std::lock_guard lock(mutex);
+    running.erase(id);
+  }
+
+  std::mutex mutex;
+  std::map<std::uint64_t, Pending> pending;
+  std::map<std::uint64_t, BackgroundQueue::Token> running;
+  std::uint64_t next = 0;
+  bool closed = false;
 };
+
+DelayedTasks::DelayedTasks(BackgroundQueue& queue)
+    : queue_(queue), tasks_(std::make_shared<Tasks>()) {}
 
 bool DelayedTasks::after(std::chrono::milliseconds delay, std::function<void()> run) {
   // Held while the task is handed over, so that it cannot start before its token is known.
-  const std::lock_guard lock(mutex_);
-  if (closed_) return false;
-  const std::uint64_t id = next_++;
-  auto task = std::make_shared<Task>(Task{std::move(run)});
-  pending_.emplace(id, task);
-  task->token = queue_.after(delay, [this, id] {
-    std::unique_lock running(mutex_);
-    const auto found = pending_.find(id);
-    if (found == pending_.end()) return;
-    const std::shared_ptr<Task> started = found->second;
-    started->started = true;
-    running.unlock();
-    started->run();
-    running.lock();
-    pending_.erase(id);
-  });
+  const std::lock_guard lock(tasks_->mutex);
+  if (tasks_->closed) return false;
+  const std::uint64_t id = tasks_->next++;
+  Tasks::Pending& task = tasks_->pending[id];
+  task.run = std::move(run);
+  task.token = queue_.after(delay, [tasks = tasks_, id] { tasks->run(id); });
   return true;
 }
 
 void DelayedTasks::close(const std::function<void()>& dropped) {
-  std::map<std::uint64_t, std::shared_ptr<Task>> left;
+  std::map<std::uint64_t, Tasks::Pending> pending;
+  std::map<std::uint64_t, BackgroundQueue::Token> running;
   {
-    const std::lock_guard lock(mutex_);
-    closed_ = true;
-    left.swap(pending_);
+    const std::lock_guard lock(tasks_->mutex);
+    tasks_->closed = true;
+    pending.swap(tasks_->pending);
+    running = tasks_->running;
   }
-  for (const auto& [id, task] : left) {
-    queue_.cancel(task->token);
-    if (!task->started) dropped();
+  for (const auto& [id, task] : pending) {
+    queue_.cancel(task.token);
+    dropped();
   }
+  for (const auto& [id, token] : running) queue_.cancel(token);
 }
 
 void Semaphore::signal() {

@@ -6,7 +6,6 @@
 #include <cstdint>
 #include <deque>
 #include <functional>
-#include <map>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -57,7 +56,11 @@ class AccessQueue {
 /// destructor runs what was added to its end. Thread-safe.
 class OperationQueue {
  public:
-  explicit OperationQueue(std::size_t maximum) : maximum_(maximum) {}
+  /// Starts a thread. Throws std::system_error when the system has none to give.
+  using StartThread = std::function<std::thread(std::function<void()> work)>;
+
+  explicit OperationQueue(std::size_t maximum, StartThread startThread = newThread)
+      : maximum_(maximum), startThread_(std::move(startThread)) {}
   ~OperationQueue();
   OperationQueue(const OperationQueue&) = delete;
   OperationQueue& operator=(const OperationQueue&) = delete;
@@ -67,10 +70,12 @@ class OperationQueue {
   void waitUntilAllOperationsAreFinished();
 
  private:
+  static std::thread newThread(std::function<void()> work);
   void addThread();
   void work();
 
   const std::size_t maximum_;
+  const StartThread startThread_;
   std::mutex mutex_;
   std::condition_variable changed_;
   std::deque<std::function<void()>> waiting_;
@@ -80,11 +85,14 @@ class OperationQueue {
   bool closing_ = false;
 };
 
-/// Delayed tasks that belong to one owner. After `close` none runs any more. Thread-safe.
+/// Delayed tasks that belong to one owner. After `close` none runs any more, and what they held is
+/// gone. Thread-safe; a task may add the next, but must not close.
 class DelayedTasks {
  public:
-  explicit DelayedTasks(BackgroundQueue& queue) : queue_(queue) {}
+  explicit DelayedTasks(BackgroundQueue& queue);
   ~DelayedTasks() { close(); }
+  DelayedTasks(const DelayedTasks&) = delete;
+  DelayedTasks& operator=(const DelayedTasks&) = delete;
 
   /// Runs the task after the delay. False when closed: the task is dropped.
   bool after(std::chrono::milliseconds delay, std::function<void()> task);
@@ -92,13 +100,11 @@ class DelayedTasks {
   void close(const std::function<void()>& dropped = [] {});
 
  private:
-  struct Task;
+  struct Tasks;
 
   BackgroundQueue& queue_;
-  std::mutex mutex_;
-  std::map<std::uint64_t, std::shared_ptr<Task>> pending_;
-  std::uint64_t next_ = 0;
-  bool closed_ = false;
+  /// Shared with the tasks, whose very end may come after their owner's.
+  const std::shared_ptr<Tasks> tasks_;
 };
 
 /// A counting semaphore whose wait can have a limit.

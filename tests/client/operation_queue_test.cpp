@@ -4,9 +4,11 @@
 #include <algorithm>
 #include <atomic>
 #include <barrier>
+#include <cerrno>
 #include <latch>
 #include <mutex>
 #include <set>
+#include <system_error>
 #include <thread>
 
 #include "client/queues.h"
@@ -103,6 +105,44 @@ TEST(OperationQueue, UsesAnIdleThreadAgain) {
   }
   EXPECT_EQ(threads.size(), 1u);
   EXPECT_FALSE(threads.contains(std::this_thread::get_id()));
+}
+
+[[noreturn]] std::thread noThread(const std::function<void()>&) {
+  throw std::system_error(EAGAIN, std::generic_category());
+}
+
+TEST(OperationQueue, RunsAtOnceWhatNoThreadCanBeMadeFor) {
+  OperationQueue queue(3, noThread);
+  std::vector<std::thread::id> ranOn;
+  for (std::size_t i = 1; i <= 2; ++i) {
+    queue.add([&ranOn] { ranOn.push_back(std::this_thread::get_id()); });
+    EXPECT_EQ(ranOn.size(), i);
+  }
+  EXPECT_THAT(ranOn, testing::Each(std::this_thread::get_id()));
+  queue.waitUntilAllOperationsAreFinished();
+}
+
+TEST(OperationQueue, LeavesToTheThreadThatIsThereWhatNoOtherCanBeMadeFor) {
+  int made = 0;
+  OperationQueue queue(3, [&made](std::function<void()> work) {
+    if (++made > 1) noThread(work);
+    return std::thread(std::move(work));
+  });
+  std::latch added(1);
+  std::vector<std::thread::id> ranOn;
+  for (int i = 0; i < 3; ++i) {
+    queue.add([&] {
+      added.wait();
+      ranOn.push_back(std::this_thread::get_id());
+    });
+  }
+  EXPECT_THAT(ranOn, testing::IsEmpty());
+  added.count_down();
+  queue.waitUntilAllOperationsAreFinished();
+  EXPECT_GT(made, 1);
+  EXPECT_EQ(ranOn.size(), 3u);
+  EXPECT_THAT(ranOn, testing::Each(testing::Eq(ranOn.front())));
+  EXPECT_NE(ranOn.front(), std::this_thread::get_id());
 }
 
 TEST(OperationQueue, AnOperationIsGoneWhenItCountsAsFinished) {

@@ -214,6 +214,49 @@ TEST_F(DelayedTasksTest, CloseWaitsForATaskThatRunsAndDoesNotCallItDropped) {
   releasing.join();
 }
 
+TEST_F(DelayedTasksTest, WhatATaskHeldMayAddTheNextWhenItGoes) {
+  DelayedTasks tasks(queue);
+  int ran = 0;
+  const auto addsNext = [&](int*) { tasks.after(1s, [&ran] { ++ran; }); };
+  tasks.after(1s, [held = std::shared_ptr<int>(nullptr, addsNext)] {});
+  queue.advance(1s);
+  EXPECT_EQ(ran, 0);
+  queue.advance(1s);
+  EXPECT_EQ(ran, 1);
+}
+
+TEST_F(DelayedTasksTest, CloseWaitsUntilWhatARunningTaskHeldIsGone) {
+  std::latch going(1);
+  std::latch mayGo(1);
+  std::atomic<bool> gone = false;
+  const auto goes = [&](int*) {
+    going.count_down();
+    mayGo.wait();
+    gone = true;
+  };
+  DelayedTasks tasks(queue);
+  tasks.after(1s, [held = std::shared_ptr<int>(nullptr, goes)] {});
+  std::thread running([this] { queue.advance(1s); });
+  going.wait();
+  std::thread releasing([&mayGo] { mayGo.count_down(); });
+  tasks.close([] { FAIL() << "a task that ran was called dropped"; });
+  EXPECT_TRUE(gone);
+  running.join();
+  releasing.join();
+}
+
+TEST_F(DelayedTasksTest, MayBeDestroyedWhileATaskEnds) {
+  for (int round = 0; round < 200; ++round) {
+    auto tasks = std::make_unique<DelayedTasks>(queue);
+    std::latch ran(1);
+    tasks->after(1s, [&ran] { ran.count_down(); });
+    std::thread running([this] { queue.advance(1s); });
+    ran.wait();
+    tasks.reset();
+    running.join();
+  }
+}
+
 TEST_F(DelayedTasksTest, ATaskThatRunsDuringCloseCannotAddAnother) {
   for (int round = 0; round < 50; ++round) {
     DelayedTasks tasks(queue);
