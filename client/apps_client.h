@@ -60,7 +60,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   /// Sets the operation of the identifier's first entry in the todo list.
   void changeAssetID(std::string_view identifier, std::string_view toDo);
   std::optional<std::string> _operationStateForIdentifier(std::string_view identifier) const;
-  /// A value that outlives the sync, kept for one version of one application.
+  /// A value that outlives the sync, kept for one version of one application; no version is one
+  /// too.
   std::optional<PropertyList> _restoreStatePropertyForKey(
       std::string_view key, std::string_view identifier,
       const std::optional<std::string>& version) const;
@@ -207,6 +208,7 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   void _removeFailedPlaceholder(const SyncAsset& asset);
   void _copyIcon(const std::optional<FileLocation>& icon, const std::string& target);
   void _installPackage(const SyncAssetPtr& asset);
+  void _installFailed(const SyncAssetPtr& asset, const std::optional<Error>& error);
   /// The result of the last application that was processed; false when none was.
   bool _restoreApplications(const PropertyList::Dictionary& restoreList);
   bool _installRestorePlaceholder(std::string_view bundleId,
@@ -226,7 +228,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   std::set<std::string> _outstandingXFTTransfers;
   OperationQueue _installOperationQueue;
   BackupManager& _backupManager;
-  /// Applications not to be requested in this sync.
+  /// Applications not to be requested in this sync. Emptied and asked by this client; nothing on
+  /// this platform fills it.
   std::set<std::string> _qlpAppsToIgnore;
   AccessQueue _accessQueue;
   /// Whether installs go through coordinators; asked once.

@@ -18,7 +18,7 @@ inline const std::string IconLayout = joinPath(WorkArea, IconLayoutName);
 inline const std::string SortOrder = joinPath(SyncRoot, "AssetSortOrder.plist");
 inline constexpr std::string_view IconScratch = "/var/mobile/Library/ApplicationSync/Icons";
 
-// Files of a container and of a bundle as an asset names them: without either, in the phone's root.
+// Files of a container and of a bundle, as an asset names them.
 inline std::string metadataIn(std::string_view container) {
   return std::string(container) + "/HalvoMetadata.plist";
 }

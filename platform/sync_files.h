@@ -11,7 +11,8 @@
 ///
 /// Paths are the phone's own. All files are property lists, binary or XML, unless said otherwise;
 /// each is replaced whole, so that nobody sees half of one. The client takes a missing, empty or
-/// damaged file as absent unless said otherwise; a damaged one also gives a log line. Keys that are
+/// damaged file as absent unless said otherwise; a damaged one also gives a log line. One that it
+/// cannot read just now it takes as absent for that call, says so, and leaves as it is. Keys that are
 /// not named here belong to the side that writes the file, and the other passes them through.
 namespace appsync::exchange {
 
@@ -95,7 +96,8 @@ inline const std::string RestoreState = joinPath(SyncRoot, "RestoreState.plist")
 /// String: where the package lies.
 inline constexpr std::string_view RestorePathKey = "path";
 
-/// Where the packages of a restore lie, and those that a store brings.
+/// Where the packages of a restore lie, and those that a store brings. The client takes a package
+/// from here or from the staging root, and ignores one that lies elsewhere.
 inline constexpr std::string_view Downloads = "/var/mobile/Media/Downloads";
 
 // An application's own files, in its container, in its directory of the staging area, and beside

@@ -6,6 +6,7 @@
 #include "client/apps_client.h"
 #include "platform/bundle.h"
 #include "transfer/install_plan.h"
+#include "transfer/package_path.h"
 
 namespace appsync {
 namespace {
@@ -53,7 +54,7 @@ void AppsClient::_performAssetInstall(const SyncAssetPtr& asset) {
       break;
   }
   result.assertion.reset();
-  if (asset->path) _platform.files.removeItem(*asset->path);
+  removePackage(_platform.files, asset->path);
 }
 
 void AppsClient::_installPackage(const SyncAssetPtr& asset) {
@@ -66,7 +67,7 @@ void AppsClient::_installPackage(const SyncAssetPtr& asset) {
   if (installed) {
     assetInstallSucceeded(asset);
   } else {
-    assetInstallFailed(asset, error.value_or(Error{}));
+    _installFailed(asset, error);
   }
 }
 
@@ -94,6 +95,10 @@ void AppsClient::assetInstallSucceeded(const SyncAssetPtr& asset) noexcept {
 }
 
 void AppsClient::assetInstallFailed(const SyncAssetPtr& asset, const Error& error) noexcept {
+  _installFailed(asset, error);
+}
+
+void AppsClient::_installFailed(const SyncAssetPtr& asset, const std::optional<Error>& error) {
   const std::string& identifier = asset->identifier;
   if (_isRecoverableError(error) || asset->isRestore) {
     _log.normal("%{public}@ install failed but was recoverable: %{public}@", identifier, error);
@@ -122,7 +127,10 @@ void AppsClient::_removeFailedPlaceholder(const SyncAsset& asset) {
     }
     return;
   }
-  const bool removed = _platform.appRegistry.uninstallApplication(identifier, {});
+  // Without a placeholder the registry would take the working version that was to be updated.
+  AppRegistry& registry = _platform.appRegistry;
+  const bool removed = registry.recordForIdentifier(identifier, true) &&
+                       registry.uninstallApplication(identifier, {});
   if (!removed) _log.error("Uninstall of %{public}@ failed.", identifier);
   _platform.transactionLog.logScenario(
       FailureScenario, 0, removed, identifier,

@@ -1,16 +1,25 @@
 // How far each package's transfer has come, how it ended, and the end of them all.
 
+#include <algorithm>
 #include <cmath>
 
 #include "client/apps_client.h"
 #include "client/identifier_safety.h"
 #include "client/paths.h"
+#include "coordination/failure.h"
+#include "transfer/package_path.h"
 #include "transfer/status_names.h"
 
 namespace appsync {
 namespace {
 
 constexpr std::int64_t ProgressUnits = 1000;
+
+/// A host that has nothing to send divides by zero: what is no fraction counts as none of it.
+std::int64_t completedUnits(double fraction) {
+  if (!(fraction > 0)) return 0;
+  return static_cast<std::int64_t>(std::trunc(std::min(fraction, 1.0) * ProgressUnits));
+}
 
 bool isUnfinished(InstallState state) {
   return static_cast<std::uint64_t>(state) < static_cast<std::uint64_t>(InstallState::Canceled);
@@ -43,7 +52,7 @@ void AppsClient::assetTransferUpdatedProgress(const SyncAssetPtr& asset, double 
   } else if (const auto progress = _progressForAssetIdentifier(identifier)) {
     progress->setInstallState(InstallState::Active);
     if (progress->totalUnitCount() != ProgressUnits) progress->setTotalUnitCount(ProgressUnits);
-    progress->setCompletedUnitCount(static_cast<std::int64_t>(std::trunc(fraction * 1000.0)));
+    progress->setCompletedUnitCount(completedUnits(fraction));
   }
   _accessQueue.sync([&] { _outstandingXFTTransfers.insert(identifier); });
 }
@@ -95,6 +104,10 @@ void AppsClient::_assetReceived(const SyncAssetPtr& asset,
   }
   if (!asset->isDownload) {
     changeAssetID(identifier, "SENT");
+    return;
+  }
+  if (!isPackagePath(_platform.files, asset->path)) {
+    _log.normal("Ignoring invalid path: %{public}@", asset->path);
     return;
   }
   _log.normal("Received file at %{public}@", asset->path);
@@ -165,7 +178,9 @@ void AppsClient::_assetTransferFailed(const SyncAssetPtr& asset,
     _log.normal("Uninstalling app using SW %{public}@ %s", identifier,
                 removed ? "secceeded" : "failed");
   } else if (!userCancelled) {
-    transferCompleteForApp(asset, error, existingApp);
+    // Without an error it would count as complete.
+    transferCompleteForApp(asset, error.value_or(failure(FailureCode::TransferFailed)),
+                           existingApp);
   }
 }
 

@@ -1,8 +1,6 @@
-#include <latch>
 #include <thread>
 
-#include "client/queues.h"
-#include "tests/client/client_test.h"
+#include "tests/client/install_queue.h"
 #include "transfer/install_plan.h"
 
 namespace appsync {
@@ -11,61 +9,6 @@ namespace {
 using namespace std::chrono_literals;
 using testing::Contains;
 using testing::ElementsAre;
-
-const std::string PackagePath = StagingRootPath + "/a.zip";
-const Error Refused{std::string(InstallerServiceErrorDomain), 2, {}, nullptr};
-const Error Passing{"Passing", 8, {}, nullptr};
-
-class InstallQueue : public ClientTest {
- protected:
-  void SetUp() override {
-    phone.files.putFile(PackagePath, "package");
-    putTodo({{"com.a", "DOWNLOADED"}});
-  }
-
-  SyncAssetPtr asset(std::string_view identifier = "com.a", const std::string& path = PackagePath) {
-    const SyncAssetPtr made = phone.host.makeDownload(identifier, "Application", std::nullopt);
-    made->path = path;
-    return made;
-  }
-  void prepare() {
-    client();
-    forgetTrace();
-  }
-  /// One whole install, on the install queue.
-  void install(const SyncAssetPtr& made) {
-    prepare();
-    client()._enqueueAssetInstall(made);
-    client().assetTransferEndedWithSuccess(false);
-  }
-  /// The trace up to the end of the install, without the end of the transfers.
-  Lines installTrace() {
-    Lines trace = phone.trace.readable();
-    const auto end =
-        std::ranges::find(trace, "log default SyncBundle|asset transfer ended withsuccess: n");
-    // The end is announced before the wait, at any point of the install.
-    if (end != trace.end()) trace.erase(end);
-    std::erase_if(trace, [](const std::string& line) {
-      return line.find("SystemNotifier.") == 0 || line.find("serverPort") != std::string::npos ||
-             line.find("Notifying DS") != std::string::npos;
-    });
-    return trace;
-  }
-  static Lines begun() {
-    return {"log default SyncBundle|Enqueue install request for com.a",
-            "log default SyncBundle|Performing install for com.a",
-            "log default SyncBundle|Grabbing assertion for com.a",
-            "HomeScreenService.createTerminationAssertion(com.a, 0)"};
-  }
-  static Lines joined(Lines first, const Lines& second) {
-    first.insert(first.end(), second.begin(), second.end());
-    return first;
-  }
-};
-
-const std::string InstallCall = "AppRegistry.installApplication(" + PackagePath +
-                                ", {KBBundleIdentifier = com.a; SWPackageTypeKey = "
-                                "SWPackageTypeCustomer})";
 
 TEST(InstallPlan, DecidesByTheOutcomeAlone) {
   using Next = InstallPlan::Next;
@@ -175,42 +118,6 @@ TEST_F(InstallQueue, KeepsRetryingForAsLongAsTheHomeScreenRefuses) {
   EXPECT_TRUE(phone.appRegistry.installed("com.a"));
 }
 
-/// Tells when the end of the transfers has begun.
-class EndNoticingLog : public fakes::FakeLog {
- public:
-  using FakeLog::FakeLog;
-  void write(LogChannel channel, LogLevel level, std::string_view text) noexcept override {
-    FakeLog::write(channel, level, text);
-    if (text.ends_with("asset transfer ended withsuccess: y")) endBegan.count_down();
-  }
-
-  std::latch endBegan{1};
-};
-
-TEST_F(InstallQueue, EndOfTheTransfersWaitsForARetryThatWaits) {
-  phone.homeScreen.queueOutcomes("com.a", {AssertionOutcome::Denied});
-  EndNoticingLog noticing(phone.trace);
-  AppsClient ending(with(phone.platform(), noticing));
-  ending._enqueueAssetInstall(asset());
-  ASSERT_TRUE(phone.backgroundQueue.waitForPending(1));
-  std::atomic<bool> ended = false;
-  std::thread host([&] {
-    ending.assetTransferEndedWithSuccess(true);
-    ended = true;
-  });
-  noticing.endBegan.wait();
-  // It has not ended while the retry is pending: only the clock can let it.
-  EXPECT_FALSE(ended);
-  phone.backgroundQueue.advance(30s);
-  host.join();
-  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
-  const Lines log = phone.trace.log();
-  const auto done =
-      std::ranges::find(log, "log default SyncBundle|Notifying DS we are done syncing");
-  const auto installed = std::ranges::find(log, "log default SyncBundle|com.a install succeeded");
-  EXPECT_LT(installed, done);
-}
-
 TEST_F(InstallQueue, UnknownAssertionErrorFailsWithPosix22AndRemovesTheFile) {
   phone.host.setRecoverable(POSIXErrorDomain, false);
   phone.appRegistry.seedPlaceholder("com.a");
@@ -266,26 +173,51 @@ class SilentRegistry : public fakes::FaultyAppRegistry {
   }
 };
 
-TEST_F(InstallQueue, PackageRefusedWithoutAReasonIsSortedByTheHostLikeAnyOther) {
+TEST_F(InstallQueue, PackageRefusedWithoutAReasonIsFailedForGood) {
   phone.appRegistry.seedPlaceholder("com.a");
   SilentRegistry registry(phone.appRegistry, phone.faults);
   AppsClient installing(with(phone.platform(), registry));
-  for (const bool recoverable : {true, false}) {
-    phone.host.setRecoverable("", recoverable);
-    phone.files.putFile(PackagePath, "package");
-    forgetTrace();
-    installing._enqueueAssetInstall(asset());
-    installing.assetTransferEndedWithSuccess(false);
-    EXPECT_EQ(todoOperation("com.a"), recoverable ? "DOWNLOADED" : "FAILED");
-    EXPECT_EQ(phone.appRegistry.placeholder("com.a").has_value(), recoverable);
-    EXPECT_THAT(phone.trace.log(),
-                Contains(testing::StartsWith(
-                    recoverable ? "log default SyncBundle|com.a install failed but was "
-                                  "recoverable: "
-                                : "log default SyncBundle|com.a install failed "
-                                  "unrecoverably: ")));
-    EXPECT_FALSE(phone.files.exists(PackagePath));
-  }
+  // The host would try again whatever it is asked about.
+  phone.host.setRecoverable("", true);
+  installing._enqueueAssetInstall(asset());
+  installing.assetTransferEndedWithSuccess(false);
+  EXPECT_EQ(todoOperation("com.a"), "FAILED");
+  EXPECT_FALSE(phone.appRegistry.placeholder("com.a"));
+  EXPECT_THAT(phone.trace.log(),
+              Contains("log default SyncBundle|com.a install failed unrecoverably: (null)"));
+  EXPECT_FALSE(phone.files.exists(PackagePath));
+}
+
+TEST_F(InstallQueue, AnUpdateWithoutAPlaceholderThatFailsForGoodKeepsTheWorkingVersion) {
+  phone.appRegistry.seedInstalled("com.a", "1.0");
+  phone.appRegistry.failInstall("com.a", Refused);
+  install(asset());
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
+  EXPECT_THAT(
+      installTrace(),
+      testing::ElementsAreArray(joined(
+          begun(),
+          {"log default SyncBundle|Assertion succeeded for com.a",
+           "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
+           InstallCall,
+           "log default SyncBundle|com.a install failed unrecoverably: " + description(Refused),
+           "log default SyncBundle|Changing com.a from DOWNLOADED to FAILED",
+           "FileManager.writeAtomically(" + TodoListPath + ")",
+           "log error SyncBundle|Uninstall of com.a failed.",
+           "transaction scenario \"Aerix restore\" step 0 failed com.a \"failed to remove "
+           "placeholder\"",
+           "TerminationAssertion.release(com.a)", "FileManager.removeItem(" + PackagePath + ")",
+           "log default SyncBundle|Finished install for com.a"})));
+}
+
+TEST_F(InstallQueue, APlaceholderThatCannotBeFoundJustNowIsNotTakenForTheApplication) {
+  phone.appRegistry.seedInstalled("com.a", "1.0");
+  phone.appRegistry.seedPlaceholder("com.a");
+  phone.faults.failEvery("AppRegistry.recordForIdentifier", Passing);
+  phone.appRegistry.failInstall("com.a", Refused);
+  install(asset());
+  EXPECT_EQ(phone.trace.count("AppRegistry.uninstallApplication"), 0u);
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
 }
 
 TEST_F(InstallQueue, RefusedPackageIsFailedForGoodAndItsPlaceholderRemoved) {
@@ -305,6 +237,7 @@ TEST_F(InstallQueue, RefusedPackageIsFailedForGoodAndItsPlaceholderRemoved) {
 }
 
 TEST_F(InstallQueue, PlaceholderThatCannotBeRemovedIsLoggedAndRecorded) {
+  phone.appRegistry.seedPlaceholder("com.a");
   phone.appRegistry.failInstall("com.a", Refused);
   phone.appRegistry.failUninstall("com.a");
   install(asset());
@@ -335,20 +268,21 @@ TEST_F(InstallQueue, FailedRestoreCountsAsRecoverableWhateverItsError) {
   const SyncAssetPtr made = asset();
   made->isRestore = true;
   install(made);
+  EXPECT_THAT(
+      installTrace(),
+      testing::ElementsAreArray(joined(
+          begun(),
+          {"log default SyncBundle|Assertion succeeded for com.a",
+           "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
+           InstallCall,
+           "log default SyncBundle|com.a install failed but was recoverable: " +
+               description(Refused),
+           "transaction scenario \"Aerix restore\" step 0 failed com.a \"install failed "
+           "recoverably\"",
+           "TerminationAssertion.release(com.a)", "FileManager.removeItem(" + PackagePath + ")",
+           "log default SyncBundle|Finished install for com.a"})));
   EXPECT_EQ(todoOperation("com.a"), "DOWNLOADED");
   EXPECT_TRUE(phone.appRegistry.placeholder("com.a"));
-  EXPECT_EQ(phone.trace.count("BackupManager.cancelApplicationRestore"), 0u);
-}
-
-TEST_F(InstallQueue, RestoreStateIsClearedWhateverTheOutcome) {
-  for (const bool fails : {false, true}) {
-    phone.files.putPlist(
-        RestoreStatePath,
-        Dictionary{{"com.a", Dictionary{{"1.0", Dictionary{{"path", PackagePath}}}}}});
-    if (fails) phone.appRegistry.failInstall("com.a", Passing);
-    install(asset());
-    EXPECT_FALSE(phone.files.exists(RestoreStatePath)) << fails;
-  }
 }
 
 TEST_F(InstallQueue, CountsTheAttemptsThatReachedTheInstaller) {
@@ -360,24 +294,6 @@ TEST_F(InstallQueue, CountsTheAttemptsThatReachedTheInstaller) {
   }
   EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 2u);
   EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 0u);
-}
-
-TEST_F(InstallQueue, TenInstallsOverlapAndTheEleventhWaits) {
-  prepare();
-  phone.appRegistry.blockInstalls();
-  for (int index = 0; index < 11; ++index) {
-    const std::string identifier = "com.app" + std::to_string(index);
-    const std::string path = StagingRootPath + "/" + identifier + ".zip";
-    phone.files.putFile(path, "package");
-    client()._enqueueAssetInstall(asset(identifier, path));
-  }
-  ASSERT_TRUE(phone.appRegistry.waitForInstalls(10));
-  EXPECT_EQ(phone.appRegistry.installsStarted(), 10u);
-  phone.appRegistry.releaseInstalls();
-  client().assetTransferEndedWithSuccess(true);
-  EXPECT_EQ(phone.appRegistry.installsStarted(), 11u);
-  EXPECT_EQ(phone.appRegistry.mostInstallsAtOnce(), 10u);
-  EXPECT_EQ(phone.appRegistry.installedIdentifiers().size(), 11u);
 }
 
 TEST_F(InstallQueue, DestroyedClientFinishesRunningInstallsAndDropsWaitingRetries) {

@@ -1,53 +1,11 @@
-#include "tests/client/client_test.h"
+#include "tests/client/transfer_results.h"
+
+#include <limits>
 
 namespace appsync {
 namespace {
 
 using testing::Contains;
-
-class TransferResults : public ClientTest {
- protected:
-  void SetUp() override {
-    phone.files.putDirectory(WorkAreaPath);
-    phone.files.putFile(StagingRootPath + "/a.zip", "package");
-    phone.files.putFile("/var/mobile/Media/a.zip", "package");
-  }
-
-  SyncAssetPtr asset(std::string_view identifier = "com.a") {
-    const SyncAssetPtr made = phone.host.makeDownload(identifier, "Application", "Alpha");
-    made->variantOptions = {{"Version", "1.0"}};
-    made->shortDescription = std::string(identifier);
-    return made;
-  }
-  SyncAssetPtr received(const std::string& path, std::string_view identifier = "com.a") {
-    const SyncAssetPtr made = asset(identifier);
-    made->path = path;
-    return made;
-  }
-  SyncAssetPtr restored(const std::optional<std::string>& path) {
-    const SyncAssetPtr made = asset();
-    made->isRestore = true;
-    made->path = path;
-    made->completedAssetParts = kTWAssetPartApplication;
-    return made;
-  }
-
-  void succeed(const SyncAssetPtr& made) {
-    client();
-    forgetTrace();
-    client().assetTransferSucceeded(made, true, std::nullopt);
-  }
-  void fail(const SyncAssetPtr& made, const std::optional<Error>& error) {
-    client();
-    forgetTrace();
-    client().assetTransferSucceeded(made, false, error);
-  }
-  /// Ends the transfers, and with them the installs that run on other threads.
-  void settle() { client().assetTransferEndedWithSuccess(true); }
-};
-
-const Error Final{"Final", 7, {}, nullptr};
-const Error Passing{"Passing", 8, {}, nullptr};
 
 TEST_F(TransferResults, ProgressIsForwardedInThousandthsTruncated) {
   phone.appRegistry.seedPlaceholder("com.a");
@@ -64,6 +22,32 @@ TEST_F(TransferResults, ProgressIsForwardedInThousandthsTruncated) {
                "InstallProgress.setInstallState(com.a, 1)",
                "InstallProgress.setTotalUnitCount(com.a, 1000)",
                "InstallProgress.setCompletedUnitCount(com.a, 456)"});
+}
+
+TEST_F(TransferResults, ProgressThatIsNoFractionCountsAsNoneOrAll) {
+  constexpr double Infinity = std::numeric_limits<double>::infinity();
+  const std::pair<double, std::int64_t> counts[] = {{std::numeric_limits<double>::quiet_NaN(), 0},
+                                                    {-Infinity, 0},
+                                                    {-0.5, 0},
+                                                    {0.9999, 999},
+                                                    {Infinity, 1000},
+                                                    {1e300, 1000},
+                                                    {1.5, 1000}};
+  phone.appRegistry.seedPlaceholder("com.a");
+  for (const auto& [fraction, units] : counts) {
+    phone.appRegistry.progress("com.a")->setCompletedUnitCount(-1);
+    client().assetTransferUpdatedProgress(asset(), fraction);
+    EXPECT_EQ(phone.appRegistry.progress("com.a")->completedUnitCount(), units) << fraction;
+  }
+}
+
+TEST_F(TransferResults, AnotherInstallsProgressIsNotTouchedWithoutAPlaceholder) {
+  phone.appRegistry.seedInstalled("com.a");
+  client();
+  EXPECT_EQ(client()._progressForAssetIdentifier("com.a"), nullptr);
+  expectTrace({"AppRegistry.recordForIdentifier(com.a, true)",
+               "log error SyncBundle|Returning (null) progress for com.a"},
+              fakes::TraceAll);
 }
 
 TEST_F(TransferResults, TotalUnitCountIsSetOnlyOnce) {
@@ -92,10 +76,10 @@ TEST_F(TransferResults, RelativePathIsCompletedUnderTheStagingRoot) {
 }
 
 TEST_F(TransferResults, AbsolutePathIsKept) {
-  const SyncAssetPtr made = received("/var/mobile/Media/elsewhere/a.zip");
+  const SyncAssetPtr made = received("/var/mobile/Media/PublicStaging/elsewhere/a.zip");
   succeed(made);
   settle();
-  EXPECT_EQ(made->path, "/var/mobile/Media/elsewhere/a.zip");
+  EXPECT_EQ(made->path, "/var/mobile/Media/PublicStaging/elsewhere/a.zip");
 }
 
 TEST_F(TransferResults, ReceivedPackageIsMarkedDownloadedAndItsInstallEnqueued) {
@@ -142,6 +126,16 @@ TEST_F(TransferResults, MissingPathWithNothingRememberedIsIgnored) {
   EXPECT_THAT(phone.trace.log(), Contains("log default SyncBundle|Ignoring invalid path: (null)"));
 }
 
+TEST_F(TransferResults, ClimbingPathIsIgnoredAlsoWhenThereIsNothingToInstall) {
+  putTodo({{"com.a", "install"}});
+  const SyncAssetPtr made = received("/var/../etc/a.zip");
+  made->isDownload = false;
+  succeed(made);
+  EXPECT_EQ(phone.trace.readable().back(),
+            "log default SyncBundle|Ignoring invalid path: /var/../etc/a.zip");
+  EXPECT_EQ(todoOperation("com.a"), "install");
+}
+
 TEST_F(TransferResults, AssetThatIsNoDownloadIsMarkedSentAndInstallsNothing) {
   putTodo({{"com.a", "install"}});
   const SyncAssetPtr made = received("a.zip");
@@ -155,30 +149,60 @@ TEST_F(TransferResults, AssetThatIsNoDownloadIsMarkedSentAndInstallsNothing) {
 TEST_F(TransferResults, RestoreWithBackupDataIsRememberedAndNotInstalled) {
   phone.backup.addRestoreData("com.a");
   phone.appRegistry.seedPlaceholder("com.a", InstallType::Restore);
-  succeed(restored("/var/mobile/Media/a.zip"));
+  succeed(restored("/var/mobile/Media/Downloads/a.zip"));
   EXPECT_EQ(phone.files.plistAt(RestoreStatePath),
             PropertyList(Dictionary{
-                {"com.a", Dictionary{{"1.0", Dictionary{{"path", "/var/mobile/Media/a.zip"}}}}}}));
+                {"com.a",
+                 Dictionary{{"1.0", Dictionary{{"path", "/var/mobile/Media/Downloads/a.zip"}}}}}}));
   EXPECT_EQ(phone.appRegistry.progress("com.a")->installPhase(), InstallPhase::RestoringData);
-  EXPECT_THAT(phone.trace.log(), Contains("log default SyncBundle|Restore data exists for com.a"));
+  const std::string progress = phone.appRegistry.progress("com.a")->description();
+  settle();
   EXPECT_FALSE(phone.appRegistry.installed("com.a"));
+  Lines trace = phone.trace.readable();
+  trace.resize(9);
+  EXPECT_THAT(trace, testing::ElementsAre(
+                         "log default SyncBundle|transfer for asset com.a ended with success y "
+                         "error (null) existingApp:0",
+                         testing::StartsWith("log error SyncBundle|Returning "),
+                         "log default SyncBundle|asset transfer succeeded for com.a",
+                         "AppRegistry.installPhaseFinished(com.a)",
+                         "log default SyncBundle|Received file at "
+                         "/var/mobile/Media/Downloads/a.zip",
+                         "log default SyncBundle|Restore data exists for com.a",
+                         "InstallProgress.setInstallPhase(com.a, 2)",
+                         "FileManager.writeAtomically(" + RestoreStatePath + ")",
+                         "log default SyncBundle|asset transfer ended withsuccess: y"));
+}
+
+TEST_F(TransferResults, RestoreOfNoVersionIsRememberedToo) {
+  phone.backup.addRestoreData("com.a");
+  const SyncAssetPtr package = restored("/var/mobile/Media/Downloads/a.zip");
+  package->variantOptions.clear();
+  succeed(package);
+  const SyncAssetPtr data = restored(std::nullopt);
+  data->variantOptions.clear();
+  data->completedAssetParts = kTWAssetPartApplicationData;
+  succeed(data);
+  settle();
+  EXPECT_EQ(data->path, "/var/mobile/Media/Downloads/a.zip");
+  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
 }
 
 TEST_F(TransferResults, LaterDataOnlyAssetFindsTheRememberedPackageAndInstallsIt) {
   phone.backup.addRestoreData("com.a");
-  succeed(restored("/var/mobile/Media/a.zip"));
+  succeed(restored("/var/mobile/Media/Downloads/a.zip"));
   const SyncAssetPtr data = restored(std::nullopt);
   data->completedAssetParts = kTWAssetPartApplicationData;
   succeed(data);
   settle();
-  EXPECT_EQ(data->path, "/var/mobile/Media/a.zip");
+  EXPECT_EQ(data->path, "/var/mobile/Media/Downloads/a.zip");
   EXPECT_TRUE(phone.appRegistry.installed("com.a"));
 }
 
 TEST_F(TransferResults, LaterDataOnlyAssetOfAnotherVersionDoesNotFindTheRememberedPackage) {
   putTodo({{"com.a", "install"}});
   phone.backup.addRestoreData("com.a");
-  succeed(restored("/var/mobile/Media/a.zip"));
+  succeed(restored("/var/mobile/Media/Downloads/a.zip"));
   const auto before = phone.files.files();
   const SyncAssetPtr data = restored(std::nullopt);
   data->variantOptions = {{"Version", "2.0"}};
@@ -194,14 +218,14 @@ TEST_F(TransferResults, LaterDataOnlyAssetOfAnotherVersionDoesNotFindTheRemember
 }
 
 TEST_F(TransferResults, RestoreIsNamedByItsShortDescription) {
-  const SyncAssetPtr made = restored("/var/mobile/Media/a.zip");
+  const SyncAssetPtr made = restored("/var/mobile/Media/Downloads/a.zip");
   made->shortDescription = "Alpha of Ann";
   phone.backup.addRestoreData("com.a");
   succeed(made);
   EXPECT_EQ(phone.trace.count("log default SyncBundle|com.corvane.twc.AppsClient|Restore data "
                               "exists for Alpha of Ann"),
             1u);
-  const SyncAssetPtr other = restored("/var/mobile/Media/a.zip");
+  const SyncAssetPtr other = restored("/var/mobile/Media/Downloads/a.zip");
   other->identifier = "com.b";
   other->shortDescription = "Beta of Ann";
   succeed(other);
@@ -212,7 +236,7 @@ TEST_F(TransferResults, RestoreIsNamedByItsShortDescription) {
 }
 
 TEST_F(TransferResults, RestoreWithoutBackupDataIsInstalledAtOnce) {
-  succeed(restored("/var/mobile/Media/a.zip"));
+  succeed(restored("/var/mobile/Media/Downloads/a.zip"));
   EXPECT_EQ(phone.trace.count("log default SyncBundle|com.corvane.twc.AppsClient|No restore data "
                               "exists for com.a"),
             1u);
@@ -345,29 +369,28 @@ TEST_F(TransferResults, EndWithSuccessWhileTransfersAreOutstandingFinishesThemAn
 TEST_F(TransferResults, EndWithFailureMarksOutstandingTransfersFailedAndLogsNoErrorOfItsOwn) {
   phone.appRegistry.seedPlaceholder("com.a");
   client().assetTransferUpdatedProgress(asset(), 0.5);
+  forgetTrace();
+  const std::string progress = phone.appRegistry.progress("com.a")->description();
   client().assetTransferEndedWithSuccess(false);
   EXPECT_EQ(phone.appRegistry.progress("com.a")->installState(), InstallState::Failed);
-  EXPECT_EQ(
-      phone.trace.count("log error SyncBundle|com.corvane.twc.AppsClient|Called with success"), 0u);
+  expectTrace(
+      {"log default SyncBundle|asset transfer ended withsuccess: n",
+       "SystemNotifier.registerCheck(com.corvane.dashel.twc.wsyncnotify)",
+       "log default SyncBundle|Notifying DS we are done syncing", "HomeScreenService.serverPort()",
+       "SystemNotifier.setState(com.corvane.dashel.twc.wsyncnotify, 0)",
+       "SystemNotifier.post(com.corvane.dashel.twc.wsyncnotify)",
+       "log default SyncBundle|Setting state for outstanding XFT loading phase of asset com.a to "
+       "SWInstallStateFailed",
+       "log error SyncBundle|Returning " + progress + " progress for com.a",
+       "InstallProgress.setInstallState(com.a, 4)", "AppRegistry.installPhaseFinished(com.a)"});
   // Settled once: nothing is left for a second end.
   forgetTrace();
   client().assetTransferEndedWithSuccess(false);
   EXPECT_EQ(phone.trace.count("InstallProgress.setInstallState"), 0u);
 }
 
-class CoordinatedResults : public TransferResults {
- protected:
-  void SetUp() override {
-    TransferResults::SetUp();
-    phone.installCoordination.setEnabled(true);
-    coordinator = phone.installCoordination.seedCoordinator(CoordinatorKind::Initiating, "com.a",
-                                                            SyncHostClientID);
-  }
-  std::shared_ptr<fakes::FakeInstallCoordinator> coordinator;
-};
-
 TEST_F(CoordinatedResults, ProgressGoesToTheCoordinatorsPackagePromise) {
-  const SyncAssetPtr made = received("/var/mobile/Media/a.zip");
+  const SyncAssetPtr made = received("/var/mobile/Media/Downloads/a.zip");
   made->downloadProgress = 0.25;
   client().assetTransferUpdatedProgress(made, 0.25);
   ASSERT_TRUE(phone.installCoordination.pathPromise("com.a-Asset"));
@@ -396,12 +419,12 @@ TEST_F(CoordinatedResults, ReceivedPackageSatisfiesItsPromise) {
 }
 
 TEST_F(CoordinatedResults, RestoreAssetsAreLeftToTheStore) {
-  succeed(restored("/var/mobile/Media/a.zip"));
+  succeed(restored("/var/mobile/Media/Downloads/a.zip"));
   EXPECT_THAT(
       phone.trace.log(),
       Contains("log default SyncBundle|Not processing restore asset com.a as coordination is "
                "enabled"));
-  const SyncAssetPtr data = restored("/var/mobile/Media/a.zip");
+  const SyncAssetPtr data = restored("/var/mobile/Media/Downloads/a.zip");
   data->completedAssetParts = kTWAssetPartApplicationData;
   succeed(data);
   EXPECT_THAT(
@@ -415,6 +438,20 @@ TEST_F(CoordinatedResults, FailureCancelsTheCoordinatorOfAnInstalledApplication)
   fail(asset(), Passing);
   EXPECT_TRUE(coordinator->state().cancellation.has_value());
   EXPECT_EQ(phone.trace.count("AppRegistry.uninstallApplication"), 0u);
+}
+
+TEST_F(CoordinatedResults, FailureWithoutAReasonCancelsTheCoordinatorToo) {
+  putTodo({{"com.a", "install"}});
+  phone.appRegistry.seedPlaceholder("com.a");
+  const SyncAssetPtr made = received("a.zip");
+  client().assetTransferUpdatedProgress(made, 0.5);
+  fail(made, std::nullopt);
+  EXPECT_FALSE(phone.installCoordination.pathPromise("com.a-Asset")->isComplete());
+  const auto cancellation = coordinator->state().cancellation;
+  ASSERT_TRUE(cancellation);
+  EXPECT_EQ(phone.trace.count("InstallCoordination.createUserPresentableError(1, 0, Error "
+                              "Domain=TWError Code=30)"),
+            1u);
 }
 
 TEST_F(CoordinatedResults, FailureAfterThePersonCancelledLeavesTheCoordinatorAlone) {
