@@ -70,6 +70,7 @@ bool RestorePreparation::parseMetadata() {
     return false;
   }
   metadata_ = std::move(*parsed);
+  sayUnexpectedTypesOfMetadata(log_, app_.bundleId, metadata_);
   return true;
 }
 

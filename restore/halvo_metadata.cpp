@@ -1,16 +1,15 @@
 #include "restore/halvo_metadata.h"
 
+#include "client/usable_text.h"
 #include "platform/property_list_codec.h"
 #include "restore/placeholder_info.h"
 
 namespace appsync {
 namespace {
 
-std::optional<std::string> stringUnder(const PropertyList::Dictionary& dictionary,
-                                       std::string_view key) {
-  const std::string* text = findString(dictionary, key);
-  return text ? std::optional(*text) : std::nullopt;
-}
+constexpr std::string_view VersionKey = "bundleVersion";
+constexpr std::string_view TitleKey = "title";
+constexpr std::string_view ItemNameKey = "itemName";
 
 }  // namespace
 
@@ -26,13 +25,18 @@ std::optional<PropertyList::Dictionary> parseDictionary(ByteView bytes,
   return std::move(*dictionary);
 }
 
+void sayUnexpectedTypesOfMetadata(const ClientLog& log, std::string_view bundleId,
+                                  const PropertyList::Dictionary& metadata) {
+  sayUnexpectedTypes(log, bundleId, metadata, {VersionKey, TitleKey, ItemNameKey});
+}
+
 std::optional<std::string> metadataVersion(const PropertyList::Dictionary& metadata) {
-  return stringUnder(metadata, "bundleVersion");
+  return usableText(metadata, VersionKey);
 }
 
 std::optional<std::string> metadataName(const PropertyList::Dictionary& metadata) {
-  std::optional<std::string> title = stringUnder(metadata, "title");
-  return title ? title : stringUnder(metadata, "itemName");
+  std::optional<std::string> title = usableText(metadata, TitleKey);
+  return title ? title : usableText(metadata, ItemNameKey);
 }
 
 bool metadataProhibitsLaunch(const PropertyList::Dictionary& metadata) {

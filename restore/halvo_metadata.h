@@ -2,7 +2,9 @@
 
 #include <optional>
 #include <string>
+#include <string_view>
 
+#include "client/log_message.h"
 #include "platform/bytes.h"
 #include "platform/error.h"
 #include "platform/property_list.h"
@@ -14,7 +16,12 @@ namespace appsync {
 std::optional<PropertyList::Dictionary> parseDictionary(ByteView bytes,
                                                         std::optional<Error>* error);
 
-// What an application's store metadata says of it.
+// What an application's store metadata says of it. A version or a name that is a number is taken in
+// digits; of another type it counts as missing.
+
+/// Says in the log which of them are no strings.
+void sayUnexpectedTypesOfMetadata(const ClientLog& log, std::string_view bundleId,
+                                  const PropertyList::Dictionary& metadata);
 
 std::optional<std::string> metadataVersion(const PropertyList::Dictionary& metadata);
 /// The title or, failing that, the item's name.

@@ -1,6 +1,7 @@
 // The applications of a restored backup: each becomes a placeholder or a coordinated restore.
 
 #include "client/apps_client.h"
+#include "client/identifier_safety.h"
 #include "client/missing.h"
 #include "client/paths.h"
 #include "restore/halvo_metadata.h"
@@ -123,6 +124,11 @@ bool AppsClient::_restoreApplications(const PropertyList::Dictionary& restoreLis
   const DemotedApps demoted(lists.value_or(PropertyList::Dictionary{}));
   bool result = false;
   for (const auto& [bundleId, value] : restoreList) {
+    // The whole path is tested, since ".." climbs out of the folder that it is joined to.
+    if (!isSafe(placeholderAppPathForBundleIdentifier(bundleId))) {
+      _log.normal("Ignoring invalid path: %{public}@", bundleId);
+      continue;
+    }
     const DemotionStatus status = demoted.statusOf(bundleId);
     _log.normal("processing halvo restore info for '%{public}@' demotionStatus :%lu", bundleId,
                 static_cast<std::uint64_t>(status));
@@ -153,6 +159,7 @@ bool AppsClient::_processHalvoRestoreInfoForApp(std::string_view bundleId, ByteV
     // Handled: trying again would not make it readable.
     return true;
   }
+  sayUnexpectedTypesOfMetadata(_log, bundleId, *metadata);
   PropertyList::Dictionary options = placeholderOptions(bundleId, InstallType::Restore);
   options.emplace(SWHalvoMetadataKey, Bytes(halvoMetaData.begin(), halvoMetaData.end()));
   options.emplace(SWApplicationSINFKey, sinfData ? PropertyList(*sinfData) : PropertyList::null());

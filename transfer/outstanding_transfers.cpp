@@ -1,6 +1,7 @@
 // Which packages the host must still send, and what is made ready for each of them.
 
 #include "client/apps_client.h"
+#include "client/identifier_safety.h"
 #include "client/missing.h"
 #include "client/paths.h"
 #include "transfer/in_progress_query.h"
@@ -63,6 +64,19 @@ bool packageIsHere(FileManager& files, const std::string& identifier,
   return false;
 }
 
+/// Whether the candidate's identifier and record give paths to work with.
+bool hasUsablePaths(const TransferCandidate& app, const ClientLog& log) {
+  if (!isSafe(app.iconPath)) {
+    log.normal("Ignoring invalid path: %{public}@", app.identifier);
+    return false;
+  }
+  if (!app.bundlePath || !app.container) {
+    log.normal("skipping %{public}@ - it has no bundle or no container", app.identifier);
+    return false;
+  }
+  return true;
+}
+
 }  // namespace
 
 std::vector<SyncAssetPtr> AppsClient::outstandingAssetTransfers() noexcept {
@@ -92,6 +106,7 @@ std::vector<SyncAssetPtr> AppsClient::outstandingAssetTransfers() noexcept {
   for (const PropertyList& entry : ordered) {
     const std::optional<TransferCandidate> candidate = readCandidate(entry, _platform.files);
     if (!candidate || !isWanted(*candidate, context, _log)) continue;
+    if (!hasUsablePaths(*candidate, _log)) continue;
     const SyncAssetPtr asset = _prepareAsset(*candidate);
     const bool handedOff =
         _useInstallCoordinator
@@ -106,13 +121,11 @@ std::vector<SyncAssetPtr> AppsClient::outstandingAssetTransfers() noexcept {
 SyncAssetPtr AppsClient::_prepareAsset(const TransferCandidate& app) {
   const std::string prettyName =
       app.displayName ? *app.displayName : app.nameFromHalvo.value_or(app.identifier);
-  const std::string container = app.container.value_or(std::string());
-  const std::string bundlePath = app.bundlePath.value_or(std::string());
   const bool rendered = _makeIconFromBundlePath(app.bundlePath, app.iconPath);
 
   SyncAssetPtr asset =
       _platform.syncHost.makeDownload(app.identifier, ApplicationDataclass, prettyName);
-  asset->icon = FileLocation::file(rendered ? app.iconPath : paths::artworkIn(container));
+  asset->icon = FileLocation::file(rendered ? app.iconPath : paths::artworkIn(*app.container));
   asset->isRestore = app.isRestore;
 
   const bool here =
@@ -122,8 +135,8 @@ SyncAssetPtr AppsClient::_prepareAsset(const TransferCandidate& app) {
   options.emplace(AssetPartsKey, static_cast<std::int64_t>(assetParts(app.isRestore, here)));
   if (app.version) options.emplace(AssetVersionKey, *app.version);
   asset->variantOptions = std::move(options);
-  asset->storePlist = paths::metadataIn(container);
-  asset->infoPlist = paths::infoIn(bundlePath);
+  asset->storePlist = paths::metadataIn(*app.container);
+  asset->infoPlist = paths::infoIn(*app.bundlePath);
   _log.normal(
       "Asset %{public}@ (pretty=%{public}@, version=%{public}@) prepped with icon %{public}@, at "
       "%{public}@, meta at %{public}@, info at %{public}@, storePid=%lld, isRestore=%c",

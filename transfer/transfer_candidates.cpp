@@ -2,6 +2,7 @@
 
 #include "client/identifier_safety.h"
 #include "client/paths.h"
+#include "client/usable_text.h"
 #include "platform/bundle.h"
 
 namespace appsync {
@@ -26,7 +27,9 @@ void putFrom(PropertyList::Dictionary& entry, std::string_view key, const Proper
   if (const PropertyList* value = source.find(sourceKey)) entry.emplace(key, *value);
 }
 
-PropertyList::Dictionary todoEntry(const PropertyList& todo, const std::string& identifier) {
+PropertyList::Dictionary todoEntry(const PropertyList& todo, const std::string& identifier,
+                                   const ClientLog& log) {
+  sayUnexpectedTypes(log, identifier, *todo.asDictionary(), {"version", "name"});
   const std::string path = joinPath(paths::WorkArea, identifier);
   PropertyList::Dictionary entry;
   entry.emplace(PathKey, path);
@@ -85,7 +88,7 @@ void addTodoEntries(const PropertyList::Array& todoList, CandidateEntries& entri
     if (entries.all.contains(identifier)) {
       log.normal("%{public}@ already has a placeholder - skipping", identifier);
     } else {
-      entries.all.emplace(identifier, todoEntry(todo, identifier));
+      entries.all.emplace(identifier, todoEntry(todo, identifier, log));
     }
   }
 }
@@ -98,9 +101,9 @@ std::optional<TransferCandidate> readCandidate(const PropertyList& value, FileMa
   candidate.identifier = *identifier;
   candidate.bundlePath = stringOf(*entry, PathKey);
   candidate.container = stringOf(*entry, ContainerKey);
-  candidate.version = stringOf(*entry, KBBundleVersion);
+  candidate.version = usableText(*entry, KBBundleVersion);
   candidate.displayName = displayNameOf(files, candidate.bundlePath);
-  candidate.nameFromHalvo = stringOf(*entry, NameFromHalvoKey);
+  candidate.nameFromHalvo = usableText(*entry, NameFromHalvoKey);
   candidate.iconPath = joinPath(paths::IconScratch, *identifier + ".png");
   candidate.isRestore = flagOf(*entry, IsRestoreKey);
   candidate.isAutoDemoted = flagOf(*entry, AutoDemotedKey);

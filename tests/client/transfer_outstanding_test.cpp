@@ -100,6 +100,59 @@ TEST_F(OutstandingTransfers, UnsafeIdentifiersAreLoggedAndContributeNothing) {
   EXPECT_TRUE(loggedMessage("Ignoring invalid path: (null)"));
 }
 
+TEST_F(OutstandingTransfers, IdentifiersThatLeaveTheFolderTheyAreJoinedToAreIgnored) {
+  phone.files.putFile(SyncRootPath + "/x.png", "of another");
+  phone.files.putFile("/var/mobile/evil.png", "of another");
+  seedRestore("com.evil");
+  phone.appRegistry.edit("com.evil",
+                         [](AppRecord& record) { record.bundleIdentifier = "../../../evil"; });
+  putEntries({install("../x"), install("..")});
+  EXPECT_THAT(requested(), IsEmpty());
+  EXPECT_TRUE(loggedMessage("Ignoring invalid path: ../../../evil"));
+  EXPECT_TRUE(loggedMessage("Ignoring invalid path: ../x"));
+  EXPECT_TRUE(loggedMessage("Ignoring invalid path: .."));
+  EXPECT_EQ(phone.files.textAt(SyncRootPath + "/x.png"), "of another");
+  EXPECT_EQ(phone.files.textAt("/var/mobile/evil.png"), "of another");
+  EXPECT_EQ(phone.trace.count("AppRegistry.installApplication"), 0u);
+}
+
+TEST_F(OutstandingTransfers, ARecordWithoutBundleOrContainerIsSkipped) {
+  seedRestore("com.a");
+  seedRestore("com.b");
+  phone.appRegistry.edit("com.a", [](AppRecord& record) { record.bundlePath.reset(); });
+  phone.appRegistry.edit("com.b", [](AppRecord& record) { record.bundleContainerPath.reset(); });
+  EXPECT_THAT(requested(), IsEmpty());
+  EXPECT_TRUE(loggedMessage("skipping com.a - it has no bundle or no container"));
+  EXPECT_TRUE(loggedMessage("skipping com.b - it has no bundle or no container"));
+  EXPECT_THAT(phone.host.made(), IsEmpty());
+}
+
+TEST_F(OutstandingTransfers, AVersionOrNameThatIsANumberIsTakenInDigitsAndSaid) {
+  putEntries({Dictionary{
+      {"operation", "install"}, {"identifier", "com.a"}, {"version", 3}, {"name", 2048}}});
+  const std::vector<SyncAssetPtr> assets = client().outstandingAssetTransfers();
+  ASSERT_THAT(identifiersOf(assets), ElementsAre("com.a"));
+  EXPECT_EQ(assets[0]->prettyName, "2048");
+  EXPECT_EQ(assets[0]->variantOptions, (Dictionary{{"AssetParts", 1}, {"Version", "3"}}));
+  EXPECT_THAT(phone.trace.log(),
+              testing::IsSupersetOf({"log error SyncBundle|unexpected type for version of com.a: 3",
+                                     "log error SyncBundle|unexpected type for name of com.a: "
+                                     "2048"}));
+}
+
+TEST_F(OutstandingTransfers, AVersionOrNameOfAnUnusableTypeIsSaidAndCountsAsMissing) {
+  putEntries({Dictionary{
+      {"operation", "install"}, {"identifier", "com.a"}, {"version", true}, {"name", Array{"A"}}}});
+  const std::vector<SyncAssetPtr> assets = client().outstandingAssetTransfers();
+  ASSERT_THAT(identifiersOf(assets), ElementsAre("com.a"));
+  EXPECT_EQ(assets[0]->prettyName, "com.a");
+  EXPECT_EQ(assets[0]->variantOptions, (Dictionary{{"AssetParts", 1}}));
+  EXPECT_THAT(phone.trace.log(),
+              testing::IsSupersetOf({"log error SyncBundle|unexpected type for version of com.a: 1",
+                                     "log error SyncBundle|unexpected type for name of com.a: "
+                                     "(A)"}));
+}
+
 TEST_F(OutstandingTransfers, ApplicationWithAPlaceholderIsWantedButNotRequestedAgain) {
   phone.appRegistry.seedPlaceholder("com.a", InstallType::Sync);
   putEntries({install("com.a")});
@@ -124,6 +177,8 @@ TEST_F(OutstandingTransfers, InProgressIsMissingFromTheResultAndRestoringIsNot) 
   EXPECT_TRUE(loggedMessage("Assets already in progress (not returning these): (com.busy)"));
   EXPECT_TRUE(loggedMessage("Assets currently restoring: (com.back)"));
   EXPECT_FALSE(loggedMessage("lastly com.busy"));
+  EXPECT_FALSE(
+      loggedMessage("Not creating a placeholder app for com.busy because we already have one"));
   EXPECT_TRUE(loggedMessage("lastly com.back"));
 }
 

@@ -153,6 +153,32 @@ TEST_F(RestoreListTest, BrokenEntriesAreSkipped) {
                                listKept()}));
 }
 
+constexpr const char* Victim = "/var/mobile/Containers/Applications/1/Victim.app/Info.plist";
+
+PropertyList::Dictionary climbingEntries() {
+  const PropertyList entry = entryWith(plainMetadata());
+  return {{"../../var/mobile/Containers/Applications/1/Victim", entry},
+          {"..", entry},
+          {"../x", entry},
+          {"a/../../b", entry}};
+}
+
+Trace climbersIgnored() {
+  return joined({{said("processing halvo restore info"),
+                  "log default Oversize|Demoted Apps: (null)", said("Ignoring invalid path: .."),
+                  said("Ignoring invalid path: ../../var/mobile/Containers/Applications/1/Victim"),
+                  said("Ignoring invalid path: ../x"), said("Ignoring invalid path: a/../../b")},
+                 listKept()});
+}
+
+TEST_F(RestoreListTest, IdentifiersThatClimbAreIgnored) {
+  phone.files.putFile(Victim, "untouched");
+  putList(climbingEntries());
+  EXPECT_FALSE(process());
+  EXPECT_EQ(effects(), climbersIgnored());
+  EXPECT_EQ(phone.files.textAt(Victim), "untouched");
+}
+
 TEST_F(RestoreListTest, TheLastApplicationProcessedDecides) {
   const PropertyList good = entryWith(plainMetadata());
   const PropertyList bad = entryWith({});
@@ -188,6 +214,14 @@ class CoordinatedRestoreListTest : public RestoredBackupTest {
     return phone.installCoordination.placeholders().back()->state().installType;
   }
 };
+
+TEST_F(CoordinatedRestoreListTest, IdentifiersThatClimbAreIgnored) {
+  phone.files.putFile(Victim, "untouched");
+  putList(climbingEntries());
+  EXPECT_FALSE(process());
+  EXPECT_EQ(effects(), climbersIgnored());
+  EXPECT_EQ(phone.files.textAt(Victim), "untouched");
+}
 
 TEST_F(CoordinatedRestoreListTest, HandsEveryPartOfAnEntryToItsCoordinator) {
   putList({{"com.r", entryWith(plainMetadata())}});

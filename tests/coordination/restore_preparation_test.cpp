@@ -91,7 +91,8 @@ struct NameCase {
 TEST_F(RestoreTest, ThePlaceholderIsCalledByTitleElseItemNameElseIdentifier) {
   const NameCase cases[] = {{{{"title", "Rho"}, {"itemName", "Item"}}, "Rho"},
                             {{{"itemName", "Item"}}, "Item"},
-                            {{{"title", 5}, {"itemName", "Item"}}, "Item"},
+                            {{{"title", 5}, {"itemName", "Item"}}, "5"},
+                            {{{"title", true}, {"itemName", "Item"}}, "Item"},
                             {{}, "com.r"}};
   for (const NameCase& given : cases) {
     client->_placeHolderForBundleIdentifier("com.r", given.metadata, sinf, icon,

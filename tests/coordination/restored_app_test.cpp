@@ -212,6 +212,23 @@ TEST_F(RestoredAppTest, TheItemNameServesAsBothNames) {
   EXPECT_EQ(infoValue(KBBundleDisplayName), PropertyList("Item"));
 }
 
+TEST_F(RestoredAppTest, AVersionAndANameThatAreNumbersAreTakenInDigitsAndSaid) {
+  EXPECT_TRUE(process({{"bundleVersion", 3}, {"title", 2048}}));
+  EXPECT_EQ(infoValue(KBBundleVersion), PropertyList("3"));
+  EXPECT_EQ(infoValue(KBBundleDisplayName), PropertyList("2048"));
+  EXPECT_THAT(effects(),
+              testing::IsSupersetOf({complained("unexpected type for bundleVersion of com.r: 3"),
+                                     complained("unexpected type for title of com.r: 2048")}));
+}
+
+TEST_F(RestoredAppTest, ATitleOfAnUnusableTypeGivesWayToTheItemName) {
+  EXPECT_TRUE(process(
+      {{"bundleVersion", "3"}, {"title", PropertyList::Array{"Rho"}}, {"itemName", "Item"}}));
+  EXPECT_EQ(infoValue(KBBundleDisplayName), PropertyList("Item"));
+  EXPECT_THAT(effects(),
+              testing::Contains(complained("unexpected type for title of com.r: (Rho)")));
+}
+
 TEST_F(RestoredAppTest, LaunchingIsProhibitedByEitherKeyTheFirstOneWinning) {
   struct {
     PropertyList::Dictionary flags;

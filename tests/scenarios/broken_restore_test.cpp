@@ -85,7 +85,9 @@ const Break Breaks[] = {
      NoInfo},
     {"no-version", [](Id id) { return withMetadataKey(id, "bundleVersion", {}); }, false, true,
      NoInfo},
-    {"version-is-a-number", [](Id id) { return withMetadataKey(id, "bundleVersion", 3); }, false,
+    {"version-is-a-number", [](Id id) { return withMetadataKey(id, "bundleVersion", 3); }, true,
+     true, ""},
+    {"version-is-true", [](Id id) { return withMetadataKey(id, "bundleVersion", true); }, false,
      true, NoInfo},
     {"no-name", [](Id id) { return withMetadataKey(id, "title", {}); }, false, true, NoInfo},
     {"name-is-a-list",
@@ -104,9 +106,9 @@ const Break Breaks[] = {
     {"entry-is-text", [](Id) -> PropertyList { return "restore me"; }, false, false, NoEntry},
     {"entry-is-empty", [](Id) -> PropertyList { return Dictionary{}; }, false, false, NoMetadata},
     {"../../escape", [](Id id) -> PropertyList { return goodEntry(id); }, false, false,
-     "processing halvo restore info for '%'"},
+     "Ignoring invalid path: %"},
     {"a/../../../../escape", [](Id id) -> PropertyList { return goodEntry(id); }, false, false,
-     "processing halvo restore info for '%'"},
+     "Ignoring invalid path: %"},
 };
 
 struct Restored {
