@@ -8,6 +8,9 @@
 namespace appsync {
 namespace {
 
+/// The key of an application that names no version, as in its placeholder.
+const std::string NoVersion;
+
 /// The dictionary under `key`, put there if the value is another or missing.
 PropertyList::Dictionary& dictionaryUnder(PropertyList::Dictionary& parent, std::string_view key) {
   PropertyList& child = parent[std::string(key)];
@@ -40,13 +43,12 @@ void writeXml(FileManager& files, PropertyList::Dictionary state) {
 std::optional<PropertyList> AppsClient::_restoreStatePropertyForKey(
     std::string_view key, std::string_view identifier,
     const std::optional<std::string>& version) const {
-  if (!version) return std::nullopt;
   std::optional<Error> error;
   const std::optional<Bytes> bytes = readState(_platform.files, _log, error);
   const std::optional<PropertyList::Dictionary> state = bytes ? stateIn(*bytes) : std::nullopt;
   if (!state) return std::nullopt;
   const PropertyList* versions = find(*state, identifier);
-  const PropertyList* properties = versions ? versions->find(*version) : nullptr;
+  const PropertyList* properties = versions ? versions->find(version.value_or(NoVersion)) : nullptr;
   const PropertyList* value = properties ? properties->find(key) : nullptr;
   return value ? std::optional(*value) : std::nullopt;
 }
@@ -54,7 +56,6 @@ std::optional<PropertyList> AppsClient::_restoreStatePropertyForKey(
 void AppsClient::_setRestoreStatePropertyValue(const PropertyList& value, std::string_view key,
                                                std::string_view identifier,
                                                const std::optional<std::string>& version) {
-  if (!version) return;
   const std::lock_guard lock(_stateFileMutex);
   std::optional<Error> error;
   const std::optional<Bytes> bytes = readState(_platform.files, _log, error);
@@ -65,7 +66,7 @@ void AppsClient::_setRestoreStatePropertyValue(const PropertyList& value, std::s
       bytes ? stateIn(*bytes) : PropertyList::Dictionary{};
   if (!state) return;
   PropertyList::Dictionary& versions = dictionaryUnder(*state, identifier);
-  dictionaryUnder(versions, *version).insert_or_assign(std::string(key), value);
+  dictionaryUnder(versions, version.value_or(NoVersion)).insert_or_assign(std::string(key), value);
   writeXml(_platform.files, std::move(*state));
 }
 

@@ -9,10 +9,9 @@
 namespace appsync {
 namespace {
 
-/// Empty when there is no such file or it holds no dictionary.
-PropertyList::Dictionary dictionaryAt(FileManager& files, const std::optional<std::string>& path) {
-  if (!path) return {};
-  return loadDictionary(files, *path).value_or(PropertyList::Dictionary{});
+std::optional<PropertyList::Dictionary> dictionaryAt(FileManager& files,
+                                                     const std::optional<std::string>& path) {
+  return path ? loadDictionary(files, *path) : std::nullopt;
 }
 
 }  // namespace
@@ -62,7 +61,7 @@ bool InstallPreparation::addInstallOptions() {
     log_.normal("coordinator for %{public}@ has install options", bundleId_);
     return true;
   }
-  storeMetadata_ = StoreMetadata::fromDictionary(store_);
+  storeMetadata_ = StoreMetadata::fromDictionary(store_.value_or(PropertyList::Dictionary{}));
   if (!coordinator_->setInstallOptions(installOptions(InstallType::Sync, storeMetadata_),
                                        &error_)) {
     log_.error("Error %{public}@ setting install options on coordinator for '%{public}@'", error_,
@@ -155,8 +154,9 @@ bool InstallPreparation::addIconPromise(const std::string& bundlePath) {
 }
 
 bool InstallPreparation::setAttributes() {
-  PlaceholderAttributes attributes = PlaceholderAttributes::fromInfoDictionary(info_);
-  attributes.setLaunchProhibited(infoProhibitsLaunch(info_));
+  const PropertyList::Dictionary info = info_.value_or(PropertyList::Dictionary{});
+  PlaceholderAttributes attributes = PlaceholderAttributes::fromInfoDictionary(info);
+  attributes.setLaunchProhibited(infoProhibitsLaunch(info));
   attributes.setBundleVersion(version_);
   if (!placeholder_->setPlaceholderAttributes(attributes, &error_)) {
     log_.error("Error %{public}@ setting attributes on placeholder for '%{public}@'", error_,

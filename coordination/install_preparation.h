@@ -43,8 +43,9 @@ class InstallPreparation {
   const SyncAsset& asset_;
   const bool existingApp_;
   const std::string& bundleId_;
-  const PropertyList::Dictionary info_;
-  const PropertyList::Dictionary store_;
+  /// none when there is no such file or it holds no dictionary.
+  const std::optional<PropertyList::Dictionary> info_;
+  const std::optional<PropertyList::Dictionary> store_;
   const std::optional<std::string> version_;
 
   std::shared_ptr<InstallCoordinator> coordinator_;

@@ -72,9 +72,12 @@ TEST_F(RestoreState, ALevelThatIsNoDictionaryIsReplacedByOne) {
   EXPECT_EQ(client()._restoreStatePropertyForKey("path", "com.b", "1.0"), PropertyList("/b"));
 }
 
-TEST_F(RestoreState, NothingIsSetWithoutAVersion) {
+TEST_F(RestoreState, NoVersionIsAVersionOfItsOwn) {
+  put(Dictionary{{"com.a", Dictionary{{"1.0", Dictionary{{"path", "/old"}}}}}});
   client()._setRestoreStatePropertyValue("/a", "path", "com.a", std::nullopt);
-  expectTrace({}, fakes::TraceAll);
+  EXPECT_EQ(client()._restoreStatePropertyForKey("path", "com.a", std::nullopt),
+            PropertyList("/a"));
+  EXPECT_EQ(client()._restoreStatePropertyForKey("path", "com.a", "1.0"), PropertyList("/old"));
 }
 
 TEST_F(RestoreState, AValueThatNoFileCanHoldIsNotWritten) {
@@ -153,6 +156,19 @@ TEST_F(RestoreState, CleaningThatCannotDeleteTheFileKeepsItForTheNextTime) {
   client().cleanRestoreStateForIdentifier("com.a");
   expectTrace({Remove});
   EXPECT_FALSE(phone.files.exists(RestoreStatePath));
+}
+
+TEST_F(RestoreState, CleaningAnIdentifierThatIsAbsentWritesTheOthersBack) {
+  put(Dictionary{{"com.b", Dictionary{}}});
+  client().cleanRestoreStateForIdentifier("com.a");
+  expectTrace({Write});
+  EXPECT_EQ(state(), PropertyList(Dictionary{{"com.b", Dictionary{}}}));
+}
+
+TEST_F(RestoreState, CleaningAnIdentifierThatIsAbsentDeletesAnEmptyList) {
+  put(Dictionary{});
+  client().cleanRestoreStateForIdentifier("com.a");
+  expectTrace({Remove});
 }
 
 TEST_F(RestoreState, CleaningWithoutAFileDoesNothing) {

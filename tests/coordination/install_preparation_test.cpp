@@ -109,7 +109,7 @@ TEST_F(InstallPreparationTest, AnAssetWithoutNameAndIdentifierIsRefusedAtOnce) {
   EXPECT_FALSE(prepare());
   EXPECT_THAT(effects(),
               ElementsAre("log default Oversize|processing app install for bundle '', title  "
-                          "assetplist {}, version 2.0 with install coordination",
+                          "assetplist (null), version 2.0 with install coordination",
                           R"(transaction step 1 party 1 phase 1 ok  "Install App")",
                           said("processing app install for bundle  finished with status 0 error "
                                "(null)"),
