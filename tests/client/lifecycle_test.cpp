@@ -1,5 +1,6 @@
 // What a client does when it is made and when it goes, and the small answers that it gives.
 #include <array>
+#include <atomic>
 #include <thread>
 #include <tuple>
 
@@ -64,6 +65,13 @@ TEST_P(AlmostTheSyncHost, IsAnotherProcess) {
   EXPECT_EQ(phone.notifier.observerCount(Startup), 0u);
   phone.notifier.post(Startup);
   EXPECT_EQ(phone.installCoordination.listenerCount(), 0u);
+}
+
+TEST_P(AlmostTheSyncHost, IsAnotherProcessAtTheEndOfTheClientToo) {
+  phone.host.setMainBundleIdentifier(GetParam());
+  client();
+  destroyClient();
+  expectTrace({"AppRegistry.removeObserver()"});
 }
 
 INSTANTIATE_TEST_SUITE_P(Identifiers, AlmostTheSyncHost,
@@ -227,21 +235,22 @@ TEST_F(InstallAttempts, AreZeroWhenReadTwiceWithNoInstallBetween) {
 }
 
 TEST_F(InstallAttempts, LoseNoCountBetweenAReadAndItsReset) {
-  constexpr std::uint32_t EachThread = 25;
+  constexpr std::uint32_t EachThread = 100;
+  std::atomic<int> running = 4;
   client();
   std::vector<SyncAssetPtr> assets;
   for (int i = 0; i < 4; ++i) assets.push_back(packageOf("com." + std::to_string(i)));
   std::vector<std::thread> installers;
   for (const SyncAssetPtr& asset : assets) {
-    installers.emplace_back([&client = client(), asset] {
+    installers.emplace_back([&client = client(), &running, asset] {
       for (std::uint32_t i = 0; i < EachThread; ++i) client._performAssetInstall(asset);
+      --running;
     });
   }
+  // Read without a pause, so that a read is nearly always between its halves, if it has any.
   std::uint32_t counted = 0;
-  for (std::thread& installer : installers) {
-    counted += client()._getAndResetNumAppInstallsAttempted();
-    installer.join();
-  }
+  while (running > 0) counted += client()._getAndResetNumAppInstallsAttempted();
+  for (std::thread& installer : installers) installer.join();
   counted += client()._getAndResetNumAppInstallsAttempted();
   EXPECT_EQ(counted, EachThread * assets.size());
 }

@@ -301,6 +301,14 @@ TEST_F(IconData, WithoutBytesIsNotWrittenAndTheSizeIsLeftUntouched) {
   expectTrace({"log error SyncBundle|no icon data for 'com.a'"}, fakes::TraceAll);
 }
 
+TEST_F(IconData, OfNoLengthIsWrittenAllTheSame) {
+  std::uint64_t size = 77;
+  EXPECT_TRUE(write(Bytes{}, &size));
+  EXPECT_EQ(size, 0u);
+  expectTrace({Create, line("1", "0")});
+  EXPECT_EQ(phone.files.textAt(IconPath), "");
+}
+
 TEST_F(IconData, ThatCannotBeWrittenLeavesTheSizeUntouched) {
   phone.faults.failEvery("FileManager.createFile", Error::posix(28));
   std::uint64_t size = 77;

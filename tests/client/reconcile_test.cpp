@@ -223,6 +223,31 @@ TEST_F(Reconcile, SendsAnIconLayoutThatIsNoPropertyListAsItIs) {
                              "HomeScreenService.setIconState(7)", WriteDebugCopy}));
 }
 
+/// Keeps the bytes of the layout that it was given.
+class LayoutKeepingHomeScreen : public fakes::FakeHomeScreen {
+ public:
+  using FakeHomeScreen::FakeHomeScreen;
+  int setIconState(Port, ByteView layout) noexcept override {
+    given = std::string(asText(layout));
+    return 0;
+  }
+
+  std::optional<std::string> given;
+};
+
+TEST_F(Reconcile, SendsTheBytesOfTheIconLayoutUnchanged) {
+  for (const std::string layout :
+       {"<plist version='1.0'>\n\n <array><string>com.a</string> </array></plist>\n", "?",
+        "bplist00"}) {
+    stageTodo({});
+    phone.files.putFile(StagedLayoutPath, layout);
+    LayoutKeepingHomeScreen homeScreen(phone.trace);
+    AppsClient reconciling(with(phone.platform(), homeScreen));
+    EXPECT_TRUE(reconciling.reconcileSync({}, "anchor", nullptr, nullptr));
+    EXPECT_EQ(homeScreen.given, layout);
+  }
+}
+
 TEST_F(Reconcile, ADebugCopyThatCannotBeWrittenDoesNotMatter) {
   stageTodo({});
   phone.faults.failEvery("FileManager.writeAtomically", Error::posix(28));

@@ -1,5 +1,11 @@
 // The end of a sync, and clearing everything.
+#include <functional>
+#include <latch>
+#include <thread>
+#include <utility>
+
 #include "tests/client/client_test.h"
+#include "tests/client/turns.h"
 
 namespace appsync {
 namespace {
@@ -218,6 +224,51 @@ TEST_F(ClearSyncData, GoesOnWhenTheSyncRootCannotBeRemoved) {
   phone.appRegistry.seedPlaceholder("com.a");
   client().clearSyncData();
   EXPECT_TRUE(phone.appRegistry.placeholderIdentifiers().empty());
+}
+
+/// Has something happen between the read and the write of a change.
+class InterruptedFiles : public fakes::FaultyFileManager {
+ public:
+  using FaultyFileManager::FaultyFileManager;
+  std::optional<Bytes> contentsAtPath(std::string_view path,
+                                      std::optional<Error>* error) noexcept override {
+    std::optional<Bytes> bytes = FaultyFileManager::contentsAtPath(path, error);
+    if (const auto now = std::exchange(afterRead, nullptr)) now();
+    return bytes;
+  }
+
+  std::function<void()> afterRead;
+};
+
+/// Tells when the clearing has begun.
+class ClearingLog : public fakes::FakeLog {
+ public:
+  using FakeLog::FakeLog;
+  void write(LogChannel channel, LogLevel level, std::string_view text) noexcept override {
+    FakeLog::write(channel, level, text);
+    if (text.ends_with("blasting work area")) began.count_down();
+  }
+
+  std::latch began{1};
+};
+
+TEST_F(ClearSyncData, WaitsForTheEndOfAChangeThatIsUnderWay) {
+  putTodo({{"com.a", "install"}});
+  InterruptedFiles files(phone.files, phone.faults);
+  ClearingLog log(phone.trace);
+  AppsClient clearing(with(with(phone.platform(), files), log));
+  forgetTrace();
+  std::thread other;
+  files.afterRead = [&] {
+    other = std::thread([&clearing] { clearing.clearSyncData(); });
+    log.began.wait();
+    seenInTurns([this] { return phone.trace.count("FileManager.removeItem") > 0; });
+  };
+  clearing.changeAssetID("com.a", "SENT");
+  other.join();
+  expectTrace({"FileManager.writeAtomically(" + TodoListPath + ")",
+               "FileManager.removeItem(" + SyncRootPath + ")"},
+              fakes::TraceFile);
 }
 
 TEST_F(ClearSyncData, LeavesTheListOfTheInventoryToTheNextSyncEnd) {
