@@ -12,8 +12,8 @@
 /// Paths are the phone's own. All files are property lists, binary or XML, unless said otherwise;
 /// each is replaced whole, so that nobody sees half of one. The client takes a missing, empty or
 /// damaged file as absent unless said otherwise; a damaged one also gives a log line. One that it
-/// cannot read just now it takes as absent for that call, says so, and leaves as it is. Keys that are
-/// not named here belong to the side that writes the file, and the other passes them through.
+/// cannot read just now it takes as absent for that call, says so, and leaves as it is. Keys that
+/// are not named here belong to the side that writes the file, and the other passes them through.
 namespace appsync::exchange {
 
 // A desktop sync.
