@@ -9,7 +9,8 @@ class BackupManager {
  public:
   virtual ~BackupManager() = default;
 
-  /// Whether the restored backup holds data that is still to be given back to the application.
+  /// Whether the restored backup holds data that is still to be given back to the application; true
+  /// also when that cannot be looked at just now, so that nobody goes on without it.
   virtual bool restoreDataExists(std::string_view bundleId) noexcept = 0;
   /// Gives up restoring the application; its data is not given back.
   virtual void cancelApplicationRestore(std::string_view bundleId) noexcept = 0;

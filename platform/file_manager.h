@@ -37,9 +37,10 @@ struct ItemAttributes {
 };
 
 /// The phone's file system. Every path is absolute and the phone's own ("/var/mobile/..."); a path
-/// that is relative, empty or holds a NUL byte fails with POSIX 22. Symbolic links are followed
-/// inside the phone's file system and never lead out of it. Failures carry POSIXErrorDomain.
-/// Called from any thread at once; calls on one path are as atomic as said and no more.
+/// that is relative, empty, holds a NUL byte or has a part "." or ".." fails with POSIX 22.
+/// Symbolic links are followed inside the phone's file system and never lead out of it. Failures
+/// carry POSIXErrorDomain. Called from any thread at once; calls on one path are as atomic as said
+/// and no more.
 class FileManager {
  public:
   virtual ~FileManager() = default;
