@@ -59,17 +59,20 @@ std::deque<KeyedWorkers::Pending>::iterator KeyedWorkers::next() {
   });
 }
 
-void KeyedWorkers::waitForChange(Lock& lock) {
-  // A job that is due already waits for its key, whose end is a change.
-  const auto now = Clock::now();
-  auto wake = Clock::time_point::max();
-  for (const Pending& each : pending_) {
-    if (each.due > now) wake = std::min(wake, each.due);
+std::optional<KeyedWorkers::Clock::time_point> KeyedWorkers::nextLook(
+    const std::deque<Pending>& pending, Clock::time_point now) {
+  std::optional<Clock::time_point> next;
+  for (const Pending& each : pending) {
+    if (each.due > now) next = std::min(next.value_or(each.due), each.due);
   }
-  if (wake == Clock::time_point::max()) {
-    changed_.wait(lock);
+  return next;
+}
+
+void KeyedWorkers::waitForChange(Lock& lock) {
+  if (const auto next = nextLook(pending_, Clock::now())) {
+    changed_.wait_until(lock, *next);
   } else {
-    changed_.wait_until(lock, wake);
+    changed_.wait(lock);
   }
 }
 

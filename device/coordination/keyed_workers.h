@@ -6,6 +6,7 @@
 #include <functional>
 #include <map>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <thread>
@@ -37,13 +38,18 @@ class KeyedWorkers {
   /// Does all that was added, without delay, and ends the threads. Not to be called from a job.
   void stop();
 
- private:
   using Clock = std::chrono::steady_clock;
   struct Pending {
     std::string key;
     Job job;
     Clock::time_point due;
   };
+  /// When a worker that finds nothing to do is to look again by itself; none when only a change can
+  /// bring something: a job that is due already waits for its key, whose end is a change.
+  static std::optional<Clock::time_point> nextLook(const std::deque<Pending>& pending,
+                                                   Clock::time_point now);
+
+ private:
   using Lock = std::unique_lock<std::mutex>;
 
   void run();
