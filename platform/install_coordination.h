@@ -63,9 +63,10 @@ struct PlaceholderAttributes {
 
 std::string description(const PlaceholderAttributes& attributes);
 
-/// Data that a client owes to a coordinator. Objects of this family are shared, live and callable
-/// from any thread; they stay usable (without effect) after the service has settled or cancelled
-/// them.
+/// Data that a client owes to a coordinator, and to one only: another one refuses it. Objects of
+/// this family are shared, live and callable from any thread. After the service has settled or
+/// cancelled them they stay readable; operations that give a result then fail with an error, the
+/// others do nothing.
 class DataPromise {
  public:
   virtual ~DataPromise() = default;
@@ -94,7 +95,9 @@ class PathTransferPromise : public DataPromise {
 /// A promise kept by somebody else's means; only its progress and completion are told.
 class OutOfBandTransferPromise : public DataPromise {};
 
-/// The application shown on the home screen until its package is installed.
+/// The application shown on the home screen until its package is installed. Where nothing but a
+/// placeholder of another sort is left of the application (demoted, or waiting for its restore),
+/// that one is shown instead of a sync's, and stays as it was if the install fails or is cancelled.
 class InstallPlaceholder {
  public:
   virtual ~InstallPlaceholder() = default;
@@ -106,7 +109,7 @@ class InstallPlaceholder {
                                         std::optional<Error>* error) noexcept = 0;
   virtual bool setMetadata(const StoreMetadata& metadata, std::optional<Error>* error) noexcept = 0;
   virtual bool setSinfData(ByteView sinf, std::optional<Error>* error) noexcept = 0;
-  /// Nothing more will be set; the service may install it.
+  /// Nothing more will be set; the placeholder may be handed over.
   virtual bool setConfigurationComplete(std::optional<Error>* error) noexcept = 0;
   virtual bool cancel(const Error& reason, CoordinationClientId client) noexcept = 0;
   virtual std::string description() const = 0;
@@ -114,8 +117,8 @@ class InstallPlaceholder {
 
 class InstallCoordinator;
 
-/// Receives coordinator events, each once, on a service thread. The coordinator is valid for the
-/// call.
+/// Receives coordinator events, one after another, on a service thread. The coordinator is valid
+/// for the call. An event comes once; a process that dies while it receives one gets it anew.
 class CoordinatorObserver {
  public:
   virtual ~CoordinatorObserver() = default;
@@ -125,12 +128,15 @@ class CoordinatorObserver {
   virtual void coordinatorDidCompleteSuccessfully(InstallCoordinator& coordinator) noexcept = 0;
   /// The person asks for this application first.
   virtual void coordinatorShouldPrioritize(InstallCoordinator& coordinator) noexcept = 0;
+  /// Comes only while the process lives in which it was cancelled; a creator's own cancel is not
+  /// told to it.
   virtual void coordinatorCanceledWithReason(InstallCoordinator& coordinator, const Error& reason,
                                              CoordinationClientId client) noexcept = 0;
 };
 
 /// One application's install, update or restore, owned by the coordination service; this is a
-/// shared handle to it. Setters give false and an error when the service refuses.
+/// shared handle to it. Setters give false and an error when the service refuses, or when the
+/// coordinator is over. It is also over, untold, when its placeholder is taken out of the registry.
 class InstallCoordinator {
  public:
   virtual ~InstallCoordinator() = default;
@@ -138,7 +144,7 @@ class InstallCoordinator {
   /// none: the event's coordinator is not known any more.
   virtual std::optional<std::string> bundleIdentifier() const = 0;
   virtual CoordinationClientId creatorIdentifier() const noexcept = 0;
-  /// Why the install failed or was cancelled; none while all is well.
+  /// Why the install failed, was cancelled or cannot go on now; none while all is well.
   virtual std::optional<Error> error() const = 0;
   /// Borrows the observer (nullptr: no observer) until it is replaced or unregistered by
   /// InstallCoordination::removeObserver.
@@ -168,7 +174,8 @@ class InstallCoordinator {
                                   std::optional<Error>* error) noexcept = 0;
 
   virtual bool hasPlaceholderPromise() const noexcept = 0;
-  /// A null placeholder is refused with an error.
+  /// Refused with an error: none, one of another application, and one whose configuration is not
+  /// complete, which nobody might ever complete.
   virtual bool setPlaceholderPromise(const std::shared_ptr<InstallPlaceholder>& placeholder,
                                      std::optional<Error>* error) noexcept = 0;
 
@@ -193,8 +200,11 @@ class InstallCoordination {
   virtual bool coordinationIsEnabled() noexcept = 0;
 
   /// The application's coordinator: the live one, whatever its kind and whoever made it, else a new
-  /// one of this kind. nullptr when there is none and none is to be made, or when it failed (with
-  /// an error). `created` may be null.
+  /// one of this kind. Only the demoted restore, which ends without a package, and the other kinds
+  /// do not stand in for one another: asked to make one, the service ends a live one of the other
+  /// sort that is this client's own, untold, and refuses to while it is another client's or past
+  /// cancelling. nullptr when there is none and none is to be made, or when it failed (with an
+  /// error). `created` may be null.
   virtual std::shared_ptr<InstallCoordinator> coordinatorFor(
       CoordinatorKind kind, std::string_view bundleId, CoordinationClientId client,
       bool createIfNotExisting, bool* created, std::optional<Error>* error) noexcept = 0;

@@ -5,7 +5,6 @@
 #include <cerrno>
 
 #include "device/apps/demotion.h"
-#include "device/apps/installers.h"
 #include "device/apps/installs.h"
 #include "device/apps/removal.h"
 #include "device/base/identifiers.h"
@@ -51,7 +50,7 @@ bool canBeAskedFor(InstallType placeholder) {
          placeholder == InstallType::StoreDownload;
 }
 
-PlaceholderOptions placeholderOptions(const PropertyList::Dictionary& options) {
+InstallDetails placeholderDetails(const PropertyList::Dictionary& options) {
   const PropertyList* type = find(options, SWInstallTypeKey);
   return {static_cast<InstallType>(type ? type->asUnsigned().value_or(0) : 0),
           dataOption(options, SWHalvoMetadataKey), dataOption(options, SWApplicationSINFKey)};
@@ -132,23 +131,31 @@ bool DeviceAppRegistry::installApplication(const FileLocation& package,
     setError(error, invalid("the options lack an identifier or a known package type"));
     return false;
   }
-  if (placeholder != package.isDirectory) {
-    setError(error, invalid(placeholder ? "a placeholder is installed from its directory"
-                                        : "a package is installed from a file"));
+  if (placeholder && !package.isDirectory) {
+    setError(error, invalid("a placeholder is installed from its directory"));
     return false;
   }
   if (placeholder) {
     const auto install = [&](const std::string& id, std::optional<Error>* reason) {
-      return installPlaceholder(core_, package.path, id, placeholderOptions(options), reason);
+      return installPlaceholder(core_, package.path, id, placeholderDetails(options), reason);
     };
     return changeApplication(*identifier, install, error);
   }
+  return installPackageWith(package, *identifier, {}, error);
+}
+
+bool DeviceAppRegistry::installPackageWith(const FileLocation& package,
+                                           const std::string& identifier,
+                                           const InstallDetails& details,
+                                           std::optional<Error>* error) noexcept {
   std::optional<Error> reason;
   const auto install = [&](const std::string& id, std::optional<Error>* why) {
-    return installPackage(core_, package.path, id, why);
+    if (!package.isDirectory) return installPackage(core_, package.path, id, details, why);
+    setError(why, invalid("a package is installed from a file"));
+    return false;
   };
-  const bool installed = changeApplication(*identifier, install, &reason);
-  core_.watcher.installFinished(*identifier, reason);
+  const bool installed = changeApplication(identifier, install, &reason);
+  core_.watcher.installFinished(identifier, reason);
   if (reason) setError(error, std::move(*reason));
   return installed;
 }

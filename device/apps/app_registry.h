@@ -1,5 +1,6 @@
 #pragma once
 
+#include "device/apps/installers.h"
 #include "device/state/device_core.h"
 #include "platform/app_registry.h"
 
@@ -25,6 +26,10 @@ class DeviceAppRegistry final : public AppRegistry {
                                                    InstallPhase phase) noexcept override;
   std::shared_ptr<InstallProgress> installProgressSync(const AppRecord& record) noexcept override;
   void installPhaseFinished(InstallProgress& progress) noexcept override;
+
+  /// Installs a package of which more is said than in its file, like installApplication.
+  bool installPackageWith(const FileLocation& package, const std::string& identifier,
+                          const InstallDetails& details, std::optional<Error>* error) noexcept;
 
   /// What a person does: the application goes with its placeholder and data.
   bool removeApplication(std::string_view bundleId, std::optional<Error>* error) noexcept;

@@ -46,11 +46,11 @@ bool buildBundle(FileManager& files, const ApplicationRow& installed, const std:
 bool layPlaceholder(DeviceCore& core, const ApplicationRow& installed,
                     std::optional<Error>* error) {
   const std::string bundle = joinPath(BundleParts, installed.identifier + ".app");
-  PlaceholderOptions options{InstallType::IntentionalDowngrade, std::nullopt, installed.sinf};
+  InstallDetails details{InstallType::IntentionalDowngrade, std::nullopt, installed.sinf};
   const std::string metadata = joinPath(installed.container, "HalvoMetadata.plist");
-  if (!readIfThere(core.files, metadata, options.metadata, error)) return false;
+  if (!readIfThere(core.files, metadata, details.metadata, error)) return false;
   const bool laid = buildBundle(core.files, installed, bundle, error) &&
-                    installPlaceholder(core, bundle, installed.identifier, options, error);
+                    installPlaceholder(core, bundle, installed.identifier, details, error);
   core.files.removeItem(bundle);
   return laid;
 }

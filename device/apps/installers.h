@@ -12,20 +12,22 @@ namespace appsync::device {
 // everything as it was when it returns false or the machine goes down before. The identifier is
 // usable and the caller holds its application lock.
 
-/// Installs an application package in the place of the installed version and of the placeholder.
-bool installPackage(DeviceCore& core, const std::string& package, const std::string& identifier,
-                    std::optional<Error>* error);
-
-struct PlaceholderOptions {
+/// What is said of an application beside its bundle.
+struct InstallDetails {
   InstallType installType = InstallType::None;
   std::optional<Bytes> metadata;  ///< becomes the container's HalvoMetadata.plist
   std::optional<Bytes> sinf;
 };
 
+/// Installs an application package in the place of the installed version and of the placeholder.
+/// What `details` leave open is taken over from those.
+bool installPackage(DeviceCore& core, const std::string& package, const std::string& identifier,
+                    const InstallDetails& details, std::optional<Error>* error);
+
 /// Installs a placeholder from its bundle directory, which it copies, and begins the application's
 /// install. It replaces an earlier placeholder and lies over an installed version.
 bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
-                        const std::string& identifier, const PlaceholderOptions& options,
+                        const std::string& identifier, const InstallDetails& details,
                         std::optional<Error>* error);
 
 /// Registers an application that comes with the system.

@@ -46,7 +46,7 @@ bool prepareData(DeviceCore& core, const std::string& identifier, const Applicat
 
 bool extractInto(DeviceCore& core, const std::string& package, const std::string& container,
                  const std::string& identifier, ApplicationRow& row, const ApplicationRows& before,
-                 std::optional<Error>* error) {
+                 const InstallDetails& details, std::optional<Error>* error) {
   const FileDescriptor file = core.handles.openFile(package, error);
   if (!file) return false;
   const FileDescriptor target = core.handles.openDirectory(container, error);
@@ -57,7 +57,12 @@ bool extractInto(DeviceCore& core, const std::string& package, const std::string
   row.bundle = extracted->bundleName;
   row.diskUsage = extracted->bytes;
   describe(row, extracted->info);
-  return (extracted->hasMetadata || carryOver(core, MetadataFile, before, container, error)) &&
+  if (!extracted->hasMetadata && details.metadata &&
+      !core.files.writeAtomically(joinPath(container, MetadataFile), *details.metadata, error)) {
+    return false;
+  }
+  const bool hasMetadata = extracted->hasMetadata || details.metadata;
+  return (hasMetadata || carryOver(core, MetadataFile, before, container, error)) &&
          (extracted->hasArtwork || carryOver(core, ArtworkFile, before, container, error));
 }
 
@@ -72,12 +77,15 @@ bool readMetadata(DeviceCore& core, ApplicationRow& row, std::optional<Error>* e
   return true;
 }
 
-void inherit(ApplicationRow& row, const ApplicationRows& before) {
+void inherit(ApplicationRow& row, const ApplicationRows& before, const InstallDetails& details) {
   row.type = before.type();
   if (before.installed) row.sinf = before.installed->sinf;
-  if (!before.placeholder) return;
-  row.installType = before.placeholder->installType;
-  if (before.placeholder->sinf) row.sinf = before.placeholder->sinf;
+  if (before.placeholder) {
+    row.installType = before.placeholder->installType;
+    if (before.placeholder->sinf) row.sinf = before.placeholder->sinf;
+  }
+  if (details.installType != InstallType::None) row.installType = details.installType;
+  if (details.sinf) row.sinf = details.sinf;
 }
 
 bool switchTo(DeviceCore& core, const ApplicationRow& row, const ApplicationRows& before,
@@ -96,15 +104,16 @@ bool switchTo(DeviceCore& core, const ApplicationRow& row, const ApplicationRows
 }
 
 bool replaceApplication(DeviceCore& core, const std::string& package, const std::string& identifier,
-                        const ApplicationRows& before, std::optional<Error>* error) {
+                        const ApplicationRows& before, const InstallDetails& details,
+                        std::optional<Error>* error) {
   StagedContainer staged(core, error);
   if (!staged.isMade()) return false;
   ApplicationRow row;
   row.identifier = identifier;
   row.container = staged.path();
-  inherit(row, before);
+  inherit(row, before, details);
   // One flush for all files of the package, before a row of the registry names them.
-  if (!extractInto(core, package, staged.path(), identifier, row, before, error) ||
+  if (!extractInto(core, package, staged.path(), identifier, row, before, details, error) ||
       !readMetadata(core, row, error) || !prepareData(core, identifier, before, error) ||
       !core.containers.flush(error) || !switchTo(core, row, before, error)) {
     return false;
@@ -133,14 +142,14 @@ void markFailed(DeviceCore& core, const std::string& identifier) {
 }  // namespace
 
 bool installPackage(DeviceCore& core, const std::string& package, const std::string& identifier,
-                    std::optional<Error>* error) {
+                    const InstallDetails& details, std::optional<Error>* error) {
   ApplicationRows before;
   const bool read = core.database.read(
       "the registry could not be read",
       [&](SQLite::Database& database) { before = findApplication(database, identifier); }, error);
   if (!read) return false;
   markInstalling(core, identifier);
-  const bool installed = replaceApplication(core, package, identifier, before, error);
+  const bool installed = replaceApplication(core, package, identifier, before, details, error);
   if (!installed) markFailed(core, identifier);
   core.observers.installsChanged();
   return installed;

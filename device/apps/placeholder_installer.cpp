@@ -47,15 +47,15 @@ std::uint64_t sizeOf(DeviceCore& core, const std::string& file) {
   return attributes ? attributes->size : 0;
 }
 
-bool fill(DeviceCore& core, const std::string& source, const PlaceholderOptions& options,
+bool fill(DeviceCore& core, const std::string& source, const InstallDetails& details,
           ApplicationRow& row, std::optional<Error>* error) {
   if (!core.files.copyItem(source, row.bundlePath(), error)) return false;
   row.diskUsage = sizeOf(core, joinPath(row.bundlePath(), "Info.plist")) +
                   sizeOf(core, joinPath(row.bundlePath(), "Icon.png"));
-  if (!options.metadata) return true;
+  if (!details.metadata) return true;
   const std::string metadata = joinPath(row.container, "HalvoMetadata.plist");
-  row.diskUsage += options.metadata->size();
-  return core.files.writeAtomically(metadata, *options.metadata, error);
+  row.diskUsage += details.metadata->size();
+  return core.files.writeAtomically(metadata, *details.metadata, error);
 }
 
 /// A sync's placeholder that a power failure takes is made anew by the next sync; any other is all
@@ -82,7 +82,7 @@ bool enter(DeviceCore& core, ApplicationRow& row, std::optional<ApplicationRow>&
 }  // namespace
 
 bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
-                        const std::string& identifier, const PlaceholderOptions& options,
+                        const std::string& identifier, const InstallDetails& details,
                         std::optional<Error>* error) {
   const auto info = readInfo(core, bundleDirectory, identifier, error);
   if (!info) return false;
@@ -93,11 +93,11 @@ bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
   row.placeholder = true;
   row.container = staged.path();
   row.bundle = bundleName(bundleDirectory, identifier);
-  row.installType = options.installType;
-  row.sinf = options.sinf;
+  row.installType = details.installType;
+  row.sinf = details.sinf;
   describe(row, *info);
   std::optional<ApplicationRow> replaced;
-  if (!fill(core, bundleDirectory, options, row, error) ||
+  if (!fill(core, bundleDirectory, details, row, error) ||
       (mustLast(row) && !core.containers.flush(error)) || !enter(core, row, replaced, error)) {
     return false;
   }

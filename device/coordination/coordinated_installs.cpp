@@ -3,7 +3,9 @@
 #include <fmt/format.h>
 
 #include <cerrno>
+#include <utility>
 
+#include "device/apps/installs.h"
 #include "device/coordination/coordination_core.h"
 #include "device/coordination/coordination_values.h"
 #include "device/state/application_rows.h"
@@ -51,6 +53,20 @@ PropertyList::Dictionary optionsOf(const PlaceholderRow& row) {
   }
   if (row.sinf) options.emplace(SWApplicationSINFKey, *row.sinf);
   return options;
+}
+
+/// What the options say of a package that takes its placeholder's place.
+InstallDetails detailsOf(const Bytes& options) {
+  const auto given = optionsFrom(options).value_or(InstallOptions{});
+  return {given.installType, metadataFile(given.storeMetadata), given.sinfData};
+}
+
+/// Whether a sync finds all that is left of an application: if the sync comes to nothing, that must
+/// not be gone.
+bool isToStay(SQLite::Database& database, const PlaceholderRow& placeholder) {
+  const ApplicationRows present = findApplication(database, placeholder.identifier);
+  return placeholder.installType == InstallType::Sync && !present.installed &&
+         present.placeholder && present.placeholder->installType != InstallType::Sync;
 }
 
 bool isFile(FileManager& files, const std::string& path) {
@@ -106,19 +122,30 @@ void CoordinatedInstalls::advance(const std::string& identifier) {
   }
 }
 
-void CoordinatedInstalls::removePlaceholder(const std::string& identifier) {
-  const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
-  core_.registry().uninstallApplication(identifier, options);
+void CoordinatedInstalls::removePlaceholder(const std::string& identifier,
+                                            const PlaceholderRow& placeholder) {
+  if (placeholder.presence != Presence::Adopted) {
+    const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
+    core_.registry().uninstallApplication(identifier, options);
+    return;
+  }
+  core_.device().database.change("an install could not be ended", Database::Commit::Ordinary,
+                                 [&](SQLite::Database& database) {
+                                   endInstall(database, identifier, InstallState::Canceled);
+                                 });
+  core_.device().observers.installsChanged();
 }
 
 void CoordinatedInstalls::tidyUp(const std::string& identifier) {
   Leftovers left;
   core_.read([&](SQLite::Database& database) { left = findLeftovers(database, identifier); });
   for (const PlaceholderRow& placeholder : left.placeholders) {
-    removePlaceholder(identifier);
+    removePlaceholder(identifier, placeholder);
+    // What cannot be written is found, and tidied up, again.
     core_.change(
         [&](SQLite::Database& database, Consequences&) {
-          if (findApplication(database, identifier).placeholder) return;
+          const bool isAdopted = placeholder.presence == Presence::Adopted;
+          if (!isAdopted && findApplication(database, identifier).placeholder) return;
           setPresence(database, placeholder, Presence::None);
         },
         nullptr);
@@ -132,35 +159,60 @@ void CoordinatedInstalls::tidyUp(const std::string& identifier) {
   }
 }
 
-bool CoordinatedInstalls::installPlaceholder(const CoordinatorState& state) {
-  const PlaceholderRow& placeholder = *state.placeholder;
-  const std::int64_t coordinator = state.coordinator.number;
-  const auto mark = [&](Presence presence) {
-    bool wanted = false;
-    const bool marked = core_.change(
-        [&](SQLite::Database& database, Consequences& consequences) {
-          const auto row = findCoordinator(database, coordinator);
-          const auto present = findPlaceholder(database, placeholder.number);
-          wanted = row && present && row->isLive() && row->placeholder == placeholder.number;
-          if (!wanted) return;
-          setPresence(database, *present, presence);
-          if (presence != Presence::Installed) return;
-          addEvent(database, *row, EventKind::PlaceholderInstalled);
-          consequences.events = true;
-        },
-        nullptr);
-    return marked && wanted;
-  };
-  // Noted first, so that whoever cancels meanwhile, or a crash, leaves no placeholder behind.
-  if (!mark(Presence::Begun)) return false;
-  const std::string directory = joinPath(PlaceholderBundles, std::to_string(placeholder.number));
-  const std::string bundle = joinPath(directory, placeholder.identifier + ".app");
+bool CoordinatedInstalls::change(const CoordinatorState& state,
+                                 const std::function<void(SQLite::Database&, Consequences&)>& work,
+                                 Database::Commit commit) {
   std::optional<Error> error;
-  const bool installed = buildBundle(state, bundle, &error) && installBundle(state, bundle, &error);
-  core_.device().files.removeItem(directory);
-  if (installed) return mark(Presence::Installed);
+  if (core_.change(work, &error, commit)) return true;
+  core_.noteTrouble(state.coordinator.number, *error);
+  return false;
+}
+
+Presence CoordinatedInstalls::note(const CoordinatorState& state, Presence presence) {
+  Presence noted = Presence::None;
+  const bool changed = change(state, [&](SQLite::Database& database, Consequences& consequences) {
+    const auto row = findCoordinator(database, state.coordinator.number);
+    const auto placeholder = findPlaceholder(database, state.placeholder->number);
+    if (!row || !placeholder || !row->isLive() || row->placeholder != placeholder->number) return;
+    const bool adopts = presence == Presence::Begun && isToStay(database, *placeholder);
+    noted = adopts ? Presence::Adopted : presence;
+    setPresence(database, *placeholder, noted);
+    if (noted == Presence::Begun) return;
+    if (adopts) beginInstall(database, placeholder->identifier);
+    addEvent(database, *row, EventKind::PlaceholderInstalled);
+    consequences.events = true;
+  });
+  return changed ? noted : Presence::None;
+}
+
+bool CoordinatedInstalls::installPlaceholder(const CoordinatorState& state) {
+  // Noted first, so that whoever cancels meanwhile, or a crash, leaves no placeholder behind.
+  switch (note(state, Presence::Begun)) {
+    case Presence::None:
+    case Presence::Installed:
+      return false;
+    case Presence::Adopted:
+      core_.device().observers.installsChanged();
+      return true;
+    case Presence::Begun:
+      break;
+  }
+  std::optional<Error> error;
+  if (layPlaceholder(state, &error)) return note(state, Presence::Installed) != Presence::None;
   finish(state, error);
   return false;
+}
+
+bool CoordinatedInstalls::layPlaceholder(const CoordinatorState& state,
+                                         std::optional<Error>* error) {
+  const PlaceholderRow& placeholder = *state.placeholder;
+  const std::string directory = joinPath(PlaceholderBundles, std::to_string(placeholder.number));
+  const std::string bundle = joinPath(directory, placeholder.identifier + ".app");
+  const bool laid = buildBundle(state, bundle, error) &&
+                    core_.registry().installApplication(FileLocation::directory(bundle),
+                                                        optionsOf(placeholder), error);
+  core_.device().files.removeItem(directory);
+  return laid;
 }
 
 bool CoordinatedInstalls::buildBundle(const CoordinatorState& state, const std::string& bundle,
@@ -188,12 +240,6 @@ void CoordinatedInstalls::copyIcon(const CoordinatorState& state, const std::str
                         state.coordinator.identifier, error->localizedDescription()));
 }
 
-bool CoordinatedInstalls::installBundle(const CoordinatorState& state, const std::string& bundle,
-                                        std::optional<Error>* error) {
-  return core_.registry().installApplication(FileLocation::directory(bundle),
-                                             optionsOf(*state.placeholder), error);
-}
-
 bool CoordinatedInstalls::completeDemoted(const CoordinatorState& state) {
   finish(state, std::nullopt);
   return false;
@@ -204,105 +250,90 @@ bool CoordinatedInstalls::installPackage(const CoordinatorState& state) {
   const Foreground::HoldResult held = core_.device().foreground.hold(identifier);
   if (!held.hold) {
     const std::optional<Error> error =
-        held.isRunning ? waitForForeground(identifier) : Error::posix(EIO, identifier);
+        held.isRunning ? waitForForeground(state.coordinator) : Error::posix(EIO, identifier);
     if (error) finish(state, error);
     return false;
   }
-  {
-    const std::lock_guard lock(mutex_);
-    waiting_.erase(identifier);
-  }
   const Beginning beginning = begin(state);
   if (beginning != Beginning::Made) return beginning == Beginning::NotReady;
-  const PropertyList::Dictionary options{{std::string(SWPackageTypeKey), SWPackageTypeCustomer},
-                                         {std::string(KBBundleIdentifier), identifier}};
   std::optional<Error> error;
   const FileLocation package{*state.package->path, state.package->pathIsDirectory};
-  const bool installed =
-      adoptOptions(state, &error) && core_.registry().installApplication(package, options, &error);
+  const bool installed = core_.registry().installPackageWith(
+      package, identifier, detailsOf(*state.coordinator.options), &error);
   finish(state, installed ? std::nullopt : error);
   return false;
 }
 
 CoordinatedInstalls::Beginning CoordinatedInstalls::begin(const CoordinatorState& state) {
   bool ready = false;
-  const bool begun = core_.change(
-      [&](SQLite::Database& database, Consequences&) {
-        auto row = findCoordinator(database, state.coordinator.number);
-        ready = row && row->package == state.coordinator.package &&
-                nextStep(loadState(database, *row)) == Step::InstallPackage;
-        if (!ready) return;
-        row->stage = Stage::Installing;
-        put(database, *row);
-      },
-      nullptr);
+  const bool begun = change(state, [&](SQLite::Database& database, Consequences&) {
+    auto row = findCoordinator(database, state.coordinator.number);
+    ready = row && row->package == state.coordinator.package &&
+            nextStep(loadState(database, *row)) == Step::InstallPackage;
+    if (!ready) return;
+    row->stage = Stage::Installing;
+    put(database, *row);
+  });
   if (!begun) return Beginning::Failed;
   return ready ? Beginning::Made : Beginning::NotReady;
 }
 
-bool CoordinatedInstalls::adoptOptions(const CoordinatorState& state, std::optional<Error>* error) {
-  const auto options = optionsFrom(*state.coordinator.options);
-  if (!options) return true;
-  std::string container;
-  const bool adopted = core_.change(
-      [&](SQLite::Database& database, Consequences&) {
-        auto row = findApplication(database, state.coordinator.identifier).placeholder;
-        if (!row) return;
-        container = row->container;
-        if (options->installType != InstallType::None) row->installType = options->installType;
-        if (options->sinfData) row->sinf = options->sinfData;
-        putApplication(database, *row);
-      },
-      error);
-  const std::optional<Bytes> metadata = metadataFile(options->storeMetadata);
-  if (!adopted || container.empty() || !metadata) return adopted;
-  FileManager& files = core_.device().files;
-  const std::string file = joinPath(container, MetadataFile);
-  if (!files.fileExists(file)) files.writeAtomically(file, *metadata);
-  return true;
-}
-
 void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optional<Error>& error) {
+  const auto end = [&](bool isOver, Database::Commit commit) {
+    return change(
+        state,
+        [&](SQLite::Database& database, Consequences& consequences) {
+          auto row = findCoordinator(database, state.coordinator.number);
+          if (!row || !row->isLive()) return;
+          if (isOver) return complete(database, *row, error, consequences);
+          row->error = bytesOf(*error);
+          put(database, *row);
+          setPresence(database, *state.placeholder, state.placeholder->presence);
+        },
+        commit);
+  };
   if (error) {
     core_.log(fmt::format("The coordinated install of {} failed: {}", state.coordinator.identifier,
                           error->localizedDescription()));
+    // On record before anything is taken away: what is not, is tried again when the device is next
+    // opened.
+    if (!end(false, Database::Commit::Ordinary)) return;
     // Before anybody hears of it, so that whoever does finds the phone as it is to stay.
-    removePlaceholder(state.coordinator.identifier);
+    if (state.placeholder->presence != Presence::None) {
+      removePlaceholder(state.coordinator.identifier, *state.placeholder);
+    }
   }
-  // If this fails, what is still on record is carried on when the device is next opened.
-  core_.change(
-      [&](SQLite::Database& database, Consequences& consequences) {
-        if (const auto row = findCoordinator(database, state.coordinator.number)) {
-          complete(database, *row, error, consequences);
-        }
-      },
-      nullptr, Database::Commit::OnDisk);
+  end(true, Database::Commit::OnDisk);
 }
 
-std::optional<Error> CoordinatedInstalls::waitForForeground(const std::string& identifier) {
-  bool isNew = false;
+void CoordinatedInstalls::lookAgain(const std::string& identifier) {
   {
     const std::lock_guard lock(mutex_);
-    if (hurried_) {
-      waiting_.erase(identifier);
-      return inForeground(identifier);
-    }
-    const auto [place, inserted] = waiting_.try_emplace(identifier, false);
-    if (place->second) return std::nullopt;
-    place->second = true;
-    isNew = inserted;
+    waiting_[identifier].lookIsDue = false;
+  }
+  advance(identifier);
+  const std::lock_guard lock(mutex_);
+  if (const auto place = waiting_.find(identifier); place != waiting_.end()) {
+    if (!place->second.lookIsDue) waiting_.erase(place);
+  }
+}
+
+std::optional<Error> CoordinatedInstalls::waitForForeground(const CoordinatorRow& coordinator) {
+  const std::string& identifier = coordinator.identifier;
+  bool isNew = false;
+  bool isDue = false;
+  {
+    const std::lock_guard lock(mutex_);
+    if (hurried_) return inForeground(identifier);
+    Waiting& waiting = waiting_[identifier];
+    isNew = std::exchange(waiting.coordinator, coordinator.number) != coordinator.number;
+    isDue = std::exchange(waiting.lookIsDue, true);
   }
   if (isNew) core_.device().watcher.assertionDenied(identifier);
-  const auto look = [this, identifier] {
-    {
-      const std::lock_guard lock(mutex_);
-      if (const auto place = waiting_.find(identifier); place != waiting_.end()) {
-        place->second = false;
-      }
-    }
-    advance(identifier);
-  };
-  core_.workers().add(identifier, look, ForegroundPoll);
+  if (!isDue) {
+    core_.workers().add(
+        identifier, [this, identifier] { lookAgain(identifier); }, ForegroundPoll);
+  }
   return std::nullopt;
 }
 

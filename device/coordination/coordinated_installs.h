@@ -1,10 +1,12 @@
 #pragma once
 
+#include <functional>
 #include <map>
 #include <mutex>
 #include <string>
 
 #include "device/coordination/coordination_state.h"
+#include "device/state/database.h"
 
 namespace appsync::device {
 
@@ -33,28 +35,41 @@ class CoordinatedInstalls {
   bool installPackage(const CoordinatorState& state);
   bool completeDemoted(const CoordinatorState& state);
 
+  /// A change for a live coordinator; false, and trouble of the coordinator's, when it fails.
+  bool change(const CoordinatorState& state,
+              const std::function<void(SQLite::Database&, Consequences&)>& work,
+              Database::Commit commit = Database::Commit::Ordinary);
+  /// Notes the placeholder's presence, Adopted in the place of Begun where one stands already that
+  /// is to stay. None when it is not wanted any more, or that failed.
+  Presence note(const CoordinatorState& state, Presence presence);
+  bool layPlaceholder(const CoordinatorState& state, std::optional<Error>* error);
   /// Builds the bundle of a placeholder in a directory of its own.
   bool buildBundle(const CoordinatorState& state, const std::string& bundle,
                    std::optional<Error>* error);
   void copyIcon(const CoordinatorState& state, const std::string& bundle);
-  bool installBundle(const CoordinatorState& state, const std::string& bundle,
-                     std::optional<Error>* error);
   enum class Beginning { Made, NotReady, Failed };
   /// Marks the package as being installed, unless the coordinator is not ready any more.
   Beginning begin(const CoordinatorState& state);
-  /// Gives the placeholder what the options say of the package that takes its place.
-  bool adoptOptions(const CoordinatorState& state, std::optional<Error>* error);
   void finish(const CoordinatorState& state, const std::optional<Error>& error);
-  void removePlaceholder(const std::string& identifier);
+  /// Takes away what the placeholder has in the registry, which stays as it was where it was only
+  /// adopted.
+  void removePlaceholder(const std::string& identifier, const PlaceholderRow& placeholder);
 
   /// Comes back later; an error when that is not to be.
-  std::optional<Error> waitForForeground(const std::string& identifier);
+  std::optional<Error> waitForForeground(const CoordinatorRow& coordinator);
+  void lookAgain(const std::string& identifier);
   bool isLeaving();
+
+  /// An application in the foreground.
+  struct Waiting {
+    std::int64_t coordinator = 0;
+    bool lookIsDue = false;
+  };
 
   CoordinationCore& core_;
   std::mutex mutex_;
   // Guarded by mutex_.
-  std::map<std::string, bool> waiting_;  ///< for the foreground, and whether the next look is due
+  std::map<std::string, Waiting> waiting_;
   bool hurried_ = false;
   bool leaving_ = false;
 };

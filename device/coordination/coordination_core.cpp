@@ -1,5 +1,7 @@
 #include "device/coordination/coordination_core.h"
 
+#include <cerrno>
+
 #include "device/apps/installs.h"
 #include "device/coordination/coordination_handles.h"
 #include "device/coordination/coordination_recovery.h"
@@ -23,6 +25,10 @@ std::shared_ptr<Handle> shared(std::map<std::int64_t, std::weak_ptr<Handle>>& ha
   std::shared_ptr<Handle> made = make();
   handles[number] = made;
   return made;
+}
+
+Refused isOver(std::string_view what) {
+  return {Error::withDescription(POSIXErrorDomain, ECANCELED, what)};
 }
 
 }  // namespace
@@ -88,7 +94,8 @@ bool CoordinationCore::changeCoordinator(std::int64_t number, const CoordinatorC
   return change(
       [&](SQLite::Database& database, Consequences& consequences) {
         auto row = findCoordinator(database, number);
-        if (!row || row->stage != Stage::Waiting) return;
+        if (!row || !row->isLive()) throw isOver("the install is over");
+        if (row->stage != Stage::Waiting) throw isOver("the package is being installed already");
         work(database, *row);
         put(database, *row);
         follow(database, *row, consequences);
@@ -96,7 +103,8 @@ bool CoordinationCore::changeCoordinator(std::int64_t number, const CoordinatorC
       error);
 }
 
-bool CoordinationCore::changePromise(std::int64_t number, const PromiseChange& work) {
+bool CoordinationCore::changePromise(std::int64_t number, const PromiseChange& work,
+                                     std::optional<Error>* error) {
   std::optional<PromiseRow> changed;
   const bool done = change(
       [&](SQLite::Database& database, Consequences& consequences) {
@@ -109,7 +117,7 @@ bool CoordinationCore::changePromise(std::int64_t number, const PromiseChange& w
         }
         changed = row;
       },
-      nullptr);
+      error);
   if (done && changed) showProgress(*changed);
   return done;
 }
@@ -119,7 +127,7 @@ bool CoordinationCore::changePlaceholder(std::int64_t number, const PlaceholderC
   return change(
       [&](SQLite::Database& database, Consequences& consequences) {
         auto row = findPlaceholder(database, number);
-        if (!row || row->over) return;
+        if (!row || row->over) throw isOver("the placeholder is over");
         work(database, *row);
         put(database, *row);
         if (const auto coordinator = coordinatorWithPlaceholder(database, number)) {
@@ -188,6 +196,23 @@ std::optional<PromiseRow> CoordinationCore::promise(std::int64_t number) {
   std::optional<PromiseRow> row;
   read([&](SQLite::Database& database) { row = findPromise(database, number); });
   return row;
+}
+
+void CoordinationCore::noteTrouble(std::int64_t coordinator, const Error& error) {
+  const std::lock_guard lock(mutex_);
+  troubles_.insert_or_assign(coordinator, error);
+}
+
+void CoordinationCore::noteTroubleWithPromise(std::int64_t promise, const Error& error) {
+  std::vector<CoordinatorRow> users;
+  read([&](SQLite::Database& database) { users = coordinatorsUsingPromise(database, promise); });
+  for (const CoordinatorRow& user : users) noteTrouble(user.number, error);
+}
+
+std::optional<Error> CoordinationCore::trouble(std::int64_t coordinator) {
+  const std::lock_guard lock(mutex_);
+  const auto found = troubles_.find(coordinator);
+  return found == troubles_.end() ? std::nullopt : std::optional(found->second);
 }
 
 /// People who look at the device see how far the package has come.

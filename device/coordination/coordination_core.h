@@ -50,14 +50,14 @@ class CoordinationCore {
   void start();
   void hurry();
 
-  // Changes. True also when the object is over, without effect; false with an error when the change
-  // is refused (Refused thrown by `change`) or fails.
+  // Changes. False with an error when the object is over, or the change is refused (Refused thrown
+  // by `change`) or fails. A promise that is over is left as it is, which is no failure.
   using CoordinatorChange = std::function<void(SQLite::Database&, CoordinatorRow&)>;
   using PromiseChange = std::function<void(PromiseRow&)>;
   using PlaceholderChange = std::function<void(SQLite::Database&, PlaceholderRow&)>;
   bool changeCoordinator(std::int64_t number, const CoordinatorChange& change,
                          std::optional<Error>* error);
-  bool changePromise(std::int64_t number, const PromiseChange& change);
+  bool changePromise(std::int64_t number, const PromiseChange& change, std::optional<Error>* error);
   bool changePlaceholder(std::int64_t number, const PlaceholderChange& change,
                          std::optional<Error>* error);
 
@@ -68,6 +68,12 @@ class CoordinationCore {
   bool cancelPlaceholder(std::int64_t number, const Error& reason, CoordinationClientId client);
 
   std::optional<PromiseRow> promise(std::int64_t number);
+
+  // What keeps a live coordinator from going on and could not be written down: an error of the
+  // coordinator until its client asks for it anew, or the device is next opened.
+  void noteTrouble(std::int64_t coordinator, const Error& error);
+  void noteTroubleWithPromise(std::int64_t promise, const Error& error);
+  std::optional<Error> trouble(std::int64_t coordinator);
 
   /// Runs work in one transaction and then does what follows from it.
   bool change(const std::function<void(SQLite::Database&, Consequences&)>& work,
@@ -101,6 +107,7 @@ class CoordinationCore {
   // Guarded by mutex_.
   std::map<std::int64_t, std::weak_ptr<CoordinatorHandle>> coordinators_;
   std::map<std::int64_t, std::weak_ptr<PathPromiseHandle>> promises_;
+  std::map<std::int64_t, Error> troubles_;  ///< by coordinator
 
   EventDelivery events_;
   CoordinatedInstalls installs_;

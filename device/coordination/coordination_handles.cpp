@@ -19,7 +19,10 @@ template <typename Object>
 std::int64_t numberOf(const std::shared_ptr<Object>& object, const ServiceObject& owner,
                       std::string_view what) {
   const auto* const known = dynamic_cast<const ServiceObject*>(object.get());
-  if (known && known->belongsWith(owner)) return known->number();
+  if (known && known->belongsWith(owner)) {
+    if (const auto trouble = known->trouble()) throw Refused{*trouble};
+    return known->number();
+  }
   throw Refused{refusedWith(
       EINVAL, fmt::format("the {} is {}", what, object ? "none of this service's" : "missing"))};
 }
@@ -40,10 +43,22 @@ void checkPromise(SQLite::Database& database, std::int64_t number, std::int64_t 
 
 }  // namespace
 
+bool ServiceObject::attempt(const std::function<bool(CoordinationCore&)>& use,
+                            std::optional<Error>* error) const {
+  const auto done =
+      with(std::optional<bool>(), [&](CoordinationCore& core) { return std::optional(use(core)); });
+  if (!done) setError(error, refusedWith(ESHUTDOWN, "the coordination service has ended"));
+  return done.value_or(false);
+}
+
+/// Only shown, so a write that fails is no loss.
 template <typename Promise>
 void PromiseHandle<Promise>::setPercentComplete(double fraction) noexcept {
   const double percent = fraction > 0 ? std::min(fraction, 1.0) : 0;  // also for what is no number
-  change([&](PromiseRow& row) { row.percent = percent; });
+  with(false, [&](CoordinationCore& core) {
+    return core.changePromise(
+        number(), [&](PromiseRow& row) { row.percent = percent; }, nullptr);
+  });
 }
 template class PromiseHandle<PathTransferPromise>;
 template class PromiseHandle<OutOfBandTransferPromise>;
@@ -55,7 +70,7 @@ std::optional<FileLocation> PathPromiseHandle::transferPath() const {
 }
 
 void PathPromiseHandle::setTransferPath(const FileLocation& location) noexcept {
-  change([&](PromiseRow& row) {
+  fulfil([&](PromiseRow& row) {
     row.path = location.path;
     row.pathIsDirectory = location.isDirectory;
   });
@@ -63,9 +78,9 @@ void PathPromiseHandle::setTransferPath(const FileLocation& location) noexcept {
 
 bool PlaceholderHandle::change(const CoordinationCore::PlaceholderChange& change,
                                std::optional<Error>* error) {
-  return with(true, [&](CoordinationCore& core) {
-    return core.changePlaceholder(number(), change, error);
-  });
+  return attempt(
+      [&](CoordinationCore& core) { return core.changePlaceholder(number(), change, error); },
+      error);
 }
 
 bool PlaceholderHandle::setIconPromise(const std::shared_ptr<PathTransferPromise>& promise,
@@ -103,7 +118,7 @@ bool PlaceholderHandle::setConfigurationComplete(std::optional<Error>* error) no
 }
 
 bool PlaceholderHandle::cancel(const Error& reason, CoordinationClientId client) noexcept {
-  return with(true, [&](CoordinationCore& core) {
+  return with(false, [&](CoordinationCore& core) {
     return core.cancelPlaceholder(number(), reason, client);
   });
 }
@@ -128,15 +143,20 @@ std::optional<CoordinatorRow> CoordinatorHandle::find(std::optional<Error>* erro
 
 bool CoordinatorHandle::change(const CoordinationCore::CoordinatorChange& change,
                                std::optional<Error>* error) {
-  return with(true, [&](CoordinationCore& core) {
-    return core.changeCoordinator(number(), change, error);
-  });
+  return attempt(
+      [&](CoordinationCore& core) { return core.changeCoordinator(number(), change, error); },
+      error);
 }
 
 std::optional<Error> CoordinatorHandle::error() const {
   std::optional<Error> failure;
   const std::optional<CoordinatorRow> found = find(&failure);
-  if (!found || !found->error) return failure;
+  if (!found) return failure;
+  if (!found->error && found->isLive()) {
+    return with(std::optional<Error>(),
+                [&](CoordinationCore& core) { return core.trouble(number()); });
+  }
+  if (!found->error) return std::nullopt;
   // One that cannot be read is an error all the same.
   return errorFrom(*found->error).value_or(Error::posix(EIO));
 }
@@ -224,6 +244,9 @@ bool CoordinatorHandle::setPlaceholderPromise(
         if (!promised || promised->over) {
           throw Refused{refusedWith(ECANCELED, "the placeholder has been cancelled")};
         }
+        if (!promised->configured) {
+          throw Refused{refusedWith(EINVAL, "the placeholder's configuration is not complete")};
+        }
         if (promised->identifier != row.identifier) {
           throw Refused{refusedWith(EINVAL, fmt::format("the placeholder is one of {}, not of {}",
                                                         promised->identifier, row.identifier))};
@@ -238,7 +261,7 @@ bool CoordinatorHandle::setPlaceholderPromise(
 }
 
 bool CoordinatorHandle::cancel(const Error& reason, CoordinationClientId client) noexcept {
-  return with(true, [&](CoordinationCore& core) {
+  return with(false, [&](CoordinationCore& core) {
     return core.cancelCoordinator(number(), reason, client);
   });
 }

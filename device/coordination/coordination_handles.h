@@ -14,12 +14,17 @@ class ServiceObject {
   std::int64_t number() const { return number_; }
   /// Whether both are of one service.
   bool belongsWith(const ServiceObject& other) const { return gate_ == other.gate_; }
+  /// Why it cannot be promised to a coordinator any more.
+  virtual std::optional<Error> trouble() const { return std::nullopt; }
 
  protected:
   template <typename Result, typename Use>
   Result with(Result otherwise, const Use& use) const {
     return gate_->with(std::move(otherwise), use);
   }
+  /// False with an error when the service is gone, else what `use` gives.
+  bool attempt(const std::function<bool(CoordinationCore&)>& use,
+               std::optional<Error>* error) const;
 
  private:
   const std::shared_ptr<CoordinationGate> gate_;
@@ -40,7 +45,7 @@ class PromiseHandle : public Promise, public ServiceObject {
   void setPercentComplete(double fraction) noexcept override;
   bool isComplete() const noexcept override { return row().complete; }
   void setComplete(bool complete) noexcept override {
-    change([&](PromiseRow& row) { row.complete = complete; });
+    fulfil([&](PromiseRow& row) { row.complete = complete; });
   }
   void cancel(const Error& reason, CoordinationClientId client) noexcept override {
     with(false,
@@ -48,18 +53,33 @@ class PromiseHandle : public Promise, public ServiceObject {
   }
   std::string description() const override { return "<Promise " + name_ + ">"; }
 
+  std::optional<Error> trouble() const override {
+    const std::lock_guard lock(mutex_);
+    return trouble_;
+  }
+
  protected:
   PromiseRow row() const {
     return with(PromiseRow(), [&](CoordinationCore& core) {
       return core.promise(number()).value_or(PromiseRow());
     });
   }
-  void change(const CoordinationCore::PromiseChange& change) {
-    with(false, [&](CoordinationCore& core) { return core.changePromise(number(), change); });
+  /// For what its coordinator cannot do without.
+  void fulfil(const CoordinationCore::PromiseChange& change) {
+    with(false, [&](CoordinationCore& core) {
+      std::optional<Error> error;
+      const bool done = core.changePromise(number(), change, &error);
+      if (!done) core.noteTroubleWithPromise(number(), *error);
+      const std::lock_guard lock(mutex_);
+      if (!done) trouble_ = error;
+      return done;
+    });
   }
 
  private:
   const std::string name_;
+  mutable std::mutex mutex_;
+  std::optional<Error> trouble_;  ///< guarded by mutex_
 };
 
 class PathPromiseHandle final : public PromiseHandle<PathTransferPromise> {

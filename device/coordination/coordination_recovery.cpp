@@ -33,13 +33,14 @@ class Repair {
       giveUp(std::move(row), *reason);
       return;
     }
+    if (row.error) return complete(database_, row, std::nullopt, consequences_);  // with its error
+    if (isInstalled(row)) return complete(database_, row, std::nullopt, consequences_);
     // An install that was broken off has left the old state whole.
     row.stage = Stage::Waiting;
     detachMissing(row);
-    noticeMissingPlaceholder(row);
     put(database_, row);
-    if (packageIsGone(row)) {
-      giveUp(std::move(row), "its package is gone");
+    if (const auto reason = hopelessness(row)) {
+      giveUp(std::move(row), *reason);
     } else {
       follow(database_, row, consequences_);
     }
@@ -61,6 +62,26 @@ class Repair {
         (placeholder->metadata && !metadataFrom(*placeholder->metadata))) {
       return "its placeholder cannot be read";
     }
+    if (!placeholder->configured) return "its placeholder was never configured";
+    return std::nullopt;
+  }
+
+  /// Whether the package had taken the placeholder's place, which only was not noted any more.
+  bool isInstalled(const CoordinatorRow& row) {
+    const ApplicationRows present = findApplication(database_, row.identifier);
+    return row.stage == Stage::Installing && present.installed && !present.placeholder;
+  }
+
+  /// Why nobody will carry a coordinator on that is whole; none if somebody may.
+  std::optional<std::string> hopelessness(const CoordinatorRow& row) {
+    if (lostItsPlaceholder(database_, row)) return "its placeholder was taken away";
+    const auto package = findPromise(database_, row.package);
+    const bool isComplete = package && package->complete;
+    if (isComplete && (!package->path || isGone(*package->path))) return "its package is gone";
+    const auto placeholder = findPlaceholder(database_, row.placeholder);
+    // What is left of the application is free for whoever else brings it.
+    const bool isAdopted = placeholder && placeholder->presence == Presence::Adopted;
+    if (isAdopted && !isComplete) return "its client is gone";
     return std::nullopt;
   }
 
@@ -84,31 +105,20 @@ class Repair {
     }
   }
 
-  void noticeMissingPlaceholder(const CoordinatorRow& row) {
-    const auto placeholder = findPlaceholder(database_, row.placeholder);
-    if (!placeholder || placeholder->presence != Presence::Installed ||
-        findApplication(database_, row.identifier).placeholder) {
-      return;
-    }
-    setPresence(database_, *placeholder, Presence::None);
-    note(row, "gets its placeholder anew");
-  }
-
   /// Only what is known to be missing counts.
-  bool packageIsGone(const CoordinatorRow& row) {
-    const auto package = findPromise(database_, row.package);
-    if (!package || !package->complete || !package->path) return false;
+  bool isGone(const std::string& path) {
     std::optional<Error> error;
-    return !device_.files.attributesOfItem(*package->path, &error) && error &&
+    return !device_.files.attributesOfItem(path, &error) && error &&
            error->domain == POSIXErrorDomain && error->code == ENOENT;
   }
 
+  /// Nobody is there yet who might have to be told.
   void giveUp(CoordinatorRow row, std::string_view why) {
     row.stage = Stage::Waiting;
     const std::string reason =
         fmt::format("the install of {} was given up: {}", shown(row.identifier), why);
-    cancel(database_, row, Error::withDescription(POSIXErrorDomain, ECANCELED, reason),
-           DeviceClientID, consequences_);
+    cancel(database_, row, Error::withDescription(POSIXErrorDomain, ECANCELED, reason), row.creator,
+           consequences_);
     note(row, fmt::format("is cancelled: {}", why));
   }
 
@@ -148,15 +158,21 @@ std::optional<Consequences> repairCoordination(DeviceCore& device) {
 }
 
 void sweepCoordination(DeviceCore& device) {
+  int forgotten = 0;
   device.database.change(
       "what install coordinators left could not be swept", Database::Commit::Ordinary,
-      [](SQLite::Database& database) {
+      [&](SQLite::Database& database) {
+        // A cancellation is for the process that was sending the package, which is gone.
         Query(database,
               "DELETE FROM coordinator_events WHERE kind NOT BETWEEN ?1 AND ?2 OR "
-              "coordinator NOT IN (SELECT number FROM install_coordinators) OR "
-              "number <= (SELECT max(number) FROM coordinator_events) - ?3",
-              EventKind::PromiseBegan, EventKind::Cancelled, EventsKept)
+              "coordinator NOT IN (SELECT number FROM install_coordinators)",
+              EventKind::PromiseBegan, EventKind::Prioritize)
             .run();
+        forgotten = Query(database,
+                          "DELETE FROM coordinator_events WHERE number <= "
+                          "(SELECT max(number) FROM coordinator_events) - ?1",
+                          EventsKept)
+                        .run();
         Query(database,
               "DELETE FROM install_coordinators WHERE stage NOT IN (0, 1) "
               "AND number NOT IN (SELECT coordinator FROM coordinator_events) "
@@ -182,6 +198,11 @@ void sweepCoordination(DeviceCore& device) {
               "WHERE icon_promise IS NOT NULL))")
             .run();
       });
+  if (forgotten == 0) return;
+  device.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default,
+                   fmt::format("{} events of install coordinators that nobody came to hear are "
+                               "forgotten: only the last {} are kept",
+                               forgotten, EventsKept));
 }
 
 }  // namespace appsync::device

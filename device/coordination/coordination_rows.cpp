@@ -75,7 +75,8 @@ std::vector<CoordinatorRow> coordinatorsUsingPromise(SQLite::Database& database,
   return coordinatorsIn(
       Query(database,
             "SELECT " COORDINATOR_COLUMNS " FROM install_coordinators c "
-            "WHERE c.stage IN (0, 1) AND (c.package_promise = ?1 OR c.placeholder IN "
+            "WHERE c.stage IN (0, 1) AND (c.package_promise = ?1 OR c.user_data_promise = ?1 "
+            "OR c.placeholder IN "
             "(SELECT number FROM install_placeholders WHERE icon_promise = ?1))",
             promise));
 }

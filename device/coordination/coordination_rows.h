@@ -57,6 +57,7 @@ enum class Presence {
   None = 0,
   Begun = 1,  ///< perhaps there, perhaps not
   Installed = 2,
+  Adopted = 3,  ///< all that was left of the application stands in its stead, and is to stay
 };
 
 struct PlaceholderRow {
@@ -72,6 +73,8 @@ struct PlaceholderRow {
   bool configured = false;
   Presence presence = Presence::None;
   bool over = false;
+
+  bool stands() const { return presence == Presence::Installed || presence == Presence::Adopted; }
 };
 
 /// Stored: values do not change.
@@ -99,7 +102,8 @@ std::optional<CoordinatorRow> findCoordinator(SQLite::Database& database, std::i
 std::optional<CoordinatorRow> findLiveCoordinator(SQLite::Database& database,
                                                   std::string_view identifier);
 std::vector<CoordinatorRow> allCoordinators(SQLite::Database& database);
-/// The live coordinators that use a promise for their package or their placeholder's icon.
+/// The live coordinators that use a promise for their package, their user data or their
+/// placeholder's icon.
 std::vector<CoordinatorRow> coordinatorsUsingPromise(SQLite::Database& database,
                                                      std::int64_t promise);
 std::optional<CoordinatorRow> coordinatorWithPlaceholder(SQLite::Database& database,

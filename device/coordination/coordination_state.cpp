@@ -1,6 +1,7 @@
 #include "device/coordination/coordination_state.h"
 
 #include "device/coordination/coordination_values.h"
+#include "device/state/application_rows.h"
 
 namespace appsync::device {
 namespace {
@@ -45,10 +46,10 @@ void noteBeginning(SQLite::Database& database, const CoordinatorRow& coordinator
 
 Step nextStep(const CoordinatorState& state) {
   const CoordinatorRow& coordinator = state.coordinator;
-  if (!coordinator.isLive() || !state.placeholder || !state.placeholder->configured) {
+  if (coordinator.stage != Stage::Waiting || !state.placeholder || !state.placeholder->configured) {
     return Step::None;
   }
-  if (state.placeholder->presence != Presence::Installed) {
+  if (!state.placeholder->stands()) {
     const bool iconIsComing = state.icon && !state.icon->complete && !state.icon->over;
     return iconIsComing ? Step::None : Step::InstallPlaceholder;
   }
@@ -98,6 +99,12 @@ void complete(SQLite::Database& database, CoordinatorRow coordinator,
   addEvent(database, coordinator, EventKind::Completed);
   consequences.events = true;
   consequences.over.insert(coordinator.identifier);
+}
+
+bool lostItsPlaceholder(SQLite::Database& database, const CoordinatorRow& coordinator) {
+  const auto placeholder = findPlaceholder(database, coordinator.placeholder);
+  return coordinator.stage == Stage::Waiting && placeholder && placeholder->stands() &&
+         !findApplication(database, coordinator.identifier).placeholder;
 }
 
 void setPresence(SQLite::Database& database, PlaceholderRow placeholder, Presence presence) {

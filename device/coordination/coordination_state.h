@@ -51,6 +51,10 @@ bool cancel(SQLite::Database& database, CoordinatorRow coordinator, const Error&
 void complete(SQLite::Database& database, CoordinatorRow coordinator,
               const std::optional<Error>& error, Consequences& consequences);
 
+/// Whether what stood in the registry for the coordinator was taken away by somebody else. While a
+/// package is being installed it goes by itself.
+bool lostItsPlaceholder(SQLite::Database& database, const CoordinatorRow& coordinator);
+
 /// Changes a placeholder's presence.
 void setPresence(SQLite::Database& database, PlaceholderRow placeholder, Presence presence);
 

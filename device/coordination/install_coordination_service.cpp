@@ -34,16 +34,17 @@ Error unusable() {
                                 "no application can have this identifier");
 }
 
-/// The placeholder of a coordinator that somebody takes up again may have been removed meanwhile.
-void restorePlaceholder(SQLite::Database& database, const CoordinatorRow& row,
-                        Consequences& consequences) {
-  const auto placeholder = findPlaceholder(database, row.placeholder);
-  if (row.stage != Stage::Waiting || !placeholder || placeholder->presence != Presence::Installed ||
-      findApplication(database, row.identifier).placeholder) {
-    return;
-  }
-  setPresence(database, *placeholder, Presence::None);
-  follow(database, row, consequences);
+/// Whether both kinds end with a package, or both without.
+bool endAlike(CoordinatorKind one, CoordinatorKind other) {
+  return (one == CoordinatorKind::RestoringDemoted) == (other == CoordinatorKind::RestoringDemoted);
+}
+
+/// Why nobody is served by going on with a live coordinator; none if it can be taken up again.
+std::optional<std::string> objectionTo(SQLite::Database& database, const CoordinatorRow& row,
+                                       CoordinatorKind kind) {
+  if (lostItsPlaceholder(database, row)) return "its placeholder was taken away";
+  if (!endAlike(row.kind, kind)) return "it is restored in another way";
+  return std::nullopt;
 }
 
 }  // namespace
@@ -73,21 +74,37 @@ std::shared_ptr<InstallCoordinator> DeviceInstallCoordination::coordinatorFor(
   const bool changed = core_.change(
       [&](SQLite::Database& database, Consequences& consequences) {
         found = findLiveCoordinator(database, bundleId);
+        if (found && endedFor(database, *found, kind, client, consequences)) found.reset();
         made = !found;
-        if (made) {
-          found.emplace();
-          found->identifier = bundleId;
-          found->kind = kind;
-          found->creator = client;
-          put(database, *found);
-        } else {
-          restorePlaceholder(database, *found, consequences);
-        }
+        if (!made) return;
+        found.emplace();
+        found->identifier = bundleId;
+        found->kind = kind;
+        found->creator = client;
+        put(database, *found);
       },
       error);
   if (!changed) return nullptr;
   if (created) *created = made;
   return core_.handleOf(*found);
+}
+
+bool DeviceInstallCoordination::endedFor(SQLite::Database& database, const CoordinatorRow& live,
+                                         CoordinatorKind kind, CoordinationClientId client,
+                                         Consequences& consequences) {
+  std::optional<std::string> why = objectionTo(database, live, kind);
+  if (const auto trouble = core_.trouble(live.number); !why && trouble) {
+    why = trouble->localizedDescription();
+  }
+  if (!why) return false;
+  const Error reason = Error::withDescription(
+      POSIXErrorDomain, ECANCELED,
+      fmt::format("the install of {} was begun anew: {}", live.identifier, *why));
+  if (live.creator == client && cancel(database, live, reason, client, consequences)) return true;
+  if (endAlike(live.kind, kind)) return false;
+  throw Refused{
+      Error::withDescription(POSIXErrorDomain, EBUSY,
+                             fmt::format("{} is being installed in another way", live.identifier))};
 }
 
 void DeviceInstallCoordination::removeObserver(CoordinatorObserver* observer) noexcept {

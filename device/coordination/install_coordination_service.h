@@ -13,7 +13,8 @@ namespace appsync::device {
 /// device is opened anew.
 ///
 /// An application has at most one live coordinator. Its placeholder is installed as soon as it is
-/// promised and configured and its icon has come; its package, a complete path promise, as soon as
+/// promised and its icon has come (all that is left of an application, a demoted one say, stands in
+/// the stead of a sync's); its package, a complete path promise, as soon as
 /// the placeholder stands and there are options. An application in the foreground keeps its
 /// package waiting until it is closed. A demoted restore ends with its placeholder. A coordinator
 /// that fails keeps its error, loses its placeholder and leaves an installed version alone; until
@@ -29,7 +30,7 @@ class DeviceInstallCoordination final : public InstallCoordination {
   DeviceInstallCoordination(DeviceCore& device, DeviceAppRegistry& registry);
 
   bool coordinationIsEnabled() noexcept override { return true; }
-  /// With `createIfNotExisting`, a placeholder that somebody else took off the device comes back.
+  /// With `createIfNotExisting`, this client's live coordinator that cannot go on makes room.
   std::shared_ptr<InstallCoordinator> coordinatorFor(CoordinatorKind kind,
                                                      std::string_view bundleId,
                                                      CoordinationClientId client,
@@ -71,6 +72,10 @@ class DeviceInstallCoordination final : public InstallCoordination {
   void hurry() noexcept { core_.hurry(); }
 
  private:
+  /// Ends a live coordinator that nobody is served by going on with, if it is this client's. Throws
+  /// Refused when one that does not serve cannot be ended.
+  bool endedFor(SQLite::Database& database, const CoordinatorRow& live, CoordinatorKind kind,
+                CoordinationClientId client, Consequences& consequences);
   /// The row's number; 0 when it could not be entered.
   std::int64_t enterPromise(PromiseRow& row);
 

@@ -1,4 +1,6 @@
 // How every coordination service installs, and whom it tells.
+#include <cerrno>
+
 #include "tests/contract/coordination_contract.h"
 
 namespace appsync::contract {
@@ -32,7 +34,7 @@ TEST_P(CoordinatedInstallContract, APlaceholderStandsUntilItsPackageTakesItsPlac
   EXPECT_EQ(live("com.a"), nullptr) << "what is over is not found";
 }
 
-TEST_P(CoordinatedInstallContract, WhatIsOverStaysUsableWithoutEffect) {
+TEST_P(CoordinatedInstallContract, WhatIsOverStaysReadableAndTakesNoMoreChanges) {
   const auto coordinator = prepare("com.a");
   const auto promise = coordinator->appAssetPromise(nullptr);
   deliver(*coordinator, "com.a");
@@ -40,7 +42,9 @@ TEST_P(CoordinatedInstallContract, WhatIsOverStaysUsableWithoutEffect) {
   ASSERT_EQ(version("com.a"), "2.0");
   promise->setPercentComplete(0.5);
   EXPECT_EQ(promise->percentComplete(), 1.0);
-  EXPECT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(KQClientKiosk, nullptr));
+  std::optional<Error> error;
+  EXPECT_FALSE(coordinator->setAppAssetPromiseResponsibleClient(KQClientKiosk, &error));
+  EXPECT_EQ(error.value_or(Error{}).code, ECANCELED);
   EXPECT_EQ(coordinator->appAssetPromiseResponsibleClient(), 0U);
   EXPECT_FALSE(coordinator->cancel(reason, SyncHostClientID)) << "it is past cancelling";
   EXPECT_FALSE(coordinator->error());
@@ -50,13 +54,11 @@ TEST_P(CoordinatedInstallContract, WhatIsOverStaysUsableWithoutEffect) {
 TEST_P(CoordinatedInstallContract, NothingIsInstalledBeforeTheClientIsReady) {
   const auto coordinator = make("com.a");
   coordinator->setObserver(&recorder);
-  const auto promised = placeholder("com.a");
-  ASSERT_TRUE(coordinator->setPlaceholderPromise(promised, nullptr));
-  phone->settle("com.a");
-  EXPECT_FALSE(hasPlaceholder("com.a")) << "its configuration is not complete";
-  ASSERT_TRUE(promised->setConfigurationComplete(nullptr));
   ASSERT_TRUE(coordinator->setAppAssetPromise(packagePromise("com.a"), nullptr));
   deliver(*coordinator, "com.a");
+  phone->settle("com.a");
+  EXPECT_FALSE(hasPlaceholder("com.a")) << "nobody promised one";
+  ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder("com.a"), nullptr));
   phone->settle("com.a");
   EXPECT_TRUE(hasPlaceholder("com.a"));
   EXPECT_EQ(version("com.a"), "none") << "there are no options";
@@ -68,9 +70,7 @@ TEST_P(CoordinatedInstallContract, NothingIsInstalledBeforeTheClientIsReady) {
 TEST_P(CoordinatedInstallContract, ADemotedRestoreEndsWithItsPlaceholder) {
   const auto coordinator = make("com.a", CoordinatorKind::RestoringDemoted);
   coordinator->setObserver(&recorder);
-  const auto promised = placeholder("com.a");
-  ASSERT_TRUE(promised->setConfigurationComplete(nullptr));
-  ASSERT_TRUE(coordinator->setPlaceholderPromise(promised, nullptr));
+  ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder("com.a"), nullptr));
   phone->settle("com.a");
   EXPECT_EQ(recorder.events(), (Events{"placeholder com.a", "complete com.a"}));
   EXPECT_TRUE(hasPlaceholder("com.a"));
@@ -122,8 +122,8 @@ class ReasonRecorder : public EventRecorder {
 TEST_P(CoordinatedInstallContract, AnotherClientsCancelIsToldWithItsReasonTheCreatorsOwnIsNot) {
   ReasonRecorder others;
   ReasonRecorder own;
-  prepare("com.a")->setObserver(&others);
-  prepare("com.b")->setObserver(&own);
+  prepare("com.a", CoordinatorKind::Initiating, &others);
+  prepare("com.b", CoordinatorKind::Initiating, &own);
   for (const std::string id : {"com.a", "com.b"}) {
     phone->settle(id);
     ASSERT_TRUE(hasPlaceholder(id));
@@ -169,7 +169,7 @@ TEST_P(CoordinatedInstallContract, AListenerHearsOnlyOfItsClientsCoordinators) {
 }
 
 TEST_P(CoordinatedInstallContract, AnEventThatNobodyIsThereForIsKeptAndToldOnce) {
-  prepare("com.a")->setObserver(nullptr);
+  prepare("com.a", CoordinatorKind::Initiating, nullptr);
   phone->settle("com.a");
   deliver(*live("com.a"), "com.a");
   phone->settle("com.a");
@@ -182,6 +182,86 @@ TEST_P(CoordinatedInstallContract, AnEventThatNobodyIsThereForIsKeptAndToldOnce)
     for (const std::string& event : late.events()) heard.push_back(event.substr(0, 5));
   }
   EXPECT_EQ(heard, (Events{"place", "begin", "compl"}));
+}
+
+TEST_P(CoordinatedInstallContract, TheBeginningsOfIconAndPackageAreTold) {
+  const auto coordinator = make("com.a");
+  coordinator->setObserver(&recorder);
+  const auto icon = iconPromise("com.a");
+  const auto shown = barePlaceholder("com.a");
+  ASSERT_TRUE(shown->setIconPromise(icon, nullptr));
+  ASSERT_TRUE(shown->setConfigurationComplete(nullptr));
+  const auto package = packagePromise("com.a");
+  ASSERT_TRUE(coordinator->setInstallOptions({}, nullptr));
+  ASSERT_TRUE(coordinator->setAppAssetPromise(package, nullptr));
+  ASSERT_TRUE(coordinator->setPlaceholderPromise(shown, nullptr));
+  phone->settle("com.a");
+  deliver(*coordinator, "com.a");
+  phone->settle("com.a");
+  const auto begin = [](const PathTransferPromise& promise) {
+    return "begin " + std::to_string(promise.identifier());
+  };
+  EXPECT_EQ(recorder.events(),
+            (Events{begin(*icon), "placeholder com.a", begin(*package), "complete com.a"}));
+}
+
+TEST_P(CoordinatedInstallContract, AnInstallIsOverWhenItsPlaceholderIsTakenOutOfTheRegistry) {
+  const auto first = prepare("com.a", CoordinatorKind::Restoring);
+  phone->settle("com.a");
+  ASSERT_TRUE(platform.appRegistry.uninstallApplication("com.a", {}));
+  bool created = false;
+  const auto second = coordination.coordinatorFor(CoordinatorKind::Initiating, "com.a",
+                                                  SyncHostClientID, true, &created, nullptr);
+  EXPECT_TRUE(created);
+  EXPECT_NE(second, first);
+  EXPECT_TRUE(first->error());
+  phone->settle("com.a");
+  EXPECT_EQ(recorder.events(), Events{"placeholder com.a"}) << "nobody is told";
+  EXPECT_FALSE(hasPlaceholder("com.a"));
+}
+
+/// All that is left of an application when a sync brings it.
+class LastTraceContract : public CoordinatedInstallContract {
+ protected:
+  LastTraceContract() {
+    EXPECT_TRUE(installPlaceholder("com.a", "1.0", InstallType::IntentionalDowngrade));
+    coordinator = prepare("com.a");
+    phone->settle("com.a");
+  }
+  /// "1.0 of type 8", or "none".
+  std::string placeholderLeft() {
+    const auto record = platform.appRegistry.recordForIdentifier("com.a", true);
+    if (!record) return "none";
+    return record->bundleVersion.value_or("") + " of type " +
+           std::to_string(static_cast<std::uint64_t>(record->installType));
+  }
+  std::shared_ptr<InstallCoordinator> coordinator;
+};
+
+SERVICE_CONTRACT_OF(LastTraceContract);
+
+TEST_P(LastTraceContract, StandsInTheSteadOfASyncsPlaceholderUntilThePackageIsIn) {
+  EXPECT_EQ(recorder.events(), Events{"placeholder com.a"});
+  EXPECT_EQ(placeholderLeft(), "1.0 of type 8");
+  deliver(*coordinator, "com.a");
+  phone->settle("com.a");
+  EXPECT_EQ(recorder.count("complete com.a"), 1U);
+  EXPECT_EQ(placeholderLeft(), "none");
+  EXPECT_EQ(version("com.a"), "2.0");
+}
+
+TEST_P(LastTraceContract, StaysWhenThePackageIsRefused) {
+  deliver(*coordinator, "com.other");
+  phone->settle("com.a");
+  EXPECT_EQ(recorder.count("failed com.a"), 1U);
+  EXPECT_EQ(placeholderLeft(), "1.0 of type 8");
+}
+
+TEST_P(LastTraceContract, StaysWhenThePersonCancels) {
+  ASSERT_TRUE(phone->cancelInstall("com.a"));
+  phone->settle("com.a");
+  EXPECT_EQ(placeholderLeft(), "1.0 of type 8");
+  EXPECT_EQ(live("com.a"), nullptr);
 }
 
 TEST_P(CoordinatedInstallContract, NothingIsDeliveredAfterRemovingAnObserverOrAListener) {

@@ -19,26 +19,43 @@ std::shared_ptr<PathTransferPromise> CoordinationContract::packagePromise(
                                                 SyncHostClientID, std::nullopt, 0);
 }
 
-std::shared_ptr<InstallPlaceholder> CoordinationContract::placeholder(std::string_view identifier) {
+std::shared_ptr<PathTransferPromise> CoordinationContract::iconPromise(
+    std::string_view identifier) {
+  const std::string path = joinPath(platform.files.temporaryDirectory(), "Icon.png");
+  putFile(path, "picture");
+  const auto promise = coordination.createPathTransferPromise(
+      std::string(identifier) + "-Icon", SyncHostClientID, FileLocation::file(path), 7);
+  promise->setPercentComplete(1.0);
+  promise->setComplete(true);
+  return promise;
+}
+
+std::shared_ptr<InstallPlaceholder> CoordinationContract::barePlaceholder(
+    std::string_view identifier) {
   return coordination.createAppPlaceholder("Name of " + std::string(identifier), identifier,
                                            InstallType::Sync, SyncHostClientID);
 }
 
-std::shared_ptr<InstallCoordinator> CoordinationContract::prepare(std::string_view identifier,
-                                                                  CoordinatorKind kind) {
-  const auto coordinator = make(identifier, kind);
-  coordinator->setObserver(&recorder);
+std::shared_ptr<InstallPlaceholder> CoordinationContract::placeholder(std::string_view identifier) {
   PlaceholderAttributes attributes;
   attributes.setBundleVersion("2.0");
-  const auto promised = placeholder(identifier);
-  EXPECT_TRUE(promised->setPlaceholderAttributes(attributes, nullptr));
-  EXPECT_TRUE(promised->setMetadata({.values = {{"itemName", "Store name"}}}, nullptr));
-  EXPECT_TRUE(promised->setConfigurationComplete(nullptr));
+  const auto made = barePlaceholder(identifier);
+  EXPECT_TRUE(made->setPlaceholderAttributes(attributes, nullptr));
+  EXPECT_TRUE(made->setMetadata({.values = {{"itemName", "Store name"}}}, nullptr));
+  EXPECT_TRUE(made->setConfigurationComplete(nullptr));
+  return made;
+}
+
+std::shared_ptr<InstallCoordinator> CoordinationContract::prepare(std::string_view identifier,
+                                                                  CoordinatorKind kind,
+                                                                  CoordinatorObserver* observer) {
+  const auto coordinator = make(identifier, kind);
+  coordinator->setObserver(observer);
   const InstallOptions options{std::nullopt, InstallType::Sync, 1, std::nullopt};
   EXPECT_TRUE(coordinator->setInstallOptions(options, nullptr));
   EXPECT_TRUE(coordinator->setInitialQPKAssetPromises({}, nullptr));
   EXPECT_TRUE(coordinator->setAppAssetPromise(packagePromise(identifier), nullptr));
-  EXPECT_TRUE(coordinator->setPlaceholderPromise(promised, nullptr));
+  EXPECT_TRUE(coordinator->setPlaceholderPromise(placeholder(identifier), nullptr));
   return coordinator;
 }
 

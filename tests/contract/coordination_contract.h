@@ -19,11 +19,20 @@ class CoordinationContract : public ServiceContract {
   /// The live coordinator, or nullptr.
   std::shared_ptr<InstallCoordinator> live(std::string_view identifier);
   std::shared_ptr<PathTransferPromise> packagePromise(std::string_view identifier);
+  std::shared_ptr<PathTransferPromise> iconPromise(std::string_view identifier);
+  /// One that nobody has configured yet.
+  std::shared_ptr<InstallPlaceholder> barePlaceholder(std::string_view identifier);
+  /// One of version 2.0 that can be handed over.
   std::shared_ptr<InstallPlaceholder> placeholder(std::string_view identifier);
 
-  /// All that a client does before the package comes; `recorder` observes.
+  /// All that a client does before the package comes.
+  std::shared_ptr<InstallCoordinator> prepare(std::string_view identifier, CoordinatorKind kind,
+                                              CoordinatorObserver* observer);
+  /// The same; `recorder` observes.
   std::shared_ptr<InstallCoordinator> prepare(std::string_view identifier,
-                                              CoordinatorKind kind = CoordinatorKind::Initiating);
+                                              CoordinatorKind kind = CoordinatorKind::Initiating) {
+    return prepare(identifier, kind, &recorder);
+  }
   /// A package of version 2.0 comes, of the application `content`.
   void deliver(InstallCoordinator& coordinator, std::string_view content);
 

@@ -1,4 +1,6 @@
 // What every coordination service promises of its coordinators, promises and placeholders.
+#include <cerrno>
+#include <functional>
 #include <future>
 
 #include "tests/contract/coordination_contract.h"
@@ -98,6 +100,104 @@ TEST_P(InstallCoordinationContract, APlaceholderThatIsMissingCancelledOrAnothers
   }
 }
 
+TEST_P(InstallCoordinationContract, APlaceholderThatMayNeverBeConfiguredIsRefused) {
+  const auto coordinator = make("com.a");
+  const auto promised = barePlaceholder("com.a");
+  std::optional<Error> error;
+  EXPECT_FALSE(coordinator->setPlaceholderPromise(promised, &error));
+  EXPECT_EQ(error.value_or(Error{}).code, EINVAL);
+  EXPECT_FALSE(coordinator->hasPlaceholderPromise());
+  ASSERT_TRUE(promised->setConfigurationComplete(nullptr));
+  EXPECT_TRUE(coordinator->setPlaceholderPromise(promised, nullptr));
+}
+
+TEST_P(InstallCoordinationContract, WhatIsOverRefusesToBeSet) {
+  const auto coordinator = make("com.a");
+  const auto promised = placeholder("com.a");
+  ASSERT_TRUE(coordinator->setPlaceholderPromise(promised, nullptr));
+  ASSERT_TRUE(coordinator->cancel(reason, SyncHostClientID));
+  const auto data = coordination.createOutOfBandTransferPromise("d", SyncHostClientID, 0);
+  using Setter = std::function<bool(std::optional<Error>*)>;
+  const std::vector<Setter> setters = {
+      [&](auto* error) { return coordinator->setInstallOptions({}, error); },
+      [&](auto* error) { return coordinator->setInitialQPKAssetPromises({}, error); },
+      [&](auto* error) { return coordinator->setAppAssetPromise(packagePromise("com.a"), error); },
+      [&](auto* error) { return coordinator->setAppAssetPromiseResponsibleClient(1, error); },
+      [&](auto* error) { return coordinator->setUserDataPromise(data, error); },
+      [&](auto* error) { return coordinator->setPlaceholderPromise(placeholder("com.a"), error); },
+      [&](auto* error) { return promised->setIconPromise(iconPromise("com.a"), error); },
+      [&](auto* error) { return promised->setPlaceholderAttributes({}, error); },
+      [&](auto* error) { return promised->setMetadata({}, error); },
+      [&](auto* error) { return promised->setSinfData({}, error); },
+      [&](auto* error) { return promised->setConfigurationComplete(error); },
+  };
+  for (std::size_t number = 0; number < setters.size(); ++number) {
+    SCOPED_TRACE(number);
+    std::optional<Error> error;
+    EXPECT_FALSE(setters[number](&error));
+    EXPECT_EQ(error.value_or(Error{}).code, ECANCELED);
+    EXPECT_FALSE(setters[number](nullptr));
+  }
+}
+
+TEST_P(InstallCoordinationContract, APromiseIsTakenByOneCoordinatorOnly) {
+  const auto first = make("com.a");
+  const auto second = make("com.b");
+  const auto package = packagePromise("com.a");
+  const auto data = coordination.createOutOfBandTransferPromise("d", SyncHostClientID, 0);
+  ASSERT_TRUE(first->setAppAssetPromise(package, nullptr));
+  ASSERT_TRUE(first->setUserDataPromise(data, nullptr));
+  EXPECT_TRUE(first->setUserDataPromise(data, nullptr)) << "it has it already";
+  std::optional<Error> error;
+  EXPECT_FALSE(second->setAppAssetPromise(package, &error));
+  EXPECT_EQ(error.value_or(Error{}).code, EBUSY);
+  error.reset();
+  EXPECT_FALSE(second->setUserDataPromise(data, &error));
+  EXPECT_EQ(error.value_or(Error{}).code, EBUSY);
+  EXPECT_FALSE(second->hasUserDataPromise());
+  ASSERT_TRUE(first->cancel(reason, SyncHostClientID));
+  error.reset();
+  EXPECT_FALSE(second->setUserDataPromise(data, &error));
+  EXPECT_EQ(error.value_or(Error{}).code, ECANCELED) << "it went with its coordinator";
+}
+
+TEST_P(InstallCoordinationContract, ADemotedRestoreAndTheOtherKindsDoNotStandInForOneAnother) {
+  using Kind = CoordinatorKind;
+  const auto demoted = Kind::RestoringDemoted;
+  for (const auto& [before, asked] :
+       {std::pair(Kind::Restoring, demoted), std::pair(Kind::Initiating, demoted),
+        std::pair(demoted, Kind::Restoring), std::pair(demoted, Kind::Updating)}) {
+    const auto first = make("com.a", before);
+    EXPECT_EQ(
+        coordination.coordinatorFor(asked, "com.a", SyncHostClientID, false, nullptr, nullptr),
+        first)
+        << "nothing is ended for a look";
+    bool created = false;
+    const auto second =
+        coordination.coordinatorFor(asked, "com.a", SyncHostClientID, true, &created, nullptr);
+    ASSERT_TRUE(second);
+    EXPECT_NE(second, first);
+    EXPECT_TRUE(created);
+    EXPECT_TRUE(first->error());
+    EXPECT_FALSE(second->error());
+    EXPECT_EQ(live("com.a"), second);
+    ASSERT_TRUE(second->cancel(reason, SyncHostClientID));
+  }
+}
+
+TEST_P(InstallCoordinationContract, AnotherClientsCoordinatorOfTheOtherSortIsNotEnded) {
+  const auto stores = make("com.a", CoordinatorKind::Restoring, KQClientKiosk);
+  bool created = true;
+  std::optional<Error> error;
+  EXPECT_EQ(coordination.coordinatorFor(CoordinatorKind::RestoringDemoted, "com.a",
+                                        SyncHostClientID, true, &created, &error),
+            nullptr);
+  EXPECT_FALSE(created);
+  EXPECT_EQ(error.value_or(Error{}).code, EBUSY);
+  EXPECT_EQ(live("com.a"), stores);
+  EXPECT_FALSE(stores->error());
+}
+
 TEST_P(InstallCoordinationContract, APackagePromiseThatIsMissingOrCancelledIsRefused) {
   const auto coordinator = make("com.a");
   const auto cancelled = packagePromise("com.a");
@@ -154,7 +254,9 @@ TEST_P(InstallCoordinationContract, ACancelledCoordinatorKeepsItsFirstReasonAndM
   EXPECT_TRUE(coordinator->cancel(reason, SyncHostClientID));
   EXPECT_TRUE(coordinator->cancel(Error::posix(5), SyncHostClientID)) << "it is cancelled";
   EXPECT_EQ(coordinator->error(), reason);
-  EXPECT_TRUE(coordinator->setInstallOptions({}, nullptr));
+  std::optional<Error> error;
+  EXPECT_FALSE(coordinator->setInstallOptions({}, &error));
+  EXPECT_EQ(error.value_or(Error{}).code, ECANCELED);
   EXPECT_FALSE(coordinator->hasInstallOptions());
   package->setComplete(true);
   EXPECT_FALSE(package->isComplete()) << "its promises went with it";

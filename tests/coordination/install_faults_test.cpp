@@ -19,12 +19,16 @@ struct FaultCase {
 
 void PrintTo(const FaultCase& fault, std::ostream* out) { *out << fault.operation; }
 
-/// The placeholder is handed over; the preparation succeeds although a step left an error.
-Trace handedOver(const std::string& error) {
-  return {"InstallCoordinator.setPlaceholderPromise(com.a, <Placeholder com.a>)",
-          said("added placeholder promise to coordinator for com.a"),
-          said("processing app install for bundle com.a finished with status 1 error " + error),
-          R"(transaction step 1 party 1 phase 2 ok com.a "Install app")"};
+/// The placeholder is handed over all the same and refused, since nobody might ever finish it.
+Trace refusedUnfinished() {
+  const std::string error = description(Error::posix(EINVAL));
+  return joined(
+      {{"InstallCoordinator.setPlaceholderPromise(com.a, <Placeholder com.a>)",
+        complained("Error " + error + " adding placeholder promise to coordinator for 'com.a'")},
+       installGivenUp(error),
+       {said("Cancelling placeholder for appBundleIdentifier:com.a"),
+        "InstallPlaceholder.cancel(com.a, Error Domain=TWError Code=1, 3)"},
+       installCoordinatorCancelled()});
 }
 
 /// The good run's lines from the placeholder on, without the five of the icon's promise.
@@ -106,36 +110,36 @@ const FaultCase FaultCases[] = {
              installCoordinatorCancelled()})},
     {"WithoutAnIconPromiseThePlaceholderGoesUnconfigured",
      "InstallCoordination.createPathTransferPromise", 2,
-     "InstallCoordination.createPathTransferPromise(com.a-Icon", true,
+     "InstallCoordination.createPathTransferPromise(com.a-Icon", false,
      joined({{"fault InstallCoordination.createPathTransferPromise(com.a-Icon)"},
-             handedOver("(null)")})},
+             refusedUnfinished()})},
     {"ARefusedIconPromiseIsCancelledAndThePlaceholderGoesUnconfigured",
-     "InstallPlaceholder.setIconPromise", 1, "InstallPlaceholder.setIconPromise", true,
+     "InstallPlaceholder.setIconPromise", 1, "InstallPlaceholder.setIconPromise", false,
      joined({{"fault InstallPlaceholder.setIconPromise(com.a)",
               complained(
                   "Error Error Domain=Fault Code=7 adding icon promise to placeholder for 'com.a'"),
               "DataPromise.cancel(com.a-Icon, Error Domain=TWError Code=30, 3)"},
-             handedOver("(null)")})},
+             refusedUnfinished()})},
     {"RefusedAttributesLeaveThePlaceholderUnfinished",
      "InstallPlaceholder.setPlaceholderAttributes", 1,
-     "InstallPlaceholder.setPlaceholderAttributes", true,
+     "InstallPlaceholder.setPlaceholderAttributes", false,
      joined({{"fault InstallPlaceholder.setPlaceholderAttributes(com.a)",
               complained(
                   "Error Error Domain=Fault Code=7 setting attributes on placeholder for 'com.a'")},
-             handedOver("Error Domain=Fault Code=7")})},
+             refusedUnfinished()})},
     {"RefusedMetadataLeaveThePlaceholderUnfinished", "InstallPlaceholder.setMetadata", 1,
-     "InstallPlaceholder.setMetadata", true,
+     "InstallPlaceholder.setMetadata", false,
      joined({{"fault InstallPlaceholder.setMetadata(com.a)",
               complained("Error Error Domain=Fault Code=7 setting store metadata on placeholder "
                          "for 'com.a'")},
-             handedOver("Error Domain=Fault Code=7")})},
+             refusedUnfinished()})},
     {"ARefusedCompletionLeavesThePlaceholderUnfinished",
      "InstallPlaceholder.setConfigurationComplete", 1,
-     "InstallPlaceholder.setConfigurationComplete", true,
+     "InstallPlaceholder.setConfigurationComplete", false,
      joined({{"fault InstallPlaceholder.setConfigurationComplete(com.a)",
               complained("Error Error Domain=Fault Code=7"
                          " setting placeholder configuration as complete for 'com.a'")},
-             handedOver("Error Domain=Fault Code=7")})},
+             refusedUnfinished()})},
     {"ARefusedPlaceholderIsCancelledBeforeTheCoordinator",
      "InstallCoordinator.setPlaceholderPromise", 1, "InstallCoordinator.setPlaceholderPromise",
      false,

@@ -1,3 +1,6 @@
+#include <signal.h>
+#include <unistd.h>
+
 #include <future>
 
 #include "tests/device/coordination_test.h"
@@ -200,7 +203,7 @@ TEST_F(CoordinationEventsTest, ADeviceThatIsClosedKeepsWhatItHasNotTold) {
   coordinator->setObserver(&recorder);
   ASSERT_TRUE(service().tap(Id));
   inside.get_future().wait();
-  ASSERT_TRUE(service().cancelInstall(Id));
+  ASSERT_TRUE(service().tap(Id));
   auto closing = std::async(std::launch::async, [&] { device.reset(); });
   closing.wait_for(std::chrono::milliseconds(20));
   goOn.set_value();
@@ -212,7 +215,75 @@ TEST_F(CoordinationEventsTest, ADeviceThatIsClosedKeepsWhatItHasNotTold) {
   waitUntilIdle(Id);
   Events all = recorder.events();
   for (const std::string& event : listening.events()) all.push_back(event);
-  EXPECT_EQ(all, (Events{"prioritize com.example.a", "canceled com.example.a by 15"}));
+  EXPECT_EQ(all, (Events{"prioritize com.example.a", "prioritize com.example.a"}));
+}
+
+TEST_F(CoordinationEventsTest, AProcessThatDiesWhileItReceivesOneGetsItAnew) {
+  device.reset();
+  const int status = inOtherProcess([&] {
+    reopen();
+    coordinatorFor(Id)->setObserver(&recorder);
+    recorder.during = [](const std::string&) { kill(getpid(), SIGKILL); };
+    service().tap(Id);
+    return recorder.waitFor("prioritize") ? 1 : 2;
+  });
+  EXPECT_EQ(status, 128 + SIGKILL);
+  reopen();
+  EventRecorder listening;
+  const auto listener = listen(listening);
+  EXPECT_TRUE(listening.waitFor("prioritize com.example.a"));
+}
+
+TEST_F(CoordinationEventsTest, ACancellationIsToldOnlyInTheLifeOfTheProcessInWhichItCame) {
+  deliver(*prepare("com.example.b", CoordinatorKind::Initiating, nullptr),
+          stageApplication("com.example.c"));
+  waitUntilIdle("com.example.b");
+  coordinatorFor(Id);
+  ASSERT_TRUE(service().cancelInstall(Id));
+  reopen();
+  EventRecorder listening;
+  const auto listener = listen(listening);
+  waitUntilIdle(Id);
+  waitUntilIdle("com.example.b");
+  EXPECT_EQ(listening.count("failed com.example.b"), 1U) << "what else was kept has come";
+  EXPECT_EQ(listening.count("canceled"), 0U);
+}
+
+TEST_F(CoordinationEventsTest, OfOneCoordinatorKeepTheirOrderWhenItsObserverComesMidway) {
+  const auto promise = packagePromise(Id);
+  ASSERT_TRUE(coordinatorFor(Id)->setAppAssetPromise(promise, nullptr));
+  promise->setPercentComplete(0.1);
+  coordinatorFor("com.example.b");
+  ASSERT_TRUE(service().tap("com.example.b"));
+  ASSERT_TRUE(service().tap(Id));
+  EventRecorder midway;
+  recorder.during = [&](const std::string&) { live(Id)->setObserver(&midway); };
+  live("com.example.b")->setObserver(&recorder);
+  ASSERT_TRUE(midway.waitFor("prioritize"));
+  waitUntilIdle(Id);
+  EXPECT_EQ(midway.events(),
+            (Events{"begin " + std::to_string(promise->identifier()), "prioritize com.example.a"}));
+  service().removeObserver(&midway);
+}
+
+TEST_F(CoordinationEventsTest,
+       ThatNobodyEverHearsAreForgottenBeyondTheLastThousandAndTheLogSaysSo) {
+  coordinatorFor(Id);
+  device.reset();
+  edit(
+      "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 1002) "
+      "INSERT INTO coordinator_events SELECT NULL, 1, 3, 0, NULL, 0 FROM n");
+  reopen();
+  EXPECT_TRUE(
+      logMentions("2 events of install coordinators that nobody came to hear are forgotten: "
+                  "only the last 1000 are kept"));
+  EventRecorder listening;
+  const auto listener = listen(listening);
+  waitUntilIdle(Id);
+  EXPECT_EQ(listening.count("prioritize"), 1000U);
+  std::filesystem::remove_all(folder / "log");
+  reopen();
+  EXPECT_FALSE(logMentions("forgotten"));
 }
 
 }  // namespace

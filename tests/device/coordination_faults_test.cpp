@@ -1,119 +1,20 @@
 // The database fails at one place after another while the coordination service works. Whatever the
 // place, the device that is opened afterwards is whole.
 
-#include <sqlite3.h>
+#include "tests/device/coordination_faults.h"
 
-#include <array>
-#include <atomic>
 #include <future>
 
 #include "device/recovery.h"
 #include "platform/bundle.h"
-#include "tests/device/coordination_test.h"
-#include "tests/device/device_parts.h"
 
 namespace appsync::device {
 namespace {
 
 namespace fs = std::filesystem;
 using Lines = std::vector<std::string>;
-constexpr std::string_view Id = "com.example.a";
-const std::string Icon = "/tmp/Icons/com.example.a.png";
-const FileLocation Package = FileLocation::file("/var/mobile/Media/PublicStaging/a.pkg");
-
-/// What fails of the database, and for how long.
-struct Mode {
-  const char* name;
-  bool reads;  ///< reads outside of changes; else the commits of changes
-  bool once;   ///< else all from that step on
-};
-constexpr Mode Modes[] = {{"ReadsOnce", true, true},
-                          {"ReadsFromThenOn", true, false},
-                          {"ChangesOnce", false, true},
-                          {"ChangesFromThenOn", false, false}};
-
-/// Lets one connection fail from a step on, counted from 1. Works under the lock of its owner.
-class DatabaseFaults {
- public:
-  DatabaseFaults(const Mode& mode, int step) : mode_(mode), left_(step) {}
-
-  void strike(Database& database) {
-    database.read("", [this](SQLite::Database& connection) {
-      handle_ = connection.getHandle();
-      sqlite3_set_authorizer(
-          handle_,
-          [](void* faults, int action, const char* name, const char*, const char*, const char*) {
-            return static_cast<DatabaseFaults*>(faults)->allows(action, name) ? SQLITE_OK
-                                                                              : SQLITE_DENY;
-          },
-          this);
-    });
-  }
-  bool struck() const { return struck_; }
-
-  /// While it lives, what its thread asks is no step.
-  class Uncounted {
-   public:
-    Uncounted() { uncounted_ = true; }
-    ~Uncounted() { uncounted_ = false; }
-    Uncounted(const Uncounted&) = delete;
-    Uncounted& operator=(const Uncounted&) = delete;
-  };
-
- private:
-  bool allows(int action, const char* name) {
-    const bool isStep = mode_.reads
-                            ? action == SQLITE_SELECT && sqlite3_get_autocommit(handle_) != 0
-                            : action == SQLITE_TRANSACTION && std::string_view(name) == "COMMIT";
-    if (!isStep) return true;
-    if (struck_) return mode_.once;
-    if (uncounted_ || --left_ > 0) return true;
-    struck_ = true;
-    return false;
-  }
-
-  static inline thread_local bool uncounted_ = false;
-  const Mode mode_;
-  int left_;
-  sqlite3* handle_ = nullptr;
-  std::atomic<bool> struck_ = false;
-};
-
-/// What a client does, as far as it gets: it gives up when it is refused.
-void install(DeviceInstallCoordination& service, CoordinatorObserver& observer) {
-  const auto coordinator = service.coordinatorFor(CoordinatorKind::Initiating, Id, SyncHostClientID,
-                                                  true, nullptr, nullptr);
-  if (!coordinator) return;
-  coordinator->setObserver(&observer);
-  const auto package =
-      service.createPathTransferPromise("com.example.a-Asset", SyncHostClientID, std::nullopt, 0);
-  const auto icon = service.createPathTransferPromise("com.example.a-Icon", SyncHostClientID,
-                                                      FileLocation::file(Icon), 1);
-  const auto placeholder =
-      service.createAppPlaceholder("A", Id, InstallType::Sync, SyncHostClientID);
-  if (icon) icon->setComplete(true);
-  const InstallOptions options{StoreMetadata{{{"itemName", "A"}}}, InstallType::Sync, 1,
-                               toBytes("sinf")};
-  const bool ready = package && icon && placeholder &&
-                     coordinator->setInstallOptions(options, nullptr) &&
-                     coordinator->setInitialQPKAssetPromises({}, nullptr) &&
-                     coordinator->setAppAssetPromise(package, nullptr) &&
-                     placeholder->setIconPromise(icon, nullptr) &&
-                     placeholder->setPlaceholderAttributes({}, nullptr) &&
-                     placeholder->setConfigurationComplete(nullptr) &&
-                     coordinator->setPlaceholderPromise(placeholder, nullptr);
-  if (!ready) {
-    coordinator->cancel(Error::posix(ECANCELED), SyncHostClientID);
-    return;
-  }
-  package->setTransferPath(Package);
-  package->setPercentComplete(1.0);
-  package->setComplete(true);
-}
-
-std::shared_ptr<InstallCoordinator> find(DeviceInstallCoordination& service) {
-  return service.coordinatorFor(CoordinatorKind::Any, Id, SyncHostClientID, false, nullptr,
-                                nullptr);
+void installAll(DeviceInstallCoordination& service, CoordinatorObserver& observer) {
+  install(service, observer);
 }
 
 void uninstall(DeviceInstallCoordination& service, CoordinatorObserver&) {
@@ -154,12 +55,11 @@ void cancelAsPerson(DeviceInstallCoordination& service, CoordinatorObserver&) {
 void nothing(DeviceInstallCoordination&, CoordinatorObserver&) {}
 
 void PrintTo(const Course& course, std::ostream* out) { *out << course.name; }
-void PrintTo(const Mode& mode, std::ostream* out) { *out << mode.name; }
 
 const Lines OldOrNew{"com.example.a 1.0", "com.example.a 2.0"};
 const Course Courses[] = {
-    {"AFirstInstall", false, false, nullptr, install, {"", "com.example.a 2.0"}},
-    {"AnUpdate", true, false, nullptr, install, OldOrNew},
+    {"AFirstInstall", false, false, nullptr, installAll, {"", "com.example.a 2.0"}},
+    {"AnUpdate", true, false, nullptr, installAll, OldOrNew},
     {"ACancelByItsClient", false, true, nullptr, cancelAsClient, {""}},
     {"ACancelByThePerson", true, true, nullptr, cancelAsPerson, {"com.example.a 1.0"}},
     {"AnUninstall", true, false, nullptr, uninstall, {"", "com.example.a 1.0"}},
@@ -168,68 +68,6 @@ const Course Courses[] = {
     {"AnOpeningAfterABrokenInstall", true, true, InstallBroken, nothing, OldOrNew},
     {"AnOpeningAfterABrokenCancel", true, true, CancelBroken, nothing, {"com.example.a 1.0"}},
 };
-
-/// A coordinator, and a database that fails from now on.
-class CoordinationRefusalsTest : public CoordinationTest {
- protected:
-  void strike(const Mode& mode) {
-    EXPECT_TRUE(installPackage(Id, "1.0"));
-    device.reset();
-    faults_.emplace(mode, 1);
-    parts_.emplace(folder);
-    service_.emplace(parts_->core(), parts_->registry());
-    coordinator = service_->coordinatorFor(CoordinatorKind::Updating, Id, SyncHostClientID, true,
-                                           nullptr, nullptr);
-    faults_->strike(parts_->database());
-  }
-  DeviceInstallCoordination& failing() { return *service_; }
-
-  std::shared_ptr<InstallCoordinator> coordinator;
-
- private:
-  std::optional<DatabaseFaults> faults_;
-  std::optional<DeviceParts> parts_;
-  std::optional<DeviceInstallCoordination> service_;
-};
-
-TEST_F(CoordinationRefusalsTest, WhatCannotBeWrittenIsRefused) {
-  strike(Modes[3]);
-  EXPECT_EQ(failing().createPathTransferPromise("a", SyncHostClientID, std::nullopt, 0), nullptr);
-  EXPECT_EQ(failing().createOutOfBandTransferPromise("a", SyncHostClientID, 0), nullptr);
-  EXPECT_EQ(failing().createAppPlaceholder("A", Id, InstallType::Sync, SyncHostClientID), nullptr);
-  EXPECT_EQ(failing().coordinatorFor(CoordinatorKind::Initiating, "com.example.b", SyncHostClientID,
-                                     true, nullptr, &error),
-            nullptr);
-  EXPECT_TRUE(error);
-  error.reset();
-  EXPECT_FALSE(coordinator->setInstallOptions({}, &error));
-  EXPECT_TRUE(error);
-  EXPECT_FALSE(coordinator->hasInstallOptions());
-  EXPECT_FALSE(coordinator->cancel(reason, SyncHostClientID));
-  EXPECT_FALSE(coordinator->error());
-  EXPECT_FALSE(failing().tap(Id));
-  EXPECT_FALSE(failing().cancelInstall(Id));
-}
-
-TEST_F(CoordinationRefusalsTest, WhatCannotBeReadIsAnErrorAndNotTakenForWell) {
-  strike(Modes[1]);
-  EXPECT_TRUE(coordinator->error());
-  EXPECT_EQ(coordinator->appAssetPromise(&error), nullptr);
-  EXPECT_TRUE(error);
-  error.reset();
-  EXPECT_EQ(
-      failing().coordinatorFor(CoordinatorKind::Any, Id, SyncHostClientID, false, nullptr, &error),
-      nullptr);
-  EXPECT_TRUE(error);
-}
-
-TEST_F(CoordinationRefusalsTest, AnUninstallThatCannotBeWrittenSaysSoAndRemovesNothing) {
-  strike(Modes[3]);
-  std::promise<std::optional<Error>> told;
-  failing().uninstallApp(Id, false, [&](const auto& outcome) { told.set_value(outcome); });
-  EXPECT_TRUE(told.get_future().get());
-  EXPECT_EQ(find(failing()), coordinator);
-}
 
 class CoordinationFaultsTest : public CoordinationTest,
                                public ::testing::WithParamInterface<std::tuple<Course, Mode>> {

@@ -9,7 +9,12 @@ namespace {
 using Lines = std::vector<std::string>;
 constexpr std::string_view Id = "com.example.a";
 
-class CoordinationInstallTest : public CoordinationTest {};
+class CoordinationInstallTest : public CoordinationTest {
+ protected:
+  static void waitUntilTold(WaitingWatcher& watcher, std::size_t times) {
+    while (watcher.entries().size() < times) std::this_thread::yield();
+  }
+};
 
 TEST_F(CoordinationInstallTest, APlaceholderStandsUntilItsPackageTakesItsPlace) {
   const auto coordinator = prepare(Id);
@@ -52,8 +57,8 @@ TEST_F(CoordinationInstallTest, WhateverComesLastSetsTheInstallGoing) {
       },
       [&](InstallCoordinator& coordinator) {
         const auto placeholder = placeholderOf(*coordinator.bundleIdentifier());
-        coordinator.setPlaceholderPromise(placeholder, nullptr);
         placeholder->setConfigurationComplete(nullptr);
+        coordinator.setPlaceholderPromise(placeholder, nullptr);
       },
   };
   std::vector<std::size_t> order = {0, 1, 2};
@@ -168,18 +173,6 @@ TEST_F(CoordinationInstallTest, AFailedInstallCanBeBegunAnew) {
   EXPECT_EQ(registry(), Lines{"com.example.a 2.0"});
 }
 
-TEST_F(CoordinationInstallTest, APlaceholderThatIsNotConfiguredIsNotInstalled) {
-  const auto coordinator = coordinatorFor(Id);
-  coordinator->setObserver(&recorder);
-  const auto placeholder = placeholderOf(Id);
-  ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder, nullptr));
-  EXPECT_TRUE(coordinator->hasPlaceholderPromise());
-  waitUntilIdle(Id);  // although it is live: it is the client's turn
-  EXPECT_EQ(registry(), Lines{});
-  ASSERT_TRUE(placeholder->setConfigurationComplete(nullptr));
-  EXPECT_TRUE(recorder.waitFor("placeholder"));
-}
-
 TEST_F(CoordinationInstallTest, APlaceholderWaitsForItsIconOrDoesWithoutACancelledOne) {
   for (const bool kept : {true, false}) {
     const std::string id = kept ? "com.example.kept" : "com.example.cancelled";
@@ -247,6 +240,36 @@ TEST_F(CoordinationInstallTest, AnApplicationInTheForegroundIsUpdatedWhenItIsClo
   EXPECT_EQ(watcher.entries(), (Lines{"denied com.example.a", "installed com.example.a"}))
       << "people are told once";
   device->setWatcher(nullptr);
+}
+
+TEST_F(CoordinationInstallTest, PeopleAreToldOfEachInstallThatWaitsForItsApplication) {
+  ASSERT_TRUE(installPackage(Id, "1.0"));
+  ASSERT_TRUE(launch(Id));
+  WaitingWatcher watcher;
+  device->setWatcher(&watcher);
+  deliver(*prepare(Id, CoordinatorKind::Updating), Id);
+  ASSERT_TRUE(watcher.waitFor("denied com.example.a"));
+  ASSERT_TRUE(service().cancelInstall(Id));
+  deliver(*prepare(Id, CoordinatorKind::Updating), Id);
+  waitUntilTold(watcher, 2);
+  EXPECT_EQ(watcher.entries(), (Lines{"denied com.example.a", "denied com.example.a"}));
+  device->setWatcher(nullptr);
+}
+
+TEST_F(CoordinationInstallTest, TheBlobOfAPlaceholderStaysWithTheApplication) {
+  const auto coordinator = coordinatorFor(Id);
+  coordinator->setObserver(&recorder);
+  const auto placeholder = placeholderOf(Id);
+  ASSERT_TRUE(placeholder->setSinfData(toBytes("sinf"), nullptr));
+  ASSERT_TRUE(placeholder->setConfigurationComplete(nullptr));
+  ASSERT_TRUE(coordinator->setInstallOptions({}, nullptr));
+  ASSERT_TRUE(coordinator->setAppAssetPromise(packagePromise(Id), nullptr));
+  ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder, nullptr));
+  ASSERT_TRUE(recorder.waitFor("placeholder"));
+  EXPECT_EQ(device->opaqueBlob(Id), toBytes("sinf"));
+  deliver(*coordinator, Id);
+  ASSERT_TRUE(recorder.waitFor("complete"));
+  EXPECT_EQ(device->opaqueBlob(Id), toBytes("sinf"));
 }
 
 TEST_F(CoordinationInstallTest, WhenTheHostHurriesAWaitingInstallFails) {

@@ -122,7 +122,7 @@ TEST_F(CoordinationObjectsTest, ACancelledPackagePromiseOrPlaceholderTakesItsCoo
   EXPECT_EQ(first->error(), reason);
   const auto second = coordinatorFor("com.example.b");
   second->setObserver(&recorder);
-  const auto placeholder = placeholderOf("com.example.b");
+  const auto placeholder = completePlaceholder("com.example.b");
   ASSERT_TRUE(second->setPlaceholderPromise(placeholder, nullptr));
   EXPECT_TRUE(placeholder->cancel(reason, KQClientKiosk));
   EXPECT_TRUE(recorder.waitFor("canceled com.example.b by 1"));
@@ -140,7 +140,8 @@ TEST_F(CoordinationObjectsTest, WhatIsOverTakesNoMoreChanges) {
   EXPECT_EQ(promise->percentComplete(), 0);
   EXPECT_FALSE(promise->isComplete());
   EXPECT_FALSE(promise->transferPath());
-  EXPECT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(KQClientKiosk, nullptr));
+  EXPECT_FALSE(coordinator->setAppAssetPromiseResponsibleClient(KQClientKiosk, &error));
+  EXPECT_EQ(text(), "the install is over");
   EXPECT_EQ(coordinator->appAssetPromiseResponsibleClient(), 0U);
   EXPECT_EQ(coordinator->bundleIdentifier(), Id);
   EXPECT_TRUE(coordinator->hasInstallOptions()) << "the last values stay readable";
@@ -173,8 +174,13 @@ TEST_F(CoordinationObjectsTest, ObjectsOutliveTheService) {
   promise->setComplete(true);
   data->cancel(reason, SyncHostClientID);
   coordinator->setObserver(nullptr);
-  placeholder->setConfigurationComplete(nullptr);
-  coordinator->cancel(reason, SyncHostClientID);
+  EXPECT_FALSE(coordinator->setInstallOptions({}, &error));
+  EXPECT_EQ(text(), "the coordination service has ended");
+  error.reset();
+  EXPECT_FALSE(placeholder->setConfigurationComplete(&error));
+  EXPECT_EQ(text(), "the coordination service has ended");
+  EXPECT_FALSE(placeholder->cancel(reason, SyncHostClientID));
+  EXPECT_FALSE(coordinator->cancel(reason, SyncHostClientID));
   listener.reset();
   EXPECT_EQ(promise->name(), "com.example.a-Asset");
   EXPECT_FALSE(promise->isComplete());
@@ -238,19 +244,6 @@ TEST_F(CoordinationObjectsTest, APersonWhoUninstallsEndsTheInstall) {
   ASSERT_TRUE(device->uninstall(Id, &error)) << text();
   EXPECT_TRUE(recorder.waitFor("canceled com.example.a by 15"));
   EXPECT_EQ(live(Id), nullptr);
-}
-
-TEST_F(CoordinationObjectsTest, APlaceholderThatWasTakenAwayComesBackWithItsClient) {
-  prepare(Id);
-  ASSERT_TRUE(recorder.waitFor("placeholder"));
-  ASSERT_TRUE(device->appRegistry().uninstallApplication(Id, {}));
-  EXPECT_TRUE(registry().empty());
-  EventRecorder again;
-  coordinatorFor(Id)->setObserver(&again);
-  ASSERT_TRUE(again.waitFor("placeholder"));
-  EXPECT_EQ(registry(), Lines{"com.example.a 2.0 (placeholder)"});
-  EXPECT_EQ(textAt(*record(Id)->bundlePath + "/Icon.png"), "picture of com.example.a");
-  service().removeObserver(&again);
 }
 
 TEST_F(CoordinationObjectsTest, AnErrorForThePersonCarriesItsCauseAndSurvivesTheStore) {

@@ -63,11 +63,8 @@ TEST_F(CoordinationRecoveryTest, AnInstallThatIsInterruptedAfterEachStepComesToI
   EXPECT_EQ(live(Id)->appAssetPromise(nullptr)->identifier(), promise);
   EXPECT_EQ(live(Id)->appAssetPromiseResponsibleClient(), KQClientKiosk);
   EXPECT_TRUE(live(Id)->hasUserDataPromise());
-  const auto placeholder = placeholderOf(Id);
-  ASSERT_TRUE(live(Id)->setPlaceholderPromise(placeholder, nullptr));
-  reopen();
-  EXPECT_TRUE(live(Id)->hasPlaceholderPromise());
-  EXPECT_EQ(registry(), Lines{}) << "its configuration was never complete";
+  EXPECT_FALSE(live(Id)->hasPlaceholderPromise());
+  EXPECT_EQ(registry(), Lines{});
   ASSERT_TRUE(live(Id)->setPlaceholderPromise(completePlaceholder(Id), nullptr));
   live(Id)->setObserver(&recorder);
   ASSERT_TRUE(recorder.waitFor("placeholder"));
@@ -89,6 +86,7 @@ TEST_F(CoordinationRecoveryTest, APackageThatHasComeIsInstalledAfterARestart) {
   listen();
   ASSERT_TRUE(listening.waitFor("complete com.example.a"));
   EXPECT_EQ(version(Id), "2.0");
+  waitUntilIdle(Id);
   EXPECT_FALSE(device->files().fileExists(package.path));
 }
 
@@ -146,18 +144,67 @@ TEST_F(CoordinationRecoveryTest, APackageThatHasGoneCancelsItsCoordinator) {
   EXPECT_EQ(registry(), Lines{"com.example.a 1.0"});
   EXPECT_TRUE(
       logMentions("The install coordinator of com.example.a is cancelled: its package is gone"));
-  listen();
-  EXPECT_TRUE(listening.waitFor("canceled com.example.a by 16"));
 }
 
-TEST_F(CoordinationRecoveryTest, APlaceholderThatHasGoneIsInstalledAgain) {
-  prepareAndClose();
+TEST_F(CoordinationRecoveryTest, APlaceholderThatWasTakenAwayEndsItsCoordinatorUntold) {
+  prepareAndClose(CoordinatorKind::Restoring);
   reopen();
   device->appRegistry().uninstallApplication(Id, {});
   reopen();
+  EXPECT_EQ(live(Id), nullptr);
+  EXPECT_TRUE(logMentions(
+      "The install coordinator of com.example.a is cancelled: its placeholder was taken away"));
   listen();
-  EXPECT_TRUE(listening.waitFor("placeholder com.example.a"));
-  EXPECT_TRUE(logMentions("The install coordinator of com.example.a gets its placeholder anew"));
+  waitUntilIdle(Id);
+  EXPECT_EQ(listening.events(), Events{});
+  EXPECT_EQ(registry(), Lines{});
+}
+
+TEST_F(CoordinationRecoveryTest, WhatIsLeftOfAnApplicationIsFreeWhenTheSyncThatBringsItIsKilled) {
+  ASSERT_TRUE(installPackage(Id, "1.0"));
+  ASSERT_TRUE(device->demote(Id, nullptr));
+  prepareAndClose();
+  reopen();
+  EXPECT_EQ(live(Id), nullptr);
+  EXPECT_TRUE(
+      logMentions("The install coordinator of com.example.a is cancelled: its client is gone"));
+  EXPECT_EQ(registry(), Lines{"com.example.a 1.0 (placeholder)"});
+  EXPECT_EQ(record(Id, true)->installType, InstallType::IntentionalDowngrade);
+}
+
+TEST_F(CoordinationRecoveryTest, AnInstallThatWasInButNotNotedIsOnlyNoted) {
+  makeWaitingUpdate();
+  quit(Id);
+  edit(
+      "UPDATE install_coordinators SET stage = 1; DELETE FROM applications WHERE placeholder; "
+      "DELETE FROM installs");
+  reopen();
+  listen();
+  ASSERT_TRUE(listening.waitFor("complete com.example.a"));
+  waitUntilIdle(Id);
+  EXPECT_EQ(version(Id), "1.0") << "nothing was installed once more";
+  EXPECT_EQ(live(Id), nullptr);
+  EXPECT_FALSE(device->files().fileExists(package.path));
+}
+
+TEST_F(CoordinationRecoveryTest, AnInstallWhoseFailureWasOnRecordIsNotTriedAgain) {
+  makeWaitingUpdate();
+  quit(Id);
+  edit("UPDATE install_coordinators SET stage = 1, error = x'00'");
+  reopen();
+  listen();
+  ASSERT_TRUE(listening.waitFor("failed com.example.a"));
+  waitUntilIdle(Id);
+  EXPECT_EQ(registry(), Lines{"com.example.a 1.0"});
+  EXPECT_EQ(live(Id), nullptr);
+}
+
+TEST_F(CoordinationRecoveryTest, APackageThatIsCompleteWithoutAPlaceCancelsItsCoordinator) {
+  prepareAndClose();
+  edit("UPDATE data_promises SET complete = 1 WHERE name LIKE '%-Asset'");
+  reopen();
+  EXPECT_EQ(live(Id), nullptr);
+  EXPECT_EQ(registry(), Lines{});
 }
 
 TEST_F(CoordinationRecoveryTest, ADamagedCoordinatorIsCancelledWithItsPlaceholderAndTheLogSaysWhy) {
@@ -171,12 +218,12 @@ TEST_F(CoordinationRecoveryTest, ADamagedCoordinatorIsCancelledWithItsPlaceholde
       {"UPDATE install_placeholders SET metadata = zeroblob(9)", "its placeholder cannot be read"},
       {"UPDATE install_placeholders SET identifier = '../x'", "its placeholder cannot be read"},
       {"UPDATE install_placeholders SET over = 1", "its placeholder cannot be read"},
+      {"UPDATE install_placeholders SET configured = 0", "its placeholder was never configured"},
   };
   for (const auto& [sql, why] : damages) {
     SCOPED_TRACE(sql);
     EventRecorder events;
-    const auto coordinator = prepare(Id);
-    coordinator->setObserver(&events);
+    prepare(Id, CoordinatorKind::Initiating, &events);
     ASSERT_TRUE(events.waitFor("placeholder"));
     device.reset();
     edit(sql);
@@ -207,7 +254,7 @@ TEST_F(CoordinationRecoveryTest, WhatACoordinatorHasLostCanBeGivenAgain) {
   for (const auto& [sql, what] : losses) {
     SCOPED_TRACE(sql);
     EventRecorder events;
-    prepare(Id)->setObserver(&events);
+    prepare(Id, CoordinatorKind::Initiating, &events);
     ASSERT_TRUE(events.waitFor("placeholder"));
     device.reset();
     edit(sql);

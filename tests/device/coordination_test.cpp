@@ -96,9 +96,10 @@ std::shared_ptr<InstallPlaceholder> CoordinationTest::completePlaceholder(
 }
 
 std::shared_ptr<InstallCoordinator> CoordinationTest::prepare(std::string_view identifier,
-                                                              CoordinatorKind kind) {
+                                                              CoordinatorKind kind,
+                                                              CoordinatorObserver* observer) {
   const auto coordinator = coordinatorFor(identifier, kind);
-  coordinator->setObserver(&recorder);
+  coordinator->setObserver(observer);
   const bool ready = coordinator->setInstallOptions(syncOptions(), &error) &&
                      coordinator->setInitialQPKAssetPromises({}, &error) &&
                      coordinator->setAppAssetPromise(packagePromise(identifier), &error) &&

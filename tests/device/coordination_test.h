@@ -52,9 +52,14 @@ class CoordinationTest : public DeviceTest {
   std::shared_ptr<InstallPlaceholder> completePlaceholder(std::string_view identifier,
                                                           InstallType type = InstallType::Sync);
 
-  /// All that a client does before the package comes; `recorder` observes.
+  /// All that a client does before the package comes.
+  std::shared_ptr<InstallCoordinator> prepare(std::string_view identifier, CoordinatorKind kind,
+                                              CoordinatorObserver* observer);
+  /// The same; `recorder` observes.
   std::shared_ptr<InstallCoordinator> prepare(std::string_view identifier,
-                                              CoordinatorKind kind = CoordinatorKind::Initiating);
+                                              CoordinatorKind kind = CoordinatorKind::Initiating) {
+    return prepare(identifier, kind, &recorder);
+  }
   /// The package comes, version 2.0.
   void deliver(InstallCoordinator& coordinator, std::string_view identifier);
   void deliver(InstallCoordinator& coordinator, const FileLocation& package);

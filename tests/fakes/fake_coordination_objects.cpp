@@ -8,20 +8,21 @@ namespace {
 
 std::string promiseText(const DataPromise* promise) { return promise ? promise->name() : "none"; }
 
-/// Why a promise is not taken.
-std::optional<Error> objection(const std::shared_ptr<PathTransferPromise>& promise) {
-  if (!promise) return Error::posix(EINVAL);
-  const auto* const fake = dynamic_cast<const FakePathTransferPromise*>(promise.get());
-  if (!fake || !fake->state().cancellation) return std::nullopt;
-  return Error::posix(ECANCELED);
+bool isOver(const DataPromise& promise) {
+  if (const auto* const path = dynamic_cast<const FakePathTransferPromise*>(&promise)) {
+    return path->state().isOver();
+  }
+  const auto* const other = dynamic_cast<const FakeOutOfBandTransferPromise*>(&promise);
+  return other && other->state().isOver();
 }
 
 std::optional<Error> objection(const std::shared_ptr<InstallPlaceholder>& placeholder,
                                const std::string& bundleId) {
   if (!placeholder || placeholder->bundleIdentifier() != bundleId) return Error::posix(EINVAL);
   const auto* const fake = dynamic_cast<const FakeInstallPlaceholder*>(placeholder.get());
-  if (!fake || !fake->state().cancellation) return std::nullopt;
-  return Error::posix(ECANCELED);
+  if (!fake) return std::nullopt;
+  if (fake->state().isOver()) return Error::posix(ECANCELED);
+  return fake->state().configurationComplete ? std::nullopt : std::optional(Error::posix(EINVAL));
 }
 
 std::string optionsText(const InstallOptions& options) {
@@ -47,9 +48,17 @@ bool FakeInstallPlaceholder::change(std::string_view operation, std::string argu
   context_.trace.add(TraceCall, arguments.empty() ? callText(name, bundleId)
                                                   : callText(name, bundleId, arguments));
   const std::scoped_lock lock(mutex_);
-  if (state_.cancellation) return true;
+  if (state_.isOver()) {
+    setError(error, Error::posix(ECANCELED));
+    return false;
+  }
   apply(state_);
   return true;
+}
+
+void FakeInstallPlaceholder::settle() {
+  const std::scoped_lock lock(mutex_);
+  state_.settled = true;
 }
 
 bool FakeInstallPlaceholder::setIconPromise(const std::shared_ptr<PathTransferPromise>& promise,
@@ -109,13 +118,21 @@ bool FakeInstallCoordinator::change(std::string_view operation, std::string argu
   const std::string name = "InstallCoordinator." + std::string(operation);
   if (context_.faults.strikes(name, label(), error)) return false;
   context_.trace.add(TraceCall, callText(name, label(), arguments));
-  if (refusal) {
-    setError(error, *refusal);
+  const std::scoped_lock lock(mutex_);
+  const std::optional<Error> reason = state_.isLive() ? refusal : Error::posix(ECANCELED);
+  if (reason) {
+    setError(error, *reason);
     return false;
   }
-  const std::scoped_lock lock(mutex_);
-  if (state_.isLive()) apply(state_);
+  apply(state_);
   return true;
+}
+
+std::optional<Error> FakeInstallCoordinator::objection(const DataPromise* promise) const {
+  if (!promise) return Error::posix(EINVAL);
+  if (isOver(*promise)) return Error::posix(ECANCELED);
+  const bool isTaken = context_.service.isPromisedElsewhere(*promise, *this);
+  return isTaken ? std::optional(Error::posix(EBUSY)) : std::nullopt;
 }
 
 void FakeInstallCoordinator::setObserver(CoordinatorObserver* observer) noexcept {
@@ -148,7 +165,7 @@ bool FakeInstallCoordinator::setAppAssetPromise(const std::shared_ptr<PathTransf
                                                 std::optional<Error>* error) noexcept {
   return change(
       "setAppAssetPromise", promiseText(promise.get()), error,
-      [&](State& state) { state.appAssetPromise = promise; }, objection(promise));
+      [&](State& state) { state.appAssetPromise = promise; }, objection(promise.get()));
 }
 
 bool FakeInstallCoordinator::setAppAssetPromiseResponsibleClient(
@@ -160,22 +177,25 @@ bool FakeInstallCoordinator::setAppAssetPromiseResponsibleClient(
 bool FakeInstallCoordinator::setUserDataPromise(
     const std::shared_ptr<OutOfBandTransferPromise>& promise,
     std::optional<Error>* error) noexcept {
-  return change("setUserDataPromise", promiseText(promise.get()), error,
-                [&](State& state) { state.userDataPromise = promise; });
+  return change(
+      "setUserDataPromise", promiseText(promise.get()), error,
+      [&](State& state) { state.userDataPromise = promise; }, objection(promise.get()));
 }
 
 bool FakeInstallCoordinator::setPlaceholderPromise(
     const std::shared_ptr<InstallPlaceholder>& placeholder, std::optional<Error>* error) noexcept {
   return change(
       "setPlaceholderPromise", placeholder ? placeholder->description() : "none", error,
-      [&](State& state) { state.placeholder = placeholder; }, objection(placeholder, label()));
+      [&](State& state) { state.placeholder = placeholder; },
+      fakes::objection(placeholder, label()));
 }
 
 bool FakeInstallCoordinator::cancel(const Error& reason, CoordinationClientId client) noexcept {
-  const bool taken = change("cancel", argumentText(reason) + ", " + std::to_string(client), nullptr,
-                            [](State&) {});
-  if (taken) context_.service.giveUp(*this, reason, client);
-  return taken && !state().completed;
+  constexpr std::string_view operation = "InstallCoordinator.cancel";
+  if (context_.faults.strikes(operation, label(), nullptr)) return false;
+  context_.trace.add(TraceCall, callText(operation, label(), reason, client));
+  context_.service.giveUp(*this, reason, client);
+  return !state().completed;
 }
 
 std::string FakeInstallCoordinator::description() const { return "<Coordinator " + label() + ">"; }

@@ -28,6 +28,9 @@ class CoordinatorOwner {
   /// Cancels the coordinator, once, with what belongs to it.
   virtual void giveUp(FakeInstallCoordinator& coordinator, const Error& reason,
                       CoordinationClientId client) = 0;
+  /// Whether another live coordinator has the promise.
+  virtual bool isPromisedElsewhere(const DataPromise& promise,
+                                   const FakeInstallCoordinator& coordinator) = 0;
 
  protected:
   ~CoordinatorOwner() = default;
@@ -54,6 +57,8 @@ struct PromiseState {
   bool began = false;  ///< its coordinator's client was told so
   bool settled = false;
   std::optional<Cancellation> cancellation;
+
+  bool isOver() const { return settled || cancellation; }
 };
 
 template <typename Promise>
@@ -104,7 +109,7 @@ class FakeDataPromise : public Promise {
   void change(std::string line, Change apply) {
     context_.trace.add(TraceCall, std::move(line));
     const std::scoped_lock lock(mutex_);
-    if (!state_.cancellation && !state_.settled) apply(state_);
+    if (!state_.isOver()) apply(state_);
   }
 
  private:
@@ -137,7 +142,10 @@ class FakeInstallPlaceholder : public InstallPlaceholder {
     std::optional<StoreMetadata> metadata;
     std::optional<Bytes> sinfData;
     bool configurationComplete = false;
+    bool settled = false;
     std::optional<Cancellation> cancellation;
+
+    bool isOver() const { return settled || cancellation; }
   };
 
   FakeInstallPlaceholder(CoordinationContext context, State state)
@@ -155,6 +163,8 @@ class FakeInstallPlaceholder : public InstallPlaceholder {
   std::string description() const override;
 
   State state() const;
+  /// Its coordinator is over: nothing changes it any more.
+  void settle();
 
  private:
   template <typename Change>
@@ -182,6 +192,7 @@ class FakeInstallCoordinator : public InstallCoordinator,
     std::shared_ptr<OutOfBandTransferPromise> userDataPromise;
     std::shared_ptr<InstallPlaceholder> placeholder;
     bool placeholderStands = false;
+    bool placeholderIsAdopted = false;  ///< it stood there before
     bool completed = false;
     std::optional<Cancellation> cancellation;
 
@@ -230,7 +241,9 @@ class FakeInstallCoordinator : public InstallCoordinator,
  private:
   /// "com.a", or "none" when the coordinator is not known any more.
   std::string label() const { return state().bundleIdentifier.value_or("none"); }
-  /// With a reason to refuse, nothing is changed.
+  /// Why a promise is not taken.
+  std::optional<Error> objection(const DataPromise* promise) const;
+  /// With a reason to refuse, or once it is over, nothing is changed.
   template <typename Change>
   bool change(std::string_view operation, std::string arguments, std::optional<Error>* error,
               Change apply, const std::optional<Error>& refusal = std::nullopt);

@@ -1,5 +1,6 @@
 // What the coordination service does beyond keeping what it is given: installs, cancellations and
 // uninstalls.
+#include <algorithm>
 #include <cerrno>
 
 #include "platform/bundle.h"
@@ -17,11 +18,58 @@ FakeInstallPlaceholder::State placeholderOf(const FakeInstallCoordinator::State&
   return fake ? fake->state() : FakeInstallPlaceholder::State{};
 }
 
+std::shared_ptr<FakePathTransferPromise> iconOf(const FakeInstallCoordinator::State& state) {
+  return std::dynamic_pointer_cast<FakePathTransferPromise>(placeholderOf(state).iconPromise);
+}
+
 std::shared_ptr<FakePathTransferPromise> packageOf(const FakeInstallCoordinator::State& state) {
   return std::dynamic_pointer_cast<FakePathTransferPromise>(state.appAssetPromise);
 }
 
+AppRecord recordOf(const FakeInstallPlaceholder::State& placeholder) {
+  AppRecord record;
+  record.applicationIdentifier = placeholder.bundleIdentifier;
+  record.displayName = placeholder.name;
+  record.installType = placeholder.installType;
+  if (placeholder.attributes) record.bundleVersion = placeholder.attributes->bundleVersion;
+  return record;
+}
+
+/// Whether the coordinator has the promise, as whatever.
+bool uses(const FakeInstallCoordinator::State& state, const DataPromise& promise) {
+  return state.appAssetPromise.get() == &promise || state.userDataPromise.get() == &promise ||
+         placeholderOf(state).iconPromise.get() == &promise;
+}
+
+bool endAlike(CoordinatorKind one, CoordinatorKind other) {
+  return (one == CoordinatorKind::RestoringDemoted) == (other == CoordinatorKind::RestoringDemoted);
+}
+
 }  // namespace
+
+bool FakeInstallCoordination::isPromisedElsewhere(const DataPromise& promise,
+                                                  const FakeInstallCoordinator& coordinator) {
+  const std::scoped_lock lock(mutex_);
+  return std::ranges::any_of(coordinators_, [&](const auto& other) {
+    const FakeInstallCoordinator::State state = other->state();
+    return other.get() != &coordinator && state.isLive() && uses(state, promise);
+  });
+}
+
+bool FakeInstallCoordination::makesRoom(FakeInstallCoordinator& live, CoordinatorKind kind,
+                                        CoordinationClientId client,
+                                        std::optional<Error>& refusal) {
+  const FakeInstallCoordinator::State state = live.state();
+  const bool isAlike = endAlike(state.kind, kind);
+  const bool isWhole = !state.placeholderStands || registry_.placeholder(*state.bundleIdentifier);
+  if (isAlike && isWhole) return false;
+  if (state.creator == client) {
+    giveUp(live, Error::posix(ECANCELED), client);
+    return true;
+  }
+  if (!isAlike) refusal = Error::posix(EBUSY);
+  return false;
+}
 
 std::shared_ptr<FakeInstallCoordinator> FakeInstallCoordination::liveCoordinator(
     std::string_view bundleId) const {
@@ -34,7 +82,9 @@ void FakeInstallCoordination::carryOn(std::string_view bundleId) {
   if (!found) return;
   const FakeInstallCoordinator::State state = found->state();
   const auto package = packageOf(state);
-  if (package && package->begins()) fireDidBeginFulfillment(*found, package->identifier());
+  for (const auto& promise : {iconOf(state), package}) {
+    if (promise && promise->begins()) fireDidBeginFulfillment(*found, promise->identifier());
+  }
   if (!state.placeholderStands && !installPlaceholder(*found)) return;
   if (state.kind == CoordinatorKind::RestoringDemoted) {
     end(*found, std::nullopt);
@@ -46,13 +96,15 @@ void FakeInstallCoordination::carryOn(std::string_view bundleId) {
 bool FakeInstallCoordination::installPlaceholder(FakeInstallCoordinator& coordinator) {
   const FakeInstallPlaceholder::State placeholder = placeholderOf(coordinator.state());
   if (!placeholder.configurationComplete) return false;
-  AppRecord record;
-  record.applicationIdentifier = placeholder.bundleIdentifier;
-  record.displayName = placeholder.name;
-  record.installType = placeholder.installType;
-  if (placeholder.attributes) record.bundleVersion = placeholder.attributes->bundleVersion;
-  registry_.seedPlaceholder(std::move(record));
-  coordinator.edit([](FakeInstallCoordinator::State& state) { state.placeholderStands = true; });
+  const std::optional<AppRecord> left = registry_.placeholder(placeholder.bundleIdentifier);
+  const bool adopts = placeholder.installType == InstallType::Sync && left &&
+                      left->installType != InstallType::Sync &&
+                      !registry_.installed(placeholder.bundleIdentifier);
+  if (!adopts) registry_.seedPlaceholder(recordOf(placeholder));
+  coordinator.edit([&](FakeInstallCoordinator::State& state) {
+    state.placeholderStands = true;
+    state.placeholderIsAdopted = adopts;
+  });
   fireDidInstallPlaceholder(coordinator);
   return true;
 }
@@ -76,8 +128,14 @@ void FakeInstallCoordination::end(FakeInstallCoordinator& coordinator,
 
 void FakeInstallCoordination::settle(FakeInstallCoordinator& coordinator, bool keepPlaceholder) {
   const FakeInstallCoordinator::State state = coordinator.state();
-  if (const auto package = packageOf(state)) package->settle();
-  if (state.placeholderStands && !keepPlaceholder) {
+  for (const auto& promise : {iconOf(state), packageOf(state)}) {
+    if (promise) promise->settle();
+  }
+  const auto data = std::dynamic_pointer_cast<FakeOutOfBandTransferPromise>(state.userDataPromise);
+  if (data) data->settle();
+  const auto placeholder = std::dynamic_pointer_cast<FakeInstallPlaceholder>(state.placeholder);
+  if (placeholder) placeholder->settle();
+  if (state.placeholderStands && !state.placeholderIsAdopted && !keepPlaceholder) {
     registry_.remove(*state.bundleIdentifier, true);
   }
 }

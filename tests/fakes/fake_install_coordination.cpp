@@ -55,11 +55,18 @@ std::shared_ptr<InstallCoordinator> FakeInstallCoordination::coordinatorFor(
                                          createIfNotExisting ? "create" : "look up"));
   const std::scoped_lock lock(mutex_);
   if (lookupError_) setError(error, *lookupError_);
+  const bool create = createIfNotExisting && kind != CoordinatorKind::Any;
   for (const auto& coordinator : coordinators_) {
     const FakeInstallCoordinator::State state = coordinator->state();
-    if (state.bundleIdentifier == bundleId && state.isLive()) return coordinator;
+    if (state.bundleIdentifier != bundleId || !state.isLive()) continue;
+    std::optional<Error> refusal;
+    if (!create || !makesRoom(*coordinator, kind, client, refusal)) {
+      if (!refusal) return coordinator;
+      setError(error, *refusal);
+      return nullptr;
+    }
   }
-  if (!createIfNotExisting || kind == CoordinatorKind::Any) return nullptr;
+  if (!create) return nullptr;
   FakeInstallCoordinator::State state;
   state.kind = kind;
   state.bundleIdentifier = bundleId;

@@ -110,6 +110,12 @@ class FakeInstallCoordination : public InstallCoordination, private CoordinatorO
   void observerChanged() override;
   void giveUp(FakeInstallCoordinator& coordinator, const Error& reason,
               CoordinationClientId client) override;
+  bool isPromisedElsewhere(const DataPromise& promise,
+                           const FakeInstallCoordinator& coordinator) override;
+  /// Ends a live coordinator that does not serve who asks for one of this kind; an error when it
+  /// is not this client's to end. Neither if it does. The lock is held.
+  bool makesRoom(FakeInstallCoordinator& live, CoordinatorKind kind, CoordinationClientId client,
+                 std::optional<Error>& refusal);
 
   /// The lock is held.
   PromiseState newPromise(std::string_view name, CoordinationClientId client,
