@@ -34,6 +34,11 @@ Error notInstalling(std::string_view bundleId) {
                                 fmt::format("{} is not being installed", bundleId));
 }
 
+Error tooLate(std::string_view bundleId, std::string_view why) {
+  return Error::withDescription(POSIXErrorDomain, EBUSY,
+                                fmt::format("{} is just being installed, {}", bundleId, why));
+}
+
 class FolderDevice final : public EmbeddedDevice {
  public:
   explicit FolderDevice(OpenFolder opened)
@@ -67,20 +72,7 @@ class FolderDevice final : public EmbeddedDevice {
 
   /// Why a wish cannot be carried out.
   std::optional<Error> carryOut(PersonWish wish, std::string_view bundleId) {
-    if (wish == PersonWish::Tap) {
-      const bool heard =
-          (coordination_ && coordination_->tap(bundleId)) || registry_.askFor(bundleId);
-      return heard ? std::nullopt : std::optional(notInstalling(bundleId));
-    }
-    if (!coordination_) return notInstalling(bundleId);
-    const bool live =
-        coordination_->coordinatorFor(CoordinatorKind::Any, bundleId, SyncHostClientID, false,
-                                      nullptr, nullptr) != nullptr;
-    if (coordination_->cancelInstall(bundleId)) return std::nullopt;
-    return live ? Error::withDescription(
-                      POSIXErrorDomain, EBUSY,
-                      fmt::format("{} is just being installed, too late to cancel", bundleId))
-                : notInstalling(bundleId);
+    return wish == PersonWish::Tap ? tap(bundleId) : cancel(bundleId);
   }
 
   FileManager& files() noexcept override { return files_; }
@@ -201,6 +193,29 @@ class FolderDevice final : public EmbeddedDevice {
     if (isUsableIdentifier(bundleId) && database_->writable()) return true;
     setError(error, Error::posix(database_->writable() ? EINVAL : EROFS, bundleId));
     return false;
+  }
+
+  std::optional<Error> tap(std::string_view bundleId) {
+    const bool isHeard = coordination_ && coordination_->tap(bundleId);
+    const bool isAsked = (!isHeard || registry_.isDemoted(bundleId)) && registry_.askFor(bundleId);
+    if (isHeard || isAsked) return std::nullopt;
+    return registry_.isBeingInstalled(bundleId)
+               ? tooLate(bundleId, "and this phone brings packages in their order")
+               : notInstalling(bundleId);
+  }
+
+  /// What only waits for its restore goes like an application that is uninstalled.
+  std::optional<Error> cancel(std::string_view bundleId) {
+    if (coordination_ && coordination_->cancelInstall(bundleId)) {
+      if (!registry_.isApplicationInstalled(bundleId)) containers_.removeWaitingData(bundleId);
+      return std::nullopt;
+    }
+    if (registry_.cancelRestore(bundleId)) return std::nullopt;
+    const bool isLive =
+        coordination_ && coordination_->coordinatorFor(CoordinatorKind::Any, bundleId,
+                                                       PersonClientID, false, nullptr, nullptr);
+    return isLive || registry_.isBeingInstalled(bundleId) ? tooLate(bundleId, "too late to cancel")
+                                                          : notInstalling(bundleId);
   }
 
   // In the order in which they need one another: what works on threads of its own goes first.

@@ -43,10 +43,13 @@ std::optional<Bytes> dataOption(const PropertyList::Dictionary& options, std::st
   return data ? std::optional(*data) : std::nullopt;
 }
 
+bool isDemotion(InstallType placeholder) {
+  return placeholder == InstallType::Downgrade || placeholder == InstallType::IntentionalDowngrade;
+}
+
 /// What came from a backup may be demoted too, and asking twice is no harm.
 bool canBeAskedFor(InstallType placeholder) {
-  return placeholder == InstallType::Downgrade ||
-         placeholder == InstallType::IntentionalDowngrade || placeholder == InstallType::Restore ||
+  return isDemotion(placeholder) || placeholder == InstallType::Restore ||
          placeholder == InstallType::StoreDownload;
 }
 
@@ -200,6 +203,33 @@ bool DeviceAppRegistry::askFor(std::string_view bundleId) noexcept {
         error);
   };
   return changeApplication(bundleId, ask, nullptr) && asked;
+}
+
+bool DeviceAppRegistry::cancelRestore(std::string_view bundleId) noexcept {
+  const auto cancel = [&](const std::string& identifier, std::optional<Error>* error) {
+    ApplicationRows rows;
+    const bool read = core_.database.read(
+        ReadFailed,
+        [&](SQLite::Database& database) { rows = findApplication(database, identifier); }, error);
+    if (!read || rows.installed) return false;
+    const bool waits = rows.placeholder && rows.placeholder->installType == InstallType::Restore;
+    return waits && removeForPerson(core_, identifier, error);
+  };
+  return changeApplication(bundleId, cancel, nullptr);
+}
+
+bool DeviceAppRegistry::isDemoted(std::string_view bundleId) noexcept {
+  const auto placeholder = recordForIdentifier(bundleId, true);
+  return placeholder && isDemotion(placeholder->installType);
+}
+
+bool DeviceAppRegistry::isBeingInstalled(std::string_view bundleId) noexcept {
+  const auto placeholder = recordForIdentifier(bundleId, true);
+  const auto progress = currentProgress(core_.database, core_.observers, bundleId);
+  if (!placeholder || !progress) return false;
+  const InstallState state = progress->installState();
+  return state == InstallState::Active ||
+         (state == InstallState::Waiting && placeholder->installType == InstallType::Sync);
 }
 
 bool DeviceAppRegistry::addSystemApplication(std::string_view bundleId,

@@ -38,6 +38,13 @@ class DeviceAppRegistry final : public AppRegistry {
   /// What a person does: a demoted or restored application is to come. Its placeholder becomes that
   /// of a download from the store. False when there is no such placeholder.
   bool askFor(std::string_view bundleId) noexcept;
+  /// What a person does: an application that only waits to be restored is not to come, and goes
+  /// with what the restore had for it. False when there is no such placeholder.
+  bool cancelRestore(std::string_view bundleId) noexcept;
+  /// Whether only the placeholder and the data are left of it until somebody asks for it.
+  bool isDemoted(std::string_view bundleId) noexcept;
+  /// Whether an install is under way; not while a placeholder only waits for somebody to begin one.
+  bool isBeingInstalled(std::string_view bundleId) noexcept;
   /// Registers an application that comes with the system.
   bool addSystemApplication(std::string_view bundleId, std::string_view displayName,
                             std::string_view version, std::optional<Error>* error) noexcept;

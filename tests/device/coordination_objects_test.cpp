@@ -246,6 +246,34 @@ TEST_F(CoordinationObjectsTest, APersonWhoUninstallsEndsTheInstall) {
   EXPECT_EQ(live(Id), nullptr);
 }
 
+TEST_F(CoordinationObjectsTest, ARestoreThatThePersonCancelsIsGoneWithWhatItHadForTheApplication) {
+  putFile("/var/mobile/Media/HalvoRestore/Data/com.example.a/saved", "old");
+  const auto coordinator = coordinatorFor(Id, CoordinatorKind::Restoring);
+  coordinator->setObserver(&recorder);
+  ASSERT_TRUE(
+      coordinator->setPlaceholderPromise(completePlaceholder(Id, InstallType::Restore), nullptr));
+  ASSERT_TRUE(recorder.waitFor("placeholder"));
+  DeviceError problem;
+  EXPECT_TRUE(EmbeddedDevice::cancel(folder, Id, problem, &error)) << text();
+  EXPECT_EQ(registry(), Lines{});
+  EXPECT_FALSE(device->files().fileExists("/var/mobile/Media/HalvoRestore/Data/com.example.a"));
+}
+
+TEST_F(CoordinationObjectsTest, ATapOfADemotedApplicationThatASyncBringsAsksForItToo) {
+  ASSERT_TRUE(installPackage(Id, "1.0"));
+  putFile("/var/mobile/Containers/Data/com.example.a/saved", "kept");
+  ASSERT_TRUE(device->demote(Id, &error)) << text();
+  prepare(Id);
+  ASSERT_TRUE(recorder.waitFor("placeholder"));
+  DeviceError problem;
+  EXPECT_TRUE(EmbeddedDevice::tap(folder, Id, problem, &error)) << text();
+  EXPECT_TRUE(recorder.waitFor("prioritize"));
+  EXPECT_EQ(record(Id, true)->installType, InstallType::StoreDownload);
+  EXPECT_TRUE(EmbeddedDevice::cancel(folder, Id, problem, &error)) << text();
+  EXPECT_EQ(record(Id, true)->installType, InstallType::StoreDownload);
+  EXPECT_EQ(textAt("/var/mobile/Containers/Data/com.example.a/saved"), "kept");
+}
+
 TEST_F(CoordinationObjectsTest, AnErrorForThePersonCarriesItsCauseAndSurvivesTheStore) {
   const Error shown = service().createUserPresentableError(1, 2, reason);
   EXPECT_EQ(shown.domain, TWErrorDomain);

@@ -173,20 +173,31 @@ class UncoordinatedTest : public DeviceTest {
     return installPlaceholder(
         Id, "1.0", {{std::string(SWInstallTypeKey), static_cast<std::uint64_t>(demotion)}});
   }
+  using Wish = bool (*)(const std::filesystem::path&, std::string_view, DeviceError&,
+                        std::optional<Error>*);
+  std::string refusal(Wish wish) {
+    DeviceError problem;
+    std::optional<Error> why;
+    return wish(folder, Id, problem, &why) || !why ? "none" : why->localizedDescription();
+  }
   InstallType placeholderType() {
     const auto placeholder = record(Id, true);
     return placeholder ? placeholder->installType : InstallType::None;
   }
 };
 
-TEST_F(UncoordinatedTest, NoInstallCanBeTappedOrCancelled) {
+TEST_F(UncoordinatedTest, NoInstallCanBeTappedOrCancelledAndTheReasonSaysWhetherThereIsOne) {
   ASSERT_TRUE(installPlaceholder("com.example.a"));
+  EXPECT_EQ(refusal(&EmbeddedDevice::tap),
+            "com.example.a is just being installed, and this phone brings packages in their order");
+  EXPECT_EQ(refusal(&EmbeddedDevice::cancel),
+            "com.example.a is just being installed, too late to cancel");
+  reopen();  // the sync that began it is gone
+  EXPECT_EQ(refusal(&EmbeddedDevice::tap), "com.example.a is not being installed");
+  EXPECT_EQ(refusal(&EmbeddedDevice::cancel), "com.example.a is not being installed");
+  ASSERT_TRUE(installPackage(Id, "1.0"));
+  EXPECT_EQ(refusal(&EmbeddedDevice::tap), "com.example.a is not being installed");
   DeviceError problem;
-  EXPECT_FALSE(EmbeddedDevice::tap(folder, Id, problem, &error));
-  EXPECT_EQ(error->localizedDescription(), "com.example.a is not being installed");
-  error.reset();
-  EXPECT_FALSE(EmbeddedDevice::cancel(folder, Id, problem, &error));
-  EXPECT_TRUE(error);
   EXPECT_FALSE(EmbeddedDevice::tap(folder / "nowhere", Id, problem, nullptr));
   EXPECT_EQ(problem.problem, DeviceProblem::Missing);
 }
@@ -201,6 +212,21 @@ TEST_F(UncoordinatedTest, ADemotedOrRestoredApplicationThatIsTappedIsAskedForOnc
       EXPECT_EQ(placeholderType(), InstallType::StoreDownload);
     }
   }
+}
+
+TEST_F(UncoordinatedTest, ARestoredApplicationThatWaitsIsGoneWithItsDataWhenItIsCancelled) {
+  putFile("/var/mobile/Media/HalvoRestore/Data/com.example.a/saved", "old");
+  ASSERT_TRUE(demote(InstallType::Restore));
+  EXPECT_EQ(refusal(&EmbeddedDevice::cancel), "none");
+  EXPECT_EQ(registry(), std::vector<std::string>{});
+  EXPECT_FALSE(device->files().fileExists("/var/mobile/Media/HalvoRestore/Data/com.example.a"));
+  EXPECT_EQ(refusal(&EmbeddedDevice::cancel), "com.example.a is not being installed");
+}
+
+TEST_F(UncoordinatedTest, ADemotedApplicationIsNotBeingInstalled) {
+  ASSERT_TRUE(demote(InstallType::IntentionalDowngrade));
+  EXPECT_EQ(refusal(&EmbeddedDevice::cancel), "com.example.a is not being installed");
+  EXPECT_EQ(placeholderType(), InstallType::IntentionalDowngrade);
 }
 
 TEST_F(UncoordinatedTest, ATapWithoutAWriterStaysOnTheDevice) {
