@@ -98,6 +98,7 @@ class OutOfBandTransferPromise : public DataPromise {};
 /// The application shown on the home screen until its package is installed. Where nothing but a
 /// placeholder of another sort is left of the application (demoted, or waiting for its restore),
 /// that one is shown instead of a sync's, and stays as it was if the install fails or is cancelled.
+/// That of a restore stays if only its package fails.
 class InstallPlaceholder {
  public:
   virtual ~InstallPlaceholder() = default;

@@ -69,6 +69,12 @@ bool isToStay(SQLite::Database& database, const PlaceholderRow& placeholder) {
          present.placeholder && present.placeholder->installType != InstallType::Sync;
 }
 
+/// Whether a restored application waits on after its package has failed.
+bool waitsOn(SQLite::Database& database, const CoordinatorState& state) {
+  return state.coordinator.kind == CoordinatorKind::Restoring && state.placeholder->stands() &&
+         !findApplication(database, state.coordinator.identifier).installed;
+}
+
 bool isFile(FileManager& files, const std::string& path) {
   const auto attributes = files.attributesOfItem(path);
   return attributes && !attributes->isDirectory;
@@ -279,6 +285,7 @@ CoordinatedInstalls::Beginning CoordinatedInstalls::begin(const CoordinatorState
 }
 
 void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optional<Error>& error) {
+  PlaceholderRow left = *state.placeholder;
   const auto end = [&](bool isOver, Database::Commit commit) {
     return change(
         state,
@@ -288,7 +295,8 @@ void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optio
           if (isOver) return complete(database, *row, error, consequences);
           row->error = bytesOf(*error);
           put(database, *row);
-          setPresence(database, *state.placeholder, state.placeholder->presence);
+          if (waitsOn(database, state)) left.presence = Presence::Adopted;
+          setPresence(database, left, left.presence);
         },
         commit);
   };
@@ -299,9 +307,7 @@ void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optio
     // opened.
     if (!end(false, Database::Commit::Ordinary)) return;
     // Before anybody hears of it, so that whoever does finds the phone as it is to stay.
-    if (state.placeholder->presence != Presence::None) {
-      removePlaceholder(state.coordinator.identifier, *state.placeholder);
-    }
+    if (left.presence != Presence::None) removePlaceholder(state.coordinator.identifier, left);
   }
   end(true, Database::Commit::OnDisk);
 }

@@ -17,7 +17,8 @@ namespace appsync::device {
 /// the stead of a sync's); its package, a complete path promise, as soon as
 /// the placeholder stands and there are options. An application in the foreground keeps its
 /// package waiting until it is closed. A demoted restore ends with its placeholder. A coordinator
-/// that fails keeps its error, loses its placeholder and leaves an installed version alone; until
+/// that fails keeps its error, loses its placeholder (but not that of a restored application, which
+/// waits on) and leaves an installed version alone; until
 /// its package is being installed it can be cancelled, with the same effect.
 ///
 /// The service takes a package away when its coordinator is over. Events come from one thread; one

@@ -220,6 +220,18 @@ TEST_P(CoordinatedInstallContract, AnInstallIsOverWhenItsPlaceholderIsTakenOutOf
   EXPECT_FALSE(hasPlaceholder("com.a"));
 }
 
+TEST_P(CoordinatedInstallContract, ARestoredApplicationWaitsOnWhenItsPackageIsRefused) {
+  const auto coordinator = prepare("com.a", CoordinatorKind::Restoring);
+  deliver(*coordinator, "com.other");
+  phone->settle("com.a");
+  EXPECT_EQ(recorder.count("failed com.a"), 1U);
+  EXPECT_TRUE(hasPlaceholder("com.a"));
+  EXPECT_EQ(live("com.a"), nullptr);
+  deliver(*prepare("com.a", CoordinatorKind::Restoring), "com.a");
+  phone->settle("com.a");
+  EXPECT_EQ(version("com.a"), "2.0");
+}
+
 /// All that is left of an application when a sync brings it.
 class LastTraceContract : public CoordinatedInstallContract {
  protected:

@@ -122,7 +122,8 @@ void FakeInstallCoordination::installPackage(FakeInstallCoordinator& coordinator
 
 void FakeInstallCoordination::end(FakeInstallCoordinator& coordinator,
                                   const std::optional<Error>& error) {
-  settle(coordinator, !error);
+  const bool isRestore = coordinator.state().kind == CoordinatorKind::Restoring;
+  settle(coordinator, !error || isRestore);  // what is restored waits on
   fireDidComplete(coordinator, error);
 }
 
