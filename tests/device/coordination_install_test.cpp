@@ -32,6 +32,7 @@ TEST_F(CoordinationInstallTest, APlaceholderStandsUntilItsPackageTakesItsPlace) 
   ASSERT_TRUE(recorder.waitFor("complete"));
   EXPECT_EQ(registry(), Lines{"com.example.a 2.0"});
   EXPECT_FALSE(coordinator->error());
+  waitUntilIdle(Id);
   EXPECT_FALSE(device->files().fileExists(package.path)) << "the service takes the package away";
   EXPECT_EQ(live(Id), nullptr) << "what is over is not found";
   const std::string promise = std::to_string(coordinator->appAssetPromise(nullptr)->identifier());
