@@ -117,6 +117,53 @@ class Demotion(support.Case):
         self.assertEqual(self.apps(), {"com.a": "1.0", "com.b": "1.0"})
 
 
+class Leftovers(support.Case):
+    """What an earlier command left is no dead end for the next sync."""
+
+    def setUp(self):
+        super().setUp()
+        self.init("--coordination", "on")
+        self.package = self.offer("com.a", body=support.noise(100_000))
+        self.sync()
+        self.data = self.phone / "root/var/mobile/Containers/Data/com.a/notes"
+        self.data.write_text("notes")
+
+    def restore_on_new_phone(self):
+        self.run_appsync("backup", self.folder / "backup")
+        self.phone = self.folder / "new"
+        self.environment["APPSYNC_DEVICE"] = str(self.phone)
+        self.init("--coordination", "on")
+        self.run_appsync("restore", self.folder / "backup")
+        self.assertEqual(self.apps(), {"com.a?": "1.0"})
+
+    def test_after_a_clear_a_sync_installs_what_was_to_be_restored(self):
+        self.restore_on_new_phone()
+        self.run_appsync("clear")
+        self.assertEqual(self.apps(), {})
+        self.assertEqual(self.sync()["installed"], ["com.a"])
+        self.assertEqual(self.apps(), {"com.a": "1.0"})
+
+    def test_after_a_cancel_a_sync_installs_what_was_to_be_restored_as_new(self):
+        self.restore_on_new_phone()
+        self.run_appsync("cancel", "com.a")
+        self.assertEqual(self.apps(), {})
+        self.assertEqual(self.sync()["installed"], ["com.a"])
+        self.assertFalse((self.phone / "root/var/mobile/Containers/Data/com.a/notes").exists())
+
+    def test_a_damaged_package_leaves_a_demoted_application_as_it_was(self):
+        self.run_appsync("demote", "com.a")
+        damaged = bytearray(self.package.read_bytes())
+        damaged[len(damaged) // 2] ^= 0xFF
+        self.package.write_bytes(damaged)
+        summary = self.sync("--install", "com.a", code=1)
+        self.assertEqual([entry["identifier"] for entry in summary["failed"]], ["com.a"])
+        self.assertEqual(self.apps(), {"com.a?": "1.0"})
+        self.assertEqual(self.data.read_text(), "notes")
+        self.offer("com.a", body=support.noise(100_000))
+        self.assertEqual(self.sync("--install", "com.a")["installed"], ["com.a"])
+        self.assertEqual(self.data.read_text(), "notes")
+
+
 class Refusals(support.Case):
     def check_refused(self, identifier):
         for command in ("tap", "cancel"):
