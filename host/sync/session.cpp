@@ -41,6 +41,14 @@ std::set<std::string> identifiersOf(const SyncPlan& plan, bool byHost) {
   return identifiers;
 }
 
+/// Whether the phone has carried an install out since it was planned: that of a sync that was
+/// killed.
+bool isCarriedOut(AppRegistry& apps, const PlannedEntry& entry) {
+  if (entry.action == Action::Remove || entry.version == entry.installedVersion) return false;
+  const auto record = apps.recordForIdentifier(entry.identifier, false);
+  return record && !record->isPlaceholder && record->bundleVersion == entry.version;
+}
+
 }  // namespace
 
 bool servesApplications(SyncClient& client) {
@@ -65,7 +73,14 @@ SyncResult Session::run(const SyncInput& input) {
   sweepPlaceholders();
   removeLeftOverPackages(phone_.files);
   SyncResult result;
-  result.completed = callClient(input, sender);
+  SyncInput rest = input;
+  std::erase_if(rest.plan.entries, [&](const PlannedEntry& entry) {
+    const bool isDone = isCarriedOut(phone_.apps, entry);
+    if (isDone) carriedOut_.insert(entry.identifier);
+    return isDone;
+  });
+  watch_.tellInstalled(carriedOut_);
+  result.completed = callClient(rest, sender);
   result.summary = settle(input.plan, input.library, end(sender));
   return result;
 }
@@ -217,6 +232,7 @@ SyncEnd Session::end(const PackageSender& sender) const {
   end.transfers = sender.outcome();
   end.installFailures = watch_.failures();
   end.installFailures.insert(failures_.begin(), failures_.end());
+  end.carriedOut = carriedOut_;
   end.disabled = disabled_;
   end.interrupted = interruption_.requested();
   end.broken = broken_;

@@ -69,6 +69,7 @@ class Session {
   std::map<std::string, std::shared_ptr<InstallCoordinator>> coordinators_;  ///< by identifier
   /// Reason by identifier: those sent that were cancelled, and those that the host could not bring.
   std::map<std::string, std::string> failures_;
+  std::set<std::string> carriedOut_;  ///< by the phone itself, before the client was called
   bool disabled_ = false;
   bool reconciled_ = false;
   std::optional<std::string> broken_;

@@ -30,8 +30,19 @@ void InstallWatch::installFinished(std::string_view bundleId,
   {
     const std::lock_guard lock(mutex_);
     if (reason) failures_[identifier] = *reason;
+    if (!reason) installed_.insert(identifier);
   }
   reporter_.report(InstallEnded{identifier, std::move(reason)});
+}
+
+void InstallWatch::tellInstalled(const std::set<std::string>& identifiers) {
+  for (const std::string& identifier : identifiers) {
+    const bool isTold = [&] {
+      const std::lock_guard lock(mutex_);
+      return !installed_.insert(identifier).second;
+    }();
+    if (!isTold) reporter_.report(InstallEnded{identifier, std::nullopt});
+  }
 }
 
 std::map<std::string, std::string> InstallWatch::failures() const {

@@ -3,6 +3,7 @@
 #include <map>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 
@@ -24,6 +25,8 @@ class InstallWatch : public device::DeviceWatcher {
   void assertionDenied(std::string_view bundleId) noexcept override;
   void installFinished(std::string_view bundleId,
                        const std::optional<Error>& error) noexcept override;
+  /// Tells of installs that were over before it watched.
+  void tellInstalled(const std::set<std::string>& identifiers);
   /// Reason by identifier.
   std::map<std::string, std::string> failures() const;
 
@@ -33,6 +36,7 @@ class InstallWatch : public device::DeviceWatcher {
   Interruption& interruption_;
   mutable std::mutex mutex_;
   std::map<std::string, std::string> failures_;
+  std::set<std::string> installed_;
 };
 
 }  // namespace appsync::host

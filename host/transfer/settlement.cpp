@@ -43,7 +43,8 @@ void settleInstall(const PlannedEntry& entry, const SyncEnd& end, Summary& summa
   const bool asked = end.transfers.asked.count(entry.identifier) > 0;
   const bool brought = entry.byHost && end.present.installed.contains(entry.identifier) &&
                        !end.installFailures.contains(entry.identifier);
-  if (brought || operation == "INSTALLED") {
+  const bool carriedOut = end.carriedOut.contains(entry.identifier);
+  if (brought || carriedOut || operation == "INSTALLED") {
     auto& list = entry.action == Action::Install ? summary.installed : summary.updated;
     list.push_back(entry.identifier);
   } else if (operation == "install" && !asked && !end.broken && !end.interrupted) {

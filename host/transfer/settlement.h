@@ -20,6 +20,7 @@ struct SyncEnd {
   std::vector<TodoEntry> todo;  ///< as the client left it; empty when it never took the list over
   ApplicationsPresent present;
   TransferOutcome transfers;
+  std::set<std::string> carriedOut;  ///< installs that the phone itself had still to carry out
   std::map<std::string, std::string> installFailures;  ///< reason by identifier
   bool disabled = false;                               ///< by the phone's restrictions
   bool interrupted = false;

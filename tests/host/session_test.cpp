@@ -233,6 +233,18 @@ TEST_F(SessionTest, BeginsOnlyWhenThePhoneHasDoneWhatAKilledSyncLeft) {
   EXPECT_EQ(looks, 0);
 }
 
+TEST_F(SessionTest, AnInstallThatThePhoneCarriesOnFromAKilledSyncIsNotDoneTwice) {
+  offer("com.a");
+  offer("com.b");
+  isBusyWith = [&](std::string_view) {
+    phone.appRegistry.seedInstalled("com.a", "1.0");
+    return false;
+  };
+  EXPECT_EQ(text(sync().summary), "installed: com.a com.b");
+  EXPECT_THAT(reporter.lines(),
+              ElementsAre("install com.a", "progress com.b", "sent com.b", "install com.b"));
+}
+
 TEST_F(SessionTest, ACoordinatedInstallThatThePhoneGaveUpIsNotWaitedFor) {
   offer("com.a");
   coordination = true;
