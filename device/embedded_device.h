@@ -118,6 +118,8 @@ class EmbeddedDevice {
   // Tapping the placeholder of an application, and cancelling its install, reach the process that
   // writes the device; without one they are done here. False (with a reason) when no coordinated
   // install of the application is on its way, or it is past cancelling.
+  // A restored application that waits is cancelled like one that is uninstalled, also without
+  // coordination.
 
   /// The install's client is asked to bring this application first. A demoted or restored
   /// application that waits is asked for: its placeholder's install type becomes
