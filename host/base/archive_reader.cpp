@@ -96,26 +96,36 @@ bool ArchiveReader::isRegularFile() const {
   return ::archive_entry_filetype(entry_) == AE_IFREG && !::archive_entry_hardlink(entry_);
 }
 
-std::optional<Bytes> ArchiveReader::contents(std::size_t limit) {
+bool ArchiveReader::readAll(const std::function<bool(std::span<const std::byte>)>& take) {
   if (::archive_entry_is_data_encrypted(entry_)) {
     note(fmt::format("{} is encrypted", printable(name_)));
-    return std::nullopt;
+    return false;
   }
-  Bytes bytes;
   std::array<std::byte, 16 << 10> block;
   while (true) {
     const auto count = ::archive_read_data(archive_.get(), block.data(), block.size());
-    if (count == 0) return bytes;
+    if (count == 0) return true;
     if (count < 0) {
       end(fmt::format("damaged: {}: {}", printable(name_), libraryReason()));
-      return std::nullopt;
+      return false;
     }
-    bytes.insert(bytes.end(), block.begin(), block.begin() + count);
-    if (bytes.size() > limit) {
-      note(fmt::format("{} is larger than {}", printable(name_), byteCount(limit)));
-      return std::nullopt;
-    }
+    if (!take(std::span(block).first(static_cast<std::size_t>(count)))) return false;
   }
+}
+
+std::optional<Bytes> ArchiveReader::contents(std::size_t limit) {
+  Bytes bytes;
+  const auto collect = [&](std::span<const std::byte> block) {
+    bytes.insert(bytes.end(), block.begin(), block.end());
+    if (bytes.size() <= limit) return true;
+    note(fmt::format("{} is larger than {}", printable(name_), byteCount(limit)));
+    return false;
+  };
+  return readAll(collect) ? std::optional(std::move(bytes)) : std::nullopt;
+}
+
+bool ArchiveReader::isReadable() {
+  return readAll([](std::span<const std::byte>) { return true; });
 }
 
 }  // namespace appsync::host

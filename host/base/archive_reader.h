@@ -2,8 +2,10 @@
 
 #include <cstdint>
 #include <filesystem>
+#include <functional>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 
 #include "platform/bytes.h"
@@ -31,11 +33,15 @@ class ArchiveReader {
   /// longer than `limit` bytes. After the latter two the walk can go on.
   std::optional<Bytes> contents(std::size_t limit);
 
+  /// Whether the current entry's contents can be read; with a problem when they cannot.
+  bool isReadable();
+
   /// Whether the file was recognised as an archive.
   bool recognised() const { return recognised_; }
   const std::optional<std::string>& problem() const { return problem_; }
 
  private:
+  bool readAll(const std::function<bool(std::span<const std::byte>)>& take);
   bool end(std::string reason);
   void note(std::string reason);
   std::string libraryReason() const;

@@ -13,17 +13,34 @@ namespace appsync::host {
 namespace fs = std::filesystem;
 namespace {
 
-void add(Library& library, const fs::path& file) {
-  UnreadablePackage failure;
-  auto package = readPackage(file, failure);
-  if (!package) {
-    library.unreadable.push_back(std::move(failure));
-    return;
+/// Packages of one application and version.
+using Rivals = std::vector<LibraryPackage>;
+
+void add(LibraryPackage package, Rivals& rivals) {
+  const auto order = rivals.empty() ? std::weak_ordering::equivalent
+                                    : compareVersions(package.version, rivals.front().version);
+  if (std::is_gt(order)) rivals.clear();
+  if (std::is_gteq(order)) rivals.push_back(std::move(package));
+}
+
+/// The first that is whole. Only rivals are read to their ends: of a single package the phone
+/// judges what lies behind its beginning.
+const LibraryPackage& choose(const Rivals& rivals, std::vector<UnreadablePackage>& damaged) {
+  if (rivals.size() == 1) return rivals.front();
+  std::vector<UnreadablePackage> passedOver;
+  for (const LibraryPackage& package : rivals) {
+    const auto damage = damageOf(package.file);
+    if (damage) {
+      passedOver.push_back({package.file.filename().string(), false, *damage});
+      continue;
+    }
+    for (UnreadablePackage& file : passedOver) {
+      file.reason += "; " + printable(package.file.filename().string()) + " is used instead";
+      damaged.push_back(std::move(file));
+    }
+    return package;
   }
-  const auto [place, isNew] = library.packages.try_emplace(package->identifier, *package);
-  if (!isNew && std::is_gt(compareVersions(package->version, place->second.version))) {
-    place->second = std::move(*package);
-  }
+  return rivals.front();
 }
 
 }  // namespace
@@ -49,7 +66,20 @@ std::optional<Library> readLibrary(const fs::path& folder, std::string& problem)
     return std::nullopt;
   }
   std::sort(files.begin(), files.end());
-  for (const fs::path& file : files) add(library, file);
+  std::map<std::string, Rivals> rivals;
+  for (const fs::path& file : files) {
+    UnreadablePackage failure;
+    auto package = readPackage(file, failure);
+    if (package) {
+      add(*package, rivals[package->identifier]);
+    } else {
+      library.unreadable.push_back(std::move(failure));
+    }
+  }
+  for (const auto& [identifier, packages] : rivals) {
+    library.packages.emplace(identifier, choose(packages, library.unreadable));
+  }
+  std::ranges::stable_sort(library.unreadable, {}, &UnreadablePackage::file);
   return library;
 }
 

@@ -13,7 +13,8 @@ namespace appsync::host {
 /// The packages of a folder. Files whose names begin with "." are passed over, subfolders too.
 struct Library {
   std::filesystem::path folder;
-  /// By identifier; of several packages of one application the one of the highest version.
+  /// By identifier; of several packages of one application the one of the highest version, of
+  /// several of that the first that is not damaged.
   std::map<std::string, LibraryPackage, std::less<>> packages;
   std::vector<UnreadablePackage> unreadable;  ///< in the order of their names
 

@@ -164,6 +164,14 @@ std::optional<LibraryPackage> readPackage(const std::filesystem::path& path,
   return std::nullopt;
 }
 
+std::optional<std::string> damageOf(const std::filesystem::path& path) {
+  ArchiveReader reader(path);
+  while (reader.next()) {
+    if (reader.isRegularFile() && !reader.isReadable()) break;
+  }
+  return reader.problem();
+}
+
 PackageParts readPackageParts(const std::filesystem::path& path) {
   ArchiveReader reader(path);
   PackageParts parts;

@@ -30,9 +30,10 @@ struct LibraryPackage {
 
 /// Why a file cannot be offered to the phone.
 struct UnreadablePackage {
-  std::string file;               ///< its name in the library
-  bool looksLikePackage = false;  ///< by its ending or its contents
-  std::string reason;             ///< for people, one line
+  std::string file;  ///< its name in the library
+  /// By its ending or its contents, and no other is used in its place.
+  bool looksLikePackage = false;
+  std::string reason;  ///< for people, one line
 };
 
 /// Reads no further than the information dictionary: what lies behind may be damaged, the phone
@@ -40,6 +41,9 @@ struct UnreadablePackage {
 /// this is no package or its beginning cannot be read.
 std::optional<LibraryPackage> readPackage(const std::filesystem::path& path,
                                           UnreadablePackage& failure);
+
+/// Reads all of a package. Why that cannot be done, for people; nullopt when it can.
+std::optional<std::string> damageOf(const std::filesystem::path& path);
 
 /// What the phone shows of an application before its package arrives. Absent parts stay empty.
 struct PackageParts {

@@ -177,6 +177,35 @@ TEST_F(PackageReading, OfALibraryTakesTheHighestVersion) {
   EXPECT_EQ(library->find("com.a")->file.filename(), "b.zip");
 }
 
+TEST_F(PackageReading, OfALibraryPassesOverADamagedPackageBesideAWholeOne) {
+  packSample(folder / "a.zip", "com.a", "1.0", 20'000);
+  packSample(folder / "b.zip", "com.a", "1.0", 20'000);
+  packSample(folder / "c.zip", "com.a", "0.9");
+  std::string bytes = fileText(folder / "a.zip");
+  bytes[bytes.size() / 2] = static_cast<char>(bytes[bytes.size() / 2] ^ 1);
+  putFile(folder / "a.zip", bytes);
+  std::string problem;
+  const Library library = readLibrary(folder.path(), problem).value();
+  EXPECT_EQ(library.find("com.a")->file, folder / "b.zip");
+  ASSERT_THAT(library.unreadable, ::testing::SizeIs(1));
+  EXPECT_EQ(library.unreadable[0].file, "a.zip");
+  EXPECT_FALSE(library.unreadable[0].looksLikePackage);
+  EXPECT_THAT(library.unreadable[0].reason,
+              ::testing::AllOf(::testing::StartsWith("damaged: "),
+                               ::testing::EndsWith("; b.zip is used instead")));
+}
+
+TEST_F(PackageReading, OfALibraryLeavesPackagesThatAreAllDamagedToThePhone) {
+  for (const char* name : {"a.tar", "b.tar"}) {
+    packSample(folder / name, "com.a", "1.0", 20'000);
+    std::filesystem::resize_file(folder / name, 12'000);
+  }
+  std::string problem;
+  const Library library = readLibrary(folder.path(), problem).value();
+  EXPECT_EQ(library.find("com.a")->file, folder / "a.tar");
+  EXPECT_THAT(library.unreadable, ::testing::IsEmpty());
+}
+
 TEST_F(PackageReading, OfALibraryThatIsNotThereNamesIt) {
   std::string problem;
   EXPECT_FALSE(readLibrary(folder / "nowhere", problem));
