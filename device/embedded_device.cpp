@@ -2,6 +2,7 @@
 
 #include <fmt/format.h>
 
+#include <algorithm>
 #include <cerrno>
 
 #include "device/apps/app_registry.h"
@@ -89,6 +90,20 @@ class FolderDevice final : public EmbeddedDevice {
     if (database_->writable()) return receiveInto(files_, path, error);
     setError(error, Error::posix(EROFS, path));
     return nullptr;
+  }
+
+  std::optional<std::vector<std::string>> namesIn(std::string_view directory,
+                                                  std::optional<Error>* error) noexcept override {
+    std::optional<Error> cause;
+    const FileDescriptor opened = files_.openDirectory(directory, &cause);
+    std::vector<std::string> names;
+    if (!opened && cause && cause->code == ENOENT) return names;
+    if (!opened || !listNames(opened.get(), names)) {
+      setError(error, cause.value_or(Error::posix(errno, directory)));
+      return std::nullopt;
+    }
+    std::ranges::sort(names);
+    return names;
   }
 
   void setWatcher(DeviceWatcher* watcher) noexcept override { watcher_.set(watcher); }

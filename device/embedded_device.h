@@ -45,6 +45,11 @@ class EmbeddedDevice {
   virtual std::unique_ptr<FileReceiver> receiveFile(std::string_view path,
                                                     std::optional<Error>* error) noexcept = 0;
 
+  /// The names in a directory of the phone, sorted; none of one that is not there. nullopt (with an
+  /// error) when they could not be read.
+  virtual std::optional<std::vector<std::string>> namesIn(std::string_view directory,
+                                                          std::optional<Error>* error) noexcept = 0;
+
   /// At most one watcher; nullptr for none. No call to the old one runs after this has returned.
   virtual void setWatcher(DeviceWatcher* watcher) noexcept = 0;
 

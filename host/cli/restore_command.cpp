@@ -1,4 +1,5 @@
 #include <CLI/CLI.hpp>
+#include <set>
 
 #include "host/base/interruption.h"
 #include "host/cli/cli.h"
@@ -13,6 +14,8 @@ struct RestoreOptions {
   std::string folder;
   std::string catalogue;
   std::string packages;
+  std::set<std::string> only;
+  bool overwriteData = false;
 };
 
 std::optional<Library> libraryAt(const std::string& folder) {
@@ -27,9 +30,10 @@ RestoreInput readInput(const RestoreOptions& options) {
   std::string problem;
   auto backup = readBackup(options.folder, problem);
   auto list = backup ? RestoreList::of(*backup, problem) : std::nullopt;
+  if (list && !options.only.empty() && !list->keepOnly(options.only, problem)) list.reset();
   if (!list) throw CommandError(ExitCode::WrongUsage, problem);
   return {std::move(*backup), std::move(*list), libraryAt(options.packages),
-          libraryAt(options.catalogue)};
+          libraryAt(options.catalogue), options.overwriteData};
 }
 
 void reportUnreadable(const std::optional<Library>& library, Reporter& reporter) {
@@ -45,6 +49,12 @@ ExitCode exitCode(const SyncResult& result, bool interrupted) {
 ExitCode runRestore(const RestoreOptions& options, CommandContext& context) {
   const RestoreInput input = readInput(options);
   const auto device = context.openDevice(device::Access::Write);
+  if (input.packages && device->options().coordination) {
+    throw CommandError(
+        ExitCode::WrongUsage,
+        "this phone takes the packages of restored applications only from the store: "
+        "use --store instead of --packages");
+  }
   const auto reporter = context.makeReporter();
   Interruption interruption;
   const auto plugin = loadPlugin(context);
@@ -80,8 +90,14 @@ void addRestoreCommand(CLI::App& app, Command& chosen) {
       ->add_option("--packages", options->packages,
                    "Folder of packages that are sent to the phone from here")
       ->type_name("LIBRARY");
+  restore->add_option("--only", options->only, "Restore only this application (repeatable)")
+      ->type_name("ID")
+      ->allow_extra_args(false);
+  restore->add_flag("--overwrite-data", options->overwriteData,
+                    "Give the backup's data back to installed applications too");
   restore->footer(
       "Without packages, applications come back as placeholders with their data waiting.\n"
+      "Installed applications and their data are left as they are without --overwrite-data.\n"
       "A restore that was interrupted is finished by another one.\n"
       "Example: appsync --device new-phone restore backup --store catalogue");
   restore->callback([options, &chosen] {

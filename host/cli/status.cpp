@@ -14,7 +14,9 @@ namespace {
 
 std::map<std::string, std::size_t> todoCounts(FileManager& files) {
   std::map<std::string, std::size_t> counts;
-  for (const TodoEntry& entry : readTodoList(files, exchange::WorkArea)) ++counts[entry.operation];
+  for (const TodoEntry& entry :
+       readTodoList(files, exchange::WorkArea).value_or(std::vector<TodoEntry>{}))
+    ++counts[entry.operation];
   return counts;
 }
 

@@ -45,7 +45,9 @@ void plan(SyncInput& input, PlanOptions options, device::EmbeddedDevice& device)
   options.installingAllowed = allowed(device, PolicySetting::AppInstallationAllowed);
   options.removingAllowed = allowed(device, PolicySetting::AppRemovalAllowed);
   std::string problem;
-  auto made = makePlan(input.library, installedApplications(phoneOf(device)), options, problem);
+  const auto installed = installedApplications(phoneOf(device), problem);
+  if (!installed) throw CommandError(ExitCode::SomeFailed, problem);
+  auto made = makePlan(input.library, *installed, options, problem);
   if (!made) throw CommandError(ExitCode::WrongUsage, problem);
   input.plan = std::move(*made);
 }
@@ -65,6 +67,7 @@ ExitCode finish(const SyncResult& result, bool interrupted, Reporter& reporter) 
 ExitCode dryRun(const SyncInput& input, Reporter& reporter) {
   SyncPlan nothing;
   nothing.skipped = input.plan.skipped;
+  nothing.failed = input.plan.failed;
   return finish({settle(nothing, input.library, {}), true}, false, reporter);
 }
 

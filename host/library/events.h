@@ -107,11 +107,6 @@ struct SyncBroken {
   std::string reason;
 };
 
-struct FailedEntry {
-  std::string identifier;  ///< a file name where no identifier could be read
-  std::string reason;
-};
-
 /// The last event of a sync or a restore.
 struct Summary {
   std::vector<std::string> installed;
@@ -119,6 +114,9 @@ struct Summary {
   std::vector<std::string> deleted;
   std::vector<FailedEntry> failed;
   std::vector<SkippedEntry> skipped;
+  std::vector<std::string> downgraded{};
+  /// Installed applications that got a backup's data in the place of their own.
+  std::vector<std::string> dataRestored{};
 };
 
 /// The last event of a backup.

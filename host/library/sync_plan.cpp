@@ -18,6 +18,8 @@ constexpr std::string_view InstallingForbidden =
 constexpr std::string_view RemovingForbidden =
     "removing applications is forbidden on the phone (appsync policy --removing allow)";
 
+constexpr std::string_view BelongsToSystem = "it is a system application";
+
 std::string versionText(std::string_view version) {
   return version.empty() ? std::string("a version without number")
                          : "version " + printable(version);
@@ -48,6 +50,12 @@ class Planner {
                            unread == 0 ? "" : fmt::format(" (unreadable files: {})", unread));
       }
     }
+    for (const std::string& identifier : unwanted_) {
+      if (!find(identifier) && !library_.find(identifier)) {
+        return fmt::format("{} is neither on the phone nor in {}", printable(identifier),
+                           printable(library_.folder.string()));
+      }
+    }
     if (options_.mirror && library_.packages.empty()) {
       return fmt::format("{} holds no packages: --mirror would remove every application",
                          printable(library_.folder.string()));
@@ -56,7 +64,7 @@ class Planner {
   }
 
   SyncPlan plan() {
-    for (const std::string& identifier : unwanted_) remove(identifier);
+    for (const std::string& identifier : unwanted_) remove(identifier, true);
     if (options_.mirror) mirror();
     for (const auto& [identifier, package] : library_.packages) {
       if (unwanted_.count(identifier) > 0) continue;
@@ -75,13 +83,19 @@ class Planner {
     plan_.skipped.push_back({std::string(identifier), std::string(reason), upToDate});
   }
 
-  void remove(const std::string& identifier) {
+  /// What nobody named may stay undone.
+  void refuse(std::string_view identifier, std::string_view reason, bool named) {
+    if (!named) return skip(identifier, reason);
+    plan_.failed.push_back({std::string(identifier), std::string(reason)});
+  }
+
+  void remove(const std::string& identifier, bool named) {
     const InstalledApplication* application = find(identifier);
     if (!application) return skip(identifier, "it is not installed");
-    if (application->isSystem) return skip(identifier, "it is a system application");
-    if (!options_.removingAllowed) return skip(identifier, RemovingForbidden);
+    if (application->isSystem) return refuse(identifier, BelongsToSystem, named);
+    if (!options_.removingAllowed) return refuse(identifier, RemovingForbidden, named);
     plan_.entries.push_back({Action::Remove, identifier, application->version, application->version,
-                             application->name});
+                             application->name, false, named});
   }
 
   /// A file that cannot be read may be the package of any application.
@@ -94,7 +108,7 @@ class Planner {
       const auto unread = std::find_if(library_.unreadable.begin(), library_.unreadable.end(),
                                        [](const auto& file) { return file.looksLikePackage; });
       if (unread == library_.unreadable.end()) {
-        remove(identifier);
+        remove(identifier, false);
       } else {
         skip(identifier, fmt::format("not removed: its package may be {}, which cannot be read",
                                      printable(unread->file)));
@@ -106,10 +120,11 @@ class Planner {
     const InstalledApplication* application = find(package.identifier);
     const bool isInstalled = application && !application->isPlaceholder;
     const std::string current = isInstalled ? application->version : std::string();
+    const bool named = !wanted_.empty();
     if (application && application->isSystem) {
-      return skip(package.identifier, "it is a system application");
+      return refuse(package.identifier, BelongsToSystem, named);
     }
-    if (application && application->isDemoted && wanted_.empty()) {
+    if (application && application->isDemoted && !named) {
       return skip(package.identifier, StaysDemoted);
     }
     Action action = Action::Install;
@@ -118,13 +133,15 @@ class Planner {
       action = std::is_gt(order)   ? Action::Update
                : std::is_lt(order) ? Action::Downgrade
                                    : Action::Reinstall;
-      if (std::is_lteq(order) && wanted_.empty()) {
+      if (std::is_lteq(order) && !named) {
         return skip(package.identifier, versionText(current) + " is installed", true);
       }
     }
-    if (!options_.installingAllowed) return skip(package.identifier, InstallingForbidden);
+    if (!options_.installingAllowed) {
+      return refuse(package.identifier, InstallingForbidden, named);
+    }
     plan_.entries.push_back({action, package.identifier, package.version, current, package.name,
-                             application && application->waits});
+                             application && application->waits, named});
   }
 
   const Library& library_;

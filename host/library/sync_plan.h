@@ -21,6 +21,7 @@ struct PlannedEntry {
   std::string installedVersion;  ///< empty for a new application
   std::string name;
   bool byHost = false;  ///< its placeholder waits, and the client does not ask for its package
+  bool named = false;   ///< somebody asked for just this
 };
 
 /// Why a demoted application stays as it is.
@@ -32,10 +33,17 @@ struct SkippedEntry {
   bool upToDate = false;  ///< there was simply nothing to do
 };
 
+struct FailedEntry {
+  std::string identifier;  ///< a file name where no identifier could be read
+  std::string reason;
+  std::string file{};  ///< name of the package's file; empty when there is none
+};
+
 /// What a sync is to do, in the order in which the phone is told.
 struct SyncPlan {
   std::vector<PlannedEntry> entries;
   std::vector<SkippedEntry> skipped;
+  std::vector<FailedEntry> failed;  ///< somebody asked for it, and it cannot be
 };
 
 /// An application as the phone knows it before the sync.

@@ -1,12 +1,18 @@
 #include "host/phone/demotions.h"
 
+#include "host/base/text.h"
 #include "host/phone/phone.h"
 #include "platform/bundle.h"
 
 namespace appsync::host {
 
 Demotions::Demotions(FileManager& files) {
-  const auto lists = loadDictionary(files, exchange::DemotedApplications);
+  std::optional<Error> error;
+  const auto lists = readDictionary(files, exchange::DemotedApplications, &error);
+  if (error) {
+    problem_ = "the phone's list of demoted applications could not be looked at: " +
+               oneLine(error->localizedDescription());
+  }
   for (const char* key : {"AutomaticDowngrades", "IntentionalDowngrades"}) {
     const PropertyList* list = lists ? find(*lists, key) : nullptr;
     if (!list || !list->asArray()) continue;
@@ -23,7 +29,7 @@ bool Demotions::holdBack(const AppRecord& placeholder) const {
       return true;
     case InstallType::Restore:
       // Without coordination the phone makes every placeholder of a restore alike.
-      return named_.contains(placeholder.applicationIdentifier);
+      return problem_ || named_.contains(placeholder.applicationIdentifier);
     default:
       return false;
   }

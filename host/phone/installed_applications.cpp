@@ -27,13 +27,24 @@ class ClientsWishes {
 
 }  // namespace
 
-std::vector<InstalledApplication> installedApplications(const Phone& phone) {
+bool isLeftOver(const Phone& phone, const AppRecord& placeholder) {
+  if (placeholder.installType != InstallType::Sync) return false;
+  const auto record = phone.apps.recordForIdentifier(placeholder.applicationIdentifier, false);
+  const bool laidOver = record && !record->isPlaceholder;
+  return laidOver || ownsData(phone, placeholder.applicationIdentifier, nullptr) == false;
+}
+
+std::optional<std::vector<InstalledApplication>> installedApplications(const Phone& phone,
+                                                                       std::string& problem) {
   const Demotions demotions(phone.files);
+  if (demotions.problem()) {
+    problem = *demotions.problem();
+    return std::nullopt;
+  }
   const ClientsWishes wishes(phone);
   std::map<std::string, InstalledApplication> found;
   phone.apps.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
-    const bool leftOver = record.isPlaceholder && record.installType == InstallType::Sync;
-    if (!record.isApplication || leftOver) return;
+    if (!record.isApplication || (record.isPlaceholder && isLeftOver(phone, record))) return;
     const auto [place, isNew] = found.try_emplace(record.applicationIdentifier);
     InstalledApplication& application = place->second;
     if (isNew || !record.isPlaceholder) {

@@ -1,5 +1,6 @@
 #include "host/phone/phone.h"
 
+#include <cerrno>
 #include <chrono>
 #include <thread>
 
@@ -10,6 +11,10 @@ namespace {
 
 constexpr std::chrono::milliseconds IdlePoll{10};
 
+bool isMissing(const std::optional<Error>& error) {
+  return error && error->domain == POSIXErrorDomain && error->code == ENOENT;
+}
+
 }  // namespace
 
 Phone phoneOf(device::EmbeddedDevice& device) {
@@ -17,6 +22,9 @@ Phone phoneOf(device::EmbeddedDevice& device) {
           device.appRegistry(),
           [&device](std::string_view path, std::optional<Error>* error) {
             return device.receiveFile(path, error);
+          },
+          [&device](std::string_view directory, std::optional<Error>* error) {
+            return device.namesIn(directory, error);
           },
           [&device](device::DeviceWatcher* watcher) { device.setWatcher(watcher); },
           [&device] { device.hurry(); },
@@ -32,7 +40,46 @@ RestorePhone restorePhoneOf(device::EmbeddedDevice& device) {
           [&device](std::string_view bundleId, const device::DataSource& source,
                     std::optional<Error>* error) {
             return device.restoreData(bundleId, source, error);
+          },
+          [&device](std::string_view bundleId, const device::DataSource& source,
+                    std::optional<Error>* error) {
+            return device.overwriteData(bundleId, source, error);
           }};
+}
+
+std::optional<bool> isThere(FileManager& files, std::string_view path,
+                            std::optional<Error>* error) {
+  std::optional<Error> cause;
+  if (files.attributesOfItem(path, &cause)) return true;
+  if (isMissing(cause)) return false;
+  if (cause) setError(error, *cause);
+  return std::nullopt;
+}
+
+std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,
+                                                       std::optional<Error>* error) {
+  std::optional<Error> cause;
+  const auto bytes = files.contentsAtPath(path, &cause);
+  if (!bytes && !isMissing(cause)) {
+    setError(error, cause.value_or(Error::posix(EIO, path)));
+    return std::nullopt;
+  }
+  auto parsed = bytes ? parsePropertyList(*bytes) : std::nullopt;
+  PropertyList::Dictionary* dictionary = parsed ? parsed->asDictionary() : nullptr;
+  return dictionary ? std::move(*dictionary) : PropertyList::Dictionary{};
+}
+
+std::optional<bool> ownsData(const Phone& phone, const std::string& identifier,
+                             std::optional<Error>* error) {
+  const auto waits = isThere(phone.files, joinPath(exchange::WaitingData, identifier), error);
+  if (!waits || *waits) return waits ? std::optional(false) : std::nullopt;
+  bool any = false;
+  const auto look = [&](ByteView bytes) {
+    any = !bytes.empty();
+    return !any;
+  };
+  const bool read = phone.saveData(identifier, look, error);
+  return any || read ? std::optional(any) : std::nullopt;
 }
 
 void waitUntilIdle(const Phone& phone, const std::set<std::string>& identifiers) {
@@ -64,10 +111,16 @@ void claimDownloads(AppRegistry& apps, const std::set<std::string>& except) {
   }
 }
 
-std::vector<TodoEntry> readTodoList(FileManager& files, std::string_view directory) {
-  const auto bytes = files.contentsAtPath(joinPath(directory, exchange::TodoListName));
+std::optional<std::vector<TodoEntry>> readTodoList(FileManager& files, std::string_view directory,
+                                                   std::optional<Error>* error) {
+  std::optional<Error> cause;
+  const auto bytes = files.contentsAtPath(joinPath(directory, exchange::TodoListName), &cause);
+  if (!bytes && !isMissing(cause)) {
+    setError(error, cause.value_or(Error::posix(EIO, directory)));
+    return std::nullopt;
+  }
   const auto list = bytes ? parsePropertyList(*bytes) : std::nullopt;
-  if (!list || !list->asArray()) return {};
+  if (!list || !list->asArray()) return std::vector<TodoEntry>{};
   std::vector<TodoEntry> entries;
   for (const PropertyList& item : *list->asArray()) {
     const PropertyList::Dictionary* entry = item.asDictionary();

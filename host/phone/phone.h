@@ -24,6 +24,9 @@ struct Phone {
   std::function<std::unique_ptr<device::FileReceiver>(std::string_view path,
                                                       std::optional<Error>* error)>
       receiveFile;
+  std::function<std::optional<std::vector<std::string>>(std::string_view directory,
+                                                        std::optional<Error>* error)>
+      namesIn;
   std::function<void(device::DeviceWatcher*)> setWatcher;
   std::function<void()> hurry;
   std::function<bool(std::string_view bundleId)> isBusyWith;
@@ -44,10 +47,28 @@ struct RestorePhone : Phone {
   std::function<bool(std::string_view bundleId, const device::DataSource& source,
                      std::optional<Error>* error)>
       restoreData;
+  std::function<bool(std::string_view bundleId, const device::DataSource& source,
+                     std::optional<Error>* error)>
+      overwriteData;
 };
 
 /// Borrows the device.
 RestorePhone restorePhoneOf(device::EmbeddedDevice& device);
+
+/// Whether something lies at a path of the phone; nullopt (with an error) when that cannot be told.
+std::optional<bool> isThere(FileManager& files, std::string_view path,
+                            std::optional<Error>* error = nullptr);
+
+/// The dictionary in a file of the phone, empty when the file is missing or holds none; nullopt
+/// (with an error) when it cannot be read.
+std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,
+                                                       std::optional<Error>* error);
+
+/// Whether an application that has only a placeholder has data of its own, which it made before it
+/// lost its package and which is worth more than a backup's; nullopt (with an error) when that
+/// cannot be told.
+std::optional<bool> ownsData(const Phone& phone, const std::string& identifier,
+                             std::optional<Error>* error);
 
 /// Waits until the phone has nothing left to do for these applications by itself.
 void waitUntilIdle(const Phone& phone, const std::set<std::string>& identifiers);
@@ -70,7 +91,9 @@ struct TodoEntry {
   std::string operation;
 };
 
-/// The todo list in a directory of the phone; empty when there is none that can be read.
-std::vector<TodoEntry> readTodoList(FileManager& files, std::string_view directory);
+/// The todo list in a directory of the phone, empty when there is none; nullopt (with an error)
+/// when it cannot be read.
+std::optional<std::vector<TodoEntry>> readTodoList(FileManager& files, std::string_view directory,
+                                                   std::optional<Error>* error = nullptr);
 
 }  // namespace appsync::host

@@ -102,11 +102,19 @@ Json jsonOf(const Interrupted&) { return {{"event", "interrupted"}}; }
 
 Json jsonOf(const SyncBroken& event) { return {{"event", "error"}, {"message", event.reason}}; }
 
-template <typename Entries>
-Json reasons(const Entries& entries) {
+Json reasons(const std::vector<SkippedEntry>& entries) {
   Json list = Json::array();
-  for (const auto& entry : entries) {
+  for (const SkippedEntry& entry : entries) {
     list.push_back({{"identifier", entry.identifier}, {"reason", entry.reason}});
+  }
+  return list;
+}
+
+Json reasons(const std::vector<FailedEntry>& entries) {
+  Json list = Json::array();
+  for (const FailedEntry& entry : entries) {
+    list.push_back({{"identifier", entry.identifier}, {"reason", entry.reason}});
+    if (!entry.file.empty()) list.back()["file"] = entry.file;
   }
   return list;
 }
@@ -115,9 +123,11 @@ Json jsonOf(const Summary& event) {
   return {{"event", "summary"},
           {"installed", event.installed},
           {"updated", event.updated},
+          {"downgraded", event.downgraded},
           {"deleted", event.deleted},
           {"failed", reasons(event.failed)},
-          {"skipped", reasons(event.skipped)}};
+          {"skipped", reasons(event.skipped)},
+          {"dataRestored", event.dataRestored}};
 }
 
 Json jsonOf(const BackupSummary& event) {

@@ -14,6 +14,11 @@ void addCount(std::string& counts, std::size_t count, std::string_view what) {
   if (count > 0) counts += fmt::format("{}{} {}", counts.empty() ? "" : ", ", count, what);
 }
 
+std::string_view pastTense(Action action) {
+  if (action == Action::Install) return "installed";
+  return action == Action::Downgrade ? "downgraded" : "updated";
+}
+
 }  // namespace
 
 TextReporter::TextReporter(Output& output, Output& errorOutput, const ReportOptions& options,
@@ -165,8 +170,8 @@ void TextReporter::tell(const InstallEnded& event) {
   installing_.erase(event.identifier);
   if (!event.failure) {
     const auto planned = planned_.find(event.identifier);
-    const bool isNew = planned == planned_.end() || planned->second.action == Action::Install;
-    print(Style::Good, isNew ? "installed" : "updated", subject(event.identifier));
+    const Action action = planned == planned_.end() ? Action::Install : planned->second.action;
+    print(Style::Good, pastTense(action), subject(event.identifier));
   }
   showInstalling();
 }
@@ -192,9 +197,11 @@ void TextReporter::tell(const Summary& event) {
           fmt::format("{}: {}", subject(entry.identifier), printable(entry.reason)));
   }
   for (const FailedEntry& entry : event.failed) {
-    printError("failed", fmt::format("{}: {}", subject(entry.identifier), printable(entry.reason)));
+    const bool named = entry.file.empty() || entry.file == entry.identifier;
+    printError("failed", fmt::format("{}: {}{}", subject(entry.identifier), printable(entry.reason),
+                                     named ? "" : fmt::format(" [{}]", printable(entry.file))));
   }
-  if (!options_.showPlan) tellCounts(event);
+  tellCounts(event);
 }
 
 void TextReporter::tell(const BackupSummary& event) {
@@ -217,11 +224,17 @@ void TextReporter::tellCounts(const Summary& event) {
   std::string counts;
   addCount(counts, event.installed.size(), "installed");
   addCount(counts, event.updated.size(), "updated");
+  addCount(counts, event.downgraded.size(), "downgraded");
   addCount(counts, event.deleted.size(), "deleted");
+  addCount(counts, event.dataRestored.size(), "with the backup's data");
   addCount(counts, event.failed.size(), "failed");
+  const bool idle = counts.empty();
   addCount(counts, event.skipped.size() - upToDate, "skipped");
   addCount(counts, upToDate, "up to date");
-  print(Style::Plain, "done", counts.empty() ? "nothing to do" : counts);
+  const bool nothing = idle && planned_.empty();
+  if (options_.showPlan && !nothing) return;
+  if (nothing || counts.empty()) counts = "nothing to do" + (counts.empty() ? "" : ": " + counts);
+  print(Style::Plain, "done", counts);
 }
 
 }  // namespace appsync::host

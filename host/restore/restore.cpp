@@ -9,18 +9,22 @@
 #include "host/restore/restore_data.h"
 #include "host/restore/restore_packages.h"
 #include "host/restore/restore_settlement.h"
+#include "host/transfer/settlement.h"
+#include "host/transfer/staging.h"
 #include "host/transfer/store.h"
 
 namespace appsync::host {
 namespace {
 
 constexpr std::int32_t FromDesktopBackup = 2;
+constexpr const char* NotInstalled = "the phone did not install it (appsync log tells more)";
 
 void addUnreadable(const std::optional<Library>& library, Summary& summary) {
   if (!library) return;
   for (const UnreadablePackage& file : library->unreadable) {
     summary.skipped.push_back({file.file, file.reason, false});
   }
+  nameFiles(*library, summary);
 }
 
 }  // namespace
@@ -37,13 +41,36 @@ Restore::Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Repo
 SyncResult Restore::run(const RestoreInput& input) {
   handover_ = handOver(phone_, input.backup, input.list, reporter_, interruption_);
   host_.transfers().forgetCancelled();
+  removeLeftOverPackages(phone_);
   failures_ = handover_.failures;
   const bool given = !handover_.broken || broken(*handover_.broken, std::nullopt);
+  if (given && input.overwriteData) overwriteData(input);
   SyncResult result;
   result.completed = given && !interruption_.requested() && callClient(input);
-  if (input.catalogue && !broken_) bringFromStore(*input.catalogue);
+  if (input.catalogue && !broken_) bringFromStore(input.list, *input.catalogue);
+  if (handover_.layoutRefused && !broken_) broken(*handover_.layoutRefused, std::nullopt);
   result.summary = settle(input);
+  result.completed = result.completed && !broken_;
   return result;
+}
+
+void Restore::overwriteData(const RestoreInput& input) {
+  for (const BackedUpApplication& app : input.list.applications()) {
+    if (!handover_.installed.contains(app.identifier)) continue;
+    const auto file = input.backup.data.find(app.identifier);
+    if (file == input.backup.data.end()) {
+      installedData_[app.identifier] = InstalledData::NoneInBackup;
+    } else if (hasData(phone_, app.identifier, file->second)) {
+      installedData_[app.identifier] = InstalledData::SameAlready;
+    } else if (interruption_.requested()) {
+      failures_[app.identifier] = InterruptedReason;
+    } else if (const auto failure =
+                   host::overwriteData(phone_, app, file->second, reporter_, interruption_)) {
+      failures_[app.identifier] = *failure;
+    } else {
+      installedData_[app.identifier] = InstalledData::Overwritten;
+    }
+  }
 }
 
 bool Restore::callClient(const RestoreInput& input) {
@@ -70,28 +97,23 @@ void Restore::transfer(const RestoreInput& input) {
   if (!interruption_.requested()) sender.send(client_.outstandingAssetTransfers());
   sent_ = sender.outcome().sent;
   note(sender.outcome().failures);
-  if (!phone_.coordination) {
-    bringPackages(input.packages ? *input.packages : None);
-  } else if (input.packages) {
-    reporter_.report(
-        Notice{"this phone takes restored applications only from the store (--store)"});
-  }
+  if (!phone_.coordination) bringPackages(input.list, input.packages ? *input.packages : None);
   waitUntilIdle(phone_, sent_);
   client_.assetTransferEndedWithSuccess(!interruption_.requested());
   if (!phone_.coordination) sender.removeSentPackages();
 }
 
 /// Also what an earlier restore has sent, whatever the library holds now.
-void Restore::bringPackages(const Library& library) {
+void Restore::bringPackages(const RestoreList& list, const Library& library) {
   RestorePackages packages(client_, host_, phone_, reporter_, interruption_, library);
-  packages.deliver(leftOut());
+  packages.deliver(leftOut(list));
   note(packages.failures());
 }
 
-void Restore::bringFromStore(const Library& catalogue) {
+void Restore::bringFromStore(const RestoreList& list, const Library& catalogue) {
   Store store(host_, phone_, reporter_, interruption_, catalogue, InterruptedReason);
   std::set<std::string> wanted = waitingForStore(phone_);
-  for (const std::string& identifier : leftOut()) wanted.erase(identifier);
+  for (const std::string& identifier : leftOut(list)) wanted.erase(identifier);
   store.deliver(wanted);
   note(store.failures());
 }
@@ -107,9 +129,13 @@ void Restore::reportPlaceholders(const RestoreList& list) {
   }
 }
 
-std::set<std::string> Restore::leftOut() const {
+std::set<std::string> Restore::leftOut(const RestoreList& list) const {
   std::set<std::string> identifiers;
   for (const auto& failure : handover_.failures) identifiers.insert(failure.first);
+  if (!list.isPart()) return identifiers;
+  for (const auto& placeholder : applicationsPresent(phone_.apps).placeholders) {
+    if (!list.names(placeholder.first)) identifiers.insert(placeholder.first);
+  }
   return identifiers;
 }
 
@@ -117,22 +143,42 @@ void Restore::note(const std::map<std::string, std::string>& failures) {
   failures_.insert(failures.begin(), failures.end());
 }
 
+void Restore::explainPlaceholders(const RestoreInput& input, RestoreEnd& end) {
+  end.missing = input.catalogue  ? "the store does not have it"
+                : input.packages ? "the library does not have it"
+                                 : "waits for its package";
+  const std::optional<Library>& library = input.catalogue ? input.catalogue : input.packages;
+  const std::vector<std::string> owed = phone_.packagesOwedBy(KQClientKiosk);
+  const Demotions demotions(phone_.files);
+  if (demotions.problem()) broken(*demotions.problem(), std::nullopt);
+  for (const auto& [identifier, record] : end.present.placeholders) {
+    if (demotions.holdBack(record)) {
+      end.heldBack.insert(identifier);
+    } else if (record.installType == InstallType::Sync ||
+               (input.list.isPart() && !input.list.names(identifier))) {
+      continue;
+    } else if (library && library->find(identifier)) {
+      failures_.emplace(identifier, broken_                     ? *broken_
+                                    : interruption_.requested() ? InterruptedReason
+                                                                : NotInstalled);
+    } else if (phone_.coordination && record.installType == InstallType::Restore &&
+               input.list.names(identifier) && !std::ranges::count(owed, identifier)) {
+      failures_.emplace(identifier, "the phone could not make it ready; the next restore does it");
+    }
+  }
+}
+
 Summary Restore::settle(const RestoreInput& input) {
   note(watch_.failures());
   RestoreEnd end;
   end.installedBefore = handover_.installed;
   end.present = applicationsPresent(phone_.apps);
-  const Demotions demotions(phone_.files);
-  for (const auto& [identifier, record] : end.present.placeholders) {
-    if (demotions.holdBack(record)) end.heldBack.insert(identifier);
-  }
   for (const std::string& identifier : sent_) {
     if (handover_.installed.contains(identifier)) end.updated.insert(identifier);
   }
+  end.installedData = installedData_;
+  explainPlaceholders(input, end);
   end.failures = failures_;
-  end.missing = input.catalogue                          ? "the store does not have it"
-                : input.packages && !phone_.coordination ? "the library does not have it"
-                                                         : "waits for its package";
   end.interrupted = interruption_.requested();
   end.broken = broken_;
   Summary summary = settleRestore(input.list, end);

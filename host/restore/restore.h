@@ -9,6 +9,7 @@
 #include "host/phone/sync_host.h"
 #include "host/restore/restore_handover.h"
 #include "host/restore/restore_list.h"
+#include "host/restore/restore_settlement.h"
 #include "host/sync/session.h"
 #include "host/transfer/install_watch.h"
 
@@ -19,6 +20,7 @@ struct RestoreInput {
   RestoreList list;                  ///< the backup's
   std::optional<Library> packages;   ///< what the host itself brings
   std::optional<Library> catalogue;  ///< the store's
+  bool overwriteData = false;        ///< of installed applications too
 };
 
 /// One restore of a backup: what the phone is given, the client's calls in their order, and the
@@ -33,14 +35,17 @@ class Restore {
   SyncResult run(const RestoreInput& input);
 
  private:
+  void overwriteData(const RestoreInput& input);
   bool callClient(const RestoreInput& input);
   void transfer(const RestoreInput& input);
-  void bringPackages(const Library& library);
-  void bringFromStore(const Library& catalogue);
+  void bringPackages(const RestoreList& list, const Library& library);
+  void bringFromStore(const RestoreList& list, const Library& catalogue);
   void reportPlaceholders(const RestoreList& list);
   /// The applications that nothing must be brought to.
-  std::set<std::string> leftOut() const;
+  std::set<std::string> leftOut(const RestoreList& list) const;
   void note(const std::map<std::string, std::string>& failures);
+  /// Why a placeholder has no package.
+  void explainPlaceholders(const RestoreInput& input, RestoreEnd& end);
   Summary settle(const RestoreInput& input);
   /// Always false.
   bool broken(std::string_view what, const std::optional<Error>& error);
@@ -52,6 +57,7 @@ class Restore {
   Interruption& interruption_;
   InstallWatch watch_;
   Handover handover_;
+  std::map<std::string, InstalledData> installedData_;
   std::set<std::string> sent_;                   ///< what the client asked for
   std::map<std::string, std::string> failures_;  ///< reason by identifier
   std::optional<std::string> broken_;

@@ -7,8 +7,7 @@ namespace appsync::host {
 namespace {
 
 /// The archive of an application without data has no bytes.
-bool waitsAlready(const RestorePhone& phone, const std::string& identifier,
-                  const BackupFile* file) {
+bool isSame(const RestorePhone& phone, const std::string& identifier, const BackupFile* file) {
   Sha256 digest;
   std::uint64_t size = 0;
   const std::uint64_t expected = file ? file->size : 0;
@@ -50,15 +49,18 @@ std::string cause(const std::optional<Error>& error) {
   return error ? oneLine(error->localizedDescription()) : "no reason is known";
 }
 
-std::optional<std::string> layOut(const RestorePhone& phone, const BackedUpApplication& app,
-                                  const BackupFile& file, Reporter& reporter,
-                                  const Interruption& interruption) {
+using Taker = std::function<bool(std::string_view bundleId, const device::DataSource& source,
+                                 std::optional<Error>* error)>;
+
+std::optional<std::string> giveData(const Taker& taker, const BackedUpApplication& app,
+                                    const BackupFile& file, Reporter& reporter,
+                                    const Interruption& interruption) {
   ReportedData data(app, file, reporter);
   const auto source = [&](std::uint8_t* bytes, std::size_t size) {
     return interruption.requested() ? -1 : data.read(bytes, size);
   };
   std::optional<Error> error;
-  if (phone.restoreData(app.identifier, source, &error)) return std::nullopt;
+  if (taker(app.identifier, source, &error)) return std::nullopt;
   if (!data.problem().empty()) return "its data in the backup is damaged: " + data.problem();
   if (interruption.requested()) return InterruptedReason;
   return "its data could not be given back: " + cause(error);
@@ -74,23 +76,24 @@ std::optional<std::string> clear(const RestorePhone& phone, const std::string& i
 
 }  // namespace
 
-bool ownsData(const RestorePhone& phone, const std::string& identifier) {
-  if (phone.files.directoryExists(joinPath(exchange::WaitingData, identifier))) return false;
-  bool any = false;
-  const auto look = [&](ByteView bytes) {
-    any = !bytes.empty();
-    return !any;
-  };
-  phone.saveData(identifier, look, nullptr);
-  return any;
+bool hasData(const RestorePhone& phone, const std::string& identifier, const BackupFile& file) {
+  return isSame(phone, identifier, &file);
+}
+
+std::optional<std::string> overwriteData(const RestorePhone& phone, const BackedUpApplication& app,
+                                         const BackupFile& file, Reporter& reporter,
+                                         const Interruption& interruption) {
+  auto failure = giveData(phone.overwriteData, app, file, reporter, interruption);
+  reporter.report(DataEnded{app.identifier, failure});
+  return failure;
 }
 
 std::optional<std::string> giveBackData(const RestorePhone& phone, const BackedUpApplication& app,
                                         const BackupFile* file, Reporter& reporter,
                                         const Interruption& interruption) {
-  if (waitsAlready(phone, app.identifier, file)) return std::nullopt;
+  if (isSame(phone, app.identifier, file)) return std::nullopt;
   if (!file) return clear(phone, app.identifier);
-  auto failure = layOut(phone, app, *file, reporter, interruption);
+  auto failure = giveData(phone.restoreData, app, *file, reporter, interruption);
   reporter.report(DataEnded{app.identifier, failure});
   return failure;
 }

@@ -14,9 +14,14 @@ namespace appsync::host {
 /// Why an application did not come back that a restore did not get to.
 inline constexpr const char* InterruptedReason = "interrupted; the next restore does it";
 
-/// Whether an application that has only a placeholder has data of its own, which it made before it
-/// lost its package and which is worth more than a backup's.
-bool ownsData(const RestorePhone& phone, const std::string& identifier);
+/// Whether the application's data on the phone is just this.
+bool hasData(const RestorePhone& phone, const std::string& identifier, const BackupFile& file);
+
+/// Gives an installed application this data in the place of its own, in one step. Gives the reason,
+/// for people, when its own stays.
+std::optional<std::string> overwriteData(const RestorePhone& phone, const BackedUpApplication& app,
+                                         const BackupFile& file, Reporter& reporter,
+                                         const Interruption& interruption);
 
 /// Lays an application's data out on the phone, where it waits for the application; does nothing
 /// when just this waits there already. `file` is nullptr for an application without data. Gives the

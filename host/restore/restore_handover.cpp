@@ -5,9 +5,36 @@
 #include "host/base/text.h"
 #include "host/library/package_reader.h"
 #include "host/restore/restore_data.h"
+#include "platform/property_list_codec.h"
 
 namespace appsync::host {
 namespace {
+
+/// The backup's demotions; of a part of it those beside the phone's own of other applications.
+std::optional<Bytes> demotionsOf(const Backup& backup, const RestoreList& list, FileManager& files,
+                                 std::optional<Error>* error) {
+  if (!list.isPart()) return backup.demotions;
+  const auto onPhone = readDictionary(files, exchange::DemotedApplications, error);
+  if (!onPhone) return std::nullopt;
+  const auto parsed = parsePropertyList(backup.demotions);
+  const PropertyList::Dictionary none;
+  const PropertyList::Dictionary* inBackup = parsed ? parsed->asDictionary() : nullptr;
+  PropertyList::Dictionary merged;
+  for (const char* key : {"AutomaticDowngrades", "IntentionalDowngrades"}) {
+    PropertyList::Array names;
+    const auto take = [&](const PropertyList::Dictionary& lists, bool named) {
+      const PropertyList* entries = find(lists, key);
+      if (!entries || !entries->asArray()) return;
+      for (const PropertyList& entry : *entries->asArray()) {
+        if (entry.asString() && list.names(*entry.asString()) == named) names.push_back(entry);
+      }
+    };
+    take(*onPhone, false);
+    take(inBackup ? *inBackup : none, true);
+    merged.emplace(key, std::move(names));
+  }
+  return serializePropertyList(std::move(merged), PropertyListFormat::Xml, error);
+}
 
 class HandoverInProgress {
  public:
@@ -84,7 +111,16 @@ class HandoverInProgress {
       if (result_.installed.contains(app.identifier) || result_.failures.contains(app.identifier)) {
         continue;
       }
-      if (isRestoring(app.identifier) && ownsData(phone_, app.identifier)) continue;
+      if (isRestoring(app.identifier)) {
+        std::optional<Error> error;
+        const auto owns = ownsData(phone_, app.identifier, &error);
+        if (!owns) {
+          result_.failures[app.identifier] =
+              "its data on the phone could not be looked at: " +
+              oneLine(error.value_or(Error::posix(EIO)).localizedDescription());
+        }
+        if (owns.value_or(true)) continue;
+      }
       const auto file = backup_.data.find(app.identifier);
       const auto failure =
           host::giveBackData(phone_, app, file == backup_.data.end() ? nullptr : &file->second,
@@ -99,19 +135,25 @@ class HandoverInProgress {
   void putBack() {
     if (result_.listed.empty()) {
       // An older list would make the client do what is not wanted any more.
-      if (phone_.files.fileExists(exchange::RestoreList)) {
-        phone_.files.removeItem(exchange::RestoreList);
+      std::optional<Error> error;
+      const auto older = isThere(phone_.files, exchange::RestoreList, &error);
+      if (older == false || (older && phone_.files.removeItem(exchange::RestoreList, &error))) {
+        return;
       }
-      return;
+      return breakOff("an older list of applications to restore could not be removed: ", error);
     }
-    putBackLayout();
+    if (!list_.isPart()) putBackLayout();
     std::optional<Error> error;
+    const auto demotions = demotionsOf(backup_, list_, phone_.files, &error);
     const auto list = list_.only(result_.listed, &error);
-    const bool done = write(exchange::DemotedApplications, backup_.demotions, &error) && list &&
-                      write(exchange::RestoreList, *list, &error);
-    if (done) return;
-    result_.broken = "the phone does not take the backup: " +
-                     oneLine(error.value_or(Error::posix(EIO)).localizedDescription());
+    const bool done = demotions && write(exchange::DemotedApplications, *demotions, &error) &&
+                      list && write(exchange::RestoreList, *list, &error);
+    if (!done) breakOff("the phone does not take the backup: ", error);
+  }
+
+  void breakOff(std::string_view what, const std::optional<Error>& error) {
+    result_.broken =
+        std::string(what) + oneLine(error.value_or(Error::posix(EIO)).localizedDescription());
   }
 
   /// The home screen keeps places for what is still to come.
@@ -120,8 +162,8 @@ class HandoverInProgress {
     const int status =
         phone_.homeScreen.setIconState(phone_.homeScreen.serverPort(), backup_.iconLayout);
     if (status == 0) return;
-    reporter_.report(Notice{"the home screen does not take its layout: " +
-                            oneLine(Error::posix(status).localizedDescription())});
+    result_.layoutRefused = "the home screen does not take its layout: " +
+                            oneLine(Error::posix(status).localizedDescription());
   }
 
   bool write(std::string_view path, const Bytes& bytes, std::optional<Error>* error) {

@@ -18,12 +18,13 @@ struct Handover {
   std::set<std::string> listed;                  ///< the client is to make placeholders of these
   std::map<std::string, std::string> failures;   ///< reason by identifier of what was left out
   std::optional<std::string> broken;             ///< why it was broken off, for people
+  std::optional<std::string> layoutRefused;      ///< why the home screen stays as it is, for people
 };
 
 /// Gives a phone what it lacks of a backup: first each application's data, then the order of the
-/// home screen and the demoted applications, and last the list that sets the client off. Broken off
-/// or killed anywhere, it has done no harm, and the next one carries on. What is installed is left
-/// alone, with its data.
+/// home screen (unless it is a part of a backup) and the demoted applications, and last the list
+/// that sets the client off. Broken off or killed anywhere, it has done no harm, and the next one
+/// carries on. What is installed is left alone, with its data.
 Handover handOver(const RestorePhone& phone, const Backup& backup, const RestoreList& list,
                   Reporter& reporter, const Interruption& interruption);
 

@@ -1,5 +1,6 @@
 #include "host/restore/restore_list.h"
 
+#include "host/base/text.h"
 #include "host/library/package_reader.h"
 #include "platform/property_list_codec.h"
 
@@ -49,6 +50,20 @@ std::optional<RestoreList> RestoreList::of(const Backup& backup, std::string& pr
     list.applications_.push_back(describe(identifier, entry));
   }
   return list;
+}
+
+bool RestoreList::keepOnly(const std::set<std::string>& identifiers, std::string& problem) {
+  for (const std::string& identifier : identifiers) {
+    if (names(identifier)) continue;
+    problem = "the backup has no application " + printable(identifier);
+    return false;
+  }
+  std::erase_if(entries_, [&](const auto& entry) { return !identifiers.contains(entry.first); });
+  std::erase_if(applications_, [&](const BackedUpApplication& app) {
+    return !identifiers.contains(app.identifier);
+  });
+  isPart_ = true;
+  return true;
 }
 
 std::optional<Bytes> RestoreList::only(const std::set<std::string>& identifiers,

@@ -26,6 +26,12 @@ class RestoreList {
   /// nullopt, with one line for people, when the backup's list is none.
   static std::optional<RestoreList> of(const Backup& backup, std::string& problem);
 
+  /// Keeps only these. False, with one line for people, when the backup lacks one of them.
+  bool keepOnly(const std::set<std::string>& identifiers, std::string& problem);
+  /// Whether that was done: what concerns the phone as a whole stays as it is.
+  bool isPart() const { return isPart_; }
+  bool names(const std::string& identifier) const { return entries_.contains(identifier); }
+
   /// Sorted by identifier.
   const std::vector<BackedUpApplication>& applications() const { return applications_; }
 
@@ -36,6 +42,7 @@ class RestoreList {
  private:
   PropertyList::Dictionary entries_;
   std::vector<BackedUpApplication> applications_;
+  bool isPart_ = false;
 };
 
 }  // namespace appsync::host

@@ -1,5 +1,8 @@
 #include "host/restore/restore_packages.h"
 
+#include <cerrno>
+
+#include "host/base/text.h"
 #include "host/phone/demotions.h"
 #include "platform/bundle.h"
 
@@ -9,35 +12,53 @@ namespace {
 /// The packages that the client keeps in mind until the data of their applications is delivered.
 class Remembered {
  public:
-  explicit Remembered(FileManager& files)
-      : files_(files), state_(loadDictionary(files, exchange::RestoreState)) {}
+  explicit Remembered(FileManager& files) : files_(files) {
+    std::optional<Error> error;
+    state_ = readDictionary(files, exchange::RestoreState, &error);
+    if (error) note(*error);
+  }
 
-  /// False also when the package is gone.
-  bool holds(const AppRecord& record) const {
+  /// False also when the package is gone, or when a problem keeps it from being looked at.
+  bool holds(const AppRecord& record) {
     const PropertyList* versions = state_ ? find(*state_, record.applicationIdentifier) : nullptr;
     const PropertyList* properties =
         versions && record.bundleVersion ? versions->find(*record.bundleVersion) : nullptr;
     const PropertyList* path = properties ? properties->find("path") : nullptr;
-    return path && path->asString() && files_.fileExists(*path->asString());
+    if (!path || !path->asString()) return false;
+    std::optional<Error> error;
+    const auto there = isThere(files_, *path->asString(), &error);
+    if (!there) note(error.value_or(Error::posix(EIO, *path->asString())));
+    return there.value_or(false);
   }
 
+  /// Why something could not be looked at, for people.
+  const std::optional<std::string>& problem() const { return problem_; }
+
  private:
+  void note(const Error& error) {
+    problem_ = "what the phone remembers of it could not be looked at: " +
+               oneLine(error.localizedDescription());
+  }
+
   FileManager& files_;
-  const std::optional<PropertyList::Dictionary> state_;
+  std::optional<PropertyList::Dictionary> state_;
+  std::optional<std::string> problem_;
 };
 
 }  // namespace
 
 void RestorePackages::deliver(const std::set<std::string>& except) {
   const std::vector<AppRecord> records = wanted(except);
-  const Remembered before(phone_.files);
+  Remembered before(phone_.files);
   std::vector<SyncAssetPtr> assets;
   for (const AppRecord& record : records) {
     if (before.holds(record) || !library_.find(record.applicationIdentifier)) continue;
     assets.push_back(makeAsset(record, kTWAssetPartApplication | kTWAssetPartApplicationData));
   }
+  if (before.problem()) return fail(records, *before.problem());
   sender_.send(assets);
-  const Remembered after(phone_.files);
+  failures_ = sender_.outcome().failures;
+  Remembered after(phone_.files);
   for (const AppRecord& record : records) {
     if (interruption_.requested()) return;
     if (!after.holds(record)) continue;
@@ -46,6 +67,12 @@ void RestorePackages::deliver(const std::set<std::string>& except) {
     asset->completedAssetParts = kTWAssetPartApplicationData;
     client_.assetTransferSucceeded(asset, true, std::nullopt);
   }
+  if (after.problem()) fail(records, *after.problem());
+}
+
+/// What comes after all counts in spite of it.
+void RestorePackages::fail(const std::vector<AppRecord>& records, const std::string& reason) {
+  for (const AppRecord& record : records) failures_.emplace(record.applicationIdentifier, reason);
 }
 
 std::vector<AppRecord> RestorePackages::wanted(const std::set<std::string>& except) const {

@@ -32,9 +32,10 @@ class RestorePackages {
   void deliver(const std::set<std::string>& except);
 
   /// Reason by identifier.
-  const std::map<std::string, std::string>& failures() const { return sender_.outcome().failures; }
+  const std::map<std::string, std::string>& failures() const { return failures_; }
 
  private:
+  void fail(const std::vector<AppRecord>& records, const std::string& reason);
   std::vector<AppRecord> wanted(const std::set<std::string>& except) const;
   SyncAssetPtr makeAsset(const AppRecord& record, std::uint32_t parts) const;
 
@@ -44,6 +45,7 @@ class RestorePackages {
   const Interruption& interruption_;
   const Library& library_;
   PackageSender sender_;
+  std::map<std::string, std::string> failures_;
 };
 
 }  // namespace appsync::host

@@ -19,6 +19,21 @@ void settlePlaceholder(const std::string& identifier, const RestoreEnd& end, Sum
       {identifier, heldBack ? "stays a placeholder until it is asked for" : end.missing, false});
 }
 
+void settleInstalled(const std::string& identifier, const RestoreEnd& end, Summary& summary) {
+  const auto found = end.installedData.find(identifier);
+  switch (found == end.installedData.end() ? InstalledData::LeftAlone : found->second) {
+    case InstalledData::LeftAlone:
+      return summary.skipped.push_back({identifier, LeftAsItIs, false});
+    case InstalledData::NoneInBackup:
+      return summary.skipped.push_back(
+          {identifier, "is installed, and the backup has no data of it", true});
+    case InstalledData::SameAlready:
+      return summary.skipped.push_back({identifier, "is installed with the backup's data", true});
+    case InstalledData::Overwritten:
+      return summary.dataRestored.push_back(identifier);
+  }
+}
+
 }  // namespace
 
 Summary settleRestore(const RestoreList& list, const RestoreEnd& end) {
@@ -30,7 +45,7 @@ Summary settleRestore(const RestoreList& list, const RestoreEnd& end) {
   for (const BackedUpApplication& app : list.applications()) {
     const std::string& identifier = app.identifier;
     if (end.installedBefore.contains(identifier)) {
-      summary.skipped.push_back({identifier, "is installed already", true});
+      if (!failures.contains(identifier)) settleInstalled(identifier, end, summary);
     } else if (end.present.installed.contains(identifier) || failures.contains(identifier)) {
       continue;
     } else if (end.present.placeholders.contains(identifier)) {

@@ -11,9 +11,16 @@
 
 namespace appsync::host {
 
+inline constexpr const char* LeftAsItIs =
+    "is installed: it and its data are left as they are (--overwrite-data gives back the backup's)";
+
+/// What became of the data of an application that was installed before.
+enum class InstalledData { LeftAlone, NoneInBackup, SameAlready, Overwritten };
+
 /// What is known when a restore is over.
 struct RestoreEnd {
   std::set<std::string, std::less<>> installedBefore;
+  std::map<std::string, InstalledData> installedData;  ///< LeftAlone of what is not named
   ApplicationsPresent present;
   std::set<std::string> heldBack;               ///< demoted placeholders
   std::set<std::string> updated;                ///< installed before, and again

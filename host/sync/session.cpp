@@ -7,6 +7,7 @@
 #include <thread>
 
 #include "host/base/text.h"
+#include "host/phone/installed_applications.h"
 #include "host/transfer/staging.h"
 #include "host/transfer/store.h"
 #include "platform/bundle.h"
@@ -20,8 +21,11 @@ constexpr std::chrono::milliseconds InstallPoll{10};
 
 void ignoreProgress(double) {}
 
-bool isDownloaded(const std::string& identifier, const std::vector<TodoEntry>& todo) {
-  return std::any_of(todo.begin(), todo.end(), [&](const TodoEntry& entry) {
+using TodoList = std::optional<std::vector<TodoEntry>>;
+
+/// Taken to be so while the list cannot be read.
+bool isDownloaded(const std::string& identifier, const TodoList& todo) {
+  return !todo || std::any_of(todo->begin(), todo->end(), [&](const TodoEntry& entry) {
     return entry.identifier == identifier && entry.operation == "DOWNLOADED";
   });
 }
@@ -71,7 +75,7 @@ SyncResult Session::run(const SyncInput& input) {
   waitUntilIdle(phone_, identifiersOf(input.plan));
   host_.transfers().forgetCancelled();
   sweepPlaceholders();
-  removeLeftOverPackages(phone_.files);
+  removeLeftOverPackages(phone_);
   SyncResult result;
   SyncInput rest = input;
   std::erase_if(rest.plan.entries, [&](const PlannedEntry& entry) {
@@ -80,8 +84,9 @@ SyncResult Session::run(const SyncInput& input) {
     return isDone;
   });
   watch_.tellInstalled(carriedOut_);
-  result.completed = callClient(rest, sender);
+  const bool good = callClient(rest, sender);
   result.summary = settle(input.plan, input.library, end(sender));
+  result.completed = good && !broken_;
   return result;
 }
 
@@ -154,7 +159,8 @@ void Session::findCoordinators(const std::vector<SyncAssetPtr>& assets) {
 
 /// A completed install shows in the todo list; a cancelled one leaves no trace there, and one that
 /// the phone gave up stays as it is.
-bool Session::isSettled(const std::string& identifier, const std::vector<TodoEntry>& todo) {
+bool Session::isSettled(const std::string& identifier,
+                        const std::optional<std::vector<TodoEntry>>& todo) {
   const auto& coordinator = coordinators_.at(identifier);
   const std::optional<Error> error = coordinator ? coordinator->error() : std::nullopt;
   if (!coordinator || error) {
@@ -184,7 +190,7 @@ void Session::waitForCoordination(const SyncPlan& plan, const std::set<std::stri
 void Session::sweepPlaceholders() {
   std::vector<std::string> leftOver;
   phone_.apps.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
-    if (!record.isPlaceholder || record.installType != InstallType::Sync) return;
+    if (!record.isPlaceholder || !isLeftOver(phone_, record)) return;
     const auto progress = phone_.apps.installProgressSync(record);
     const bool onItsWay = progress && progress->installState() == InstallState::Active &&
                           progress->installPhase() == InstallPhase::Installing;
@@ -225,9 +231,14 @@ void Session::writeApplicationsPresent() {
   }
 }
 
-SyncEnd Session::end(const PackageSender& sender) const {
+SyncEnd Session::end(const PackageSender& sender) {
   SyncEnd end;
-  if (reconciled_) end.todo = readTodoList(phone_.files, exchange::WorkArea);
+  if (reconciled_) {
+    std::optional<Error> error;
+    const TodoList todo = readTodoList(phone_.files, exchange::WorkArea, &error);
+    if (todo) end.todo = *todo;
+    if (!todo) broken("it cannot be seen what the phone has done", error);
+  }
   end.present = applicationsPresent(phone_.apps);
   end.transfers = sender.outcome();
   end.installFailures = watch_.failures();

@@ -50,13 +50,13 @@ class Session {
   bool transfer(const SyncInput& input, PackageSender& sender);
   void bringWhatWaits(const SyncInput& input);
   void findCoordinators(const std::vector<SyncAssetPtr>& assets);
-  bool isSettled(const std::string& identifier, const std::vector<TodoEntry>& todo);
+  bool isSettled(const std::string& identifier, const std::optional<std::vector<TodoEntry>>& todo);
   void waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent);
 
   void sweepPlaceholders();
   void reportDeletions(const PropertyList::Dictionary& inventory);
   void writeApplicationsPresent();
-  SyncEnd end(const PackageSender& sender) const;
+  SyncEnd end(const PackageSender& sender);
   /// Always false.
   bool broken(std::string_view what, const std::optional<Error>& error);
 

@@ -38,6 +38,20 @@ void settleRemoval(const PlannedEntry& entry, const SyncEnd& end, Summary& summa
   }
 }
 
+/// What nobody named may stay undone.
+void notDone(const PlannedEntry& entry, const std::string& reason, Summary& summary) {
+  if (entry.named) {
+    summary.failed.push_back({entry.identifier, reason});
+  } else {
+    summary.skipped.push_back({entry.identifier, reason, false});
+  }
+}
+
+std::vector<std::string>& listFor(Action action, Summary& summary) {
+  if (action == Action::Install) return summary.installed;
+  return action == Action::Downgrade ? summary.downgraded : summary.updated;
+}
+
 void settleInstall(const PlannedEntry& entry, const SyncEnd& end, Summary& summary) {
   const std::string operation = operationOf(end.todo, entry.identifier);
   const bool asked = end.transfers.asked.count(entry.identifier) > 0;
@@ -45,10 +59,9 @@ void settleInstall(const PlannedEntry& entry, const SyncEnd& end, Summary& summa
                        !end.installFailures.contains(entry.identifier);
   const bool carriedOut = end.carriedOut.contains(entry.identifier);
   if (brought || carriedOut || operation == "INSTALLED") {
-    auto& list = entry.action == Action::Install ? summary.installed : summary.updated;
-    list.push_back(entry.identifier);
+    listFor(entry.action, summary).push_back(entry.identifier);
   } else if (operation == "install" && !asked && !end.broken && !end.interrupted) {
-    summary.skipped.push_back({entry.identifier, "the phone did not ask for its package", false});
+    notDone(entry, "the phone did not ask for its package", summary);
   } else {
     summary.failed.push_back({entry.identifier, failureReason(entry.identifier, end)});
   }
@@ -56,26 +69,34 @@ void settleInstall(const PlannedEntry& entry, const SyncEnd& end, Summary& summa
 
 }  // namespace
 
+void nameFiles(const Library& library, Summary& summary) {
+  for (FailedEntry& failure : summary.failed) {
+    const LibraryPackage* package = library.find(failure.identifier);
+    if (package && failure.file.empty()) failure.file = package->file.filename().string();
+  }
+}
+
 Summary settle(const SyncPlan& plan, const Library& library, const SyncEnd& end) {
   Summary summary;
   summary.skipped = plan.skipped;
+  summary.failed = plan.failed;
   for (const PackageProblem& file : library.unreadable) {
     if (file.looksLikePackage) {
-      summary.failed.push_back({file.file, file.reason});
+      summary.failed.push_back({file.file, file.reason, file.file});
     } else {
       summary.skipped.push_back({file.file, file.reason, false});
     }
   }
   for (const PlannedEntry& entry : plan.entries) {
     if (end.disabled) {
-      summary.skipped.push_back(
-          {entry.identifier, "the phone's restrictions forbid installing and removing", false});
+      notDone(entry, "the phone's restrictions forbid installing and removing", summary);
     } else if (entry.action == Action::Remove) {
       settleRemoval(entry, end, summary);
     } else {
       settleInstall(entry, end, summary);
     }
   }
+  nameFiles(library, summary);
   return summary;
 }
 

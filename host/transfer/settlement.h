@@ -27,6 +27,9 @@ struct SyncEnd {
   std::optional<std::string> broken;  ///< why the sync as a whole failed
 };
 
+/// Adds to each failure the file of the application's package, where the library has one.
+void nameFiles(const Library& library, Summary& summary);
+
 /// What became of each entry of the plan and each file of the library. Pure.
 Summary settle(const SyncPlan& plan, const Library& library, const SyncEnd& end);
 

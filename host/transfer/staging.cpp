@@ -72,6 +72,37 @@ PropertyList todoList(const SyncPlan& plan) {
   return list;
 }
 
+/// nullopt when that cannot be told.
+std::optional<std::set<std::string>> rememberedPackages(FileManager& files) {
+  const auto state = readDictionary(files, exchange::RestoreState, nullptr);
+  if (!state) return std::nullopt;
+  std::set<std::string> paths;
+  for (const auto& application : *state) {
+    const PropertyList::Dictionary* versions = application.second.asDictionary();
+    if (!versions) continue;
+    for (const auto& version : *versions) {
+      const PropertyList* path = version.second.find("path");
+      if (path && path->asString()) paths.insert(*path->asString());
+    }
+  }
+  return paths;
+}
+
+/// The application whose package is sent under this name; nullopt when it is no such name.
+std::optional<std::string> packagedApplication(const std::string& name) {
+  std::string_view ending = packageEnding(name);
+  if (ending.empty() && name.ends_with(PlainEnding)) ending = PlainEnding;
+  const std::string identifier = name.substr(0, name.size() - ending.size());
+  return ending.empty() || !isUsableIdentifier(identifier) ? std::nullopt
+                                                           : std::optional(identifier);
+}
+
+bool isBeingInstalled(const Phone& phone, const std::string& identifier) {
+  return phone.coordination &&
+         phone.coordination->coordinatorFor(CoordinatorKind::Any, identifier, SyncHostClientID,
+                                            false, nullptr, nullptr);
+}
+
 }  // namespace
 
 bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
@@ -95,16 +126,19 @@ std::string stagedPackageName(const LibraryPackage& package) {
   return package.identifier + std::string(ending.empty() ? PlainEnding : ending);
 }
 
-void removeLeftOverPackages(FileManager& files) {
-  static const std::set<std::string> settled = {"remove", "INSTALLED", "FAILED"};
-  for (const std::string_view directory : {exchange::WorkArea, exchange::StagingArea}) {
-    for (const TodoEntry& entry : readTodoList(files, directory)) {
-      if (settled.count(entry.operation) > 0 || !isUsableIdentifier(entry.identifier)) continue;
-      const std::string base = joinPath(exchange::StagingRoot, entry.identifier);
-      for (const std::string_view ending : packageEndings()) {
-        files.removeItem(base + std::string(ending));
+void removeLeftOverPackages(const Phone& phone) {
+  const auto remembered = rememberedPackages(phone.files);
+  if (!remembered) return;
+  for (const std::string_view directory : {exchange::StagingRoot, exchange::Downloads}) {
+    const auto names = phone.namesIn(directory, nullptr);
+    if (!names) continue;
+    for (const std::string& name : *names) {
+      const std::string path = joinPath(directory, name);
+      const auto identifier = packagedApplication(name);
+      if (!identifier || remembered->contains(path) || isBeingInstalled(phone, *identifier)) {
+        continue;
       }
-      files.removeItem(base + std::string(PlainEnding));
+      phone.files.removeItem(path);
     }
   }
 }

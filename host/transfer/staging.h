@@ -17,7 +17,8 @@ bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
 /// The name under which a package is sent: the identifier and the ending of the library's file.
 std::string stagedPackageName(const LibraryPackage& package);
 
-/// Removes packages that a broken-off sync left in the staging root.
-void removeLeftOverPackages(FileManager& files);
+/// Removes packages that broken-off syncs and restores left where packages arrive, but none that
+/// the restore state remembers or that an install coordinator may still want.
+void removeLeftOverPackages(const Phone& phone);
 
 }  // namespace appsync::host

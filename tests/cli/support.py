@@ -31,8 +31,8 @@ EVENTS = {
     "log": {"channel": str, "level": str, "text": str},
     "interrupted": {},
     "error": {"message": str},
-    "summary": {"installed": list, "updated": list, "deleted": list, "failed": list,
-                "skipped": list},
+    "summary": {"installed": list, "updated": list, "downgraded": list, "deleted": list,
+                "failed": list, "skipped": list, "dataRestored": list},
     "backup-summary": {"saved": list, "failed": list},
 }
 

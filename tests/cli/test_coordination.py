@@ -40,7 +40,8 @@ class TapAndCancel(support.Case):
         events = self.rest_of_events(process, 1)
         summary = events[-1]
         self.assertEqual(summary["failed"],
-                         [{"identifier": "com.a-big", "reason": "cancelled on the phone"}])
+                         [{"identifier": "com.a-big", "reason": "cancelled on the phone",
+                           "file": "com.a-big.tar"}])
         self.assertEqual(summary["installed"], ["com.b", "com.c", "com.d"])
         self.assertEqual(sum(event["event"] == "transfer-ended" and
                              event["identifier"] == "com.a-big" for event in events), 1)
@@ -76,7 +77,8 @@ class TapAndCancel(support.Case):
         self.run_appsync("cancel", "com.b")
         summary = self.rest_of_events(process, 1)[-1]
         self.assertEqual(summary["failed"], [{
-            "identifier": "com.b", "reason": "the install of com.b was cancelled on the phone"}])
+            "identifier": "com.b", "reason": "the install of com.b was cancelled on the phone",
+            "file": "com.b.zip"}])
         self.assertEqual((summary["installed"], summary["updated"]), ([], []))
         self.assertEqual(len(self.apps()), 4)
         self.assertEqual(self.apps()["com.b"], "1.0")

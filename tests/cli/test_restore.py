@@ -45,8 +45,34 @@ class Restores(RestoreCase):
         before = self.files()
         summary = self.restore("--store", self.library)
         self.assertEqual(summary["installed"], [])
-        self.assertEqual(self.reasons(summary["skipped"])["com.a"], "is installed already")
+        self.assertIn("left as they are", self.reasons(summary["skipped"])["com.a"])
         self.assertEqual(self.files(), before)
+
+    def test_data_of_an_installed_application(self):
+        notes = self.phone / DATA / "com.a/Documents/notes"
+        notes.write_text("newer")
+        out, _ = self.run_appsync("restore", self.backup, "--only", "com.a")
+        self.assertEqual(out, "skipped    com.a: is installed: it and its data are left as "
+                              "they are (--overwrite-data gives back the backup's)\n"
+                              "done       nothing to do: 1 skipped\n")
+        self.assertEqual(notes.read_text(), "newer")
+        self.run_appsync("launch", "com.a")
+        summary = self.restore("--overwrite-data", "--only", "com.a", code=1)
+        self.assertEqual(list(self.reasons(summary["failed"])), ["com.a"])
+        self.assertEqual(notes.read_text(), "newer")
+        self.run_appsync("quit", "com.a")
+        self.assertEqual(self.restore("--overwrite-data")["dataRestored"], ["com.a"])
+        self.assertEqual(self.notes("com.a"), "notes of com.a")
+        self.assertEqual(self.restore("--overwrite-data")["dataRestored"], [])
+
+    def test_only_what_is_named(self):
+        self.use("new")
+        before = self.phone_tree()
+        [error] = self.json_lines("restore", self.backup, "--only", "com.x", code=2)
+        self.assertEqual(error["message"], "the backup has no application com.x")
+        self.assertEqual(self.phone_tree(), before)
+        self.restore("--only", "com.b", "--only", "com.d", "--store", self.library)
+        self.assertEqual(self.apps(), {"com.b": "1.0", "com.d?": "1.0"})
 
     def test_with_a_store_that_has_only_some(self):
         (self.library / "com.a.zip").unlink()
@@ -149,10 +175,10 @@ class CoordinatedRestores(Restores):
 
     def test_packages_are_left_to_the_store(self):
         self.use("new")
-        self.restore("--packages", self.library)
-        [notice] = [event for event in self.events if event["event"] == "notice"]
-        self.assertIn("--store", notice["message"])
-        self.assertEqual(len([name for name in self.apps() if name.endswith("?")]), 4)
+        before = self.phone_tree()
+        [error] = self.json_lines("restore", self.backup, "--packages", self.library, code=2)
+        self.assertIn("use --store", error["message"])
+        self.assertEqual(self.phone_tree(), before)
 
 
 class Packages(RestoreCase):

@@ -32,9 +32,28 @@ class Sync(support.Case):
         self.assertEqual(self.sync()["updated"], ["com.a"])
         self.assertEqual(self.apps(), {"com.a": "1.10", "com.b": "1.0"})
 
+        package = self.offer("com.c")
         self.assertEqual(self.sync("--remove", "com.b", "--remove", "com.c")["deleted"], ["com.b"])
         self.assertEqual(self.apps(), {"com.a": "1.10"})
         self.assertEqual(reasons(self.events[-1]["skipped"])["com.c"], "it is not installed")
+
+        package.unlink()
+        before = self.phone_tree()
+        [error] = self.json_lines("sync", self.library, "--remove", "com.c", code=2)
+        self.assertIn("com.c is neither on the phone nor in", error["message"])
+        self.assertEqual(self.phone_tree(), before)
+        self.assertEqual(self.sync()["installed"], ["com.b"])
+        out, _ = self.run_appsync("sync", self.library)
+        self.assertEqual(out, "done       nothing to do: 2 up to date\n")
+        out, _ = self.run_appsync("sync", self.library, "--dry-run")
+        self.assertEqual(out, "done       nothing to do: 2 up to date\n")
+
+    def test_a_downgrade_is_told_as_one(self):
+        self.offer("com.a", "2.0")
+        self.sync()
+        self.offer("com.a", "1.0")
+        out, _ = self.run_appsync("sync", self.library, "--install", "com.a")
+        self.assertEqual(out, "downgraded A 1.0 (com.a)\ndone       1 downgraded\n")
 
     def test_installs_only_what_is_named_also_anew(self):
         self.offer("com.a")
@@ -88,7 +107,7 @@ class Sync(support.Case):
         self.offer("com.a", "2.0")
         self.offer("com.new")
         before = self.phone_tree(), self.apps(), self.json_lines("history"), self.json_lines("log")
-        summary = self.sync("--dry-run", "--remove", "com.b")
+        summary = self.sync("--dry-run")
         after = self.phone_tree(), self.apps(), self.json_lines("history"), self.json_lines("log")
         self.assertEqual(before, after)
         self.assertEqual([(event["action"], event["identifier"]) for event in self.events
@@ -110,11 +129,15 @@ class Sync(support.Case):
         self.run_appsync("policy", "--installing", "allow", "--removing", "forbid")
         package.unlink()
         self.assertEqual(self.sync()["installed"], ["com.b"])
-        self.assertIn("forbidden", reasons(self.sync("--remove", "com.b")["skipped"])["com.b"])
+        self.assertIn("forbidden", reasons(self.sync("--remove", "com.b", code=1)["failed"])["com.b"])
 
         self.run_appsync("policy", "--installing", "forbid")
         self.offer("com.c")
         self.assertIn("forbidden", reasons(self.sync()["skipped"])["com.c"])
+        for arguments in (("--install", "com.c"), ("--install", "com.c", "--dry-run")):
+            summary = self.sync(*arguments, code=1)
+            self.assertIn("forbidden", reasons(summary["failed"])["com.c"])
+            self.assertEqual(summary["failed"][0]["file"], "com.c.zip")
         self.assertEqual(self.apps(), {"com.b": "1.0"})
 
     def test_status_tells_all(self):
@@ -247,6 +270,15 @@ class OddPackages(support.Case):
         apps, _ = self.run_appsync("apps")
         for character in "\x1b\u009b\u202e":
             self.assertNotIn(character, out + apps)
+
+    def test_a_damaged_package_beside_a_whole_one(self):
+        whole = self.offer("com.a", body=support.noise(100_000)).read_bytes()
+        (self.library / "a-damaged.zip").write_bytes(
+            whole[:50_000] + bytes([whole[50_000] ^ 1]) + whole[50_001:])
+        summary = self.sync()
+        self.assertEqual(summary["installed"], ["com.a"])
+        [reason] = [reasons(summary["skipped"])["a-damaged.zip"]]
+        self.assertRegex(reason, "^damaged: .*; com.a.zip is used instead$")
 
     def test_the_highest_version_counts(self):
         for version in ("1.9", "1.10", "1.2"):

@@ -1,6 +1,8 @@
 // What a sync finds on a fake phone.
 #include "host/phone/installed_applications.h"
 
+#include <cerrno>
+
 #include "tests/host/restore_fixture.h"
 
 namespace appsync::host {
@@ -13,7 +15,9 @@ class InstalledApplicationsTest : public RestoreTest {
  protected:
   std::vector<std::string> found() {
     std::vector<std::string> lines;
-    for (const auto& application : installedApplications(phoneForHost())) {
+    const auto all = installedApplications(phoneForHost(), problem);
+    if (!all) return {problem};
+    for (const auto& application : *all) {
       lines.push_back(application.identifier + " " + application.version +
                       (application.isSystem ? " system" : "") +
                       (application.isPlaceholder ? " placeholder" : "") +
@@ -22,6 +26,8 @@ class InstalledApplicationsTest : public RestoreTest {
     }
     return lines;
   }
+
+  std::string problem;
 };
 
 TEST_F(InstalledApplicationsTest, AreOnePerIdentifierWithoutLeftOverPlaceholders) {
@@ -61,6 +67,15 @@ TEST_F(InstalledApplicationsTest, TheClientAsksForWhatIsNotTheStoresWithCoordina
   phone.appRegistry.seedPlaceholder(tapped);
   EXPECT_THAT(found(), ElementsAre("com.a 1.0 placeholder", "com.b 1.0 placeholder demoted",
                                    "com.c 1.0 placeholder waits", "com.d 1.0 placeholder waits"));
+}
+
+TEST_F(InstalledApplicationsTest, AreNotToldWhenItCannotBeSeenWhatIsDemoted) {
+  seedRestoring("com.a");
+  phone.files.putPlist(exchange::DemotedApplications, PropertyList::Dictionary{});
+  phone.faults.failWhere("FileManager.contentsAtPath", exchange::DemotedApplications,
+                         Error::posix(EMFILE));
+  EXPECT_THAT(found(), ElementsAre("the phone's list of demoted applications could not be looked "
+                                   "at: Too many open files"));
 }
 
 }  // namespace

@@ -45,7 +45,7 @@ const PlannedEntry Paint{Action::Update, "com.paint", "2.0", "1.0", "Paint"};
 const Summary Mixed{{"com.a"},
                     {"com.paint"},
                     {"com.old"},
-                    {{"com.bad", "damaged"}, {"x.zip", "no archive"}},
+                    {{"com.bad", "damaged", "bad.zip"}, {"x.zip", "no archive", "x.zip"}},
                     {{"com.same", "version 1 is installed", true}, {"com.no", "forbidden", false}}};
 
 class Reporting : public ::testing::Test {
@@ -153,8 +153,8 @@ TEST_F(Reporting, GivesTheSummaryAsPromised) {
   EXPECT_THAT(
       json({Mixed, Summary{}}),
       ElementsAre(
-          R"({"event":"summary","installed":["com.a"],"updated":["com.paint"],"deleted":["com.old"],"failed":[{"identifier":"com.bad","reason":"damaged"},{"identifier":"x.zip","reason":"no archive"}],"skipped":[{"identifier":"com.same","reason":"version 1 is installed"},{"identifier":"com.no","reason":"forbidden"}]})",
-          R"({"event":"summary","installed":[],"updated":[],"deleted":[],"failed":[],"skipped":[]})"));
+          R"({"event":"summary","installed":["com.a"],"updated":["com.paint"],"downgraded":[],"deleted":["com.old"],"failed":[{"identifier":"com.bad","reason":"damaged","file":"bad.zip"},{"identifier":"x.zip","reason":"no archive","file":"x.zip"}],"skipped":[{"identifier":"com.same","reason":"version 1 is installed"},{"identifier":"com.no","reason":"forbidden"}],"dataRestored":[]})",
+          R"({"event":"summary","installed":[],"updated":[],"downgraded":[],"deleted":[],"failed":[],"skipped":[],"dataRestored":[]})"));
 }
 
 TEST_F(Reporting, KeepsJsonWholeWhateverAPackageHolds) {
@@ -182,13 +182,31 @@ TEST_F(Reporting, WritesPlainLinesWhereThereIsNoTerminal) {
           "waiting    Paint 2.0 (com.paint) is open on the phone; it is installed when it "
           "quits (appsync quit com.paint), next try in 30 s",
           "updated    Paint 2.0 (com.paint)", "installed  com.new", "deleted    com.old",
-          "skipped    com.no: forbidden", "failed     com.bad: damaged",
+          "skipped    com.no: forbidden", "failed     com.bad: damaged [bad.zip]",
           "failed     x.zip: no archive",
           "done       1 installed, 1 updated, 1 deleted, 2 failed, 1 skipped, 1 up to date"));
 }
 
 TEST_F(Reporting, SaysWhenThereWasNothingToDo) {
   EXPECT_THAT(told({}, {Summary{}}), ElementsAre("done       nothing to do"));
+}
+
+TEST_F(Reporting, SaysWhenADryRunFindsNothingToDo) {
+  Summary summary;
+  summary.skipped = {{"com.a", "version 1 is installed", true},
+                     {"com.b", "it is a system application"}};
+  EXPECT_THAT(told({.showPlan = true}, {summary}),
+              ElementsAre("skipped    com.b: it is a system application",
+                          "done       nothing to do: 1 skipped, 1 up to date"));
+}
+
+TEST_F(Reporting, TellsADowngradeAsOne) {
+  PlannedEntry back = Paint;
+  back.action = Action::Downgrade;
+  Summary summary;
+  summary.downgraded = {"com.paint"};
+  EXPECT_THAT(told({}, {back, InstallEnded{"com.paint", {}}, summary}),
+              ElementsAre("downgraded Paint 2.0 (com.paint)", "done       1 downgraded"));
 }
 
 TEST_F(Reporting, ShowsThePlanOfADryRun) {
@@ -198,8 +216,8 @@ TEST_F(Reporting, ShowsThePlanOfADryRun) {
 
 TEST_F(Reporting, WritesOnlyFailuresWhenQuietAndThemAsErrors) {
   EXPECT_TRUE(told({.quiet = true}, {Paint, InstallEnded{"com.a", {}}, Mixed}).empty());
-  EXPECT_THAT(errors.lines(),
-              ElementsAre("appsync: failed com.bad: damaged", "appsync: failed x.zip: no archive"));
+  EXPECT_THAT(errors.lines(), ElementsAre("appsync: failed com.bad: damaged [bad.zip]",
+                                          "appsync: failed x.zip: no archive"));
 }
 
 TEST_F(Reporting, ShowsTheClientsLogWhenVerbose) {

@@ -130,6 +130,20 @@ RestorePhone RestoreTest::restorePhone() {
             waiting.erase(std::string(identifier));
             if (!bytes.empty()) waiting.emplace(identifier, bytes);
             return true;
+          },
+          [this](std::string_view identifier, const device::DataSource& source,
+                 std::optional<Error>* error) {
+            if (phone.faults.strikes("phone.overwriteData", identifier, error)) return false;
+            std::string bytes(1000, 0);
+            const std::int64_t count =
+                source(reinterpret_cast<std::uint8_t*>(bytes.data()), bytes.size());
+            if (count < 0) return false;
+            bytes.resize(static_cast<std::size_t>(count));
+            EXPECT_EQ(source(nullptr, 0), 0);
+            phone.trace.add(fakes::TraceCall,
+                            fmt::format("phone.overwriteData({}, {})", identifier, bytes));
+            owned[std::string(identifier)] = bytes;
+            return true;
           }};
 }
 
@@ -157,7 +171,10 @@ std::string RestoreTest::restore() {
   std::string problem;
   Backup read = backup();
   RestoreList list = RestoreList::of(read, problem).value();
-  RestoreInput input{std::move(read), std::move(list), {}, {}};
+  RestoreInput input{std::move(read), std::move(list), {}, {}, overwriteData};
+  if (!only.empty()) {
+    EXPECT_TRUE(input.list.keepOnly(only, problem)) << problem;
+  }
   if (packages) input.packages = readLibrary(folder.path(), problem).value();
   if (store) input.catalogue = readLibrary(folder.path(), problem).value();
   Restore session(client, host, restorePhone(), reporter, interruption);

@@ -57,8 +57,10 @@ class RestoreTest : public SessionTest {
   PropertyList::Array intentional;
   std::map<std::string, std::string> data;
   RestoringClient client{phone, host, waiting, coordination};
-  bool packages = false;                        ///< from `folder`
-  bool store = false;                           ///< from `folder`
+  bool packages = false;  ///< from `folder`
+  bool store = false;     ///< from `folder`
+  bool overwriteData = false;
+  std::set<std::string> only;                   ///< none: all
   std::map<std::string, Error> refusedByPhone;  ///< coordinated installs
   Folder backups;
 

@@ -100,6 +100,18 @@ TEST_F(HandoverTest, LeavesTheDataOfADemotedApplicationAlone) {
   EXPECT_THAT(waiting, ElementsAre(Pair("com.a", "data of a")));
 }
 
+TEST_F(HandoverTest, LeavesOutAnApplicationWhoseDataCannotBeLookedAt) {
+  backUp("com.a", "data of a");
+  seedRestoring("com.a", InstallType::IntentionalDowngrade);
+  owned["com.a"] = "made since";
+  phone.faults.failWhere("phone.saveData", "com.a", Error::posix(EMFILE));
+  EXPECT_THAT(handOver().failures,
+              ElementsAre(Pair("com.a",
+                               "its data on the phone could not be looked at: Too many open "
+                               "files")));
+  EXPECT_THAT(waiting, IsEmpty());
+}
+
 TEST_F(HandoverTest, TellsHowFarDataHasCome) {
   backUp("com.a", std::string(2500, 'x'));
   handOver();
@@ -206,8 +218,8 @@ TEST_F(HandoverTest, GoesOnWithoutALayoutThatTheHomeScreenRefuses) {
   const Handover given = host::handOver(restorePhone(), damaged, list, reporter, interruption);
   EXPECT_FALSE(given.broken);
   EXPECT_THAT(namesOnList(), ElementsAre("com.a"));
-  EXPECT_THAT(reporter.lines("notice"),
-              ElementsAre(HasSubstr("the home screen does not take its layout: ")));
+  EXPECT_THAT(given.layoutRefused.value_or(""),
+              HasSubstr("the home screen does not take its layout: "));
 }
 
 TEST_F(HandoverTest, TellsWhenThePhoneTakesNoFile) {

@@ -50,6 +50,18 @@ TEST_F(RestorePackagesTest, RememberedPackageIsNotSentAgain) {
               ElementsAre("client.restoreParts(com.a, 1.0, asked 2, came 2)"));
 }
 
+TEST_F(RestorePackagesTest, NothingIsSentWhenItCannotBeSeenWhatIsRemembered) {
+  backUp("com.a", "data of a");
+  offer("com.a");
+  // The first look is for packages left behind.
+  phone.faults.failWhere("FileManager.contentsAtPath", exchange::RestoreState,
+                         Error::posix(EMFILE));
+  EXPECT_EQ(restore(),
+            "failed: com.a (what the phone remembers of it could not be looked at: Too many open "
+            "files)");
+  EXPECT_THAT(trace("phone.receive"), IsEmpty());
+}
+
 TEST_F(RestorePackagesTest, RememberedPackageNeedsNoLibrary) {
   packages = false;
   backUp("com.a", "data of a");

@@ -44,7 +44,8 @@ TEST_F(RestoreTest, SecondRestoreOnlyAsksTheClient) {
   phone.appRegistry.seedInstalled("com.a");
   restore();
   phone.trace.clear();
-  EXPECT_EQ(restore(), "skipped: com.a (is installed already) com.b (waits for its package)");
+  EXPECT_EQ(restore(),
+            "skipped: com.a (" + std::string(LeftAsItIs) + ") com.b (waits for its package)");
   EXPECT_THAT(trace(),
               ElementsAre("client.supportedDataclasses", "client.currentSyncAnchor",
                           "client.prepareForSyncWithHostAnchor(ANCHOR)",
@@ -123,16 +124,105 @@ TEST_F(RestoreTest, AsksTheClientNothingWhenInterruptedBefore) {
   EXPECT_THAT(trace("client"), IsEmpty());
 }
 
-TEST_F(RestoreTest, SaysThatCoordinatedRestoresLeavePackagesToTheStore) {
-  coordination = true;
+TEST_F(RestoreTest, TellsOfPlaceholdersBeforePackages) {
   backUp("com.a");
   offer("com.a");
   packages = true;
-  EXPECT_EQ(restore(), "skipped: com.a (waits for its package)");
-  EXPECT_THAT(reporter.lines("notice"),
-              ElementsAre("notice this phone takes restored applications only from the store "
-                          "(--store)"));
-  EXPECT_THAT(trace("phone.receive"), IsEmpty());
+  restore();
+  EXPECT_THAT(reporter.lines(), ElementsAre("plan com.a", "placeholder com.a Name of com.a",
+                                            "progress com.a", "sent com.a", "install com.a"));
+}
+
+TEST_F(RestoreTest, OverwritesTheDataOfInstalledApplicationsWhenAsked) {
+  backUp("com.a", "data of a");
+  backUp("com.b", "data of b");
+  backUp("com.c");
+  for (const char* identifier : {"com.a", "com.b", "com.c"}) {
+    phone.appRegistry.seedInstalled(identifier);
+    owned[identifier] = "own";
+  }
+  owned["com.b"] = "data of b";
+  EXPECT_EQ(restore(), "skipped: com.a (" + std::string(LeftAsItIs) + ") com.b (" + LeftAsItIs +
+                           ") com.c (" + LeftAsItIs + ")");
+  EXPECT_EQ(owned["com.a"], "own");
+  overwriteData = true;
+  EXPECT_EQ(restore(),
+            "data restored: com.a; skipped: com.b (is installed with the backup's data) com.c (is "
+            "installed, and the backup has no data of it)");
+  EXPECT_THAT(trace("phone."), ElementsAre("phone.overwriteData(com.a, data of a)"));
+  EXPECT_EQ(owned["com.c"], "own");
+}
+
+TEST_F(RestoreTest, TellsWhyTheDataOfAnInstalledApplicationStays) {
+  backUp("com.a", "data of a");
+  backUp("com.b", "data of b");
+  for (const char* identifier : {"com.a", "com.b"}) phone.appRegistry.seedInstalled(identifier);
+  overwriteData = true;
+  phone.faults.failWhere("phone.overwriteData", "com.a",
+                         Error::withDescription(POSIXErrorDomain, EBUSY, "com.a is open"));
+  EXPECT_EQ(
+      restore(),
+      "failed: com.a (its data could not be given back: com.a is open); data restored: com.b");
+}
+
+TEST_F(RestoreTest, RestoresOnlyWhatIsNamed) {
+  backUp("com.a", "data of a");
+  backUp("com.b", "data of b", true);
+  backUp("com.c", {}, true);
+  seedRestoring("com.other");
+  phone.files.putPlist(exchange::DemotedApplications,
+                       PropertyList::Dictionary{
+                           {"AutomaticDowngrades", PropertyList::Array{"com.b", "com.other2"}}});
+  for (const char* identifier : {"com.a", "com.b", "com.other"}) offer(identifier);
+  only = {"com.a", "com.b"};
+  packages = store = true;
+  EXPECT_EQ(
+      restore(),
+      "data restored: com.b; failed: com.a (its data could not be given back: com.a is open)");
+}
+
+TEST_F(RestoreTest, IsNotCompleteWhenTheHomeScreenTakesNoLayout) {
+  backUp("com.a");
+  Backup damaged = backup();
+  damaged.iconLayout = toBytes("damaged");
+  std::string problem;
+  const RestoreList list = RestoreList::of(damaged, problem).value();
+  Restore session(client, host, restorePhone(), reporter, interruption);
+  EXPECT_FALSE(session.run({damaged, list, {}, {}, false}).completed);
+  EXPECT_THAT(reporter.lines("broken"),
+              ElementsAre(HasSubstr("broken the home screen does not take its layout: ")));
+}
+
+TEST_F(RestoreTest, IsNotCompleteWhenItCannotBeSeenWhatIsDemoted) {
+  backUp("com.a");
+  offer("com.a");
+  store = true;
+  phone.faults.failWhere("FileManager.contentsAtPath", exchange::DemotedApplications,
+                         Error::posix(EMFILE));
+  EXPECT_EQ(restore(), "skipped: com.a (stays a placeholder until it is asked for)");
+  EXPECT_THAT(reporter.lines("broken"),
+              ElementsAre("broken the phone's list of demoted applications could not be looked at: "
+                          "Too many open files"));
+}
+
+TEST_F(RestoreTest, FailsWhatTheStoreHasAndThePhoneDidNotInstall) {
+  coordination = true;
+  backUp("com.a");
+  backUp("com.b");
+  offer("com.a");
+  store = true;
+  client.onReconcile = [this] {
+    phone.files.erase(exchange::RestoreList);
+    seedRestoring("com.a", InstallType::Migration);
+    auto record = *phone.appRegistry.recordForIdentifier("com.a", true);
+    record.applicationIdentifier = "com.b";
+    record.installType = InstallType::Restore;
+    phone.appRegistry.seedPlaceholder(record);
+  };
+  EXPECT_EQ(
+      restore(),
+      "failed: com.a (the phone did not install it (appsync log tells more)) com.b (the phone "
+      "could not make it ready; the next restore does it)");
 }
 
 TEST_F(RestoreTest, BringsNothingToAnApplicationWhoseDataIsDamaged) {

@@ -14,6 +14,10 @@ std::string reasonText(const std::optional<std::string>& reason) {
   return reason ? " failed: " + *reason : "";
 }
 
+std::vector<TodoEntry> todoOf(fakes::FakePlatform& phone) {
+  return readTodoList(phone.files, exchange::WorkArea).value();
+}
+
 std::string lineOf(const Event& event) {
   return std::visit(
       Overloaded{
@@ -94,7 +98,7 @@ bool RecordingClient::reconcileSync(const PropertyList&, std::string_view newAnc
   phone_.files.erase(exchange::WorkArea);
   phone_.files.putCopy(exchange::StagingArea, exchange::WorkArea);
   phone_.files.erase(exchange::StagingArea);
-  for (const TodoEntry& entry : readTodoList(phone_.files, exchange::WorkArea)) {
+  for (const TodoEntry& entry : todoOf(phone_)) {
     if (entry.operation == "remove" && removes)
       phone_.appRegistry.uninstallApplication(entry.identifier, {});
   }
@@ -104,7 +108,7 @@ bool RecordingClient::reconcileSync(const PropertyList&, std::string_view newAnc
 std::vector<SyncAssetPtr> RecordingClient::outstandingAssetTransfers() noexcept {
   note("outstandingAssetTransfers");
   std::vector<SyncAssetPtr> assets;
-  for (const TodoEntry& entry : readTodoList(phone_.files, exchange::WorkArea)) {
+  for (const TodoEntry& entry : todoOf(phone_)) {
     if (entry.operation == "install" && notAskedFor.count(entry.identifier) == 0) {
       assets.push_back(host_.makeDownload(entry.identifier, "Application", std::nullopt));
     }
@@ -202,6 +206,8 @@ std::string text(const Summary& summary) {
   };
   add("installed", summary.installed, plain);
   add("updated", summary.updated, plain);
+  add("downgraded", summary.downgraded, plain);
+  add("data restored", summary.dataRestored, plain);
   add("deleted", summary.deleted, plain);
   add("failed", summary.failed, withReason);
   add("skipped", summary.skipped, withReason);
@@ -217,10 +223,22 @@ Phone SessionTest::phoneForHost() {
             phone.trace.add(fakes::TraceFile, fmt::format("phone.receive({})", path));
             return std::make_unique<FakeReceiver>(phone, std::string(path));
           },
+          [this](std::string_view directory, std::optional<Error>*) {
+            std::vector<std::string> names;
+            const std::string parent = std::string(directory) + "/";
+            for (const auto& file : phone.files.files()) {
+              const bool below = file.first.starts_with(parent);
+              const std::string name = below ? file.first.substr(parent.size()) : "";
+              if (below && name.find('/') == std::string::npos) names.push_back(name);
+            }
+            return std::optional(names);
+          },
           [this](device::DeviceWatcher* watcher) { client.watcher = watcher; },
           [this] { phone.trace.add(fakes::TraceCall, "phone.hurry"); },
           [this](std::string_view bundleId) { return isBusyWith && isBusyWith(bundleId); },
-          [this](std::string_view identifier, const device::DataSink& sink, std::optional<Error>*) {
+          [this](std::string_view identifier, const device::DataSink& sink,
+                 std::optional<Error>* error) {
+            if (phone.faults.strikes("phone.saveData", identifier, error)) return false;
             const auto& all = waiting.contains(std::string(identifier)) ? waiting : owned;
             const auto found = all.find(std::string(identifier));
             return found == all.end() || sink(toBytes(found->second));
@@ -244,8 +262,9 @@ std::vector<std::string> SessionTest::owedBy(CoordinationClientId responsible) {
 SyncResult SessionTest::sync() {
   std::string problem;
   SyncInput input{readLibrary(folder.path(), problem).value(), {}, iconLayout, "NEW"};
-  input.plan =
-      makePlan(input.library, installedApplications(phoneForHost()), options, problem).value();
+  input.plan = makePlan(input.library, installedApplications(phoneForHost(), problem).value(),
+                        options, problem)
+                   .value();
   Session session(client, host, phoneForHost(), reporter, interruption);
   return session.run(input);
 }

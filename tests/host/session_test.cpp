@@ -96,6 +96,17 @@ TEST_F(SessionTest, ReplacesAStaleStagingArea) {
   EXPECT_FALSE(phone.files.exists(std::string(exchange::WorkArea) + "/com.stale"));
 }
 
+TEST_F(SessionTest, IsBrokenWhenItCannotBeSeenWhatThePhoneHasDone) {
+  offer("com.a");
+  client.onTransfersEnd = [this] {
+    phone.faults.failWhere("FileManager.contentsAtPath", exchange::WorkArea, Error::posix(EMFILE));
+  };
+  const SyncResult result = sync();
+  EXPECT_FALSE(result.completed);
+  EXPECT_EQ(text(result.summary),
+            "failed: com.a (it cannot be seen what the phone has done: Too many open files)");
+}
+
 TEST_F(SessionTest, WritesTheApplicationsPresentAfterTheEnd) {
   offer("com.a");
   phone.appRegistry.seedInstalled("com.b", "1.0");
@@ -109,21 +120,35 @@ TEST_F(SessionTest, WritesTheApplicationsPresentAfterTheEnd) {
             PropertyList(PropertyList::Array{"com.a", "com.b"}));
 }
 
-TEST_F(SessionTest, RemovesPackagesThatABrokenOffSyncLeft) {
+TEST_F(SessionTest, RemovesPackagesThatWereLeftBehind) {
   phone.files.putPlist(
-      std::string(exchange::WorkArea) + "/ApplicationsSync.plist",
-      PropertyList::Array{
-          PropertyList::Dictionary{{"identifier", "com.left"}, {"operation", "DOWNLOADED"}},
-          PropertyList::Dictionary{{"identifier", "com.done"}, {"operation", "INSTALLED"}},
-          PropertyList::Dictionary{{"identifier", "../evil"}, {"operation", "install"}}});
-  for (const char* name : {"com.left.zip", "com.done.zip", "foreign.zip", "../evil.zip"}) {
+      exchange::RestoreState,
+      PropertyList::Dictionary{
+          {"com.kept",
+           PropertyList::Dictionary{
+               {"1.0", PropertyList::Dictionary{{"path", std::string(Root) + "com.kept.zip"}}}}}});
+  for (const char* name : {"com.left.zip", "com.left.package", "com.kept.zip", "com.kept.tar",
+                           "notes.txt", "com.waits.tar.gz"}) {
     phone.files.putFile(std::string(Root) + name, "package");
   }
+  phone.files.putFile("/var/mobile/Media/Downloads/com.left.zip", "package");
+  coordination = true;
+  makeCoordinator("com.waits");
   sync();
-  EXPECT_FALSE(phone.files.exists(std::string(Root) + "com.left.zip"));
-  EXPECT_TRUE(phone.files.exists(std::string(Root) + "com.done.zip"));
-  EXPECT_TRUE(phone.files.exists(std::string(Root) + "foreign.zip"));
-  EXPECT_TRUE(phone.files.exists("/var/mobile/Media/evil.zip"));
+  EXPECT_THAT(trace("FileManager.removeItem"),
+              ElementsAre("FileManager.removeItem(STAGING/com.kept.tar)",
+                          "FileManager.removeItem(STAGING/com.left.package)",
+                          "FileManager.removeItem(STAGING/com.left.zip)",
+                          "FileManager.removeItem(/var/mobile/Media/Downloads/com.left.zip)",
+                          "FileManager.removeItem(STAGING/ApplicationSync)"));
+}
+
+TEST_F(SessionTest, RemovesNoPackageWhenItCannotBeSeenWhatIsRemembered) {
+  phone.files.putFile(std::string(Root) + "com.left.zip", "package");
+  phone.faults.failWhere("FileManager.contentsAtPath", exchange::RestoreState,
+                         Error::posix(EMFILE));
+  sync();
+  EXPECT_TRUE(phone.files.exists(std::string(Root) + "com.left.zip"));
 }
 
 TEST_F(SessionTest, LeavesAPlaceholderWhosePackageIsBeingInstalled) {
@@ -134,6 +159,18 @@ TEST_F(SessionTest, LeavesAPlaceholderWhosePackageIsBeingInstalled) {
   sync();
   EXPECT_THAT(phone.appRegistry.placeholderIdentifiers(),
               ElementsAre("com.coming", "com.restoring"));
+}
+
+TEST_F(SessionTest, LeavesAPlaceholderThatIsAllThatIsLeftOfAnApplication) {
+  for (const char* identifier : {"com.left", "com.demoted", "com.unseen", "com.updated"}) {
+    phone.appRegistry.seedPlaceholder(identifier, InstallType::Sync);
+  }
+  phone.appRegistry.seedInstalled("com.updated", "1.0");
+  owned = {{"com.demoted", "notes"}, {"com.updated", "notes"}};
+  phone.faults.failWhere("phone.saveData", "com.unseen", Error::posix(EMFILE));
+  sync();
+  EXPECT_THAT(phone.appRegistry.placeholderIdentifiers(), ElementsAre("com.demoted", "com.unseen"));
+  EXPECT_THAT(reporter.lines(), ElementsAre("swept com.left", "swept com.updated"));
 }
 
 TEST_F(SessionTest, SendsNothingWhenRestrictionsSwitchTheSyncOff) {
@@ -148,6 +185,18 @@ TEST_F(SessionTest, SendsNothingWhenRestrictionsSwitchTheSyncOff) {
                           "client.disabledAssetTypes"));
 }
 
+TEST_F(SessionTest, WhatRestrictionsForbidIsNeitherDoneNorUpToDate) {
+  offer("com.a");
+  phone.appRegistry.seedInstalled("com.old", "1.0");
+  options.mirror = true;
+  client.disabled = {"Application"};
+  const Summary summary = sync().summary;
+  EXPECT_EQ(text(summary),
+            "skipped: com.old (the phone's restrictions forbid installing and removing) com.a (the "
+            "phone's restrictions forbid installing and removing)");
+  for (const SkippedEntry& entry : summary.skipped) EXPECT_FALSE(entry.upToDate);
+}
+
 TEST_F(SessionTest, SkipsWhatThePhoneDoesNotAskFor) {
   offer("com.a");
   offer("com.b");
@@ -155,6 +204,35 @@ TEST_F(SessionTest, SkipsWhatThePhoneDoesNotAskFor) {
   const SyncResult result = sync();
   EXPECT_EQ(text(result.summary),
             "installed: com.b; skipped: com.a (the phone did not ask for its package)");
+}
+
+TEST_F(SessionTest, FailsWhatWasNamedAndThePhoneDoesNotAskFor) {
+  offer("com.a");
+  options.install = {"com.a"};
+  client.notAskedFor = {"com.a"};
+  EXPECT_EQ(text(sync().summary), "failed: com.a (the phone did not ask for its package)");
+  client.disabled = {"Application"};
+  EXPECT_EQ(text(sync().summary),
+            "failed: com.a (the phone's restrictions forbid installing and removing)");
+}
+
+TEST_F(SessionTest, NamesTheFileOfAPackageThatFailed) {
+  offer("com.a");
+  putFile(folder / "broken.zip", "garbage");
+  client.refusedPackages = {{"com.a", Error::withDescription("I", 2, "damaged")}};
+  const Summary summary = sync().summary;
+  ASSERT_THAT(summary.failed, ::testing::SizeIs(2));
+  EXPECT_EQ(summary.failed[0].file, "broken.zip");
+  EXPECT_EQ(summary.failed[1].file, "com.a.tar");
+}
+
+TEST_F(SessionTest, TellsDowngradesFromUpdates) {
+  offer("com.a", "1.0");
+  offer("com.b", "1.0");
+  phone.appRegistry.seedInstalled("com.a", "2.0");
+  phone.appRegistry.seedInstalled("com.b", "1.0");
+  options.install = {"com.a", "com.b"};
+  EXPECT_EQ(text(sync().summary), "updated: com.b; downgraded: com.a");
 }
 
 TEST_F(SessionTest, FailsAnAssetThatTheLibraryLacks) {

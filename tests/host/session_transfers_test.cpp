@@ -48,6 +48,27 @@ TEST_F(SessionTest, TellsProgressChunkByChunk) {
                           "client.assetTransferUpdatedProgress(com.a, 1.00)"));
 }
 
+TEST_F(SessionTest, TheAssetHoldsItsProgressBeforeTheClientIsTold) {
+  offer("com.a", "1.0", ThreeChunks);
+  std::vector<double> told;
+  client.onProgress = [&](const SyncAssetPtr& asset, double fraction) {
+    EXPECT_EQ(asset->downloadProgress, fraction);
+    told.push_back(fraction);
+  };
+  sync();
+  EXPECT_THAT(told, SizeIs(3));
+}
+
+TEST_F(SessionTest, AnEmptyPackageIsSentWhole) {
+  offer("com.a");
+  client.onOutstanding = [&] { std::filesystem::resize_file(folder / "com.a.tar", 0); };
+  sync();
+  EXPECT_THAT(trace("client.assetTransfer"),
+              ElementsAre("client.assetTransferUpdatedProgress(com.a, 1.00)",
+                          "client.assetTransferSucceeded(com.a, com.a.tar, none)",
+                          "client.assetTransferEndedWithSuccess(true)"));
+}
+
 TEST_F(SessionTest, TellsProgressAtMostAHundredTimesForALargePackage) {
   offer("com.a", "1.0", 60 << 20);
   sync();

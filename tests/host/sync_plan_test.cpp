@@ -23,6 +23,7 @@ class Planning : public ::testing::Test {
     problem.clear();
     entries.clear();
     skipped.clear();
+    failed.clear();
     const auto made = makePlan(library, installed, options, problem);
     if (!made) return;
     for (const PlannedEntry& entry : made->entries) {
@@ -34,6 +35,9 @@ class Planning : public ::testing::Test {
     for (const SkippedEntry& entry : made->skipped) {
       skipped.push_back(entry.identifier + ": " + entry.reason + (entry.upToDate ? " (fine)" : ""));
     }
+    for (const FailedEntry& entry : made->failed) {
+      failed.push_back(entry.identifier + ": " + entry.reason);
+    }
   }
 
   Library library{"lib", {}, {}};
@@ -42,6 +46,7 @@ class Planning : public ::testing::Test {
   std::string problem;
   std::vector<std::string> entries;
   std::vector<std::string> skipped;
+  std::vector<std::string> failed;
 };
 
 TEST_F(Planning, TakesWhatIsNewOrNewer) {
@@ -96,13 +101,20 @@ TEST_F(Planning, RemovesWhatIsNamedAndDoesNotInstallItAgain) {
   EXPECT_THAT(entries, ElementsAre("remove com.a 1.0 over 1.0"));
 }
 
-TEST_F(Planning, SkipsRemovalsThatCannotBe) {
+TEST_F(Planning, RemovesOnlyWhatIsThereAndTheUsers) {
   have("com.system", "1.0", true);
+  offer("com.absent", "1.0");
   options.remove = {"com.absent", "com.system"};
   plan();
   EXPECT_THAT(entries, IsEmpty());
-  EXPECT_THAT(skipped, ElementsAre("com.absent: it is not installed",
-                                   "com.system: it is a system application"));
+  EXPECT_THAT(skipped, ElementsAre("com.absent: it is not installed"));
+  EXPECT_THAT(failed, ElementsAre("com.system: it is a system application"));
+}
+
+TEST_F(Planning, RefusesToRemoveWhatNobodyKnows) {
+  options.remove = {"com.unknown"};
+  plan();
+  EXPECT_EQ(problem, "com.unknown is neither on the phone nor in lib");
 }
 
 TEST_F(Planning, MirrorsTheLibrary) {
@@ -143,13 +155,30 @@ TEST_F(Planning, ObeysThePhonesRestrictions) {
   offer("com.same", "1.0");
   have("com.same", "1.0");
   have("com.old", "1.0");
+  options.mirror = true;
+  options.installingAllowed = options.removingAllowed = false;
+  plan();
+  EXPECT_THAT(entries, IsEmpty());
+  EXPECT_THAT(failed, IsEmpty());
+  EXPECT_THAT(skipped, ElementsAre(HasSubstr("com.old: removing applications is forbidden"),
+                                   HasSubstr("com.new: installing applications is forbidden"),
+                                   "com.same: version 1.0 is installed (fine)"));
+}
+
+TEST_F(Planning, FailsWhatWasNamedAndIsForbidden) {
+  offer("com.new", "1.0");
+  offer("com.system", "2.0");
+  have("com.old", "1.0");
+  have("com.system", "1.0", true);
+  options.install = {"com.new", "com.system"};
   options.remove = {"com.old"};
   options.installingAllowed = options.removingAllowed = false;
   plan();
   EXPECT_THAT(entries, IsEmpty());
-  EXPECT_THAT(skipped, ElementsAre(HasSubstr("com.old: removing applications is forbidden"),
-                                   HasSubstr("com.new: installing applications is forbidden"),
-                                   "com.same: version 1.0 is installed (fine)"));
+  EXPECT_THAT(skipped, IsEmpty());
+  EXPECT_THAT(failed, ElementsAre(HasSubstr("com.old: removing applications is forbidden"),
+                                  HasSubstr("com.new: installing applications is forbidden"),
+                                  "com.system: it is a system application"));
 }
 
 TEST_F(Planning, LeavesSystemApplicationsAlone) {

@@ -175,12 +175,14 @@ class ModePhone {
         options.remove.push_back(task.identifier);
       } else {
         options.install.push_back(task.identifier);
-        input.library.packages.emplace(task.identifier, shelf.package(task));
       }
+      // Also of what is to be removed: an application that nobody knows is refused.
+      input.library.packages.emplace(task.identifier, shelf.package(task));
     }
     std::string problem;
-    input.plan =
-        makePlan(input.library, installedApplications(phoneOf(*device_)), options, problem).value();
+    input.plan = makePlan(input.library, installedApplications(phoneOf(*device_), problem).value(),
+                          options, problem)
+                     .value();
     return input;
   }
 

@@ -96,8 +96,9 @@ class PersonRacesTest : public ::testing::Test {
                                      LibraryPackage{file, idOf(number), version, "Sample"});
     }
     std::string problem;
-    input.plan =
-        makePlan(input.library, installedApplications(phoneOf(*device_)), options, problem).value();
+    input.plan = makePlan(input.library, installedApplications(phoneOf(*device_), problem).value(),
+                          options, problem)
+                     .value();
     return input;
   }
 

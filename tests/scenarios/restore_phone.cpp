@@ -50,6 +50,7 @@ std::string text(const Summary& summary) {
   };
   for (const auto& identifier : summary.installed) add("installed", identifier);
   for (const auto& identifier : summary.updated) add("updated", identifier);
+  for (const auto& identifier : summary.dataRestored) add("data restored", identifier);
   for (const auto& entry : summary.failed) add("failed", entry.identifier + ": " + entry.reason);
   for (const auto& entry : summary.skipped) add("skipped", entry.identifier + ": " + entry.reason);
   return result;
@@ -109,10 +110,11 @@ RestorePhone stepping(const RestorePhone& phone, FileManager& files,
     };
     return phone.restoreData(identifier, stepped, error);
   };
-  return {{files, phone.apps, receive, phone.setWatcher, phone.hurry, phone.isBusyWith,
-           phone.saveData, phone.packagesOwedBy, phone.coordination},
+  return {{files, phone.apps, receive, phone.namesIn, phone.setWatcher, phone.hurry,
+           phone.isBusyWith, phone.saveData, phone.packagesOwedBy, phone.coordination},
           phone.homeScreen,
-          restoreData};
+          restoreData,
+          phone.overwriteData};
 }
 
 }  // namespace
@@ -161,7 +163,7 @@ RestoreInput SampleBackup::read() {
   std::string problem;
   Backup backup = readBackup(folder(), problem).value();
   RestoreList list = RestoreList::of(backup, problem).value();
-  return {std::move(backup), std::move(list), {}, {}};
+  return {std::move(backup), std::move(list), {}, {}, false};
 }
 
 void Shelf::add(const std::string& identifier, const std::string& version, std::size_t bodySize) {
@@ -218,7 +220,8 @@ std::string RestoringPhone::sync(const Library& library, const PlanOptions& opti
   std::string problem;
   SyncInput input{library, {}, {}, "NEW"};
   input.plan =
-      makePlan(library, installedApplications(phoneOf(*device_)), options, problem).value();
+      makePlan(library, installedApplications(phoneOf(*device_), problem).value(), options, problem)
+          .value();
   HostProcess host(SyncHostBundleIdentifier, "com.corvane.twc.AppsClient", interruption);
   AppsClient client(device_->platform(host));
   announceStartUp(device_->systemNotifier());
