@@ -143,17 +143,9 @@ class FolderDevice final : public EmbeddedDevice {
     return registry_.addSystemApplication(bundleId, displayName, version, error);
   }
 
-  std::optional<Bytes> opaqueBlob(std::string_view bundleId) noexcept override {
-    std::optional<Bytes> blob;
-    database_->read("the registry could not be read", [&](SQLite::Database& connection) {
-      const ApplicationRows rows = findApplication(connection, bundleId);
-      if (rows.installed) {
-        blob = rows.installed->sinf;
-      } else if (rows.placeholder) {
-        blob = rows.placeholder->sinf;
-      }
-    });
-    return blob;
+  std::optional<Bytes> opaqueBlob(std::string_view bundleId,
+                                  std::optional<Error>* error) noexcept override {
+    return registry_.opaqueBlob(bundleId, error);
   }
 
   bool saveData(std::string_view bundleId, const DataSink& sink,
@@ -175,7 +167,9 @@ class FolderDevice final : public EmbeddedDevice {
 
   DeviceOptions options() noexcept override { return options_; }
 
-  std::vector<AppRecord> applications() noexcept override { return registry_.records(); }
+  std::vector<AppRecord> applications(std::optional<Error>* error) noexcept override {
+    return registry_.records(error);
+  }
 
   PolicyValue policy(PolicySetting setting) noexcept override {
     return policy_.effectiveBoolValue(setting);

@@ -86,8 +86,10 @@ class EmbeddedDevice {
 
   // What a backup saves of an application beside its files, and a restore gives back.
 
-  /// The opaque blob that came with the application or its placeholder; nullopt for none.
-  virtual std::optional<Bytes> opaqueBlob(std::string_view bundleId) noexcept = 0;
+  /// The opaque blob that came with the application or its placeholder; nullopt for none, and with
+  /// an error when that cannot be read.
+  virtual std::optional<Bytes> opaqueBlob(std::string_view bundleId,
+                                          std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// Gives an application's own data, or for a placeholder what a restore has still to give back to
   /// it, as a tar archive whose bytes depend only on the data. Empty data gives no bytes at all.
@@ -138,7 +140,8 @@ class EmbeddedDevice {
 
   virtual DeviceOptions options() noexcept = 0;
   /// One record per registry entry (BundleKind::All), sorted by identifier, placeholders last.
-  virtual std::vector<AppRecord> applications() noexcept = 0;
+  /// None, with an error, when the registry cannot be read.
+  virtual std::vector<AppRecord> applications(std::optional<Error>* error = nullptr) noexcept = 0;
   virtual PolicyValue policy(PolicySetting setting) noexcept = 0;
   virtual std::vector<std::string> foregroundApplications() noexcept = 0;
   virtual std::vector<std::string> uninstalledApplications() noexcept = 0;

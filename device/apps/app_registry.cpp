@@ -83,12 +83,29 @@ std::optional<AppRecord> DeviceAppRegistry::recordForIdentifier(std::string_view
   return std::nullopt;
 }
 
-std::vector<AppRecord> DeviceAppRegistry::records() noexcept {
+std::vector<AppRecord> DeviceAppRegistry::records(std::optional<Error>* error) noexcept {
   std::vector<AppRecord> records;
-  core_.database.read(ReadFailed, [&](SQLite::Database& database) {
-    for (const ApplicationRow& row : allApplications(database)) records.push_back(row.record());
-  });
+  const bool read = core_.database.read(
+      ReadFailed,
+      [&](SQLite::Database& database) {
+        for (const ApplicationRow& row : allApplications(database)) records.push_back(row.record());
+      },
+      error);
+  if (!read) records.clear();
   return records;
+}
+
+std::optional<Bytes> DeviceAppRegistry::opaqueBlob(std::string_view bundleId,
+                                                   std::optional<Error>* error) noexcept {
+  std::optional<Bytes> blob;
+  core_.database.read(
+      ReadFailed,
+      [&](SQLite::Database& database) {
+        const ApplicationRows rows = findApplication(database, bundleId);
+        if (rows.any()) blob = (rows.installed ? rows.installed : rows.placeholder)->sinf;
+      },
+      error);
+  return blob;
 }
 
 void DeviceAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept {

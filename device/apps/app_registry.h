@@ -48,8 +48,12 @@ class DeviceAppRegistry final : public AppRegistry {
   /// Registers an application that comes with the system.
   bool addSystemApplication(std::string_view bundleId, std::string_view displayName,
                             std::string_view version, std::optional<Error>* error) noexcept;
-  /// Every record, the placeholder after the installed version of the same identifier.
-  std::vector<AppRecord> records() noexcept;
+  /// Every record, the placeholder after the installed version of the same identifier. None, with
+  /// an error, when they cannot be read.
+  std::vector<AppRecord> records(std::optional<Error>* error = nullptr) noexcept;
+  /// The opaque blob of the installed version or, failing that, of the placeholder; nullopt for
+  /// none, and with an error when it cannot be read.
+  std::optional<Bytes> opaqueBlob(std::string_view bundleId, std::optional<Error>* error) noexcept;
 
  private:
   /// Runs a change of one application, alone on it. False with an error for an identifier that
