@@ -36,22 +36,25 @@ BackupRun::BackupRun(SyncClient& client, const BackupPhone& phone, BackupWriter&
 
 BackupRun::~BackupRun() { interruption_.setListener({}); }
 
-BackupSummary BackupRun::run() {
-  summary_.made = saveAll();
+BackupSummary BackupRun::run(const BackupOptions& options) {
+  summary_.made = saveAll(options);
   if (summary_.made) {
     for (const AppRecord& record : saved_) summary_.saved.push_back(record.applicationIdentifier);
   }
   return std::move(summary_);
 }
 
-bool BackupRun::saveAll() {
+bool BackupRun::saveAll(const BackupOptions& options) {
   client_.prepareForBackup();
-  waitUntilIdle(applicationsToSave(phone_.services.appRegistry));
-  const std::vector<AppRecord> applications = applicationsToSave(phone_.services.appRegistry);
+  std::optional<Error> error;
+  waitUntilIdle(applicationsToSave(phone_, &error));
+  const std::vector<AppRecord> applications = applicationsToSave(phone_, &error);
+  if (error) return broken("the applications cannot be told: " + reasonOf(error));
   count_ = applications.size();
   for (const AppRecord& record : applications) {
     if (!save(record)) return false;
   }
+  if (!options.allowMissing && !mayReplaceOlder()) return false;
   if (!saveLists() || interruption_.requested()) return false;
   return writer_.finish() || broken(writer_.problem());
 }
@@ -108,15 +111,29 @@ std::optional<std::string> BackupRun::saveData(const AppRecord& record) {
   return "its data cannot be saved: " + reasonOf(error);
 }
 
+bool BackupRun::mayReplaceOlder() {
+  std::string lost;
+  for (const FailedEntry& entry : summary_.failed) {
+    if (!writer_.olderHolds(entry.identifier)) continue;
+    lost += (lost.empty() ? "" : ", ") + entry.identifier;
+  }
+  return lost.empty() || broken(fmt::format("the older backup stays, since {} cannot be saved now; "
+                                            "--allow-missing replaces it all the same",
+                                            lost));
+}
+
 bool BackupRun::saveLists() {
   const Platform& services = phone_.services;
   const auto layout = services.homeScreen.getFlattenedIconState(services.homeScreen.serverPort(),
                                                                 FlattenedIconState);
   if (!layout) return broken("the home screen does not tell its layout");
+  std::optional<Error> error;
+  auto demotions = demotionsAmong(services.files, saved_, &error);
+  if (!demotions)
+    return broken("the list of demoted applications cannot be read: " + reasonOf(error));
   // Binary, since it is mostly icons.
   return addList(BackupApplicationsFile, std::move(entries_), PropertyListFormat::Binary) &&
-         addList(BackupDemotionsFile, demotionsAmong(services.files, saved_),
-                 PropertyListFormat::Xml) &&
+         addList(BackupDemotionsFile, std::move(*demotions), PropertyListFormat::Xml) &&
          (writer_.addFile(BackupIconLayoutFile, *layout) || broken(writer_.problem()));
 }
 

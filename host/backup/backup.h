@@ -13,9 +13,14 @@
 
 namespace appsync::host {
 
+struct BackupOptions {
+  /// Replace an older backup even by one that lacks an application of it.
+  bool allowMissing = false;
+};
+
 /// One backup of a phone: its applications one after another, then what belongs to all of them. An
-/// application that cannot be saved whole is left out and harms no other. Borrows everything; used
-/// once, by one thread.
+/// application that cannot be saved whole is left out and harms no other; but an older backup that
+/// holds it stays. Borrows everything; used once, by one thread.
 class BackupRun {
  public:
   BackupRun(SyncClient& client, const BackupPhone& phone, BackupWriter& writer, Reporter& reporter,
@@ -26,14 +31,16 @@ class BackupRun {
 
   /// The last event, which it does not report itself. When the backup as a whole fails or is
   /// interrupted, the writer is left unfinished.
-  BackupSummary run();
+  BackupSummary run(const BackupOptions& options = {});
 
  private:
-  bool saveAll();
+  bool saveAll(const BackupOptions& options);
   void waitUntilIdle(const std::vector<AppRecord>& applications);
   bool save(const AppRecord& record);
   /// Why the application's data is not in the backup.
   std::optional<std::string> saveData(const AppRecord& record);
+  /// False when the older backup would be replaced by one that lacks what it holds.
+  bool mayReplaceOlder();
   bool saveLists();
   bool addList(std::string_view name, const PropertyList& list, PropertyListFormat format);
   void reportProgress(const AppRecord& record, std::uint64_t bytes);

@@ -16,27 +16,45 @@
 namespace appsync::host {
 namespace {
 
-std::string reasonOf(int errnoValue) {
-  if (errnoValue == ENOENT) return "is missing";
-  if (errnoValue == ELOOP) return "is a link";
-  return "cannot be read: " + std::generic_category().message(errnoValue);
+BackupProblem problemOf(const std::string& name, int errnoValue) {
+  if (errnoValue == ENOENT) return {name + " is missing", true};
+  if (errnoValue == ELOOP) return {name + " is a link", true};
+  const std::string reason = std::generic_category().message(errnoValue);
+  return {fmt::format("{} cannot be read: {}", name, reason), false};
+}
+
+bool readWhole(int fd, Bytes& bytes) {
+  std::size_t filled = 0;
+  while (filled < bytes.size()) {
+    const std::int64_t count =
+        readSome(fd, reinterpret_cast<std::uint8_t*>(bytes.data()) + filled, bytes.size() - filled);
+    if (count < 0) return false;
+    if (count == 0) break;
+    filled += static_cast<std::size_t>(count);
+  }
+  bytes.resize(filled);
+  return true;
 }
 
 }  // namespace
 
 device::FileDescriptor openBackupFile(const std::filesystem::path& path, std::uint64_t& size,
-                                      std::string& problem) {
+                                      BackupProblem& problem) {
+  const std::string name = printable(path.filename().string());
   const auto top = device::ConfinedDirectory::open("/", device::Confinement::Beneath);
+  if (!top.isOpen()) {
+    problem = problemOf(name, errno);
+    return {};
+  }
   auto file = top.openAt(path.relative_path().string(), O_RDONLY | O_NONBLOCK);
   struct stat status {};
   const int reason = file && ::fstat(file.get(), &status) == 0 ? 0 : errno;
-  const std::string name = printable(path.filename().string());
   if (reason != 0) {
-    problem = fmt::format("{} {}", name, reasonOf(reason));
+    problem = problemOf(name, reason);
     return {};
   }
   if (!S_ISREG(status.st_mode)) {
-    problem = name + " is no file";
+    problem = {name + " is no file", true};
     return {};
   }
   size = static_cast<std::uint64_t>(status.st_size);
@@ -51,11 +69,11 @@ std::int64_t readSome(int fd, std::uint8_t* bytes, std::size_t size) {
 }
 
 std::optional<BackupManifest> readBackupManifest(const std::filesystem::path& folder,
-                                                 std::string& problem) {
+                                                 BackupProblem& problem) {
   const std::filesystem::path path = folder / BackupManifestFile;
-  std::error_code failure;
-  if (!std::filesystem::exists(std::filesystem::symlink_status(path, failure))) {
-    problem = "it holds no Manifest.plist, so it is no backup";
+  struct stat status {};
+  if (::lstat(path.c_str(), &status) != 0 && errno == ENOENT) {
+    problem = {"it holds no Manifest.plist, so it is no backup", true};
     return std::nullopt;
   }
   std::uint64_t size = 0;
@@ -63,15 +81,12 @@ std::optional<BackupManifest> readBackupManifest(const std::filesystem::path& fo
   if (!file) return std::nullopt;
   // What is cut off here is refused as damaged.
   Bytes bytes(std::min<std::uint64_t>(size, PropertyListLimits{}.bytes));
-  std::size_t filled = 0;
-  while (filled < bytes.size()) {
-    const std::int64_t count = readSome(
-        file.get(), reinterpret_cast<std::uint8_t*>(bytes.data()) + filled, bytes.size() - filled);
-    if (count <= 0) break;
-    filled += static_cast<std::size_t>(count);
+  if (!readWhole(file.get(), bytes)) {
+    problem = problemOf(std::string(BackupManifestFile), errno);
+    return std::nullopt;
   }
-  bytes.resize(filled);
-  return parseManifest(bytes, problem);
+  problem.isWrongFolder = true;
+  return parseManifest(bytes, problem.text);
 }
 
 }  // namespace appsync::host

@@ -6,6 +6,7 @@
 #include <string>
 
 #include "device/base/file_descriptor.h"
+#include "host/backup/backup_folder.h"
 #include "host/backup/backup_manifest.h"
 
 namespace appsync::host {
@@ -14,10 +15,10 @@ namespace appsync::host {
 
 /// A regular file reached through no link. Not valid, with a problem, for anything else.
 device::FileDescriptor openBackupFile(const std::filesystem::path& path, std::uint64_t& size,
-                                      std::string& problem);
+                                      BackupProblem& problem);
 /// The number of bytes read, 0 at the end, -1 with errno set.
 std::int64_t readSome(int fd, std::uint8_t* bytes, std::size_t size);
 std::optional<BackupManifest> readBackupManifest(const std::filesystem::path& folder,
-                                                 std::string& problem);
+                                                 BackupProblem& problem);
 
 }  // namespace appsync::host

@@ -41,6 +41,12 @@ struct Backup {
   std::map<std::string, BackupFile, std::less<>> data;  ///< by identifier
 };
 
+/// Why a folder is not to be had as a backup, or for one: text for people.
+struct BackupProblem {
+  std::string text;
+  bool isWrongFolder = false;  ///< another is to be named; else the system refuses this one
+};
+
 /// nullopt, with one line for people, for what is no backup, and where a property list is missing
 /// or does not match its digest.
 std::optional<Backup> readBackup(const std::filesystem::path& folder, std::string& problem);
@@ -70,11 +76,15 @@ class BackupFileReader {
 /// process left beside the folder is removed. Used by one thread.
 class BackupWriter {
  public:
-  /// nullptr, with one line for people, when the folder cannot be made or holds something that is
+  /// nullptr, with a problem of one line, when the folder cannot be made or holds something that is
   /// no backup. The folder that is to hold it must exist.
   static std::unique_ptr<BackupWriter> open(const std::filesystem::path& folder,
-                                            std::string& problem);
+                                            BackupProblem& problem);
   virtual ~BackupWriter() = default;
+
+  /// Whether the older backup, which this one is to replace, holds the application; true too when
+  /// that cannot be told. False when there is no older one.
+  virtual bool olderHolds(std::string_view identifier) = 0;
 
   // False when the file could not be written; problem() then tells why, and nothing more succeeds.
 

@@ -29,26 +29,35 @@ void complete(PropertyList::Dictionary& metadata, const AppRecord& record) {
   }
 }
 
+bool isMissing(const Error& error) {
+  return error.domain == POSIXErrorDomain && error.code == ENOENT;
+}
+
+/// The file's bytes, if there is one. False when that cannot be told or it cannot be read.
+bool readIfThere(FileManager& files, const std::string& path, std::optional<Bytes>& bytes,
+                 std::optional<Error>* error) {
+  std::optional<Error> reason;
+  bytes = files.contentsAtPath(path, &reason);
+  if (bytes || (reason && isMissing(*reason))) return true;
+  if (reason) setError(error, *std::move(reason));
+  return false;
+}
+
 /// Completed, if need be, so that a phone can make a placeholder of it; and always written in the
 /// same way, since a phone that coordinates installs does not keep the file's own bytes.
-std::optional<Bytes> metadataOf(FileManager& files, const AppRecord& record, std::string& problem) {
-  std::optional<Error> error = Error::posix(ENOENT);
+std::optional<Bytes> metadataOf(FileManager& files, const AppRecord& record,
+                                std::optional<Error>* error) {
   std::optional<Bytes> bytes;
-  if (record.bundleContainerPath) {
-    bytes =
-        files.contentsAtPath(joinPath(*record.bundleContainerPath, "HalvoMetadata.plist"), &error);
-  }
-  if (!bytes && (error->domain != POSIXErrorDomain || error->code != ENOENT)) {
-    problem = "its metadata cannot be read: " + error->localizedDescription();
+  if (record.bundleContainerPath &&
+      !readIfThere(files, joinPath(*record.bundleContainerPath, "HalvoMetadata.plist"), bytes,
+                   error)) {
     return std::nullopt;
   }
   const auto parsed = bytes ? parsePropertyList(*bytes) : std::nullopt;
   const PropertyList::Dictionary* stored = parsed ? parsed->asDictionary() : nullptr;
   PropertyList::Dictionary metadata = stored ? *stored : PropertyList::Dictionary();
   complete(metadata, record);
-  bytes = serializePropertyList(std::move(metadata), PropertyListFormat::Binary, &error);
-  if (!bytes) problem = "its metadata cannot be written: " + error->localizedDescription();
-  return bytes;
+  return serializePropertyList(std::move(metadata), PropertyListFormat::Binary, error);
 }
 
 std::optional<Bytes> renderedIcon(const Platform& services, const std::string& bundlePath) {
@@ -62,12 +71,30 @@ std::optional<Bytes> renderedIcon(const Platform& services, const std::string& b
   return encoder->finalize() ? std::optional(std::move(png)) : std::nullopt;
 }
 
-std::optional<Bytes> iconOf(const Platform& services, const AppRecord& record) {
-  if (!record.bundlePath) return std::nullopt;
+/// False when an icon may be there though none could be drawn.
+bool canTellIcon(FileManager& files, const std::string& bundlePath, std::optional<Error>* error) {
+  std::optional<Bytes> bytes;
+  if (!readIfThere(files, joinPath(bundlePath, "Info.plist"), bytes, error)) return false;
+  const auto info = bytes ? parsePropertyList(*bytes) : std::nullopt;
+  const PropertyList* name = info ? info->find(KBBundleIconFile) : nullptr;
+  if (!name || !name->asString()) return true;
+  std::optional<Error> reason;
+  files.attributesOfItem(joinPath(bundlePath, *name->asString()), &reason);
+  if (!reason || isMissing(*reason)) return true;
+  setError(error, *std::move(reason));
+  return false;
+}
+
+/// None for an application without an icon that can be drawn. False when that cannot be told.
+bool takeIcon(const Platform& services, const AppRecord& record, std::optional<Bytes>& icon,
+              std::optional<Error>* error) {
+  if (!record.bundlePath) return true;
   // A placeholder's icon is a home-screen icon already.
-  return record.isPlaceholder
-             ? services.files.contentsAtPath(joinPath(*record.bundlePath, "Icon.png"))
-             : renderedIcon(services, *record.bundlePath);
+  if (record.isPlaceholder) {
+    return readIfThere(services.files, joinPath(*record.bundlePath, "Icon.png"), icon, error);
+  }
+  icon = renderedIcon(services, *record.bundlePath);
+  return icon || canTellIcon(services.files, *record.bundlePath, error);
 }
 
 /// A placeholder that a person has asked for since is of another type.
@@ -85,18 +112,26 @@ PropertyList::Array arrayOf(const std::set<std::string>& identifiers) {
 
 BackupPhone backupPhoneOf(device::EmbeddedDevice& device, SyncHost& host) {
   return {device.platform(host),
+          [&device](std::optional<Error>* error) { return device.applications(error); },
           [&device](std::string_view bundleId, const device::DataSink& sink,
                     std::optional<Error>* error) { return device.saveData(bundleId, sink, error); },
-          [&device](std::string_view bundleId) { return device.opaqueBlob(bundleId); },
+          [&device](std::string_view bundleId, std::optional<Error>* error) {
+            return device.opaqueBlob(bundleId, error);
+          },
           [&device](std::string_view bundleId) { return device.isBusyWith(bundleId); }};
 }
 
-std::vector<AppRecord> applicationsToSave(AppRegistry& registry) {
+std::vector<AppRecord> applicationsToSave(const BackupPhone& phone, std::optional<Error>* error) {
   std::vector<AppRecord> applications;
-  registry.enumerateBundles(BundleKind::User, [&](const AppRecord& record, bool&) {
+  std::set<std::string_view> taken;
+  const std::vector<AppRecord> all = phone.applications(error);
+  // Of an update under way the installed version, whose record comes first.
+  for (const AppRecord& record : all) {
     const bool leftOver = record.isPlaceholder && record.installType == InstallType::Sync;
-    if (record.isApplication && !leftOver) applications.push_back(record);
-  });
+    const bool isUsers = record.isApplication && record.applicationType == ApplicationTypeUser;
+    if (!taken.insert(record.applicationIdentifier).second) continue;
+    if (isUsers && !leftOver) applications.push_back(record);
+  }
   std::ranges::sort(applications, {}, &AppRecord::applicationIdentifier);
   return applications;
 }
@@ -104,20 +139,31 @@ std::vector<AppRecord> applicationsToSave(AppRegistry& registry) {
 std::optional<PropertyList::Dictionary> restoreEntry(const BackupPhone& phone,
                                                      const AppRecord& record,
                                                      std::string& problem) {
-  auto metadata = metadataOf(phone.services.files, record, problem);
-  if (!metadata) return std::nullopt;
+  std::optional<Error> error;
+  const auto refuse = [&](std::string_view what) {
+    problem = fmt::format("its {} cannot be read: {}", what,
+                          error ? error->localizedDescription() : "unknown reason");
+    return std::nullopt;
+  };
+  auto metadata = metadataOf(phone.services.files, record, &error);
+  if (!metadata) return refuse("metadata");
   PropertyList::Dictionary entry{{"HalvoMetadata", std::move(*metadata)}};
-  if (auto blob = phone.opaqueBlob(record.applicationIdentifier)) {
-    entry.emplace("ApplicationSINF", std::move(*blob));
-  }
-  if (auto icon = iconOf(phone.services, record)) {
-    entry.emplace("PlaceholderIcon", std::move(*icon));
-  }
+  auto blob = phone.opaqueBlob(record.applicationIdentifier, &error);
+  if (error) return refuse("opaque blob");
+  if (blob) entry.emplace("ApplicationSINF", std::move(*blob));
+  std::optional<Bytes> icon;
+  if (!takeIcon(phone.services, record, icon, &error)) return refuse("icon");
+  if (icon) entry.emplace("PlaceholderIcon", std::move(*icon));
   return entry;
 }
 
-PropertyList::Dictionary demotionsAmong(FileManager& files,
-                                        const std::vector<AppRecord>& applications) {
+std::optional<PropertyList::Dictionary> demotionsAmong(FileManager& files,
+                                                       const std::vector<AppRecord>& applications,
+                                                       std::optional<Error>* error) {
+  std::optional<Bytes> bytes;
+  if (!readIfThere(files, std::string(exchange::DemotedApplications), bytes, error)) {
+    return std::nullopt;
+  }
   std::map<std::string, std::set<std::string>> demoted{{AutomaticKey, {}}, {IntentionalKey, {}}};
   std::set<std::string, std::less<>> candidates;
   for (const AppRecord& record : applications) {
@@ -128,17 +174,17 @@ PropertyList::Dictionary demotionsAmong(FileManager& files,
     demoted[automatic ? AutomaticKey : IntentionalKey].insert(record.applicationIdentifier);
   }
   // Without coordination, a placeholder does not show that it is demoted.
-  const auto stored = loadDictionary(files, exchange::DemotedApplications);
+  const auto stored = bytes ? parsePropertyList(*bytes) : std::nullopt;
   for (auto& [key, identifiers] : demoted) {
-    const PropertyList* list = stored ? find(*stored, key) : nullptr;
+    const PropertyList* list = stored ? stored->find(key) : nullptr;
     if (!list || !list->asArray()) continue;
     for (const PropertyList& item : *list->asArray()) {
       const std::string* identifier = item.asString();
       if (identifier && candidates.contains(*identifier)) identifiers.insert(*identifier);
     }
   }
-  return {{AutomaticKey, arrayOf(demoted[AutomaticKey])},
-          {IntentionalKey, arrayOf(demoted[IntentionalKey])}};
+  return PropertyList::Dictionary{{AutomaticKey, arrayOf(demoted[AutomaticKey])},
+                                  {IntentionalKey, arrayOf(demoted[IntentionalKey])}};
 }
 
 }  // namespace appsync::host

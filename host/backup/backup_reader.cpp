@@ -40,8 +40,12 @@ std::optional<Bytes> wholeList(const BackupFile& file, std::string& problem) {
 }
 
 bool readContents(const fs::path& folder, Backup& backup, std::string& problem) {
-  const auto manifest = readBackupManifest(folder, problem);
-  if (!manifest) return false;
+  BackupProblem unusable;
+  const auto manifest = readBackupManifest(folder, unusable);
+  if (!manifest) {
+    problem = unusable.text;
+    return false;
+  }
   for (const auto& [name, entry] : manifest->files) {
     auto bytes = wholeList({folder / name, entry.size, entry.digest}, problem);
     if (!bytes) return false;
@@ -70,7 +74,9 @@ std::optional<Backup> readBackup(const fs::path& folder, std::string& problem) {
   const fs::path real = fs::canonical(folder, failure);
   if (failure == std::errc::no_such_file_or_directory) return refuse("there is no such folder");
   if (failure) return refuse(failure.message());
-  if (!fs::is_directory(real, failure)) return refuse("it is no folder");
+  const bool isFolder = fs::is_directory(real, failure);
+  if (failure) return refuse(failure.message());
+  if (!isFolder) return refuse("it is no folder");
   Backup backup;
   std::string reason;
   if (!readContents(real, backup, reason)) return refuse(reason);
@@ -80,7 +86,9 @@ std::optional<Backup> readBackup(const fs::path& folder, std::string& problem) {
 struct BackupFileReader::State {
   explicit State(const BackupFile& described) : file(described) {
     std::uint64_t size = 0;
-    descriptor = openBackupFile(file.path, size, problem);
+    BackupProblem unusable;
+    descriptor = openBackupFile(file.path, size, unusable);
+    problem = unusable.text;
     if (descriptor && size != file.size) fail("is shorter or longer than the manifest tells");
   }
 

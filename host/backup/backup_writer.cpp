@@ -20,6 +20,7 @@
 #include "host/backup/backup_manifest.h"
 #include "host/base/digest.h"
 #include "host/base/text.h"
+#include "platform/property_list_codec.h"
 
 namespace appsync::host {
 namespace {
@@ -54,45 +55,56 @@ fs::path resolve(const fs::path& folder) {
   return path.has_filename() ? path : path.parent_path();
 }
 
-/// The first thing in an older backup that no backup holds; it would be lost with it.
-std::string foreignItem(const fs::path& folder) {
-  std::error_code failure;
-  for (fs::directory_iterator item(folder, failure), end; !failure && item != end;
-       item.increment(failure)) {
-    std::string name = item->path().filename().string();
-    if (name != BackupManifestFile && name != BackupApplicationsFile &&
-        name != BackupDemotionsFile && name != BackupIconLayoutFile && name != BackupDataFolder) {
-      return name;
-    }
-  }
-  return {};
+BackupProblem wrongFolder(std::string text) { return {std::move(text), true}; }
+
+BackupProblem refusedBySystem(int errnoValue) { return {systemText(errnoValue), false}; }
+
+/// It would be lost with an older backup.
+bool isForeign(const std::string& name) {
+  return name != BackupManifestFile && name != BackupApplicationsFile &&
+         name != BackupDemotionsFile && name != BackupIconLayoutFile && name != BackupDataFolder;
 }
 
-/// Empty, or why the folder cannot become a backup.
-std::string objectionTo(Target& target) {
-  struct stat status {};
-  struct stat around {};
-  if (target.path == target.path.root_path()) return "it is no folder for a backup";
-  if (!target.parent) {
-    return fmt::format("{}: {}", printable(target.path.parent_path().string()), systemText(errno));
+/// Why the folder that stands there cannot give way to a backup.
+std::optional<BackupProblem> objectionToContents(Target& target) {
+  std::vector<std::string> names;
+  const FileDescriptor folder = openFolder(target.parent.get(), target.name());
+  if (!folder || !device::listNames(folder.get(), names)) return refusedBySystem(errno);
+  if (names.empty()) return std::nullopt;
+  BackupProblem problem;
+  if (!readBackupManifest(target.path, problem)) {
+    problem.text.insert(0, "it is not empty, and ");
+    return problem;
   }
-  if (::fstatat(target.parent.get(), target.name().c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
-    return errno == ENOENT ? "" : systemText(errno);
-  }
-  if (!S_ISDIR(status.st_mode)) return "it is no folder";
-  if (::fstat(target.parent.get(), &around) == 0 && around.st_dev != status.st_dev) {
-    return "it is a mount point; name a folder in it";
-  }
-  std::error_code failure;
-  if (fs::is_empty(target.path, failure)) return "";
-  if (failure) return failure.message();
-  std::string problem;
-  if (!readBackupManifest(target.path, problem)) return "it is not empty, and " + problem;
-  if (const std::string name = foreignItem(target.path); !name.empty()) {
-    return fmt::format("it holds \"{}\", which is no part of a backup", printable(name));
+  const auto foreign = std::ranges::find_if(names, isForeign);
+  if (foreign != names.end()) {
+    return wrongFolder(
+        fmt::format("it holds \"{}\", which is no part of a backup", printable(*foreign)));
   }
   target.replaces = true;
-  return "";
+  return std::nullopt;
+}
+
+/// Opens the folder around. Why the target cannot become a backup, if so.
+std::optional<BackupProblem> objectionTo(Target& target) {
+  if (target.path == target.path.root_path()) return wrongFolder("it is no folder for a backup");
+  const fs::path around = target.path.parent_path();
+  target.parent = FileDescriptor(::open(around.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  struct stat parent {};
+  struct stat status {};
+  if (!target.parent || ::fstat(target.parent.get(), &parent) != 0) {
+    const int reason = errno;
+    return BackupProblem{fmt::format("{}: {}", printable(around.string()), systemText(reason)),
+                         reason == ENOENT || reason == ENOTDIR};
+  }
+  if (::fstatat(target.parent.get(), target.name().c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
+    return errno == ENOENT ? std::nullopt : std::optional(refusedBySystem(errno));
+  }
+  if (!S_ISDIR(status.st_mode)) return wrongFolder("it is no folder");
+  if (parent.st_dev != status.st_dev) {
+    return wrongFolder("it is a mount point; name a folder in it");
+  }
+  return objectionToContents(target);
 }
 
 bool isUnfinished(const std::string& name, const std::string& backupName) {
@@ -139,6 +151,18 @@ class FolderWriter final : public BackupWriter {
     }
     data_ = openFolder(folder_.get(), data);
     return data_ || fail(data, errno);
+  }
+
+  bool olderHolds(std::string_view identifier) override {
+    if (!target_.replaces) return false;
+    if (!older_) {
+      std::string ignored;
+      const auto backup = readBackup(target_.path, ignored);
+      older_ = PropertyList();
+      if (backup) older_ = parsePropertyList(backup->applications).value_or(PropertyList());
+    }
+    const PropertyList::Dictionary* applications = older_->asDictionary();
+    return !applications || find(*applications, identifier);
   }
 
   bool addFile(std::string_view name, ByteView contents) override {
@@ -246,6 +270,7 @@ class FolderWriter final : public BackupWriter {
   }
 
   const Target target_;
+  std::optional<PropertyList> older_;  ///< the applications of the older backup, once asked for
   std::string unfinished_;  ///< name beside the target; empty when there is none any more
   FileDescriptor folder_;
   FileDescriptor data_;
@@ -262,19 +287,18 @@ class FolderWriter final : public BackupWriter {
 
 }  // namespace
 
-std::unique_ptr<BackupWriter> BackupWriter::open(const fs::path& folder, std::string& problem) {
+std::unique_ptr<BackupWriter> BackupWriter::open(const fs::path& folder, BackupProblem& problem) {
   Target target;
   target.path = resolve(folder);
-  target.parent =
-      FileDescriptor(::open(target.path.parent_path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (const std::string objection = objectionTo(target); !objection.empty()) {
-    problem = fmt::format("cannot make a backup in {}: {}", printable(folder.string()), objection);
+  if (auto objection = objectionTo(target)) {
+    problem = *std::move(objection);
+    problem.text.insert(0, fmt::format("cannot make a backup in {}: ", printable(folder.string())));
     return nullptr;
   }
   sweep(target);
   auto writer = std::make_unique<FolderWriter>(std::move(target));
   if (writer->begin()) return writer;
-  problem = writer->problem();
+  problem = {writer->problem(), false};
   return nullptr;
 }
 

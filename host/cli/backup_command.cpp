@@ -14,7 +14,12 @@ ExitCode exitCode(const BackupSummary& summary, const Interruption& interruption
   return interruption.requested() ? ExitCode::Interrupted : ExitCode::SomeFailed;
 }
 
-ExitCode runBackup(const std::string& folder, CommandContext& context) {
+struct BackupArguments {
+  std::string folder;
+  BackupOptions options;
+};
+
+ExitCode runBackup(const BackupArguments& arguments, CommandContext& context) {
   const auto device = context.openDevice(device::Access::Write);
   const auto reporter = context.makeReporter();
   Interruption interruption;
@@ -22,12 +27,15 @@ ExitCode runBackup(const std::string& folder, CommandContext& context) {
   PluginSession loaded(*plugin, SyncHostBundleIdentifier, *device, interruption,
                        context.verbose ? reporter.get() : nullptr);
   const SignalWatcher signals(interruption);
-  std::string problem;
-  auto writer = BackupWriter::open(folder, problem);
-  if (!writer) throw CommandError(ExitCode::WrongUsage, problem);
+  BackupProblem problem;
+  auto writer = BackupWriter::open(arguments.folder, problem);
+  if (!writer) {
+    throw CommandError(problem.isWrongFolder ? ExitCode::WrongUsage : ExitCode::DeviceUnusable,
+                       problem.text);
+  }
   const BackupPhone phone = backupPhoneOf(*device, loaded.host());
   const BackupSummary summary =
-      BackupRun(loaded.client(), phone, *writer, *reporter, interruption).run();
+      BackupRun(loaded.client(), phone, *writer, *reporter, interruption).run(arguments.options);
   writer.reset();  // takes away what is not whole
   reporter->report(summary);
   context.tellIfUnseen("backup");
@@ -37,18 +45,22 @@ ExitCode runBackup(const std::string& folder, CommandContext& context) {
 }  // namespace
 
 void addBackupCommand(CLI::App& app, Command& chosen) {
-  auto folder = std::make_shared<std::string>();
+  auto arguments = std::make_shared<BackupArguments>();
   CLI::App* backup = app.add_subcommand("backup", "Save the phone's applications and their data");
-  backup->add_option("folder", *folder, "Folder for the backup, or of an older one to replace")
+  backup
+      ->add_option("folder", arguments->folder,
+                   "Folder for the backup, or of an older one to replace")
       ->required()
       ->type_name("FOLDER");
+  backup->add_flag("--allow-missing", arguments->options.allowMissing,
+                   "Replace an older backup also when an application of it cannot be saved now");
   backup->footer(
-      "Packages are not saved: \"restore\" gets them from a store or a library. An older backup "
-      "is\n"
-      "replaced when the new one is whole.\n"
+      "Packages are not saved: \"restore\" gets them from a store or a library. An older backup\n"
+      "is replaced when the new one is whole; it stays when the new one would lack an application\n"
+      "that it holds.\n"
       "Example: appsync --device phone backup backup-of-phone");
-  backup->callback([folder, &chosen] {
-    chosen = [folder](CommandContext& context) { return runBackup(*folder, context); };
+  backup->callback([arguments, &chosen] {
+    chosen = [arguments](CommandContext& context) { return runBackup(*arguments, context); };
   });
 }
 

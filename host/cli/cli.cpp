@@ -23,8 +23,8 @@ constexpr const char* Examples = R"(Examples:
   appsync --device phone sync library --install org.example.tally --remove org.example.lantern
   appsync --device phone --json apps
 
-Exit codes: 0 all done, 1 some application failed, 2 wrong usage, 3 device missing, busy or damaged,
-130 interrupted. APPSYNC_DEVICE and APPSYNC_PLUGIN stand for --device and --plugin.
+Exit codes: 0 all done, 1 some application failed, 2 wrong usage, 3 phone missing, busy or damaged,
+or no backup can be written there, 130 interrupted. APPSYNC_DEVICE and APPSYNC_PLUGIN stand for --device and --plugin.
 )";
 
 void addGlobalOptions(CLI::App& app, CommandContext& context) {

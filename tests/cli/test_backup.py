@@ -142,6 +142,23 @@ class Backups(BackupCase):
         self.assertEqual(sorted(self.list()), ["com.b", "com.c"])
         self.check_digests()
 
+    def test_an_older_backup_that_holds_what_cannot_be_saved_stays(self):
+        self.fill()
+        self.backup()
+        older = self.tree(self.target)
+        (self.phone / DATA / "com.a" / "/".join("d" * 201)).mkdir(parents=True)
+        summary = self.backup(code=1)
+        self.assertEqual((summary["saved"], [entry["identifier"] for entry in summary["failed"]]),
+                         ([], ["com.a"]))
+        self.assertEqual(self.events[-2], {
+            "event": "error", "message": "the older backup stays, since com.a cannot be saved now; "
+                                         "--allow-missing replaces it all the same"})
+        self.assertEqual(self.tree(self.target), older)
+        self.assertEqual(self.beside(), ["phone"])
+        summary = self.backup("--allow-missing", self.target, code=1)
+        self.assertEqual(summary["saved"], ["com.b", "com.c"])
+        self.assertEqual(sorted(self.list()), ["com.b", "com.c"])
+
     def test_plain_lines(self):
         self.fill()
         self.assertEqual(self.run_appsync("backup", self.target), ("done       3 saved\n", ""))
@@ -189,6 +206,9 @@ class Refusals(BackupCase):
     def test_the_folder_around_must_exist(self):
         self.assertIn("No such file or directory",
                       self.refusal(self.folder / "missing" / "phone", code=2))
+
+    def test_a_place_that_takes_no_files(self):
+        self.assertIn("cannot write the backup /proc/phone", self.refusal("/proc/phone", code=3))
 
     def test_wrong_usage_and_a_missing_phone(self):
         self.refusal(code=2)

@@ -24,9 +24,9 @@ const std::string Applications = "what to restore";
 const std::string Archive(300'000, 'x');
 
 std::unique_ptr<BackupWriter> openWriter(const fs::path& folder) {
-  std::string problem;
+  BackupProblem problem;
   auto writer = BackupWriter::open(folder, problem);
-  EXPECT_TRUE(writer) << problem;
+  EXPECT_TRUE(writer) << problem.text;
   return writer;
 }
 
@@ -62,10 +62,12 @@ std::string objection(const fs::path& folder) {
   return problem;
 }
 
+/// Why a folder is none for a backup.
 std::string objectionToWriting(const fs::path& folder) {
-  std::string problem;
+  BackupProblem problem;
   EXPECT_FALSE(BackupWriter::open(folder, problem));
-  return problem;
+  EXPECT_TRUE(problem.isWrongFolder) << problem.text;
+  return problem.text;
 }
 
 /// The bytes, and at the end the reader's problem.
@@ -102,6 +104,24 @@ void flipByte(const fs::path& file, std::size_t offset) {
   contents.at(offset) = static_cast<char>(contents.at(offset) ^ 1);
   testing::putFile(file, contents);
 }
+
+/// Leaves this process so many descriptors to open.
+class DescriptorLimit {
+ public:
+  explicit DescriptorLimit(rlim_t spare) {
+    const int lowestFree = ::dup(0);
+    ::close(lowestFree);
+    ::getrlimit(RLIMIT_NOFILE, &before_);
+    const rlimit tight{static_cast<rlim_t>(lowestFree) + spare, before_.rlim_max};
+    ::setrlimit(RLIMIT_NOFILE, &tight);
+  }
+  ~DescriptorLimit() { ::setrlimit(RLIMIT_NOFILE, &before_); }
+  DescriptorLimit(const DescriptorLimit&) = delete;
+  DescriptorLimit& operator=(const DescriptorLimit&) = delete;
+
+ private:
+  rlimit before_{};
+};
 
 /// Lets the change work on the dictionary of a backup's manifest.
 void editManifest(const fs::path& folder,
@@ -156,8 +176,19 @@ TEST_F(BackupFolderTest, TheSameContentsGiveTheSameBytes) {
 }
 
 TEST_F(BackupFolderTest, OnlyItsOwnerMayLookIntoIt) {
+  const mode_t mask = ::umask(0);
   makeBackup(folder_);
-  EXPECT_EQ(fs::status(folder_).permissions(), fs::perms::owner_all);
+  ::umask(mask);
+  const auto permissionsOf = [&](const char* name) {
+    return fs::symlink_status(folder_ / name).permissions();
+  };
+  for (const char* name : {"", "Data"}) {
+    EXPECT_EQ(permissionsOf(name), fs::perms::owner_all) << name;
+  }
+  for (const char* name : {"Manifest.plist", "RestoreApplications.plist", "DemotedApps.plist",
+                           "IconState.plist", "Data/com.a.tar"}) {
+    EXPECT_EQ(permissionsOf(name), fs::perms::owner_read | fs::perms::owner_write) << name;
+  }
 }
 
 TEST_F(BackupFolderTest, AnOlderBackupIsReplacedWhenTheNewOneIsWhole) {
@@ -236,6 +267,59 @@ TEST_F(BackupFolderTest, ABackupOfANewerProgramIsNeitherReadNorReplaced) {
   const std::string reason = "it was made by a newer appsync; use that one";
   EXPECT_THAT(objection(folder_), EndsWith(reason));
   EXPECT_THAT(objectionToWriting(folder_), EndsWith(reason));
+}
+
+TEST_F(BackupFolderTest, TellsWhatTheOlderBackupHolds) {
+  const auto first = openWriter(folder_);
+  EXPECT_FALSE(first->olderHolds("com.a"));
+  const auto list =
+      serializePropertyList(PropertyList::Dictionary{{"com.a", 1}}, PropertyListFormat::Xml);
+  makeBackup(folder_, asText(*list));
+  const auto second = openWriter(folder_);
+  EXPECT_TRUE(second->olderHolds("com.a"));
+  EXPECT_FALSE(second->olderHolds("com.b"));
+  flipByte(folder_ / "RestoreApplications.plist", 3);
+  EXPECT_FALSE(second->olderHolds("com.b")) << "it has been read";
+  EXPECT_TRUE(openWriter(folder_)->olderHolds("com.b")) << "a damaged one may hold anything";
+}
+
+TEST_F(BackupFolderTest, AFolderThatCannotBeLookedAtIsNeitherReplacedNorWrong) {
+  makeBackup(folder_, "old");
+  testing::putFile(folder_ / "notes.txt", "mine");
+  for (rlim_t spare = 0; spare < 20; ++spare) {
+    BackupProblem problem;
+    const DescriptorLimit limit(spare);
+    EXPECT_FALSE(BackupWriter::open(folder_, problem)) << spare;
+    if (problem.isWrongFolder) {
+      EXPECT_THAT(problem.text, HasSubstr("\"notes.txt\""));
+      EXPECT_GT(spare, 2U);
+      return;
+    }
+    EXPECT_THAT(problem.text, EndsWith("Too many open files"));
+  }
+  FAIL() << "it never had enough";
+}
+
+TEST_F(BackupFolderTest, ABackupThatCannotBeLookedAtIsNotTakenForNone) {
+  makeBackup(folder_);
+  for (rlim_t spare = 0; spare < 20; ++spare) {
+    std::string problem;
+    const DescriptorLimit limit(spare);
+    if (readBackup(folder_, problem)) {
+      EXPECT_GT(spare, 0U);
+      return;
+    }
+    EXPECT_THAT(problem, EndsWith("cannot be read: Too many open files"));
+  }
+  FAIL() << "it never had enough";
+}
+
+TEST_F(BackupFolderTest, AFileSystemThatTakesNoBackupIsNotAWrongFolder) {
+  BackupProblem problem;
+  EXPECT_FALSE(BackupWriter::open("/proc/phone", problem));
+  EXPECT_FALSE(problem.isWrongFolder);
+  EXPECT_THAT(problem.text, EndsWith("cannot write the backup /proc/phone: "
+                                     "No such file or directory"));
 }
 
 TEST_F(BackupFolderTest, AFullDiskEndsTheBackupAndLeavesTheOlderOne) {

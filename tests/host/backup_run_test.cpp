@@ -38,13 +38,27 @@ class BackupRunTest : public ::testing::Test {
 
   BackupPhone backupPhone() {
     return {phone_.platform(),
+            [this](std::optional<Error>* error) { return giveApplications(error); },
             [this](std::string_view identifier, const device::DataSink& sink,
                    std::optional<Error>* error) { return giveData(identifier, sink, error); },
-            [this](std::string_view identifier) {
+            [this](std::string_view identifier, std::optional<Error>* error) {
               const auto blob = blobs_.find(identifier);
+              if (identifier == unreadableBlob_) setError(error, Error::posix(EIO));
               return blob == blobs_.end() ? std::nullopt : std::optional(toBytes(blob->second));
             },
             [this](std::string_view identifier) { return isBusyWith_ && isBusyWith_(identifier); }};
+  }
+
+  /// As a device gives them: sorted, placeholders last.
+  std::vector<AppRecord> giveApplications(std::optional<Error>* error) {
+    std::vector<AppRecord> all;
+    if (registryFailure_) return setError(error, *registryFailure_), all;
+    phone_.appRegistry.enumerateBundles(
+        BundleKind::All, [&](const AppRecord& record, bool&) { all.push_back(record); });
+    std::ranges::sort(all, {}, [](const AppRecord& record) {
+      return std::pair(record.applicationIdentifier, record.isPlaceholder);
+    });
+    return all;
   }
 
   bool giveData(std::string_view identifier, const device::DataSink& sink,
@@ -63,12 +77,12 @@ class BackupRunTest : public ::testing::Test {
     return false;
   }
 
-  BackupSummary backUp() {
-    std::string problem;
+  BackupSummary backUp(const BackupOptions& options = {}) {
+    BackupProblem problem;
     const auto writer = BackupWriter::open(target_, problem);
-    EXPECT_TRUE(writer) << problem;
+    EXPECT_TRUE(writer) << problem.text;
     const BackupPhone phone = backupPhone();
-    return BackupRun(client_, phone, *writer, reporter_, interruption_).run();
+    return BackupRun(client_, phone, *writer, reporter_, interruption_).run(options);
   }
 
   void expectMade(const BackupSummary& summary) {
@@ -126,6 +140,8 @@ class BackupRunTest : public ::testing::Test {
   std::map<std::string, std::string, std::less<>> data_;
   std::map<std::string, std::string, std::less<>> blobs_;
   std::map<std::string, Error, std::less<>> dataFailures_;
+  std::string unreadableBlob_;
+  std::optional<Error> registryFailure_;
   std::function<bool(std::string_view)> isBusyWith_;
   std::function<void(std::size_t)> onPiece_;
 };
@@ -265,17 +281,26 @@ TEST_F(BackupRunTest, SavesThePlaceholdersIconAsItIsAndDrawsThatOfAnInstalledApp
 }
 
 TEST_F(BackupRunTest, AnUpdateUnderWaySavesTheInstalledVersion) {
-  phone_.appRegistry.seedInstalled("com.a", "1.0");
-  phone_.appRegistry.seedPlaceholder("com.a", InstallType::Sync, "2.0");
-  expectMade(backUp());
-  EXPECT_EQ(metadataOf("com.a").at("bundleVersion"), PropertyList("1.0"));
+  for (const auto type : {InstallType::Sync, InstallType::AutomaticUpdate}) {
+    phone_.appRegistry.seedInstalled("com.a", "1.0");
+    phone_.appRegistry.seedPlaceholder("com.a", type, "2.0");
+    const BackupSummary summary = backUp();
+    expectMade(summary);
+    EXPECT_EQ(summary.saved, Lines{"com.a"});
+    EXPECT_EQ(metadataOf("com.a").at("bundleVersion"), PropertyList("1.0"));
+  }
 }
 
-TEST_F(BackupRunTest, WhatABrokenOffSyncLeftIsNotSaved) {
-  phone_.appRegistry.seedPlaceholder("com.a", InstallType::Sync);
+TEST_F(BackupRunTest, NeitherWhatABrokenOffSyncLeftNorAnExtensionIsSaved) {
+  AppRecord extension;
+  extension.applicationIdentifier = "com.extension";
+  extension.isApplication = false;
+  phone_.appRegistry.seedOther(extension);
+  phone_.appRegistry.seedPlaceholder("com.left-over", InstallType::Sync);
+  phone_.appRegistry.seedPlaceholder("com.store", InstallType::StoreDownload);
   const BackupSummary summary = backUp();
   expectMade(summary);
-  EXPECT_EQ(summary.saved, Lines());
+  EXPECT_EQ(summary.saved, Lines{"com.store"});
 }
 
 TEST_F(BackupRunTest, SavesWhichApplicationsAreDemotedAndByWhat) {
@@ -339,6 +364,70 @@ TEST_F(BackupRunTest, AnApplicationWhoseMetadataCannotBeReadFailsAlone) {
   ASSERT_EQ(summary.failed.size(), 1u);
   EXPECT_EQ(summary.failed[0].reason, "its metadata cannot be read: Input/output error");
   EXPECT_EQ(demotions().at("AutomaticDowngrades"), PropertyList(PropertyList::Array{}));
+}
+
+TEST_F(BackupRunTest, NothingThatCannotBeReadIsTakenForMissing) {
+  phone_.appRegistry.seedInstalled("com.installed");
+  phone_.appRegistry.seedPlaceholder("com.placeholder", InstallType::Restore);
+  const auto bundle = *phone_.appRegistry.recordForIdentifier("com.installed", false)->bundlePath;
+  Dictionary info = appInfo("com.installed", "1.0", "Installed");
+  info["KBBundleIconFile"] = "drawn.png";
+  phone_.files.putPlist(bundle + "/Info.plist", info);
+
+  const auto reasonFor = [&](const char* operation, const char* path) {
+    if (operation) phone_.faults.failWhere(operation, path, Error::posix(EIO));
+    const BackupSummary summary = backUp({.allowMissing = true});
+    phone_.faults.clear();
+    EXPECT_EQ(summary.failed.size(), 1U) << path;
+    return summary.failed.empty() ? ""
+                                  : summary.failed[0].identifier + ": " + summary.failed[0].reason;
+  };
+  const std::string icon = ": its icon cannot be read: Input/output error";
+  EXPECT_EQ(reasonFor("FileManager.contentsAtPath", "Icon.png"), "com.placeholder" + icon);
+  EXPECT_EQ(reasonFor("FileManager.contentsAtPath", "Info.plist"), "com.installed" + icon);
+  EXPECT_EQ(reasonFor("FileManager.attributesOfItem", "drawn.png"), "com.installed" + icon);
+  unreadableBlob_ = "com.installed";
+  EXPECT_EQ(reasonFor(nullptr, "blob"),
+            "com.installed: its opaque blob cannot be read: Input/output error");
+  unreadableBlob_.clear();
+  expectMade(backUp());
+}
+
+TEST_F(BackupRunTest, AListThatCannotBeReadEndsTheBackup) {
+  phone_.appRegistry.seedInstalled("com.a");
+  expectMade(backUp());
+  phone_.faults.failWhere("FileManager.contentsAtPath", "DemotedApps.plist", Error::posix(EIO));
+  EXPECT_FALSE(backUp().made);
+  phone_.faults.clear();
+  registryFailure_ = Error::posix(EMFILE);
+  EXPECT_FALSE(backUp({.allowMissing = true}).made);
+  EXPECT_EQ(reporter_.lines("broken"),
+            (Lines{"broken the list of demoted applications cannot be read: Input/output error",
+                   "broken the applications cannot be told: Too many open files"}));
+  EXPECT_EQ(entries().size(), 1U);
+}
+
+TEST_F(BackupRunTest, AnOlderBackupStaysWhenTheNewOneWouldLackAnApplicationOfIt) {
+  for (const char* identifier : {"com.a", "com.b", "com.c"}) {
+    phone_.appRegistry.seedInstalled(identifier);
+  }
+  expectMade(backUp());
+  phone_.appRegistry.seedInstalled("com.new");
+  for (const char* identifier : {"com.a", "com.c", "com.new"}) {
+    dataFailures_.emplace(identifier, Error::posix(EACCES));
+  }
+  const BackupSummary summary = backUp();
+  EXPECT_FALSE(summary.made);
+  EXPECT_EQ(summary.saved, Lines());
+  EXPECT_EQ(summary.failed.size(), 3U);
+  EXPECT_EQ(reporter_.lines("broken"),
+            Lines{"broken the older backup stays, since com.a, com.c cannot be saved now; "
+                  "--allow-missing replaces it all the same"});
+  EXPECT_EQ(entries().size(), 3U);
+
+  EXPECT_EQ(backUp({.allowMissing = true}).saved, Lines{"com.b"});
+  EXPECT_EQ(entries().size(), 1U);
+  EXPECT_EQ(backUp().saved, Lines{"com.b"}) << "nothing more is lost";
 }
 
 TEST_F(BackupRunTest, AHomeScreenThatDoesNotAnswerEndsTheBackup) {

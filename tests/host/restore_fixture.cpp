@@ -93,9 +93,9 @@ void RestoreTest::backUp(const std::string& identifier, const std::string& bytes
 }
 
 Backup RestoreTest::backup() {
-  std::string problem;
-  const auto writer = BackupWriter::open(backups / "backup", problem);
-  EXPECT_TRUE(writer) << problem;
+  BackupProblem unusable;
+  const auto writer = BackupWriter::open(backups / "backup", unusable);
+  EXPECT_TRUE(writer) << unusable.text;
   const PropertyList::Dictionary demotions{{"IntentionalDowngrades", intentional}};
   bool written = writer->addFile(BackupApplicationsFile, serialized(entries)) &&
                  writer->addFile(BackupDemotionsFile, serialized(demotions)) &&
@@ -105,6 +105,7 @@ Backup RestoreTest::backup() {
               writer->endData();
   }
   EXPECT_TRUE(written && writer->finish()) << writer->problem();
+  std::string problem;
   return readBackup(backups / "backup", problem).value();
 }
 

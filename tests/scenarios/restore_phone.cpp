@@ -139,9 +139,9 @@ void SampleBackup::write() {
   device::DeviceError error;
   EXPECT_TRUE(device::EmbeddedDevice::initialize(elsewhere / "phone", {}, error));
   const auto device = openDevice(elsewhere / "phone");
-  std::string problem;
+  BackupProblem problem;
   const auto writer = BackupWriter::open(folder(), problem);
-  ASSERT_TRUE(writer) << problem;
+  ASSERT_TRUE(writer) << problem.text;
   PropertyList::Array layout;
   for (auto entry = entries_.rbegin(); entry != entries_.rend(); ++entry) {
     layout.emplace_back(entry->first);
