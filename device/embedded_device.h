@@ -68,6 +68,8 @@ class EmbeddedDevice {
 
   // What a person does on the phone.
 
+  // Neither is done, with a reason, while the policy forbids to remove applications.
+
   /// Removes an application with its placeholder and data. False (with a reason) when there is
   /// none.
   virtual bool uninstall(std::string_view bundleId, std::optional<Error>* error) noexcept = 0;

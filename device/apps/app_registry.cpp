@@ -9,6 +9,7 @@
 #include "device/apps/removal.h"
 #include "device/base/identifiers.h"
 #include "device/state/application_rows.h"
+#include "device/state/device_policy.h"
 #include "platform/bundle.h"
 
 namespace appsync::device {
@@ -51,6 +52,15 @@ bool isDemotion(InstallType placeholder) {
 bool canBeAskedFor(InstallType placeholder) {
   return isDemotion(placeholder) || placeholder == InstallType::Restore ||
          placeholder == InstallType::StoreDownload;
+}
+
+bool mayRemove(DeviceCore& core, std::optional<Error>* error) {
+  const PolicyValue wish =
+      StoredDevicePolicy(core.database).effectiveBoolValue(PolicySetting::AppRemovalAllowed);
+  if (wish != PolicyValue::ExplicitlyNo) return true;
+  setError(error, Error::withDescription(POSIXErrorDomain, EPERM,
+                                         "removing applications is forbidden on this phone"));
+  return false;
 }
 
 InstallDetails placeholderDetails(const PropertyList::Dictionary& options) {
@@ -193,14 +203,14 @@ bool DeviceAppRegistry::uninstallApplication(std::string_view bundleId,
 bool DeviceAppRegistry::removeApplication(std::string_view bundleId,
                                           std::optional<Error>* error) noexcept {
   const auto remove = [&](const std::string& identifier, std::optional<Error>* reason) {
-    return removeForPerson(core_, identifier, reason);
+    return mayRemove(core_, reason) && removeForPerson(core_, identifier, reason);
   };
   return changeApplication(bundleId, remove, error);
 }
 
 bool DeviceAppRegistry::demote(std::string_view bundleId, std::optional<Error>* error) noexcept {
   const auto demote = [&](const std::string& identifier, std::optional<Error>* reason) {
-    return demoteForPerson(core_, identifier, reason);
+    return mayRemove(core_, reason) && demoteForPerson(core_, identifier, reason);
   };
   return changeApplication(bundleId, demote, error);
 }

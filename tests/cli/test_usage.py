@@ -107,6 +107,19 @@ class Usage(support.Case):
             self.assertIn("com.absent", self.one_line(command, "com.absent", code=1))
         self.run_appsync("quit", "com.absent")
 
+    def test_what_the_policy_forbids_to_remove_stays(self):
+        self.init()
+        self.offer("com.a")
+        self.sync()
+        self.run_appsync("policy", "--removing", "forbid")
+        for command in ("uninstall", "demote"):
+            self.assertEqual(self.one_line(command, "com.a", code=1), f"cannot {command} com.a: "
+                             "removing applications is forbidden on this phone")
+        self.assertEqual(self.apps(), {"com.a": "1.0"})
+        self.run_appsync("policy", "--removing", "allow")
+        self.run_appsync("uninstall", "com.a")
+        self.assertEqual(self.apps(), {})
+
     def test_output_that_cannot_be_written(self):
         self.init()
         with open("/dev/full", "w") as full:

@@ -54,6 +54,25 @@ TEST_F(RemovalTest, APlaceholderThatAClientRemovesIsNotReportedAsUninstalled) {
   EXPECT_TRUE(device->uninstalledApplications().empty());
 }
 
+TEST_F(RemovalTest, APersonRemovesAndDemotesNothingThatThePolicyForbidsToRemove) {
+  ASSERT_TRUE(installPackage(Id));
+  putFile(Notes, "mine");
+  for (const auto removal : {&EmbeddedDevice::uninstall, &EmbeddedDevice::demote}) {
+    ASSERT_TRUE(
+        device->setPolicy(PolicySetting::AppRemovalAllowed, PolicyValue::ExplicitlyNo, nullptr));
+    error.reset();
+    EXPECT_FALSE((*device.*removal)(Id, &error));
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->localizedDescription(), "removing applications is forbidden on this phone");
+    EXPECT_EQ(registry(), Lines{"com.example.a 1.0"});
+    EXPECT_EQ(textAt(Notes), "mine");
+    ASSERT_TRUE(device->setPolicy(PolicySetting::AppRemovalAllowed, PolicyValue::Yes, nullptr));
+    EXPECT_TRUE((*device.*removal)(Id, &error));
+    ASSERT_TRUE(installPackage(Id));
+    putFile(Notes, "mine");
+  }
+}
+
 TEST_F(RemovalTest, APersonRemovesApplicationPlaceholderAndAllData) {
   const std::string waiting = "/var/mobile/Media/HalvoRestore/Data/com.example.a";
   ASSERT_TRUE(installPackage(Id, "1.0"));
