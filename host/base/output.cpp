@@ -1,5 +1,6 @@
 #include "host/base/output.h"
 
+#include <fcntl.h>
 #include <poll.h>
 #include <sys/ioctl.h>
 #include <unistd.h>
@@ -41,6 +42,15 @@ std::size_t Output::width() const {
   winsize size{};
   if (::ioctl(fd_, TIOCGWINSZ, &size) != 0 || size.ws_col == 0) return 80;
   return size.ws_col;
+}
+
+bool openStandardDescriptors() {
+  for (const int fd : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
+    if (::fcntl(fd, F_GETFD) >= 0) continue;
+    // The lowest that is free is taken, which is this one.
+    if (::open("/dev/null", O_RDWR) != fd) return false;
+  }
+  return true;
 }
 
 }  // namespace appsync::host

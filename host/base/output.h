@@ -29,4 +29,9 @@ class Output {
   int error_ = 0;
 };
 
+/// Opens on /dev/null what this process was started without of standard input, output and error:
+/// else the first files opened would take their places, and be written into. Called before anything
+/// is opened. False when that cannot be done.
+bool openStandardDescriptors();
+
 }  // namespace appsync::host

@@ -118,6 +118,7 @@ void CommandContext::tellIfUnseen(std::string_view work) {
 }
 
 int runCommandLine(int argc, char** argv) {
+  if (!openStandardDescriptors()) return static_cast<int>(ExitCode::WrongUsage);
   // Character widths need a UTF-8 locale, whatever the person's is.
   if (!::setlocale(LC_CTYPE, "") || displayWidth("\u00e9") != 1) ::setlocale(LC_CTYPE, "C.UTF-8");
   ::signal(SIGPIPE, SIG_IGN);

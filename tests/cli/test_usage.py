@@ -5,6 +5,7 @@ import os
 import plistlib
 import shutil
 import sqlite3
+import subprocess
 
 import support
 
@@ -123,11 +124,49 @@ class Usage(support.Case):
     def test_output_that_cannot_be_written(self):
         self.init()
         with open("/dev/full", "w") as full:
-            process = support.subprocess.run([support.APPSYNC, "policy"], stdout=full,
-                                             stderr=support.subprocess.PIPE, text=True,
+            process = subprocess.run([support.APPSYNC, "policy"], stdout=full,
+                                             stderr=subprocess.PIPE, text=True,
                                              env=self.environment)
         self.assertEqual(process.returncode, 1)
         self.assertIn("cannot write to standard output", process.stderr)
+
+
+class ClosedDescriptors(support.Case):
+    """The command, started without some of the three descriptors that everybody has."""
+
+    def run_without(self, closed, *arguments):
+        def close():
+            for descriptor in closed:
+                os.close(descriptor)
+        done = subprocess.run([support.APPSYNC, *map(str, arguments)], stdin=subprocess.DEVNULL,
+                              capture_output=True, text=True, env=self.environment,
+                              preexec_fn=close, timeout=60)
+        return done.returncode, done.stdout, done.stderr
+
+    def test_no_line_is_written_into_the_phone(self):
+        self.init()
+        self.offer("com.a")
+        closed = [[0], [1], [2], [0, 1], [1, 2], [0, 1, 2]]
+        for number, descriptors in enumerate(closed):
+            version = f"{number + 1}.0"
+            self.offer("com.a", version)
+            (self.library / "broken.zip").write_bytes(b"garbage")
+            code, out, err = self.run_without(descriptors, "sync", self.library)
+            self.assertEqual((code, err), (1, ""), descriptors)
+            self.assertEqual("broken.zip" in out, 1 not in descriptors)
+            self.assertRegex((self.phone / "lock").read_text(), r"^\d+\n$", descriptors)
+            self.assertEqual(self.apps(), {"com.a": version})
+
+    def test_every_command_works_without_them(self):
+        self.assertEqual(self.run_without([0, 1, 2], "init"), (0, "", ""))
+        for command in (["apps"], ["status"], ["log"], ["policy", "--removing", "forbid"],
+                        ["policy", "--removing", "allow"], ["backup", self.folder / "backup"],
+                        ["clear"], ["home-screen", "-o", self.folder / "screen.png"]):
+            self.assertEqual(self.run_without([0, 1, 2], *command), (0, "", ""), command)
+        self.assertEqual(self.json_lines("policy")[0]["removing"], "allow")
+        self.assertEqual(sorted(path.name for path in (self.folder / "backup").iterdir()),
+                         ["Data", "DemotedApps.plist", "IconState.plist", "Manifest.plist",
+                          "RestoreApplications.plist"])
 
 
 class Plugins(support.Case):
