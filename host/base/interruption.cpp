@@ -4,6 +4,7 @@
 #include <signal.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
 #include <string_view>
 #include <utility>
@@ -25,9 +26,10 @@ void writeMark(int fd, char mark) {
   }
 }
 
-extern "C" void handleSignal(int) {
+extern "C" void handleSignal(int number) {
   const int savedErrno = errno;
   if (signalCount.fetch_add(1) > 0) {
+    if (number == SIGHUP) return;
     constexpr std::string_view ShowCursor = "\x1b[?25h\n";
     if (cursorHidden && ::write(STDOUT_FILENO, ShowCursor.data(), ShowCursor.size()) < 0) {
       // Nothing is left to be done about it.
@@ -38,8 +40,8 @@ extern "C" void handleSignal(int) {
   errno = savedErrno;
 }
 
-struct sigaction previousInterrupt;
-struct sigaction previousTerminate;
+constexpr std::array Signals = {SIGINT, SIGTERM, SIGHUP};
+std::array<struct sigaction, Signals.size()> previous;
 int readEnd = -1;
 
 }  // namespace
@@ -77,14 +79,16 @@ SignalWatcher::SignalWatcher(Interruption& interruption) {
   action.sa_handler = &handleSignal;
   action.sa_flags = SA_RESTART;
   ::sigemptyset(&action.sa_mask);
-  ::sigaction(SIGINT, &action, &previousInterrupt);
-  ::sigaction(SIGTERM, &action, &previousTerminate);
+  for (std::size_t i = 0; i < Signals.size(); ++i) {
+    ::sigaction(Signals[i], nullptr, &previous[i]);
+    const bool ignored = previous[i].sa_handler == SIG_IGN;
+    if (Signals[i] != SIGHUP || !ignored) ::sigaction(Signals[i], &action, nullptr);
+  }
 }
 
 SignalWatcher::~SignalWatcher() {
   if (!thread_.joinable()) return;
-  ::sigaction(SIGINT, &previousInterrupt, nullptr);
-  ::sigaction(SIGTERM, &previousTerminate, nullptr);
+  for (std::size_t i = 0; i < Signals.size(); ++i) ::sigaction(Signals[i], &previous[i], nullptr);
   writeMark(signalPipe, EndMark);
   thread_.join();
   ::close(signalPipe.exchange(-1));

@@ -24,8 +24,10 @@ class Interruption {
   std::function<void()> listener_;
 };
 
-/// Turns the first SIGINT or SIGTERM into a request; the second ends the process with code 130 at
-/// once. One at a time in a process. Outside its life the signals do what they did before.
+/// Turns the first SIGINT, SIGTERM or SIGHUP into a request; another SIGINT or SIGTERM ends the
+/// process with code 130 at once (a terminal that goes away may hang up more than once). A SIGHUP
+/// that the process was started to ignore stays ignored. One at a time in a process. Outside its
+/// life the signals do what they did before.
 class SignalWatcher {
  public:
   explicit SignalWatcher(Interruption& interruption);

@@ -74,6 +74,11 @@ class Interruption(support.Case):
     def test_terminate_while_an_install_waits(self):
         self.check_interrupted_while_waiting(self.waiting_sync(), signal.SIGTERM)
 
+    def test_a_terminal_that_goes_away_while_an_install_waits(self):
+        process = self.waiting_sync()
+        process.send_signal(signal.SIGHUP)
+        self.check_interrupted_while_waiting(process, signal.SIGHUP)
+
     def test_looking_is_possible_while_a_sync_runs(self):
         process = self.waiting_sync()
         self.assertEqual(self.apps(), {"com.open": "1.0", "com.open?": "2.0"})
