@@ -40,10 +40,14 @@ void addGlobalOptions(CLI::App& app, CommandContext& context) {
   app.set_version_flag("--version", "appsync " APPSYNC_VERSION);
 }
 
+std::string unknownCommand(std::string_view name) {
+  return fmt::format("unknown command \"{}\"; see appsync --help", printable(name));
+}
+
 std::string usageMessage(const CLI::App& app, const CLI::ParseError& error) {
   std::string command = "appsync";
   if (const auto unknown = app.remaining(); app.get_subcommands().empty() && !unknown.empty()) {
-    return fmt::format("unknown command \"{}\"; see appsync --help", printable(unknown.front()));
+    return unknownCommand(unknown.front());
   }
   for (const CLI::App* chosen : app.get_subcommands()) command += " " + chosen->get_name();
   return fmt::format("{}; see {} --help", printable(oneLine(error.what())), command);
@@ -117,6 +121,41 @@ void CommandContext::tellIfUnseen(std::string_view work) {
       fmt::format("appsync: nobody reads the output any more; the {} ran to its end unseen", work));
 }
 
+void insistOnRead(const std::optional<Error>& error) {
+  if (error) {
+    throw CommandError(ExitCode::DeviceUnusable, printable(oneLine(error->localizedDescription())));
+  }
+}
+
+std::string checkPositive(const std::string& text) {
+  const bool isNumber =
+      text.size() <= 9 && text.find_first_not_of("0123456789") == std::string::npos;
+  const bool isPositive = text.find_first_not_of('0') != std::string::npos;
+  return isNumber && isPositive ? "" : "must be a whole number from 1 to 999999999";
+}
+
+void addHelpCommand(CLI::App& app, Command& chosen) {
+  CLI::App* help = app.add_subcommand("help", "Tell how a command is used");
+  auto name = std::make_shared<std::string>();
+  help->add_option("command", *name, "The command; without it, all are listed")
+      ->type_name("COMMAND");
+  help->footer("Example: appsync help sync");
+  help->callback([name, &app, &chosen] {
+    chosen = [name, &app](CommandContext& context) {
+      const auto commands =
+          app.get_subcommands([&](const CLI::App* one) { return one->get_name() == *name; });
+      if (!name->empty() && commands.empty()) {
+        throw CommandError(ExitCode::WrongUsage, unknownCommand(*name));
+      }
+      // Asked itself, the program would help with the command that was chosen: this one.
+      context.out.write(name->empty() ? app.get_formatter()->make_help(&app, app.get_name(),
+                                                                       CLI::AppFormatMode::Normal)
+                                      : commands.front()->help(app.get_name()));
+      return ExitCode::Done;
+    };
+  });
+}
+
 int runCommandLine(int argc, char** argv) {
   if (!openStandardDescriptors()) return static_cast<int>(ExitCode::WrongUsage);
   // Character widths need a UTF-8 locale, whatever the person's is.
@@ -138,6 +177,7 @@ int runCommandLine(int argc, char** argv) {
   addHomeScreenCommand(app, chosen);
   addPhoneCommands(app, chosen);
   addPackageCommand(app, chosen);
+  addHelpCommand(app, chosen);
   try {
     app.parse(argc, argv);
   } catch (const CLI::Success& help) {

@@ -62,8 +62,15 @@ struct CommandContext {
   void tellIfUnseen(std::string_view work);
 };
 
+/// Ends the command when what it asked a phone for could not be read.
+void insistOnRead(const std::optional<Error>& error);
+
 /// What the chosen command does; it gives the exit code.
 using Command = std::function<ExitCode(CommandContext&)>;
+
+/// Check of an option's text: empty for a whole number from 1 to 999999999, else what is wrong with
+/// it.
+std::string checkPositive(const std::string& text);
 
 /// "allow" or "forbid".
 std::string policyText(device::EmbeddedDevice& device, PolicySetting setting);
@@ -76,6 +83,8 @@ void addPhoneCommands(CLI::App& app, Command& chosen);
 void addLookCommands(CLI::App& app, Command& chosen);
 void addPackageCommand(CLI::App& app, Command& chosen);
 void addHomeScreenCommand(CLI::App& app, Command& chosen);
+/// Last of all: it tells of the commands that are there.
+void addHelpCommand(CLI::App& app, Command& chosen);
 
 /// The whole program `appsync`.
 int runCommandLine(int argc, char** argv);

@@ -100,7 +100,7 @@ void addHomeScreenCommand(CLI::App& app, Command& chosen) {
       ->check(checkEnding)
       ->type_name("FILE.png");
   command->add_option("--page", options->page, "Only this page, from 1")
-      ->check(CLI::PositiveNumber)
+      ->check(checkPositive)
       ->type_name("N");
   command->footer(
       "Placeholders are dimmed: a ring fills while the package comes, and stays empty while it is\n"

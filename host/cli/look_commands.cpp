@@ -188,9 +188,11 @@ ExitCode runLog(const LogOptions& options, CommandContext& context) {
 
 void addLookCommands(CLI::App& app, Command& chosen) {
   CLI::App* apps = app.add_subcommand("apps", "List the applications on the phone");
+  apps->footer("Example: appsync --device phone apps");
   apps->callback([&chosen] { chosen = &runApps; });
 
   CLI::App* status = app.add_subcommand("status", "Show the state of the phone's sync");
+  status->footer("Example: appsync --device phone --json status");
   status->callback([&chosen] { chosen = &runStatus; });
 
   CLI::App* history = app.add_subcommand("history", "List what was installed and removed");
@@ -201,12 +203,15 @@ void addLookCommands(CLI::App& app, Command& chosen) {
   });
 
   CLI::App* log = app.add_subcommand("log", "Show the phone's log");
+  log->footer("Example: appsync --device phone log --level error --follow");
   auto logOptions = std::make_shared<LogOptions>();
   log->add_option("--level", logOptions->level, "Least severe level to show")
       ->check(CLI::IsMember(severities()))
       ->type_name("debug|info|default|error|fault")
       ->capture_default_str();
-  log->add_option("--limit", logOptions->limit, "Only the last lines")->type_name("N");
+  log->add_option("--limit", logOptions->limit, "Only the last lines")
+      ->check(checkPositive)
+      ->type_name("N");
   log->add_flag("-f,--follow", logOptions->follow, "Go on as lines come, until interrupted");
   log->callback([logOptions, &chosen] {
     chosen = [logOptions](CommandContext& context) { return runLog(*logOptions, context); };

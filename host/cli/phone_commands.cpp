@@ -121,9 +121,12 @@ ExitCode runPolicy(const PolicyOptions& options, CommandContext& context) {
 
 using IdentifierCommand = ExitCode (*)(const std::string&, CommandContext&);
 
+/// `more` goes before the example; empty, or whole lines.
 void addIdentifierCommand(CLI::App& app, Command& chosen, const char* name, const char* description,
-                          IdentifierCommand run) {
+                          const char* more, IdentifierCommand run) {
   CLI::App* command = app.add_subcommand(name, description);
+  command->footer(
+      fmt::format("{}Example: appsync --device phone {} org.example.tally", more, name));
   auto identifier = std::make_shared<std::string>();
   command->add_option("identifier", *identifier, "Bundle identifier of the application")
       ->required()
@@ -141,6 +144,7 @@ std::string policyText(device::EmbeddedDevice& device, PolicySetting setting) {
 
 void addPhoneCommands(CLI::App& app, Command& chosen) {
   CLI::App* init = app.add_subcommand("init", "Make a new phone in a folder");
+  init->footer("The folder must be missing or empty.\nExample: appsync --device phone init");
   auto coordination = std::make_shared<std::string>("off");
   init->add_option("--coordination", *coordination, "Drive installs through install coordinators")
       ->check(CLI::IsMember({"on", "off"}))
@@ -153,17 +157,24 @@ void addPhoneCommands(CLI::App& app, Command& chosen) {
   });
 
   addIdentifierCommand(app, chosen, "uninstall", "Uninstall an application, as a person would",
-                       &runUninstall);
+                       "Its data goes with it.\n", &runUninstall);
   addIdentifierCommand(app, chosen, "demote",
-                       "Keep only the placeholder and the data of an application", &runDemote);
-  addIdentifierCommand(app, chosen, "launch", "Open an application on the phone", &runLaunch);
-  addIdentifierCommand(app, chosen, "quit", "Close an application on the phone", &runQuit);
+                       "Keep only the placeholder and the data of an application",
+                       "\"tap\" asks for it again.\n", &runDemote);
+  addIdentifierCommand(app, chosen, "launch", "Open an application on the phone",
+                       "While it is open, its update waits. Works while a sync runs.\n",
+                       &runLaunch);
+  addIdentifierCommand(app, chosen, "quit", "Close an application on the phone",
+                       "Works while a sync runs.\n", &runQuit);
   addIdentifierCommand(app, chosen, "tap", "Tap a placeholder: have its application come next",
-                       &runTap);
+                       "Works while a sync runs.\n", &runTap);
   addIdentifierCommand(app, chosen, "cancel", "Cancel the install of an application on the phone",
-                       &runCancel);
+                       "Works while a sync runs.\n", &runCancel);
 
   CLI::App* policy = app.add_subcommand("policy", "Show or set the phone's restrictions");
+  policy->footer(
+      "What is forbidden is forbidden to syncs, stores and persons alike.\n"
+      "Example: appsync --device phone policy --removing forbid");
   auto wishes = std::make_shared<PolicyOptions>();
   policy->add_option("--installing", wishes->installing, "Whether applications may be installed")
       ->check(CLI::IsMember({"allow", "forbid"}))

@@ -138,6 +138,8 @@ void addSyncCommands(CLI::App& app, Command& chosen) {
   });
 
   CLI::App* clear = app.add_subcommand("clear", "Clear all sync data of the phone");
+  clear->footer(
+      "Placeholders that wait for their packages go too.\nExample: appsync --device phone clear");
   clear->callback([&chosen] { chosen = &runClear; });
 }
 

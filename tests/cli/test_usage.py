@@ -27,6 +27,42 @@ class Usage(support.Case):
         out, _ = self.run_appsync("--version")
         self.assertRegex(out, r"^appsync \d+\.\d+\.\d+\n$")
 
+    def commands(self):
+        out, _ = self.run_appsync("--help")
+        listed = out[out.index("Subcommands:"):out.index("Examples:")].splitlines()[1:]
+        return [line.split()[0] for line in listed if line.strip()]
+
+    def test_each_command_helps_with_an_example_of_its_own(self):
+        commands = self.commands()
+        self.assertEqual(sorted(commands), [
+            "apps", "backup", "cancel", "clear", "demote", "help", "history", "home-screen", "init",
+            "launch", "log", "package", "policy", "quit", "restore", "status", "sync", "tap",
+            "uninstall"])
+        for command in commands:
+            out, _ = self.run_appsync(command, "--help")
+            examples = [line for line in out.splitlines() if line.startswith("Example")]
+            self.assertEqual(len(examples), 1, out)
+            self.assertRegex(examples[0], rf"^Example: appsync (--\S+ (\S*phone )?)*{command}\b")
+            self.assertNotIn("Exit codes", out)
+
+    def test_help_is_a_command_too(self):
+        self.assertEqual(self.run_appsync("help"), self.run_appsync("--help"))
+        for command in self.commands():
+            self.assertEqual(self.run_appsync("help", command),
+                             self.run_appsync(command, "--help"))
+        self.assertEqual(self.one_line("help", "dance", code=2),
+                         'unknown command "dance"; see appsync --help')
+
+    def test_numbers_begin_at_one(self):
+        for command, option in (("history", "--limit"), ("log", "--limit"),
+                                ("home-screen", "--page")):
+            output = ("-o", "x.png") if command == "home-screen" else ()
+            for number in ("0", "-1", "1.5", "+1", "many", "00", "9" * 40):
+                self.assertEqual(
+                    self.one_line(command, *output, f"{option}={number}", code=2),
+                    f"{option}: must be a whole number from 1 to 999999999; "
+                    f"see appsync {command} --help")
+
     def test_bad_arguments(self):
         self.assertIn('unknown command "dance"', self.one_line("dance", code=2))
         self.assertIn("see appsync --help", self.one_line(code=2))
