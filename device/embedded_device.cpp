@@ -17,6 +17,7 @@
 #include "device/home/home_screen.h"
 #include "device/icons/icon_renderer.h"
 #include "device/icons/image_encoder.h"
+#include "device/journal/history.h"
 #include "device/journal/transaction_log.h"
 #include "device/open_folder.h"
 #include "device/person_socket.h"
@@ -189,8 +190,13 @@ class FolderDevice final : public EmbeddedDevice {
 
   std::vector<std::string> homeScreenOrder() noexcept override { return homeScreen_.order(); }
 
-  std::vector<TransactionRecord> transactions(std::int64_t afterNumber) noexcept override {
-    return transactions_.recordsAfter(afterNumber);
+  std::vector<HistoryEntry> history(std::optional<Error>* error) noexcept override {
+    return readHistory(*database_, error);
+  }
+
+  std::vector<TransactionRecord> transactions(std::int64_t afterNumber,
+                                              std::optional<Error>* error) noexcept override {
+    return transactions_.recordsAfter(afterNumber, error);
   }
 
   void readLog(const std::function<void(const LogLine&)>& visitor) noexcept override {

@@ -148,8 +148,13 @@ class EmbeddedDevice {
   virtual std::vector<std::string> foregroundApplications() noexcept = 0;
   virtual std::vector<std::string> uninstalledApplications() noexcept = 0;
   virtual std::vector<std::string> homeScreenOrder() noexcept = 0;
-  /// The records after `afterNumber`, oldest first.
-  virtual std::vector<TransactionRecord> transactions(std::int64_t afterNumber = 0) noexcept = 0;
+  /// What happened to the applications, oldest first; the device keeps the newest 10,000 entries.
+  /// None, with an error, when it cannot be read.
+  virtual std::vector<HistoryEntry> history(std::optional<Error>* error = nullptr) noexcept = 0;
+  /// The transaction records after `afterNumber`, oldest first; the device keeps the newest 20,000.
+  /// None, with an error, when they cannot be read.
+  virtual std::vector<TransactionRecord> transactions(
+      std::int64_t afterNumber = 0, std::optional<Error>* error = nullptr) noexcept = 0;
   /// The log lines kept, oldest first.
   virtual void readLog(const std::function<void(const LogLine&)>& visitor) noexcept = 0;
 };

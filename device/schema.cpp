@@ -7,6 +7,7 @@
 
 #include "device/coordination/coordination_schema.h"
 #include "device/device_folder.h"
+#include "device/journal/history.h"
 
 namespace appsync::device {
 namespace {
@@ -15,7 +16,6 @@ constexpr std::int64_t ApplicationId = 0x41505359;  // in the file's header, for
 constexpr std::int64_t FormatVersion = 1;
 constexpr int BusyTimeout =
     5000;  // milliseconds; readers meet a lock only while a log is recovered
-constexpr std::int64_t TransactionRecordsKept = 20'000;
 
 constexpr const char* Schema = R"(
 CREATE TABLE settings (key TEXT PRIMARY KEY, value) WITHOUT ROWID;
@@ -154,11 +154,10 @@ bool isCurrentDevice(SQLite::Database& database, const std::filesystem::path& fo
   return found.empty();
 }
 
-void prune(SQLite::Database& database) {
-  Query(database,
-        "DELETE FROM transactions WHERE number <= (SELECT max(number) FROM transactions) - ?",
-        TransactionRecordsKept)
-      .run();
+/// Those that the devices of older programs lack.
+void makeLaterTables(SQLite::Database& database) {
+  makeCoordinationTables(database);
+  makeHistoryTable(database);
 }
 
 DeviceError problemOf(const SQLite::Exception& exception, const std::filesystem::path& folder) {
@@ -183,7 +182,7 @@ void createDatabase(const std::filesystem::path& file, const DeviceOptions& opti
   database.exec("PRAGMA journal_mode=WAL");
   SQLite::Transaction transaction(database);
   database.exec(Schema);
-  makeCoordinationTables(database);
+  makeLaterTables(database);
   Query(database, "INSERT INTO settings VALUES ('coordination', ?)", options.coordination).run();
   database.exec(fmt::format("PRAGMA application_id={}; PRAGMA user_version={}", ApplicationId,
                             FormatVersion));
@@ -196,8 +195,7 @@ std::unique_ptr<Database> openDatabase(const std::filesystem::path& folder,
   try {
     SQLite::Database connection = connect(file, access);
     if (!isCurrentDevice(connection, folder, log, error)) return nullptr;
-    if (access == Access::Write) prune(connection);
-    if (access == Access::Write) makeCoordinationTables(connection);  // missing in older devices
+    if (access == Access::Write) makeLaterTables(connection);
     return std::make_unique<Database>(std::move(connection), access == Access::Write, log);
   } catch (const SQLite::Exception& exception) {
     log.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,

@@ -125,7 +125,7 @@ expect_apps "concord 2.3" "ditdah 1.4" "kaleido 1.2" "lune 2.0" "measure 4.1" \
 
 title "What happened"
 run 0 history
-"$program" --json history | grep -q "Uninstall succeeded" ||
+"$program" history | grep -q "removed 1.0 *org.example.lantern *by sync" ||
   fail "the history does not tell that Lantern was removed"
 
 title "The same on a second device, which installs through coordinators"

@@ -54,6 +54,14 @@ bool canBeAskedFor(InstallType placeholder) {
          placeholder == InstallType::StoreDownload;
 }
 
+/// Who brings a package.
+HistoryOrigin originOf(const PropertyList::Dictionary& options) {
+  const PropertyList* type = find(options, SWInstallTypeKey);
+  const auto number = type ? type->asUnsigned() : std::nullopt;
+  return number == static_cast<std::uint64_t>(InstallType::StoreDownload) ? HistoryOrigin::Store
+                                                                          : HistoryOrigin::Sync;
+}
+
 bool mayRemove(DeviceCore& core, std::optional<Error>* error) {
   const PolicyValue wish =
       StoredDevicePolicy(core.database).effectiveBoolValue(PolicySetting::AppRemovalAllowed);
@@ -66,7 +74,7 @@ bool mayRemove(DeviceCore& core, std::optional<Error>* error) {
 InstallDetails placeholderDetails(const PropertyList::Dictionary& options) {
   const PropertyList* type = find(options, SWInstallTypeKey);
   return {static_cast<InstallType>(type ? type->asUnsigned().value_or(0) : 0),
-          dataOption(options, SWHalvoMetadataKey), dataOption(options, SWApplicationSINFKey)};
+          dataOption(options, SWHalvoMetadataKey), dataOption(options, SWApplicationSINFKey), HistoryOrigin::Sync};
 }
 
 }  // namespace
@@ -171,7 +179,9 @@ bool DeviceAppRegistry::installApplication(const FileLocation& package,
     };
     return changeApplication(*identifier, install, error);
   }
-  return installPackageWith(package, *identifier, {}, error);
+  InstallDetails details;
+  details.origin = originOf(options);
+  return installPackageWith(package, *identifier, details, error);
 }
 
 bool DeviceAppRegistry::installPackageWith(const FileLocation& package,

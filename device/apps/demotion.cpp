@@ -7,6 +7,7 @@
 #include "device/apps/idle_application.h"
 #include "device/apps/installers.h"
 #include "device/files/existence.h"
+#include "device/journal/history.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 
@@ -58,7 +59,16 @@ bool layPlaceholder(DeviceCore& core, const ApplicationRow& installed,
 bool takePackage(DeviceCore& core, const ApplicationRow& installed, std::optional<Error>* error) {
   const bool erased = core.database.change(
       fmt::format("{} could not be demoted", installed.identifier), Database::Commit::OnDisk,
-      [&](SQLite::Database& database) { eraseApplication(database, installed); }, error);
+      [&](SQLite::Database& database) {
+        eraseApplication(database, installed);
+        HistoryEntry entry;
+        entry.event = HistoryEvent::Demoted;
+        entry.origin = HistoryOrigin::Person;
+        entry.bundleId = installed.identifier;
+        entry.version = installed.version;
+        enterInHistory(database, entry);
+      },
+      error);
   if (erased) core.containers.remove(installed.container);
   return erased;
 }

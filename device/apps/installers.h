@@ -17,6 +17,7 @@ struct InstallDetails {
   InstallType installType = InstallType::None;
   std::optional<Bytes> metadata;  ///< becomes the container's HalvoMetadata.plist
   std::optional<Bytes> sinf;
+  HistoryOrigin origin = HistoryOrigin::Sync;  ///< who brings a package
 };
 
 /// Installs an application package in the place of the installed version and of the placeholder.

@@ -7,6 +7,7 @@
 #include "device/apps/staged_container.h"
 #include "device/files/existence.h"
 #include "device/home/icon_order.h"
+#include "device/journal/history.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 
@@ -88,8 +89,18 @@ void inherit(ApplicationRow& row, const ApplicationRows& before, const InstallDe
   if (details.sinf) row.sinf = details.sinf;
 }
 
+HistoryEntry installOf(const ApplicationRow& row, const ApplicationRows& before,
+                       HistoryOrigin origin) {
+  HistoryEntry entry;
+  entry.origin = origin;
+  entry.bundleId = row.identifier;
+  entry.version = row.version;
+  if (before.installed) entry.replaced = before.installed->version.value_or("");
+  return entry;
+}
+
 bool switchTo(DeviceCore& core, const ApplicationRow& row, const ApplicationRows& before,
-              std::optional<Error>* error) {
+              HistoryOrigin origin, std::optional<Error>* error) {
   return core.database.change(
       fmt::format("{} could not be entered in the registry", row.identifier),
       Database::Commit::OnDisk,
@@ -99,6 +110,7 @@ bool switchTo(DeviceCore& core, const ApplicationRow& row, const ApplicationRows
         endInstall(database, row.identifier, InstallState::Finished);
         forgetUninstalled(database, row.identifier);
         appendToIconOrder(database, row.identifier);
+        enterInHistory(database, installOf(row, before, origin));
       },
       error);
 }
@@ -115,7 +127,7 @@ bool replaceApplication(DeviceCore& core, const std::string& package, const std:
   // One flush for all files of the package, before a row of the registry names them.
   if (!extractInto(core, package, staged.path(), identifier, row, before, details, error) ||
       !readMetadata(core, row, error) || !prepareData(core, identifier, before, error) ||
-      !core.containers.flush(error) || !switchTo(core, row, before, error)) {
+      !core.containers.flush(error) || !switchTo(core, row, before, details.origin, error)) {
     return false;
   }
   staged.keep();
@@ -133,10 +145,23 @@ void markInstalling(DeviceCore& core, const std::string& identifier) {
   }
 }
 
-void markFailed(DeviceCore& core, const std::string& identifier) {
-  core.database.change(
-      "a failed install could not be ended", Database::Commit::Ordinary,
-      [&](SQLite::Database& database) { endInstall(database, identifier, InstallState::Failed); });
+HistoryEntry failureOf(const std::string& identifier, const ApplicationRows& before,
+                       HistoryOrigin origin, const std::optional<Error>& reason) {
+  HistoryEntry entry;
+  entry.event = HistoryEvent::Failed;
+  entry.origin = origin;
+  entry.bundleId = identifier;
+  if (before.placeholder) entry.version = before.placeholder->version;
+  entry.reason = reason ? reason->localizedDescription() : "no reason given";
+  return entry;
+}
+
+void markFailed(DeviceCore& core, const HistoryEntry& failure) {
+  core.database.change("a failed install could not be ended", Database::Commit::Ordinary,
+                       [&](SQLite::Database& database) {
+                         endInstall(database, failure.bundleId, InstallState::Failed);
+                         enterInHistory(database, failure);
+                       });
 }
 
 }  // namespace
@@ -149,8 +174,12 @@ bool installPackage(DeviceCore& core, const std::string& package, const std::str
       [&](SQLite::Database& database) { before = findApplication(database, identifier); }, error);
   if (!read) return false;
   markInstalling(core, identifier);
-  const bool installed = replaceApplication(core, package, identifier, before, details, error);
-  if (!installed) markFailed(core, identifier);
+  std::optional<Error> reason;
+  const bool installed = replaceApplication(core, package, identifier, before, details, &reason);
+  if (!installed) {
+    markFailed(core, failureOf(identifier, before, details.origin, reason));
+    if (reason) setError(error, *std::move(reason));
+  }
   core.observers.installsChanged();
   return installed;
 }

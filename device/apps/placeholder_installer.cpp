@@ -7,6 +7,7 @@
 #include "device/apps/staged_container.h"
 #include "device/files/existence.h"
 #include "device/home/icon_order.h"
+#include "device/journal/history.h"
 #include "platform/bundle.h"
 #include "platform/installer_service.h"
 #include "platform/property_list_codec.h"
@@ -63,6 +64,20 @@ bool fill(DeviceCore& core, const std::string& source, const InstallDetails& det
 bool mustLast(const ApplicationRow& row) { return row.installType != InstallType::Sync; }
 
 /// Enters the placeholder; `replaced` is the one it takes the place of.
+bool isRestored(const ApplicationRow& placeholder) {
+  return placeholder.installType == InstallType::Restore ||
+         placeholder.installType == InstallType::Downgrade ||
+         placeholder.installType == InstallType::IntentionalDowngrade;
+}
+
+HistoryEntry restorationOf(const ApplicationRow& placeholder) {
+  HistoryEntry entry;
+  entry.event = HistoryEvent::Restored;
+  entry.bundleId = placeholder.identifier;
+  entry.version = placeholder.version;
+  return entry;
+}
+
 bool enter(DeviceCore& core, ApplicationRow& row, std::optional<ApplicationRow>& replaced,
            std::optional<Error>* error) {
   return core.database.change(
@@ -74,6 +89,7 @@ bool enter(DeviceCore& core, ApplicationRow& row, std::optional<ApplicationRow>&
         putApplication(database, row);
         beginInstall(database, row.identifier);
         appendToIconOrder(database, row.identifier);
+        if (!before.any() && isRestored(row)) enterInHistory(database, restorationOf(row));
         replaced = std::move(before.placeholder);
       },
       error);

@@ -7,6 +7,7 @@
 #include "device/apps/installer_service.h"
 #include "device/apps/installs.h"
 #include "device/home/icon_order.h"
+#include "device/journal/history.h"
 #include "device/state/application_rows.h"
 
 namespace appsync::device {
@@ -41,6 +42,20 @@ void erasePlaceholder(SQLite::Database& database, const ApplicationRow& placehol
   endInstall(database, placeholder.identifier, InstallState::Canceled);
 }
 
+void enterRemoval(SQLite::Database& database, const ApplicationRow& removed, HistoryOrigin origin) {
+  HistoryEntry entry;
+  entry.event = HistoryEvent::Removed;
+  entry.origin = origin;
+  entry.bundleId = removed.identifier;
+  entry.version = removed.version;
+  enterInHistory(database, entry);
+}
+
+/// Without it the application is as it was before an install that did not come to its end.
+bool isMerelyOfAnInstall(const ApplicationRows& present) {
+  return present.installed || present.placeholder->installType == InstallType::Sync;
+}
+
 void removeFiles(DeviceCore& core, const std::string& identifier, const ApplicationRows& removed) {
   if (removed.placeholder) core.containers.remove(removed.placeholder->container);
   if (removed.installed) {
@@ -64,10 +79,14 @@ bool removeForClient(DeviceCore& core, const std::string& identifier, bool place
       [&](SQLite::Database& database) {
         ApplicationRows present = findApplication(database, identifier);
         if (present.placeholder) {
+          if (!isMerelyOfAnInstall(present)) {
+            enterRemoval(database, *present.placeholder, HistoryOrigin::Sync);
+          }
           erasePlaceholder(database, *present.placeholder);
           removed.placeholder = std::move(present.placeholder);
         } else if (present.installed && !placeholderOnly) {
           eraseInstalled(database, *present.installed);
+          enterRemoval(database, *present.installed, HistoryOrigin::Sync);
           removed.installed = std::move(present.installed);
         } else {
           throw Refused{notInstalled(identifier)};
@@ -89,6 +108,8 @@ bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optio
         removed = findApplication(database, identifier);
         if (!removed.any()) throw Refused{notInstalled(identifier)};
         brokenOff = removed.placeholder && isInstalling(database, identifier);
+        enterRemoval(database, *(removed.installed ? removed.installed : removed.placeholder),
+                     HistoryOrigin::Person);
         if (removed.installed) eraseInstalled(database, *removed.installed);
         if (!removed.placeholder) return;
         erasePlaceholder(database, *removed.placeholder);

@@ -53,6 +53,30 @@ struct TransactionRecord {
   std::string description;
 };
 
+/// What happened to an application.
+enum class HistoryEvent {
+  Installed,  ///< in the place of an older version, if there was one
+  Failed,     ///< its package was not installed
+  Removed,
+  Demoted,   ///< its placeholder and data stay
+  Restored,  ///< as a placeholder, from a backup
+};
+
+/// By whom.
+enum class HistoryOrigin { Sync, Store, Person };
+
+struct HistoryEntry {
+  std::int64_t number = 0;  ///< ascending
+  double time = 0;          ///< seconds since 1970-01-01T00:00:00Z
+  HistoryEvent event = HistoryEvent::Installed;
+  HistoryOrigin origin = HistoryOrigin::Sync;
+  std::string bundleId;
+  std::optional<std::string> version;
+  /// Installed over an older version: that version, empty when it had none.
+  std::optional<std::string> replaced;
+  std::string reason;  ///< Failed: why
+};
+
 struct LogLine {
   double time = 0;  ///< seconds since 1970-01-01T00:00:00Z
   LogChannel channel = LogChannel::TWLogCategorySyncBundle;

@@ -56,9 +56,10 @@ PropertyList::Dictionary optionsOf(const PlaceholderRow& row) {
 }
 
 /// What the options say of a package that takes its placeholder's place.
-InstallDetails detailsOf(const Bytes& options) {
-  const auto given = optionsFrom(options).value_or(InstallOptions{});
-  return {given.installType, metadataFile(given.storeMetadata), given.sinfData};
+InstallDetails detailsOf(const CoordinatorState& state) {
+  const auto given = optionsFrom(*state.coordinator.options).value_or(InstallOptions{});
+  return {given.installType, metadataFile(given.storeMetadata), given.sinfData,
+          state.package->client == KQClientKiosk ? HistoryOrigin::Store : HistoryOrigin::Sync};
 }
 
 /// Whether a sync finds all that is left of an application: if the sync comes to nothing, that must
@@ -265,7 +266,7 @@ bool CoordinatedInstalls::installPackage(const CoordinatorState& state) {
   std::optional<Error> error;
   const FileLocation package{*state.package->path, state.package->pathIsDirectory};
   const bool installed = core_.registry().installPackageWith(
-      package, identifier, detailsOf(*state.coordinator.options), &error);
+      package, identifier, detailsOf(state), &error);
   finish(state, installed ? std::nullopt : error);
   return false;
 }

@@ -10,6 +10,9 @@
 
 namespace appsync::device {
 
+/// Older records go.
+inline constexpr std::int64_t TransactionRecordsKept = 20'000;
+
 /// Install milestones, kept in the device's database.
 class StoredTransactionLog final : public TransactionLog {
  public:
@@ -21,8 +24,9 @@ class StoredTransactionLog final : public TransactionLog {
   void logStep(std::uint32_t step, std::uint32_t party, std::uint32_t phase, bool success,
                std::string_view bundleId, std::string_view description) noexcept override;
 
-  /// The records after `number`, oldest first.
-  std::vector<TransactionRecord> recordsAfter(std::int64_t number) noexcept;
+  /// The records after `number`, oldest first. None, with an error, when they cannot be read.
+  std::vector<TransactionRecord> recordsAfter(std::int64_t number,
+                                              std::optional<Error>* error) noexcept;
 
  private:
   void keep(const TransactionRecord& record) noexcept;

@@ -174,6 +174,7 @@ int runCommandLine(int argc, char** argv) {
   addBackupCommand(app, chosen);
   addRestoreCommand(app, chosen);
   addLookCommands(app, chosen);
+  addHistoryCommand(app, chosen);
   addHomeScreenCommand(app, chosen);
   addPhoneCommands(app, chosen);
   addPackageCommand(app, chosen);

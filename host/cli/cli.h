@@ -81,6 +81,7 @@ void addBackupCommand(CLI::App& app, Command& chosen);
 void addRestoreCommand(CLI::App& app, Command& chosen);
 void addPhoneCommands(CLI::App& app, Command& chosen);
 void addLookCommands(CLI::App& app, Command& chosen);
+void addHistoryCommand(CLI::App& app, Command& chosen);
 void addPackageCommand(CLI::App& app, Command& chosen);
 void addHomeScreenCommand(CLI::App& app, Command& chosen);
 /// Last of all: it tells of the commands that are there.

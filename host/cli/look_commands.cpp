@@ -10,6 +10,7 @@
 #include "host/base/text.h"
 #include "host/cli/cli.h"
 #include "host/cli/status.h"
+#include "host/cli/table.h"
 
 namespace appsync::host {
 namespace {
@@ -21,25 +22,6 @@ struct LogOptions {
   std::size_t limit = 0;  // 0: all
   bool follow = false;
 };
-
-using Row = std::vector<std::string>;
-
-/// Columns as wide as their widest cell; the last one is left as it is.
-void writeTable(Output& output, const std::vector<Row>& rows) {
-  std::vector<std::size_t> widths;
-  for (const Row& row : rows) {
-    widths.resize(std::max(widths.size(), row.size()));
-    for (std::size_t i = 0; i < row.size(); ++i) {
-      widths[i] = std::max(widths[i], displayWidth(row[i]));
-    }
-  }
-  for (const Row& row : rows) {
-    std::string line;
-    for (std::size_t i = 0; i + 1 < row.size(); ++i) line += fitted(row[i], widths[i]) + "  ";
-    if (!row.empty()) line += row.back();
-    output.line(line);
-  }
-}
 
 Json jsonOf(const AppRecord& record) {
   return {{"identifier", record.applicationIdentifier},
@@ -63,45 +45,6 @@ ExitCode runApps(CommandContext& context) {
     }
   }
   if (!context.json && rows.empty() && !context.quiet) context.out.line("No applications.");
-  writeTable(context.out, rows);
-  return ExitCode::Done;
-}
-
-std::string scenarioText(const device::TransactionRecord& record) {
-  if (!record.scenario.empty()) return record.scenario;
-  return fmt::format("step {} party {} phase {}", record.step.value_or(0), record.party,
-                     record.phase);
-}
-
-Json jsonOf(const device::TransactionRecord& record) {
-  return {{"number", record.number},
-          {"time", isoTime(record.time)},
-          {"scenario", textOrNull(record.scenario)},
-          {"step", record.step ? Json(*record.step) : Json()},
-          {"party", record.party},
-          {"phase", record.phase},
-          {"success", record.success},
-          {"identifier", record.bundleId},
-          {"description", record.description}};
-}
-
-ExitCode runHistory(std::size_t limit, CommandContext& context) {
-  const auto device = context.openDevice(device::Access::ReadOnly);
-  auto records = device->transactions();
-  if (limit > 0 && records.size() > limit) {
-    records.erase(records.begin(), records.end() - static_cast<std::ptrdiff_t>(limit));
-  }
-  std::vector<Row> rows;
-  for (const device::TransactionRecord& record : records) {
-    if (context.json) {
-      writeJsonLine(context.out, jsonOf(record));
-    } else {
-      rows.push_back({isoTime(record.time), record.success ? "ok" : "failed",
-                      printable(scenarioText(record)), printable(record.bundleId),
-                      printable(record.description)});
-    }
-  }
-  if (!context.json && rows.empty() && !context.quiet) context.out.line("No history yet.");
   writeTable(context.out, rows);
   return ExitCode::Done;
 }
@@ -194,13 +137,6 @@ void addLookCommands(CLI::App& app, Command& chosen) {
   CLI::App* status = app.add_subcommand("status", "Show the state of the phone's sync");
   status->footer("Example: appsync --device phone --json status");
   status->callback([&chosen] { chosen = &runStatus; });
-
-  CLI::App* history = app.add_subcommand("history", "List what was installed and removed");
-  auto historyLimit = std::make_shared<std::size_t>(0);
-  history->add_option("--limit", *historyLimit, "Only the last records")->type_name("N");
-  history->callback([historyLimit, &chosen] {
-    chosen = [historyLimit](CommandContext& context) { return runHistory(*historyLimit, context); };
-  });
 
   CLI::App* log = app.add_subcommand("log", "Show the phone's log");
   log->footer("Example: appsync --device phone log --level error --follow");

@@ -79,8 +79,10 @@ class RegistryDelivery final : public PackageDelivery {
   }
 
   void arrived(const std::string& path) override {
-    const PropertyList::Dictionary options{{std::string(SWPackageTypeKey), SWPackageTypeCustomer},
-                                           {std::string(KBBundleIdentifier), identifier_}};
+    const PropertyList::Dictionary options{
+        {std::string(SWPackageTypeKey), SWPackageTypeCustomer},
+        {std::string(KBBundleIdentifier), identifier_},
+        {std::string(SWInstallTypeKey), static_cast<std::uint64_t>(InstallType::StoreDownload)}};
     std::optional<Error> error;
     if (!phone_.apps.installApplication(FileLocation::file(path), options, &error)) {
       failure_ = error ? oneLine(error->localizedDescription()) : NotInstalled;

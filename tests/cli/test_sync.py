@@ -106,9 +106,9 @@ class Sync(support.Case):
         self.sync()
         self.offer("com.a", "2.0")
         self.offer("com.new")
-        before = self.phone_tree(), self.apps(), self.json_lines("history"), self.json_lines("log")
+        before = self.phone_tree(), self.apps(), self.json_lines("history", "--records"), self.json_lines("log")
         summary = self.sync("--dry-run")
-        after = self.phone_tree(), self.apps(), self.json_lines("history"), self.json_lines("log")
+        after = self.phone_tree(), self.apps(), self.json_lines("history", "--records"), self.json_lines("log")
         self.assertEqual(before, after)
         self.assertEqual([(event["action"], event["identifier"]) for event in self.events
                           if event["event"] == "plan"],
@@ -157,10 +157,9 @@ class Sync(support.Case):
     def test_history_and_log(self):
         self.offer("com.a")
         self.sync()
-        records = self.json_lines("history")
+        records = self.json_lines("history", "--records")
         self.assertEqual({record["identifier"] for record in records}, {"com.a"})
-        self.assertEqual([record["number"] for record in self.json_lines("history", "--limit", "1")],
-                         [records[-1]["number"]])
+        self.assertEqual(self.json_lines("history", "--records", "--limit", "1"), records[-1:])
         lines = self.json_lines("log")
         self.assertEqual(set(lines[0]), {"time", "channel", "level", "text"})
         self.assertTrue(lines[-1]["text"].startswith("com.corvane.twc.AppsClient|"))

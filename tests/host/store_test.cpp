@@ -124,7 +124,8 @@ TEST_F(StoreTest, InstallsThroughTheRegistryWithoutCoordination) {
                           "phone.received(/var/mobile/Media/Downloads/com.a.tar)",
                           "InstallProgress.setCompletedUnitCount(com.a, 1000)",
                           "AppRegistry.installApplication(/var/mobile/Media/Downloads/com.a.tar, "
-                          "{KBBundleIdentifier = com.a; SWPackageTypeKey = SWPackageTypeCustomer})",
+                          "{KBBundleIdentifier = com.a; SWInstallType = 1; "
+                          "SWPackageTypeKey = SWPackageTypeCustomer})",
                           "FileManager.removeItem(/var/mobile/Media/Downloads/com.a.tar)"));
 }
 
