@@ -126,7 +126,11 @@ void ArchiveWriter::copyFrom(int fd, std::uint64_t size, const std::filesystem::
   while (size > 0) {
     const ssize_t count = ::read(fd, block.data(), std::min<std::uint64_t>(size, block.size()));
     if (count < 0 && errno == EINTR) continue;
-    if (count <= 0) {
+    if (count < 0) {
+      problem_ = fmt::format("{}: {}", source.string(), std::generic_category().message(errno));
+      return;
+    }
+    if (count == 0) {
       problem_ = source.string() + " changed while it was being packed";
       return;
     }

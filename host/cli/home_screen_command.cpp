@@ -51,8 +51,11 @@ Bytes encode(const Image& image) {
 /// The file appears whole or not at all; a device or a link to one is left as it is.
 void writeFile(const fs::path& path, const Bytes& bytes) {
   std::string reason = "it is no regular file";
-  std::error_code ignored;
-  if (!fs::exists(path, ignored) || fs::is_regular_file(path, ignored)) {
+  std::error_code failure;
+  const fs::file_status status = fs::status(path, failure);
+  if (!fs::status_known(status)) {
+    reason = failure.message();
+  } else if (!fs::exists(status) || fs::is_regular_file(status)) {
     std::optional<Error> error;
     device::ConfinedFileManager folder(path.parent_path());
     if (folder.writeAtomically("/" + path.filename().string(), bytes, &error)) return;

@@ -35,7 +35,10 @@ Json jsonOf(const AppRecord& record) {
 ExitCode runApps(CommandContext& context) {
   const auto device = context.openDevice(device::Access::ReadOnly);
   std::vector<Row> rows;
-  for (const AppRecord& record : device->applications()) {
+  std::optional<Error> error;
+  const std::vector<AppRecord> applications = device->applications(&error);
+  insistOnRead(error);
+  for (const AppRecord& record : applications) {
     if (context.json) {
       writeJsonLine(context.out, jsonOf(record));
     } else {

@@ -34,7 +34,10 @@ std::vector<std::string> restoring(FileManager& files) {
 
 std::vector<std::string> placeholders(device::EmbeddedDevice& device) {
   std::vector<std::string> identifiers;
-  for (const AppRecord& record : device.applications()) {
+  std::optional<Error> error;
+  const std::vector<AppRecord> applications = device.applications(&error);
+  insistOnRead(error);
+  for (const AppRecord& record : applications) {
     if (record.isPlaceholder) identifiers.push_back(record.applicationIdentifier);
   }
   return identifiers;

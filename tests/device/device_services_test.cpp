@@ -98,6 +98,10 @@ TEST_F(DeviceServicesTest, ADatabaseThatFailsGivesTheDocumentedFailureAndALogLin
   EXPECT_FALSE(platform().installerService.lookupUninstalled());
   EXPECT_NE(platform().installerService.clearUninstalled({"com.example.a"}), 0);
   EXPECT_FALSE(record("com.example.a"));
+  error.reset();
+  EXPECT_TRUE(device->applications(&error).empty() && error);
+  error.reset();
+  EXPECT_TRUE(!device->opaqueBlob("com.example.a", &error) && error);
   EXPECT_FALSE(installPackage("com.example.b"));
   EXPECT_FALSE(device->uninstall("com.example.a", &error));
   EXPECT_EQ(static_cast<int>(device->homeScreen().createTerminationAssertion("a", 0).outcome), 3);
