@@ -16,17 +16,29 @@ namespace appsync::host {
 namespace {
 namespace fs = std::filesystem;
 
-// Debian's fonts-noto-core and fonts-droid-fallback (Chinese, Japanese, Korean).
+// Debian's fonts-noto-core, fonts-noto-color-emoji and fonts-droid-fallback (Chinese, Japanese,
+// Korean).
 constexpr const char* MainFonts = "/usr/share/fonts/truetype/noto";
 constexpr const char* EastAsianFont =
     "/usr/share/fonts-droid-fallback/truetype/DroidSansFallback.ttf";
+constexpr std::string_view EmojiFont = "NotoColorEmoji.ttf";
 constexpr const char* Family = "Noto Sans";
+/// Emoji are pictures of one size, and are to be as large as the letters.
+constexpr const char* ScalingRule = R"(<fontconfig><match target="font">
+  <test name="outline" compare="eq"><bool>false</bool></test>
+  <edit name="matrix" mode="assign"><times><name>matrix</name><matrix>
+    <divide><name target="pattern">pixelsize</name><name target="font">pixelsize</name></divide>
+    <double>0</double> <double>0</double>
+    <divide><name target="pattern">pixelsize</name><name target="font">pixelsize</name></divide>
+  </matrix></times></edit>
+</match></fontconfig>)";
 /// Nobody sees more of a name than this, and laying out a huge one takes long.
 constexpr std::size_t BytesLaidOut = 400;
 
 template <class T>
 using Object = std::unique_ptr<T, Releaser<g_object_unref>>;
 using Description = std::unique_ptr<PangoFontDescription, Releaser<pango_font_description_free>>;
+using CharacterSet = std::unique_ptr<FcCharSet, Releaser<FcCharSetDestroy>>;
 using FontOptions = std::unique_ptr<cairo_font_options_t, Releaser<cairo_font_options_destroy>>;
 
 std::vector<std::string> fontFiles() {
@@ -35,35 +47,67 @@ std::vector<std::string> fontFiles() {
   for (fs::directory_iterator item(MainFonts, error), end; !error && item != end;
        item.increment(error)) {
     const std::string name = item->path().filename();
-    if (name.starts_with("NotoSans") && name.ends_with("-Regular.ttf")) {
-      files.push_back(item->path());
-    }
+    const bool isLetters = name.starts_with("NotoSans") && name.ends_with("-Regular.ttf");
+    if (isLetters || name == EmojiFont) files.push_back(item->path());
   }
   std::sort(files.begin(), files.end());
   files.push_back(EastAsianFont);
   return files;
 }
 
+const FcChar8* forFontconfig(const char* text) { return reinterpret_cast<const FcChar8*>(text); }
+
 /// Makes these fonts the only ones of this process: neither the machine's settings nor its other
-/// fonts change a picture, and no cache is needed. False when there are none.
-bool useFonts() {
+/// fonts change a picture, and no cache is needed. The characters that they have; none when they
+/// cannot be used.
+CharacterSet useFonts() {
   FcConfig* config = FcConfigCreate();
-  std::size_t added = 0;
+  CharacterSet characters;
   for (const std::string& file : fontFiles()) {
-    if (FcConfigAppFontAddFile(config, reinterpret_cast<const FcChar8*>(file.c_str()))) ++added;
+    FcConfigAppFontAddFile(config, forFontconfig(file.c_str()));
   }
-  const bool usable = added > 0 && FcConfigSetCurrent(config);
+  const FcFontSet* fonts = FcConfigGetFonts(config, FcSetApplication);
+  const bool usable = fonts && fonts->nfont > 0 &&
+                      FcConfigParseAndLoadFromMemory(config, forFontconfig(ScalingRule), FcTrue) &&
+                      FcConfigSetCurrent(config);
+  if (usable) characters.reset(FcCharSetCreate());
+  for (int i = 0; usable && i < fonts->nfont; ++i) {
+    FcCharSet* own = nullptr;
+    FcPatternGetCharSet(fonts->fonts[i], FC_CHARSET, 0, &own);
+    if (own) FcCharSetMerge(characters.get(), own, nullptr);
+  }
   FcConfigDestroy(config);  // the process keeps its own reference
-  return usable;
+  return characters;
+}
+
+/// Null when there are no fonts.
+const FcCharSet* knownCharacters() {
+  static const CharacterSet known = useFonts();
+  return known.get();
 }
 
 Object<PangoFontMap> makeFontMap() {
-  static const bool usable = useFonts();
-  if (!usable) {
+  if (!knownCharacters()) {
     throw std::runtime_error(
-        "no fonts to write with: install the packages fonts-noto-core and fonts-droid-fallback");
+        "no fonts to write with: install the packages fonts-noto-core, fonts-noto-color-emoji and "
+        "fonts-droid-fallback");
   }
   return Object<PangoFontMap>(pango_cairo_font_map_new_for_font_type(CAIRO_FONT_TYPE_FT));
+}
+
+/// The text without the characters that would be boxes since no font has them.
+std::string writable(std::string_view text) {
+  const std::string safe = printable(text.substr(0, BytesLaidOut));
+  std::string known;
+  for (const char* at = safe.c_str(); *at;) {
+    const char* next = g_utf8_next_char(at);
+    const gunichar character = g_utf8_get_char(at);
+    if (g_unichar_iszerowidth(character) || FcCharSetHasChar(knownCharacters(), character)) {
+      known.append(at, next);
+    }
+    at = next;
+  }
+  return known;
 }
 
 }  // namespace
@@ -84,12 +128,12 @@ struct HomeScreenText::Fonts {
 
   Object<PangoLayout> lay(std::string_view text, double size) const {
     Object<PangoLayout> layout(pango_layout_new(context.get()));
-    const std::string safe = printable(text.substr(0, BytesLaidOut));
+    const std::string known = writable(text);
     const Description font(pango_font_description_from_string(Family));
     pango_font_description_set_absolute_size(font.get(), size * PANGO_SCALE);
     pango_layout_set_font_description(layout.get(), font.get());
     pango_layout_set_single_paragraph_mode(layout.get(), TRUE);
-    pango_layout_set_text(layout.get(), safe.data(), static_cast<int>(safe.size()));
+    pango_layout_set_text(layout.get(), known.data(), static_cast<int>(known.size()));
     return layout;
   }
 

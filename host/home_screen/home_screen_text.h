@@ -23,7 +23,7 @@ class HomeScreenText {
     double width;  ///< longer text is cut, with "…"
   };
   /// One line of any bytes in the current colour, centred on a point of its baseline. However tall
-  /// its characters, it stays in a line's height.
+  /// its characters, it stays in a line's height; those that no font has are left out.
   void write(std::string_view text, double centre, double baseline, const Style& style);
 
   /// A letter of this size, centred in both directions; nothing if no font has it.

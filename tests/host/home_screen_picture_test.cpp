@@ -298,6 +298,31 @@ TEST(HomeScreenPicture, CommonScriptsHaveTheirLetters) {
   for (std::size_t i = 2; i < names.size(); ++i) EXPECT_NE(tiles[i], tiles[0]) << names[i];
 }
 
+TEST(HomeScreenPicture, EmojiAreDrawnInColourAndAsLargeAsTheLetters) {
+  const auto colours = [](const std::string& name) {
+    const Image image = draw({{name, plain({0, 0, 0, 255}), State::Installed, 0}});
+    Box box;
+    forEachPixel(image, [&](auto x, auto y) {
+      const Pixel pixel = at(image, x, y);
+      if (pixel[0] > 220 && pixel[1] > 120 && pixel[1] < 210 && pixel[2] < 90) box.add(x, y);
+    });
+    return box;
+  };
+  const std::string face = "\xf0\x9f\x98\x80";
+  EXPECT_EQ(colours("Name").right, 0U);
+  const Box drawn = colours(face);
+  ASSERT_GT(drawn.right, 0U);
+  EXPECT_LT(drawn.height(), 2 * ScreenView().iconSide() / 5);
+  EXPECT_NEAR(colours(face + " Name").height(), drawn.height(), 1);
+}
+
+TEST(HomeScreenPicture, WhatNoFontHasIsLeftOutOfAName) {
+  const auto named = [](const std::string& name) {
+    return draw({{name, plain(Red), State::Installed, 0}}).pixels;
+  };
+  EXPECT_EQ(named("a\xf3\xb0\x80\x80z"), named("az"));
+}
+
 TEST(HomeScreenPicture, PagesAreNumberedByTheirIcons) {
   EXPECT_EQ(pagesFor(0), 1u);
   EXPECT_EQ(pagesFor(1), 1u);
