@@ -30,7 +30,7 @@ need() {
 install_packages() {
   local root=()
   if ((EUID != 0)); then
-    command -v sudo >/dev/null || die "as root: apt-get install ${*}"
+    command -v sudo >/dev/null || die "as root: apt-get update && apt-get install ${*}"
     root=(sudo)
   fi
   step "Installing ${*%%=*}"

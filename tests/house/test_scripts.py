@@ -96,10 +96,54 @@ class Totals(unittest.TestCase):
     def test_adds_up_reports(self):
         one = '<testsuite tests="7" failures="2" disabled="1" skipped="1"/>'
         two = '<testsuite tests="5" failures="0" disabled="0" skipped="0"/>'
-        self.assertEqual(run("test_totals", one, two), "8 passed, 2 failed\n")
+        self.assertEqual(run("test_totals", one, two), "8 passed, 2 failed, 2 skipped\n")
 
     def test_no_report_is_nothing_passed(self):
-        self.assertEqual(run("test_totals"), "0 passed, 0 failed\n")
+        self.assertEqual(run("test_totals"), "0 passed, 0 failed, 0 skipped\n")
+
+
+class TerminalPicture(unittest.TestCase):
+    def setUp(self):
+        self.script = load("terminal_picture")
+
+    @staticmethod
+    def drawing(*lines):
+        return "\n".join(f'<text x="18.0" y="{20 * number}.2" fill="#fff">{line}</text>'
+                         for number, line in enumerate(lines))
+
+    def test_a_picture_is_stale_when_it_says_something_else(self):
+        kept = self.drawing("$ appsync sync", "installed &quot;A&quot;", "done  1 installed")
+        self.assertEqual(self.script.difference(kept, kept), [])
+        changed = self.drawing("$ appsync sync", "installed &quot;A&quot;", "done  1 new")
+        self.assertEqual(self.script.difference(kept, changed)[-2:],
+                         ["-done  1 installed", "+done  1 new"])
+        self.assertNotEqual(self.script.difference(kept, self.drawing("$ appsync sync")), [])
+
+    def test_the_order_of_installs_and_long_numbers_do_not_matter(self):
+        self.assertEqual(self.script.difference(
+            self.drawing("installed A", "installed B", "read 105387 bytes"),
+            self.drawing("installed B", "installed A", "read 98213 bytes")), [])
+
+
+class Setup(unittest.TestCase):
+    def test_who_may_not_install_is_told_all_that_to_type(self):
+        with tempfile.TemporaryDirectory() as folder:
+            tools = pathlib.Path(folder, "tools")
+            tools.mkdir()
+            for name in ("bash", "sed"):
+                (tools / name).symlink_to(shutil.which(name))
+            (tools / "dpkg-query").write_text("#!/bin/bash\n")
+            (tools / "dpkg-query").chmod(0o755)
+            shutil.copytree(SCRIPTS, pathlib.Path(folder, "scripts"))
+            pathlib.Path(folder, "scripts/packages.txt").write_text("g++ 4:12.* build\n")
+            pathlib.Path(folder).chmod(0o755)
+            nobody = {"user": 65534, "group": 65534, "extra_groups": []} if os.geteuid() == 0 else {}
+            done = subprocess.run(
+                [tools / "bash", "-c", 'die() { echo "$*" >&2; exit 1; }; source scripts/setup.sh; '
+                 "need build"], cwd=folder, env={"PATH": str(tools)}, capture_output=True,
+                text=True, **nobody)
+        self.assertEqual((done.returncode, done.stderr),
+                         (1, "as root: apt-get update && apt-get install g++=4:12.*\n"))
 
 
 if __name__ == "__main__":
