@@ -3,15 +3,19 @@
 
 Made for the README's picture; needs Debian's python3-pyte.
 
-usage: terminal_picture.py -o FILE.svg [--columns N] [--rows N] COMMAND [ARGUMENT...]
+usage: terminal_picture.py [--check] -o FILE.svg [--columns N] [--rows N] COMMAND [ARGUMENT...]
+
+With --check it draws nothing, but fails when the picture in FILE.svg says something else.
 """
 
 import argparse
+import collections
+import difflib
 import html
 import os
 import pty
-
-import pyte
+import re
+import sys
 
 COLOURS = {"default": "#d8dee9", "red": "#ff7b72", "green": "#7ee787", "brown": "#e3b341",
            "blue": "#79c0ff", "magenta": "#d2a8ff", "cyan": "#76e3ea", "white": "#ffffff",
@@ -20,6 +24,7 @@ ADVANCE, LINE, MARGIN = 8.43, 19, 18  # pixels, at 14 pixels of font size
 
 
 def screen_after(command, columns, rows):
+    import pyte
     screen = pyte.Screen(columns, rows)
     stream = pyte.ByteStream(screen)
     child, terminal = pty.fork()
@@ -67,15 +72,39 @@ def picture(screen):
     return "\n".join([*parts, "</svg>", ""])
 
 
+def said(drawing):
+    """The lines of a picture. In order of their texts: installs that run side by side end in any
+    order. Without long numbers, which depend on the archivers of the machine."""
+    rows = collections.defaultdict(list)
+    for y, text in re.findall(r'<text [^>]*\by="([^"]+)"[^>]*>([^<]*)</text>', drawing):
+        rows[y].append(re.sub(r"\d{4,}", "#", html.unescape(text)))
+    return sorted(" ".join(row) for row in rows.values())
+
+
+def difference(kept, drawn):
+    """What the picture that is kept says otherwise than the one just drawn; empty for nothing."""
+    return list(difflib.unified_diff(said(kept), said(drawn), "the picture", "the command", "", "",
+                                     0, ""))
+
+
 def main():
     parser = argparse.ArgumentParser(description=__doc__.splitlines()[0])
     parser.add_argument("-o", dest="output", required=True)
     parser.add_argument("--columns", type=int, default=100)
     parser.add_argument("--rows", type=int, default=60)
     parser.add_argument("command", nargs=argparse.REMAINDER)
+    parser.add_argument("--check", action="store_true")
     given = parser.parse_args()
+    drawn = picture(screen_after(given.command, given.columns, given.rows))
+    if given.check:
+        with open(given.output) as kept:
+            stale = difference(kept.read(), drawn)
+        if stale:
+            sys.exit("\n".join([f"{given.output} is stale: draw it anew", *stale]))
+        return
     with open(given.output, "w") as output:
-        output.write(picture(screen_after(given.command, given.columns, given.rows)))
+        output.write(drawn)
 
 
-main()
+if __name__ == "__main__":
+    main()
