@@ -62,50 +62,24 @@ class ClientTest : public testing::Test {
   using Dictionary = PropertyList::Dictionary;
   using Lines = std::vector<std::string>;
 
+  ClientTest();
+  ~ClientTest() override;
+
   /// Made by the first call; the trace begins after its construction.
-  AppsClient& client() {
-    if (!client_) {
-      client_.emplace(phone.platform());
-      forgetTrace();
-    }
-    return *client_;
-  }
+  AppsClient& client();
   void destroyClient() { client_.reset(); }
 
-  void forgetTrace() {
-    phone.trace.clear();
-    phone.log.clear();
-  }
+  void forgetTrace();
 
   /// Compares everything of these kinds since the last comparison, and forgets it.
   void expectTrace(const Lines& expected, fakes::TraceKinds kinds = fakes::TraceEffects,
-                   std::source_location where = std::source_location::current()) {
-    const testing::ScopedTrace place(where.file_name(), static_cast<int>(where.line()), "trace");
-    EXPECT_THAT(phone.trace.readable(kinds), testing::ElementsAreArray(expected));
-    forgetTrace();
-  }
+                   std::source_location where = std::source_location::current());
 
   /// Puts a todo list there: identifier and operation of each entry.
-  void putTodo(std::initializer_list<std::pair<std::string, std::string>> entries) {
-    Array list;
-    for (const auto& [identifier, operation] : entries) {
-      list.push_back(Dictionary{{"identifier", identifier}, {"operation", operation}});
-    }
-    phone.files.putPlist(TodoListPath, list);
-  }
+  void putTodo(std::initializer_list<std::pair<std::string, std::string>> entries);
 
   /// The operation of the identifier's first entry in the todo list as it stands in the file.
-  std::optional<std::string> todoOperation(std::string_view identifier) const {
-    const std::optional<PropertyList> list = phone.files.plistAt(TodoListPath);
-    if (!list || !list->asArray()) return std::nullopt;
-    for (const PropertyList& entry : *list->asArray()) {
-      if (!entry.asDictionary() || !entry.find("identifier")) continue;
-      if (*entry.find("identifier") != PropertyList(identifier)) continue;
-      const std::string* operation = findString(*entry.asDictionary(), "operation");
-      return operation ? std::optional(*operation) : std::nullopt;
-    }
-    return std::nullopt;
-  }
+  std::optional<std::string> todoOperation(std::string_view identifier) const;
 
   fakes::FakePlatform phone;
 

@@ -20,15 +20,12 @@ namespace appsync::fakes {
 /// A whole phone in memory. A test prepares and examines the fakes; the client gets `platform()`,
 /// in which planned faults of `faults` strike.
 struct FakePlatform {
-  FakePlatform() = default;
+  FakePlatform();
+  ~FakePlatform();
   FakePlatform(const FakePlatform&) = delete;
   FakePlatform& operator=(const FakePlatform&) = delete;
 
-  Platform platform() {
-    return {log,          faultyFiles, faultyRegistry, installCoordination, installerService,
-            backup,       policy,      homeScreen,     iconRenderer,        imageEncoders,
-            transactions, notifier,    host,           backgroundQueue};
-  }
+  Platform platform();
 
   CallTrace trace;
   FakeClock clock;
