@@ -7,7 +7,8 @@
 namespace appsync::device {
 
 // Ways for an application to leave the device. Each is on disk when it returns true. The identifier
-// is usable and the caller holds its application lock, but for the first.
+// is usable, and the caller holds its application lock; recovery needs none, since it runs before
+// anyone else has the device.
 
 /// What the registry's clients ask for: takes the placeholder if there is one, else (unless
 /// `placeholderOnly`) the application with its data.
