@@ -18,9 +18,9 @@ void ClientTest::forgetTrace() {
   phone.log.clear();
 }
 
-void ClientTest::expectTrace(const Lines& expected, fakes::TraceKinds kinds,
-                             std::source_location where) {
-  const testing::ScopedTrace place(where.file_name(), static_cast<int>(where.line()), "trace");
+void ClientTest::expectTrace(const Lines& expected, fakes::TraceKinds kinds, const char* file,
+                             int line) {
+  const testing::ScopedTrace place(file, line, "trace");
   EXPECT_THAT(phone.trace.readable(kinds), testing::ElementsAreArray(expected));
   forgetTrace();
 }

@@ -7,7 +7,6 @@
 #include <initializer_list>
 #include <optional>
 #include <ostream>
-#include <source_location>
 #include <string>
 #include <utility>
 #include <vector>
@@ -73,7 +72,7 @@ class ClientTest : public testing::Test {
 
   /// Compares everything of these kinds since the last comparison, and forgets it.
   void expectTrace(const Lines& expected, fakes::TraceKinds kinds = fakes::TraceEffects,
-                   std::source_location where = std::source_location::current());
+                   const char* file = __builtin_FILE(), int line = __builtin_LINE());
 
   /// Puts a todo list there: identifier and operation of each entry.
   void putTodo(std::initializer_list<std::pair<std::string, std::string>> entries);

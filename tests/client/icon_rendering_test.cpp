@@ -20,9 +20,9 @@ class IconRendering : public ClientTest {
   }
 
   /// No line but this, and no file.
-  void expectFailure(const Lines& expected,
-                     std::source_location where = std::source_location::current()) {
-    expectTrace(expected, fakes::TraceEffects, where);
+  void expectFailure(const Lines& expected, const char* file = __builtin_FILE(),
+                     int line = __builtin_LINE()) {
+    expectTrace(expected, fakes::TraceEffects, file, line);
     EXPECT_FALSE(phone.files.exists(TargetPath));
   }
 };

@@ -1,3 +1,5 @@
+#include <algorithm>
+#include <latch>
 #include <thread>
 
 #include "tests/client/install_queue.h"

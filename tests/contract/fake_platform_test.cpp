@@ -1,6 +1,8 @@
 // What tests rely on beyond the contracts: the trace, planned faults and installs that overlap.
 #include "tests/fakes/fake_platform.h"
 
+#include <gtest/gtest.h>
+
 #include <cerrno>
 #include <thread>
 

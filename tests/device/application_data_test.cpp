@@ -6,6 +6,8 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <algorithm>
+
 #include "device/base/temporary_file.h"
 #include "device/files/containers.h"
 #include "device/packages/data_archive.h"

@@ -1,3 +1,4 @@
+#include <algorithm>
 #include <atomic>
 
 #include "tests/device/coordination_test.h"

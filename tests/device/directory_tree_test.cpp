@@ -26,7 +26,7 @@ TEST(DirectoryTree, WithClosedDirectoriesInItIsRemovedByItsOwner) {
   }
   const int status = inOtherProcess([&] {
     if (!becomeOrdinaryUser()) return 2;
-    for (const mode_t mode : {0000, 0100, 0400, 0500}) {
+    for (const mode_t mode : {0000U, 0100U, 0400U, 0500U}) {
       const auto closed = temporary / "tree" / std::to_string(mode);
       std::filesystem::create_directories(closed / "inner");
       fakes::putFile(closed / "inner" / "file", "text");

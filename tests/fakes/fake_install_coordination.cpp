@@ -1,7 +1,6 @@
 #include "tests/fakes/fake_install_coordination.h"
 
 #include <algorithm>
-#include <ranges>
 
 namespace appsync::fakes {
 
@@ -281,10 +280,10 @@ std::shared_ptr<FakeInstallCoordinator> FakeInstallCoordination::seedCoordinator
 std::shared_ptr<FakeInstallCoordinator> FakeInstallCoordination::coordinator(
     std::string_view bundleId) const {
   const std::scoped_lock lock(mutex_);
-  for (const auto& coordinator : coordinators_ | std::views::reverse) {
-    if (coordinator->bundleIdentifier() == bundleId) return coordinator;
-  }
-  return nullptr;
+  const auto found = std::find_if(
+      coordinators_.rbegin(), coordinators_.rend(),
+      [&](const auto& coordinator) { return coordinator->bundleIdentifier() == bundleId; });
+  return found == coordinators_.rend() ? nullptr : *found;
 }
 
 std::size_t FakeInstallCoordination::coordinatorCount() const {
@@ -312,10 +311,9 @@ std::vector<std::shared_ptr<FakeInstallPlaceholder>> FakeInstallCoordination::pl
 std::shared_ptr<FakePathTransferPromise> FakeInstallCoordination::pathPromise(
     std::string_view name) const {
   const std::scoped_lock lock(mutex_);
-  for (const auto& promise : pathPromises_ | std::views::reverse) {
-    if (promise->name() == name) return promise;
-  }
-  return nullptr;
+  const auto found = std::find_if(pathPromises_.rbegin(), pathPromises_.rend(),
+                                  [&](const auto& promise) { return promise->name() == name; });
+  return found == pathPromises_.rend() ? nullptr : *found;
 }
 
 std::size_t FakeInstallCoordination::listenerCount() const {

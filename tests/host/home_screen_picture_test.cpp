@@ -193,8 +193,8 @@ TEST(HomeScreenPicture, ProgressBeyondItsBoundsIsDrawnAsTheBound) {
     icons.push_back(icon(Blue, State::Loading, progress));
   }
   const auto drawn = drawIcons(icons);
-  for (const std::size_t i : {1, 2, 3}) EXPECT_EQ(drawn[i].pixels, drawn[0].pixels) << i;
-  for (const std::size_t i : {5, 6}) EXPECT_EQ(drawn[i].pixels, drawn[4].pixels) << i;
+  for (const std::size_t i : {1U, 2U, 3U}) EXPECT_EQ(drawn[i].pixels, drawn[0].pixels) << i;
+  for (const std::size_t i : {5U, 6U}) EXPECT_EQ(drawn[i].pixels, drawn[4].pixels) << i;
 }
 
 TEST(HomeScreenPicture, EveryStateLooksDifferent) {
@@ -210,7 +210,7 @@ TEST(HomeScreenPicture, EveryStateLooksDifferent) {
 
 TEST(HomeScreenPicture, WithoutAPictureATileShowsTheFirstLetter) {
   const auto tiles = drawTiles({"Tally", "Tower", "tally", "\x01 \xff-tally", "Nine", ""});
-  for (const std::size_t i : {1, 2, 3}) EXPECT_EQ(tiles[i], tiles[0]) << i;
+  for (const std::size_t i : {1U, 2U, 3U}) EXPECT_EQ(tiles[i], tiles[0]) << i;
   EXPECT_NE(tiles[4], tiles[0]);
   EXPECT_NE(tiles[5], tiles[0]);
 }
