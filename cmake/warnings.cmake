@@ -1,7 +1,7 @@
 add_compile_options(-Wall -Wextra -Wconversion -Wshadow -Wold-style-cast -Wsuggest-override
                     -Wnon-virtual-dtor -Werror)
-# Lets ccache keep objects that use a precompiled header.
-add_compile_options(-fpch-preprocess)
+# Lets ccache keep objects that use a precompiled header; clang needs nothing for that.
+add_compile_options($<$<CXX_COMPILER_ID:GNU>:-fpch-preprocess>)
 
 if(APPSYNC_SANITIZE)
   add_compile_options(-fsanitize=${APPSYNC_SANITIZE} -fno-omit-frame-pointer
@@ -10,4 +10,4 @@ if(APPSYNC_SANITIZE)
 endif()
 
 # g++ 12 sees overlapping copies in optimised std::string concatenation where there are none.
-add_compile_options($<$<CONFIG:Release>:-Wno-restrict>)
+add_compile_options($<$<AND:$<CXX_COMPILER_ID:GNU>,$<CONFIG:Release>>:-Wno-restrict>)

@@ -94,6 +94,22 @@ class BenchTable(unittest.TestCase):
         self.assertEqual(table.splitlines()[1].split(), ["x", "5", "ns"])
 
 
+class CoverageTable(unittest.TestCase):
+    def test_sums_up_what_we_ship_by_folder(self):
+        def file(path, count, covered):
+            return {"filename": path, "summary": {"lines": {"count": count, "covered": covered}}}
+
+        summary = {"data": [{"files": [
+            file("/r/device/home/a.cpp", 30, 30), file("/r/device/home/b.h", 10, 0),
+            file("/r/client/c.cpp", 60, 59), file("/r/tests/client/t.cpp", 9, 9),
+            file("/usr/include/client/x.h", 9, 9)]}]}
+        done = subprocess.run([sys.executable, "-B", SCRIPTS / "coverage_table.py", "/r"],
+                              input=json.dumps(summary), capture_output=True, text=True, check=True)
+        self.assertEqual([line.split() for line in done.stdout.splitlines()],
+                         [["folder", "lines", "reached"], ["client", "60", "98.3%"],
+                          ["device/home", "40", "75.0%"], ["all", "100", "89.0%"]])
+
+
 class Totals(unittest.TestCase):
     def test_adds_up_reports(self):
         one = '<testsuite tests="7" failures="2" disabled="1" skipped="1"/>'
