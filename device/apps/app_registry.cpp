@@ -74,7 +74,8 @@ bool mayRemove(DeviceCore& core, std::optional<Error>* error) {
 InstallDetails placeholderDetails(const PropertyList::Dictionary& options) {
   const PropertyList* type = find(options, SWInstallTypeKey);
   return {static_cast<InstallType>(type ? type->asUnsigned().value_or(0) : 0),
-          dataOption(options, SWHalvoMetadataKey), dataOption(options, SWApplicationSINFKey), HistoryOrigin::Sync};
+          dataOption(options, SWHalvoMetadataKey), dataOption(options, SWApplicationSINFKey),
+          HistoryOrigin::Sync};
 }
 
 }  // namespace

@@ -265,8 +265,8 @@ bool CoordinatedInstalls::installPackage(const CoordinatorState& state) {
   if (beginning != Beginning::Made) return beginning == Beginning::NotReady;
   std::optional<Error> error;
   const FileLocation package{*state.package->path, state.package->pathIsDirectory};
-  const bool installed = core_.registry().installPackageWith(
-      package, identifier, detailsOf(state), &error);
+  const bool installed =
+      core_.registry().installPackageWith(package, identifier, detailsOf(state), &error);
   finish(state, installed ? std::nullopt : error);
   return false;
 }

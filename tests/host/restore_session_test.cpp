@@ -162,7 +162,7 @@ TEST_F(RestoreTest, TellsWhyTheDataOfAnInstalledApplicationStays) {
                          Error::withDescription(POSIXErrorDomain, EBUSY, "com.a is open"));
   EXPECT_EQ(
       restore(),
-      "failed: com.a (its data could not be given back: com.a is open); data restored: com.b");
+      "data restored: com.b; failed: com.a (its data could not be given back: com.a is open)");
 }
 
 TEST_F(RestoreTest, RestoresOnlyWhatIsNamed) {

@@ -123,7 +123,7 @@ TEST_F(SessionTest, StopsAPackageThatIsCancelledOnThePhone) {
   EXPECT_THAT(trace("client.assetTransferSucceeded"),
               ElementsAre("client.assetTransferSucceeded(com.a, failed, TWError 30)",
                           "client.assetTransferSucceeded(com.b, com.b.tar, none)"));
-  EXPECT_FALSE(phone.files.exists(std::string(Root) + "com.a.tar"));
+  EXPECT_FALSE(phone.files.exists(joinPath(exchange::StagingRoot, "com.a.tar")));
   EXPECT_EQ(text(result.summary), "installed: com.b; failed: com.a (cancelled on the phone)");
 }
 
@@ -168,7 +168,7 @@ TEST_F(SessionTest, FailsAPackageThatShrinksWhileItIsSent) {
   const SyncResult result = sync();
   ASSERT_THAT(result.summary.failed, SizeIs(1));
   EXPECT_THAT(result.summary.failed[0].reason, ::testing::HasSubstr("changed while it was being"));
-  EXPECT_FALSE(phone.files.exists(std::string(Root) + "com.a.tar"));
+  EXPECT_FALSE(phone.files.exists(joinPath(exchange::StagingRoot, "com.a.tar")));
 }
 
 TEST_F(SessionTest, DoesNotHangOnAPipeInAPackagesPlace) {
@@ -241,12 +241,12 @@ TEST_F(SessionTest, EndsInstallsThatWaitWhenInterruptedAtTheEnd) {
   EXPECT_THAT(trace("phone.hurry"), SizeIs(1));
   EXPECT_EQ(trace("client.").back(), "client.syncEndedWithSuccess(false)");
   EXPECT_EQ(text(result.summary), "failed: com.a (interrupted; the next sync does it)");
-  EXPECT_FALSE(phone.files.exists(std::string(Root) + "com.a.tar"));
+  EXPECT_FALSE(phone.files.exists(joinPath(exchange::StagingRoot, "com.a.tar")));
 }
 
 TEST_F(SessionTest, DoesNotTakeAnOlderSyncsTodoListForItsOwn) {
   offer("com.a");
-  phone.files.putPlist(std::string(exchange::WorkArea) + "/ApplicationsSync.plist",
+  phone.files.putPlist(joinPath(exchange::WorkArea, exchange::TodoListName),
                        PropertyList::Array{PropertyList::Dictionary{{"identifier", "com.a"},
                                                                     {"operation", "INSTALLED"}}});
   client.reconcileError = Error::posix(EIO);
