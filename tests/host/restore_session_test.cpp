@@ -176,9 +176,11 @@ TEST_F(RestoreTest, RestoresOnlyWhatIsNamed) {
   for (const char* identifier : {"com.a", "com.b", "com.other"}) offer(identifier);
   only = {"com.a", "com.b"};
   packages = store = true;
-  EXPECT_EQ(
-      restore(),
-      "data restored: com.b; failed: com.a (its data could not be given back: com.a is open)");
+  EXPECT_EQ(restore(),
+            "installed: com.a; skipped: com.b (stays a placeholder until it is asked for)");
+  const PropertyList::Dictionary demoted{{"AutomaticDowngrades", PropertyList::Array{"com.other2"}},
+                                         {"IntentionalDowngrades", PropertyList::Array{"com.b"}}};
+  EXPECT_EQ(phone.files.plistAt(exchange::DemotedApplications), PropertyList(demoted));
 }
 
 TEST_F(RestoreTest, IsNotCompleteWhenTheHomeScreenTakesNoLayout) {
