@@ -7,6 +7,9 @@ if(APPSYNC_SANITIZE)
   add_compile_options(-fsanitize=${APPSYNC_SANITIZE} -fno-omit-frame-pointer
                       -fno-sanitize-recover=all)
   add_link_options(-fsanitize=${APPSYNC_SANITIZE})
+  # In instrumented code g++ 12 sees faults where there are none, such as uninitialised members of
+  # empty optionals: warnings are errors in the build without sanitizers only.
+  add_compile_options(-Wno-error)
 endif()
 
 # g++ 12 sees overlapping copies in optimised std::string concatenation where there are none.
