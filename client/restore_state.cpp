@@ -1,8 +1,9 @@
 // The restore state: values kept per application and version until its install has ended.
 
 #include "client/apps_client.h"
-#include "client/missing.h"
 #include "client/paths.h"
+#include "client/unreadable.h"
+#include "platform/existence.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync {

@@ -3,9 +3,10 @@
 #include <algorithm>
 
 #include "client/apps_client.h"
-#include "client/missing.h"
 #include "client/paths.h"
+#include "client/unreadable.h"
 #include "platform/property_list_codec.h"
+#include "platform/todo_entry.h"
 
 namespace appsync {
 namespace {
@@ -21,10 +22,11 @@ std::optional<PropertyList> readPlist(FileManager& files, std::string_view path,
   return parsed;
 }
 
-bool names(const PropertyList& entry, std::string_view identifier) {
-  const PropertyList* value = entry.find("identifier");
-  const std::string* text = value ? value->asString() : nullptr;
-  return text && *text == identifier;
+/// The first entry of the identifier, which is the one that counts.
+template <typename List>
+auto entryOf(List& list, std::string_view identifier) {
+  return std::ranges::find_if(
+      list, [&](const PropertyList& item) { return TodoEntry(item).isFor(identifier); });
 }
 
 }  // namespace
@@ -68,11 +70,10 @@ void AppsClient::changeAssetID(std::string_view identifier, std::string_view toD
   const std::lock_guard lock(_stateFileMutex);
   std::optional<PropertyList::Array> list = _loadListOrSay(paths::TodoList);
   if (!list) return;
-  const auto entry = std::ranges::find_if(
-      *list, [identifier](const PropertyList& item) { return names(item, identifier); });
+  const auto entry = entryOf(*list, identifier);
   if (entry == list->end()) return;
 
-  PropertyList& operation = (*entry->asDictionary())["operation"];
+  PropertyList& operation = (*entry->asDictionary())[std::string(exchange::TodoOperationKey)];
   _log.normal("Changing %{public}@ from %{public}@ to %{public}@", identifier, operation, toDo);
   operation = toDo;
   const std::optional<Bytes> bytes =
@@ -84,10 +85,9 @@ std::optional<std::string> AppsClient::_operationStateForIdentifier(
     std::string_view identifier) const {
   const std::optional<PropertyList::Array> list = _loadListOrSay(paths::TodoList);
   if (!list) return std::nullopt;
-  const auto entry = std::ranges::find_if(
-      *list, [identifier](const PropertyList& item) { return names(item, identifier); });
+  const auto entry = entryOf(*list, identifier);
   if (entry == list->end()) return std::nullopt;
-  const std::string* operation = findString(*entry->asDictionary(), "operation");
+  const std::string* operation = TodoEntry(*entry).operation();
   return operation ? std::optional(*operation) : std::nullopt;
 }
 

@@ -2,6 +2,7 @@
 
 #include "client/apps_client.h"
 #include "coordination/failure.h"
+#include "platform/sync_files.h"
 
 namespace appsync {
 namespace {
@@ -36,7 +37,7 @@ void AppsClient::coordinatorDidCompleteSuccessfully(InstallCoordinator& coordina
   _log.normal("coordinatorDidCompleteSuccessfully for %{public}@ with error %{public}@", bundleId,
               error);
   if (!bundleId) return;
-  changeAssetID(*bundleId, error ? "FAILED" : "INSTALLED");
+  changeAssetID(*bundleId, error ? exchange::TodoFailed : exchange::TodoInstalled);
   cleanRestoreStateForIdentifier(*bundleId);
 }
 

@@ -6,8 +6,8 @@
 
 #include "device/apps/installs.h"
 #include "device/apps/removal.h"
-#include "device/files/existence.h"
 #include "device/state/application_rows.h"
+#include "platform/existence.h"
 
 namespace appsync::device {
 namespace {

@@ -12,8 +12,9 @@
 /// Paths are the phone's own. All files are property lists, binary or XML, unless said otherwise;
 /// each is replaced whole, so that nobody sees half of one. The client takes a missing, empty or
 /// damaged file as absent unless said otherwise; a damaged one also gives a log line. One that it
-/// cannot read just now it takes as absent for that call, says so, and leaves as it is. Keys that
-/// are not named here belong to the side that writes the file, and the other passes them through.
+/// cannot read just now it takes as absent for that call, says so, and leaves as it is, but for the
+/// restore list. Keys that are not named here belong to the side that writes the file, and the
+/// other passes them through.
 namespace appsync::exchange {
 
 // A desktop sync.
@@ -66,7 +67,7 @@ inline const std::string LastSyncState = joinPath(SyncRoot, "LastSyncAppState.pl
 /// The applications of the backup: a dictionary from identifier to a dictionary with the keys
 /// below. The host writes it last of all that a restore needs, before
 /// SyncClient::reconcileRestoreOfType; the client moves it aside when it has made the placeholders,
-/// also when it is damaged.
+/// also when it is damaged or cannot be read.
 inline constexpr std::string_view RestoreList =
     "/var/mobile/Media/HalvoRestore/RestoreApplications.plist";
 /// Data, required: the application's metadata, a property list of its own.
@@ -96,8 +97,7 @@ inline const std::string RestoreState = joinPath(SyncRoot, "RestoreState.plist")
 /// String: where the package lies.
 inline constexpr std::string_view RestorePathKey = "path";
 
-/// Where the packages of a restore lie, and those that a store brings. The client takes a package
-/// from here or from the staging root, and ignores one that lies elsewhere.
+/// Where the packages of a restore lie, and those that a store brings.
 inline constexpr std::string_view Downloads = "/var/mobile/Media/Downloads";
 
 // An application's own files, in its container, in its directory of the staging area, and beside

@@ -2,8 +2,9 @@
 
 #include "client/apps_client.h"
 #include "client/identifier_safety.h"
-#include "client/missing.h"
 #include "client/paths.h"
+#include "client/unreadable.h"
+#include "platform/existence.h"
 #include "restore/halvo_metadata.h"
 #include "restore/placeholder_info.h"
 
@@ -124,16 +125,16 @@ bool AppsClient::_restoreApplications(const PropertyList::Dictionary& restoreLis
   const DemotedApps demoted(lists.value_or(PropertyList::Dictionary{}));
   bool result = false;
   for (const auto& [bundleId, value] : restoreList) {
-    // The whole path is tested, since ".." climbs out of the folder that it is joined to.
-    if (!isSafe(placeholderAppPathForBundleIdentifier(bundleId))) {
-      _log.normal("Ignoring invalid path: %{public}@", bundleId);
-      continue;
-    }
     const DemotionStatus status = demoted.statusOf(bundleId);
     _log.normal("processing halvo restore info for '%{public}@' demotionStatus :%lu", bundleId,
                 static_cast<std::uint64_t>(status));
     if (_placeholderExistsForApplication(bundleId)) {
       _log.normal("placeholder already exists for '%{public}@' - skiping'", bundleId);
+      continue;
+    }
+    // The whole path is tested, since ".." climbs out of the folder that it is joined to.
+    if (!isSafe(placeholderAppPathForBundleIdentifier(bundleId))) {
+      _log.normal("Ignoring invalid path: %{public}@", bundleId);
       continue;
     }
     const std::optional<RestoreEntry> entry = readEntry(_log, bundleId, value);

@@ -5,6 +5,7 @@
 #include "client/apps_client.h"
 #include "client/paths.h"
 #include "platform/bundle.h"
+#include "platform/todo_entry.h"
 
 namespace appsync {
 namespace {
@@ -14,10 +15,9 @@ class TodoIndex {
  public:
   explicit TodoIndex(const std::optional<PropertyList::Array>& todoList) {
     if (!todoList) return;
-    for (const PropertyList& entry : *todoList) {
-      const PropertyList::Dictionary* fields = entry.asDictionary();
-      const std::string* identifier = fields ? findString(*fields, "identifier") : nullptr;
-      if (identifier) first_.emplace(*identifier, fields);
+    for (const PropertyList& item : *todoList) {
+      const TodoEntry entry(item);
+      if (const std::string* identifier = entry.identifier()) first_.emplace(*identifier, entry);
     }
   }
 
@@ -25,13 +25,11 @@ class TodoIndex {
 
   bool hasOperation(std::string_view identifier, std::string_view operation) const {
     const auto entry = first_.find(identifier);
-    if (entry == first_.end()) return false;
-    const std::string* value = findString(*entry->second, "operation");
-    return value && *value == operation;
+    return entry != first_.end() && entry->second.hasOperation(operation);
   }
 
  private:
-  std::map<std::string_view, const PropertyList::Dictionary*> first_;
+  std::map<std::string_view, TodoEntry> first_;
 };
 
 /// The value under `key` if `typed` accepts it; a value of another type is reported and dropped.
@@ -101,8 +99,8 @@ PropertyList::Dictionary AppsClient::installedAssets() noexcept {
   const TodoIndex todo(todoList);
   for (const std::string& candidate : candidates) {
     const bool found = todo.holds(candidate);
-    const bool failed = todo.hasOperation(candidate, "FAILED");
-    const bool previouslyInstalled = todo.hasOperation(candidate, "INSTALLED");
+    const bool failed = todo.hasOperation(candidate, exchange::TodoFailed);
+    const bool previouslyInstalled = todo.hasOperation(candidate, exchange::TodoInstalled);
     if (found && !failed && !previouslyInstalled) {
       _log.normal("%{public}@ not installed, but is in our todo list. Not marking deleted",
                   candidate);

@@ -3,9 +3,11 @@
 
 #include "client/apps_client.h"
 #include "client/identifier_safety.h"
-#include "client/missing.h"
 #include "client/paths.h"
+#include "client/unreadable.h"
+#include "platform/existence.h"
 #include "platform/property_list_codec.h"
+#include "platform/todo_entry.h"
 
 namespace appsync {
 namespace {
@@ -13,9 +15,9 @@ namespace {
 /// A restore from a backup that a desktop made.
 constexpr std::int32_t RestoreFromDesktopBackup = 2;
 
-bool isSafeRemoval(const PropertyList& entry) {
-  const PropertyList* operation = entry.find("operation");
-  return isSafe(entry.find("identifier")) && operation && *operation == PropertyList("remove");
+bool isSafeRemoval(const TodoEntry& entry) {
+  return isSafe(entry.value(exchange::TodoIdentifierKey)) &&
+         entry.hasOperation(exchange::TodoRemove);
 }
 
 /// Moves the staging area to the work area, in place of the previous one. none: go on; otherwise
@@ -77,9 +79,10 @@ bool AppsClient::reconcileSync(const PropertyList&, std::string_view newAnchor,
 void AppsClient::_performDeletions(const PropertyList::Array& todoList) {
   std::vector<std::string> deletions;
   deletions.reserve(8);
-  for (const PropertyList& entry : todoList) {
+  for (const PropertyList& item : todoList) {
+    const TodoEntry entry(item);
     if (!isSafeRemoval(entry)) continue;
-    deletions.push_back(*entry.find("identifier")->asString());
+    deletions.push_back(*entry.identifier());
     _log.normal("%{public}@ targeted for termination", deletions.back());
   }
   if (deletions.empty()) return;

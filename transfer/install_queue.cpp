@@ -5,8 +5,8 @@
 
 #include "client/apps_client.h"
 #include "platform/bundle.h"
+#include "platform/sync_files.h"
 #include "transfer/install_plan.h"
-#include "transfer/package_path.h"
 
 namespace appsync {
 namespace {
@@ -16,6 +16,21 @@ constexpr std::string_view InstallScenario = "Asset install";
 constexpr std::string_view FailureScenario = "Aerix restore";
 /// The application service's own errors, which no second try mends.
 constexpr std::string_view StartwellErrorDomain = "StartwellError";
+
+/// Removes a package whose install is over. What is not seen to be a file stays: an empty path
+/// leads to the directory in which all packages arrive.
+void removePackage(FileManager& files, const std::string& path) {
+  const std::optional<ItemAttributes> item = files.attributesOfItem(path);
+  if (item && !item->isDirectory) files.removeItem(path);
+}
+
+/// Without a placeholder over it, the registry would take the working version that was to be
+/// updated.
+bool wouldTakeTheApplication(AppRegistry& registry, std::string_view identifier) {
+  const std::optional<AppRecord> record = registry.recordForIdentifier(identifier, false);
+  return record && record->isInstalled && !record->isPlaceholder &&
+         !registry.recordForIdentifier(identifier, true);
+}
 
 }  // namespace
 
@@ -54,7 +69,7 @@ void AppsClient::_performAssetInstall(const SyncAssetPtr& asset) {
       break;
   }
   result.assertion.reset();
-  removePackage(_platform.files, asset->path);
+  if (asset->path) removePackage(_platform.files, *asset->path);
 }
 
 void AppsClient::_installPackage(const SyncAssetPtr& asset) {
@@ -90,7 +105,7 @@ void AppsClient::_retryAssetInstall(const SyncAssetPtr& asset) {
 
 void AppsClient::assetInstallSucceeded(const SyncAssetPtr& asset) noexcept {
   _log.normal("%{public}@ install succeeded", asset->identifier);
-  changeAssetID(asset->identifier, "INSTALLED");
+  changeAssetID(asset->identifier, exchange::TodoInstalled);
   cleanRestoreStateForIdentifier(asset->identifier);
 }
 
@@ -106,7 +121,7 @@ void AppsClient::_installFailed(const SyncAssetPtr& asset, const std::optional<E
                                          "install failed recoverably");
   } else {
     _log.normal("%{public}@ install failed unrecoverably: %{public}@", identifier, error);
-    changeAssetID(identifier, "FAILED");
+    changeAssetID(identifier, exchange::TodoFailed);
     _cancelApplicationRestore(*asset,
                               logMessage("not asking backup manager to cancel app restore for "
                                          "%{public}@ as install coordination is enabled",
@@ -127,10 +142,8 @@ void AppsClient::_removeFailedPlaceholder(const SyncAsset& asset) {
     }
     return;
   }
-  // Without a placeholder the registry would take the working version that was to be updated.
-  AppRegistry& registry = _platform.appRegistry;
-  const bool removed = registry.recordForIdentifier(identifier, true) &&
-                       registry.uninstallApplication(identifier, {});
+  const bool removed = !wouldTakeTheApplication(_platform.appRegistry, identifier) &&
+                       _platform.appRegistry.uninstallApplication(identifier, {});
   if (!removed) _log.error("Uninstall of %{public}@ failed.", identifier);
   _platform.transactionLog.logScenario(
       FailureScenario, 0, removed, identifier,

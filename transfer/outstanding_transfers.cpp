@@ -1,9 +1,11 @@
 // Which packages the host must still send, and what is made ready for each of them.
 
+#include <cerrno>
+
 #include "client/apps_client.h"
 #include "client/identifier_safety.h"
-#include "client/missing.h"
 #include "client/paths.h"
+#include "platform/existence.h"
 #include "transfer/in_progress_query.h"
 #include "transfer/transfer_candidates.h"
 #include "transfer/transfer_rules.h"
@@ -53,7 +55,8 @@ bool packageIsHere(FileManager& files, const std::string& identifier,
     log.normal("Recovered download path for %{public}@ at %{public}@", identifier, *path);
     return true;
   }
-  if (isMissing(error)) {
+  const bool isNoPath = error && error->code == EINVAL;
+  if (isMissing(error) || isNoPath) {
     log.normal("Download path recovered for %{public}@ but the file is missing: %{public}@",
                identifier, *path);
   } else {
@@ -64,17 +67,19 @@ bool packageIsHere(FileManager& files, const std::string& identifier,
   return false;
 }
 
-/// Whether the candidate's identifier and record give paths to work with.
-bool hasUsablePaths(const TransferCandidate& app, const ClientLog& log) {
-  if (!isSafe(app.iconPath)) {
-    log.normal("Ignoring invalid path: %{public}@", app.identifier);
-    return false;
-  }
-  if (!app.bundlePath || !app.container) {
-    log.normal("skipping %{public}@ - it has no bundle or no container", app.identifier);
-    return false;
-  }
-  return true;
+/// Whether a file can be named after the candidate.
+bool hasUsableName(const TransferCandidate& app, const ClientLog& log) {
+  if (isSafe(app.iconPath)) return true;
+  log.normal("Ignoring invalid path: %{public}@", app.identifier);
+  return false;
+}
+
+/// The icon that goes with the asset: the rendered one, else the artwork, if there is a place for
+/// it.
+std::optional<FileLocation> iconOf(const TransferCandidate& app, bool rendered) {
+  if (rendered) return FileLocation::file(app.iconPath);
+  if (!app.container) return std::nullopt;
+  return FileLocation::file(paths::artworkIn(*app.container));
 }
 
 }  // namespace
@@ -106,7 +111,7 @@ std::vector<SyncAssetPtr> AppsClient::outstandingAssetTransfers() noexcept {
   for (const PropertyList& entry : ordered) {
     const std::optional<TransferCandidate> candidate = readCandidate(entry, _platform.files);
     if (!candidate || !isWanted(*candidate, context, _log)) continue;
-    if (!hasUsablePaths(*candidate, _log)) continue;
+    if (!hasUsableName(*candidate, _log)) continue;
     const SyncAssetPtr asset = _prepareAsset(*candidate);
     const bool handedOff =
         _useInstallCoordinator
@@ -125,18 +130,18 @@ SyncAssetPtr AppsClient::_prepareAsset(const TransferCandidate& app) {
 
   SyncAssetPtr asset =
       _platform.syncHost.makeDownload(app.identifier, ApplicationDataclass, prettyName);
-  asset->icon = FileLocation::file(rendered ? app.iconPath : paths::artworkIn(*app.container));
+  asset->icon = iconOf(app, rendered);
   asset->isRestore = app.isRestore;
 
-  const bool here =
-      packageIsHere(_platform.files, app.identifier,
-                    _restoreStatePropertyForKey("path", app.identifier, app.version), _log);
+  const bool here = packageIsHere(
+      _platform.files, app.identifier,
+      _restoreStatePropertyForKey(exchange::RestorePathKey, app.identifier, app.version), _log);
   PropertyList::Dictionary options;
   options.emplace(AssetPartsKey, static_cast<std::int64_t>(assetParts(app.isRestore, here)));
   if (app.version) options.emplace(AssetVersionKey, *app.version);
   asset->variantOptions = std::move(options);
-  asset->storePlist = paths::metadataIn(*app.container);
-  asset->infoPlist = paths::infoIn(*app.bundlePath);
+  if (app.container) asset->storePlist = paths::metadataIn(*app.container);
+  if (app.bundlePath) asset->infoPlist = paths::infoIn(*app.bundlePath);
   _log.normal(
       "Asset %{public}@ (pretty=%{public}@, version=%{public}@) prepped with icon %{public}@, at "
       "%{public}@, meta at %{public}@, info at %{public}@, storePid=%lld, isRestore=%c",
@@ -166,7 +171,7 @@ bool AppsClient::_handOffCoordinated(const SyncAssetPtr& asset) {
   }
   if (!prepareAppForInstallUsingCoordination(asset, existing)) {
     _log.error("Not requesting app asset for %{public}@", identifier);
-    changeAssetID(identifier, "FAILED");
+    changeAssetID(identifier, exchange::TodoFailed);
     return false;
   }
   if (existing) _accessQueue.sync([&] { _updatingApps.insert(identifier); });

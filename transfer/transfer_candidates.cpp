@@ -4,6 +4,7 @@
 #include "client/paths.h"
 #include "client/usable_text.h"
 #include "platform/bundle.h"
+#include "platform/todo_entry.h"
 
 namespace appsync {
 namespace {
@@ -22,21 +23,23 @@ void put(PropertyList::Dictionary& entry, std::string_view key,
 }
 
 /// Takes over a value of the todo list as it stands, if there is one.
-void putFrom(PropertyList::Dictionary& entry, std::string_view key, const PropertyList& source,
+void putFrom(PropertyList::Dictionary& entry, std::string_view key, const TodoEntry& source,
              std::string_view sourceKey) {
-  if (const PropertyList* value = source.find(sourceKey)) entry.emplace(key, *value);
+  if (const PropertyList* value = source.value(sourceKey)) entry.emplace(key, *value);
 }
 
-PropertyList::Dictionary todoEntry(const PropertyList& todo, const std::string& identifier,
+PropertyList::Dictionary todoEntry(const PropertyList& item, const std::string& identifier,
                                    const ClientLog& log) {
-  sayUnexpectedTypes(log, identifier, *todo.asDictionary(), {"version", "name"});
+  sayUnexpectedTypes(log, identifier, *item.asDictionary(),
+                     {exchange::TodoVersionKey, exchange::TodoNameKey});
+  const TodoEntry todo(item);
   const std::string path = joinPath(paths::WorkArea, identifier);
   PropertyList::Dictionary entry;
   entry.emplace(PathKey, path);
   entry.emplace(ContainerKey, path);
   entry.emplace(KBBundleIdentifier, identifier);
-  putFrom(entry, KBBundleVersion, todo, "version");
-  putFrom(entry, NameFromHalvoKey, todo, "name");
+  putFrom(entry, KBBundleVersion, todo, exchange::TodoVersionKey);
+  putFrom(entry, NameFromHalvoKey, todo, exchange::TodoNameKey);
   return entry;
 }
 
@@ -75,10 +78,10 @@ PropertyList::Dictionary placeholderEntry(const AppRecord& record) {
 
 void addTodoEntries(const PropertyList::Array& todoList, CandidateEntries& entries,
                     const ClientLog& log) {
-  for (const PropertyList& todo : todoList) {
-    const PropertyList* operation = todo.find("operation");
-    if (!operation || *operation != PropertyList("install")) continue;
-    const PropertyList* value = todo.find("identifier");
+  for (const PropertyList& item : todoList) {
+    const TodoEntry todo(item);
+    if (!todo.hasOperation(exchange::TodoInstall)) continue;
+    const PropertyList* value = todo.value(exchange::TodoIdentifierKey);
     if (!isSafe(value)) {
       log.normal("Ignoring invalid path: %{public}@", value ? *value : PropertyList::null());
       continue;
@@ -88,7 +91,7 @@ void addTodoEntries(const PropertyList::Array& todoList, CandidateEntries& entri
     if (entries.all.contains(identifier)) {
       log.normal("%{public}@ already has a placeholder - skipping", identifier);
     } else {
-      entries.all.emplace(identifier, todoEntry(todo, identifier, log));
+      entries.all.emplace(identifier, todoEntry(item, identifier, log));
     }
   }
 }

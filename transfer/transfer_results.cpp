@@ -1,13 +1,11 @@
 // How far each package's transfer has come, how it ended, and the end of them all.
 
-#include <algorithm>
 #include <cmath>
 
 #include "client/apps_client.h"
 #include "client/identifier_safety.h"
 #include "client/paths.h"
 #include "coordination/failure.h"
-#include "transfer/package_path.h"
 #include "transfer/status_names.h"
 
 namespace appsync {
@@ -15,10 +13,10 @@ namespace {
 
 constexpr std::int64_t ProgressUnits = 1000;
 
-/// A host that has nothing to send divides by zero: what is no fraction counts as none of it.
+/// A host that has nothing to send divides by zero: what is no number counts as none of it.
 std::int64_t completedUnits(double fraction) {
-  if (!(fraction > 0)) return 0;
-  return static_cast<std::int64_t>(std::trunc(std::min(fraction, 1.0) * ProgressUnits));
+  const double units = std::trunc(fraction * ProgressUnits);
+  return std::abs(units) < 0x1p63 ? static_cast<std::int64_t>(units) : 0;
 }
 
 bool isUnfinished(InstallState state) {
@@ -95,7 +93,7 @@ void AppsClient::_assetReceived(const SyncAssetPtr& asset,
     asset->path = joinPath(paths::StagingRoot, *asset->path);
   } else if (!asset->path) {
     const std::optional<PropertyList> remembered =
-        _restoreStatePropertyForKey("path", identifier, versionOf(*asset));
+        _restoreStatePropertyForKey(exchange::RestorePathKey, identifier, versionOf(*asset));
     if (remembered && remembered->asString()) asset->path = *remembered->asString();
   }
   if (!isSafe(asset->path)) {
@@ -103,15 +101,11 @@ void AppsClient::_assetReceived(const SyncAssetPtr& asset,
     return;
   }
   if (!asset->isDownload) {
-    changeAssetID(identifier, "SENT");
-    return;
-  }
-  if (!isPackagePath(_platform.files, asset->path)) {
-    _log.normal("Ignoring invalid path: %{public}@", asset->path);
+    changeAssetID(identifier, exchange::TodoSent);
     return;
   }
   _log.normal("Received file at %{public}@", asset->path);
-  changeAssetID(identifier, "DOWNLOADED");
+  changeAssetID(identifier, exchange::TodoDownloaded);
   if (asset->isRestore) {
     _restoreAssetReceived(asset, progress);
     return;
@@ -149,7 +143,8 @@ void AppsClient::_restoreAssetReceived(const SyncAssetPtr& asset,
   }
   _log.normal("Restore data exists for %{public}@", asset->shortDescription);
   if (progress) progress->setInstallPhase(InstallPhase::RestoringData);
-  _setRestoreStatePropertyValue(*asset->path, "path", asset->identifier, versionOf(*asset));
+  _setRestoreStatePropertyValue(*asset->path, exchange::RestorePathKey, asset->identifier,
+                                versionOf(*asset));
 }
 
 void AppsClient::_assetTransferFailed(const SyncAssetPtr& asset,

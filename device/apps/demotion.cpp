@@ -6,10 +6,11 @@
 
 #include "device/apps/idle_application.h"
 #include "device/apps/installers.h"
-#include "device/files/existence.h"
 #include "device/journal/history.h"
 #include "platform/bundle.h"
+#include "platform/existence.h"
 #include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
 
 namespace appsync::device {
 namespace {
@@ -22,8 +23,9 @@ std::string iconOf(FileManager& files, const ApplicationRow& installed) {
   const std::string* name = info ? findString(*info, KBBundleIconFile) : nullptr;
   const std::string icon = name ? joinPath(installed.bundlePath(), *name) : std::string();
   const auto attributes = icon.empty() ? std::nullopt : files.attributesOfItem(icon);
-  return attributes && !attributes->isDirectory ? icon
-                                                : joinPath(installed.container, "HalvoArtwork");
+  return attributes && !attributes->isDirectory
+             ? icon
+             : joinPath(installed.container, exchange::ArtworkName);
 }
 
 /// A placeholder without an icon is better than none.
@@ -48,7 +50,7 @@ bool layPlaceholder(DeviceCore& core, const ApplicationRow& installed,
                     std::optional<Error>* error) {
   const std::string bundle = joinPath(BundleParts, installed.identifier + ".app");
   InstallDetails details{InstallType::IntentionalDowngrade, std::nullopt, installed.sinf};
-  const std::string metadata = joinPath(installed.container, "HalvoMetadata.plist");
+  const std::string metadata = joinPath(installed.container, exchange::MetadataName);
   if (!readIfThere(core.files, metadata, details.metadata, error)) return false;
   const bool laid = buildBundle(core.files, installed, bundle, error) &&
                     installPlaceholder(core, bundle, installed.identifier, details, error);

@@ -3,9 +3,9 @@
 #include <cerrno>
 
 #include "device/apps/idle_application.h"
-#include "device/files/existence.h"
 #include "device/state/application_rows.h"
 #include "platform/bundle.h"
+#include "platform/existence.h"
 
 namespace appsync::device {
 namespace {

@@ -5,17 +5,15 @@
 #include "device/apps/installs.h"
 #include "device/apps/removal.h"
 #include "device/apps/staged_container.h"
-#include "device/files/existence.h"
 #include "device/home/icon_order.h"
 #include "device/journal/history.h"
 #include "platform/bundle.h"
+#include "platform/existence.h"
 #include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
 
 namespace appsync::device {
 namespace {
-
-constexpr std::string_view MetadataFile = "HalvoMetadata.plist";
-constexpr std::string_view ArtworkFile = "HalvoArtwork";
 
 /// A package without a store file of its own keeps the placeholder's or the old version's.
 bool carryOver(DeviceCore& core, std::string_view file, const ApplicationRows& before,
@@ -59,18 +57,20 @@ bool extractInto(DeviceCore& core, const std::string& package, const std::string
   row.diskUsage = extracted->bytes;
   describe(row, extracted->info);
   if (!extracted->hasMetadata && details.metadata &&
-      !core.files.writeAtomically(joinPath(container, MetadataFile), *details.metadata, error)) {
+      !core.files.writeAtomically(joinPath(container, exchange::MetadataName), *details.metadata,
+                                  error)) {
     return false;
   }
   const bool hasMetadata = extracted->hasMetadata || details.metadata;
-  return (hasMetadata || carryOver(core, MetadataFile, before, container, error)) &&
-         (extracted->hasArtwork || carryOver(core, ArtworkFile, before, container, error));
+  return (hasMetadata || carryOver(core, exchange::MetadataName, before, container, error)) &&
+         (extracted->hasArtwork ||
+          carryOver(core, exchange::ArtworkName, before, container, error));
 }
 
 /// What the metadata says; of one that does not parse nothing is expected.
 bool readMetadata(DeviceCore& core, ApplicationRow& row, std::optional<Error>* error) {
   std::optional<Bytes> contents;
-  const std::string file = joinPath(row.container, MetadataFile);
+  const std::string file = joinPath(row.container, exchange::MetadataName);
   if (!readIfThere(core.files, file, contents, error)) return false;
   const auto metadata = contents ? parsePropertyList(*contents) : std::nullopt;
   const PropertyList* flag = metadata ? metadata->find("DeviceBasedQLP") : nullptr;

@@ -5,12 +5,13 @@
 #include "device/apps/installers.h"
 #include "device/apps/installs.h"
 #include "device/apps/staged_container.h"
-#include "device/files/existence.h"
 #include "device/home/icon_order.h"
 #include "device/journal/history.h"
 #include "platform/bundle.h"
+#include "platform/existence.h"
 #include "platform/installer_service.h"
 #include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
 
 namespace appsync::device {
 namespace {
@@ -54,7 +55,7 @@ bool fill(DeviceCore& core, const std::string& source, const InstallDetails& det
   row.diskUsage = sizeOf(core, joinPath(row.bundlePath(), "Info.plist")) +
                   sizeOf(core, joinPath(row.bundlePath(), "Icon.png"));
   if (!details.metadata) return true;
-  const std::string metadata = joinPath(row.container, "HalvoMetadata.plist");
+  const std::string metadata = joinPath(row.container, exchange::MetadataName);
   row.diskUsage += details.metadata->size();
   return core.files.writeAtomically(metadata, *details.metadata, error);
 }

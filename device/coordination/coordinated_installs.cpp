@@ -16,7 +16,6 @@ namespace appsync::device {
 namespace {
 
 constexpr std::string_view IconFile = "Icon.png";
-constexpr std::string_view MetadataFile = "HalvoMetadata.plist";
 constexpr std::string_view LaunchProhibitedKey = "SWApplicationLaunchProhibited";
 /// Between two looks whether an application has left the foreground: a file's worth of work.
 constexpr std::chrono::milliseconds ForegroundPoll{200};

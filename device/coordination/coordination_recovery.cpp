@@ -8,6 +8,7 @@
 #include "device/coordination/coordinated_installs.h"
 #include "device/coordination/coordination_values.h"
 #include "device/state/application_rows.h"
+#include "platform/existence.h"
 
 namespace appsync::device {
 namespace {
@@ -106,11 +107,7 @@ class Repair {
   }
 
   /// Only what is known to be missing counts.
-  bool isGone(const std::string& path) {
-    std::optional<Error> error;
-    return !device_.files.attributesOfItem(path, &error) && error &&
-           error->domain == POSIXErrorDomain && error->code == ENOENT;
-  }
+  bool isGone(const std::string& path) { return isThere(device_.files, path, nullptr) == false; }
 
   /// Nobody is there yet who might have to be told.
   void giveUp(CoordinatorRow row, std::string_view why) {

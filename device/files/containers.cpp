@@ -9,13 +9,13 @@
 #include <cerrno>
 
 #include "device/base/temporary_file.h"
-#include "device/files/existence.h"
+#include "platform/existence.h"
+#include "platform/sync_files.h"
 
 namespace appsync::device {
 namespace {
 
 constexpr std::string_view ApplicationsDirectory = "/var/mobile/Containers/Applications";
-constexpr std::string_view WaitingDataDirectory = "/var/mobile/Media/HalvoRestore/Data";
 
 /// A random UUID, as the names of containers are.
 std::string makeUuid() {
@@ -39,7 +39,7 @@ std::string Containers::dataPath(std::string_view identifier) {
 }
 
 std::string Containers::waitingDataPath(std::string_view identifier) {
-  return joinPath(WaitingDataDirectory, identifier);
+  return joinPath(exchange::WaitingData, identifier);
 }
 
 std::optional<std::string> Containers::make(std::optional<Error>* error) {

@@ -4,6 +4,7 @@
 
 #include "device/packages/package_names.h"
 #include "platform/installer_service.h"
+#include "platform/sync_files.h"
 #include "platform/utf8.h"
 
 namespace appsync::device {
@@ -151,7 +152,8 @@ std::optional<Error> PackageEntryRules::checkTop(std::string_view path, bool isD
   const std::size_t slash = path.find('/');
   const std::string_view top = path.substr(0, slash);
   const bool stands = slash == std::string_view::npos;  // at the top itself
-  if (stands && !isDirectory && (top == MetadataName || top == ArtworkName)) return std::nullopt;
+  if (stands && !isDirectory && (top == exchange::MetadataName || top == exchange::ArtworkName))
+    return std::nullopt;
   const bool isBundle =
       top.size() > BundleSuffix.size() && top.ends_with(BundleSuffix) && (isDirectory || !stands);
   if (!isBundle)

@@ -41,9 +41,6 @@ class PackageEntryRules {
   static constexpr std::size_t LongestPath = 1024;  ///< bytes
   static constexpr std::size_t DeepestPath = 32;    ///< components
 
-  static constexpr std::string_view MetadataName = "HalvoMetadata.plist";
-  static constexpr std::string_view ArtworkName = "HalvoArtwork";
-
   /// `packageBytes` is the size of the package file.
   PackageEntryRules(const PackageLimits& limits, std::uint64_t packageBytes);
 

@@ -13,6 +13,7 @@
 #include "device/packages/package_writer.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
 
 namespace appsync::device {
 
@@ -140,8 +141,8 @@ std::optional<Error> extract(int packageFd, int targetDirectoryFd,
   if (auto error = prepareExecutable(reader, writer, package)) return error;
   package.version = stringIn(package.info, KBBundleVersion);
   package.displayName = stringIn(package.info, KBBundleDisplayName);
-  package.hasMetadata = rules.holdsFile(PackageEntryRules::MetadataName);
-  package.hasArtwork = rules.holdsFile(PackageEntryRules::ArtworkName);
+  package.hasMetadata = rules.holdsFile(exchange::MetadataName);
+  package.hasArtwork = rules.holdsFile(exchange::ArtworkName);
   package.bytes = rules.fileBytes();
   return std::nullopt;
 }

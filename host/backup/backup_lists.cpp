@@ -3,7 +3,6 @@
 #include <fmt/format.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <map>
 #include <set>
 
@@ -14,8 +13,6 @@
 namespace appsync::host {
 namespace {
 
-constexpr const char* AutomaticKey = "AutomaticDowngrades";
-constexpr const char* IntentionalKey = "IntentionalDowngrades";
 /// Of an application that tells none itself: without any it could not come back.
 constexpr const char* UnknownVersion = "0";
 
@@ -29,27 +26,13 @@ void complete(PropertyList::Dictionary& metadata, const AppRecord& record) {
   }
 }
 
-bool isMissing(const Error& error) {
-  return error.domain == POSIXErrorDomain && error.code == ENOENT;
-}
-
-/// The file's bytes, if there is one. False when that cannot be told or it cannot be read.
-bool readIfThere(FileManager& files, const std::string& path, std::optional<Bytes>& bytes,
-                 std::optional<Error>* error) {
-  std::optional<Error> reason;
-  bytes = files.contentsAtPath(path, &reason);
-  if (bytes || (reason && isMissing(*reason))) return true;
-  if (reason) setError(error, *std::move(reason));
-  return false;
-}
-
 /// Completed, if need be, so that a phone can make a placeholder of it; and always written in the
 /// same way, since a phone that coordinates installs does not keep the file's own bytes.
 std::optional<Bytes> metadataOf(FileManager& files, const AppRecord& record,
                                 std::optional<Error>* error) {
   std::optional<Bytes> bytes;
   if (record.bundleContainerPath &&
-      !readIfThere(files, joinPath(*record.bundleContainerPath, "HalvoMetadata.plist"), bytes,
+      !readIfThere(files, joinPath(*record.bundleContainerPath, exchange::MetadataName), bytes,
                    error)) {
     return std::nullopt;
   }
@@ -80,7 +63,7 @@ bool canTellIcon(FileManager& files, const std::string& bundlePath, std::optiona
   if (!name || !name->asString()) return true;
   std::optional<Error> reason;
   files.attributesOfItem(joinPath(bundlePath, *name->asString()), &reason);
-  if (!reason || isMissing(*reason)) return true;
+  if (!reason || isMissing(reason)) return true;
   setError(error, *std::move(reason));
   return false;
 }
@@ -147,13 +130,14 @@ std::optional<PropertyList::Dictionary> restoreEntry(const BackupPhone& phone,
   };
   auto metadata = metadataOf(phone.services.files, record, &error);
   if (!metadata) return refuse("metadata");
-  PropertyList::Dictionary entry{{"HalvoMetadata", std::move(*metadata)}};
+  PropertyList::Dictionary entry;
+  entry.emplace(exchange::RestoreMetadataKey, std::move(*metadata));
   auto blob = phone.opaqueBlob(record.applicationIdentifier, &error);
   if (error) return refuse("opaque blob");
-  if (blob) entry.emplace("ApplicationSINF", std::move(*blob));
+  if (blob) entry.emplace(exchange::RestoreSinfKey, std::move(*blob));
   std::optional<Bytes> icon;
   if (!takeIcon(phone.services, record, icon, &error)) return refuse("icon");
-  if (icon) entry.emplace("PlaceholderIcon", std::move(*icon));
+  if (icon) entry.emplace(exchange::RestoreIconKey, std::move(*icon));
   return entry;
 }
 
@@ -161,17 +145,17 @@ std::optional<PropertyList::Dictionary> demotionsAmong(FileManager& files,
                                                        const std::vector<AppRecord>& applications,
                                                        std::optional<Error>* error) {
   std::optional<Bytes> bytes;
-  if (!readIfThere(files, std::string(exchange::DemotedApplications), bytes, error)) {
-    return std::nullopt;
-  }
-  std::map<std::string, std::set<std::string>> demoted{{AutomaticKey, {}}, {IntentionalKey, {}}};
+  if (!readIfThere(files, exchange::DemotedApplications, bytes, error)) return std::nullopt;
+  std::map<std::string_view, std::set<std::string>> demoted{
+      {exchange::AutomaticDowngradesKey, {}}, {exchange::IntentionalDowngradesKey, {}}};
   std::set<std::string, std::less<>> candidates;
   for (const AppRecord& record : applications) {
     if (!mayBeDemoted(record)) continue;
     candidates.insert(record.applicationIdentifier);
     if (record.installType == InstallType::Restore) continue;
     const bool automatic = record.installType == InstallType::Downgrade;
-    demoted[automatic ? AutomaticKey : IntentionalKey].insert(record.applicationIdentifier);
+    demoted[automatic ? exchange::AutomaticDowngradesKey : exchange::IntentionalDowngradesKey]
+        .insert(record.applicationIdentifier);
   }
   // Without coordination, a placeholder does not show that it is demoted.
   const auto stored = bytes ? parsePropertyList(*bytes) : std::nullopt;
@@ -183,8 +167,9 @@ std::optional<PropertyList::Dictionary> demotionsAmong(FileManager& files,
       if (identifier && candidates.contains(*identifier)) identifiers.insert(*identifier);
     }
   }
-  return PropertyList::Dictionary{{AutomaticKey, arrayOf(demoted[AutomaticKey])},
-                                  {IntentionalKey, arrayOf(demoted[IntentionalKey])}};
+  PropertyList::Dictionary lists;
+  for (const auto& [key, identifiers] : demoted) lists.emplace(key, arrayOf(identifiers));
+  return lists;
 }
 
 }  // namespace appsync::host

@@ -14,8 +14,8 @@ namespace {
 
 std::map<std::string, std::size_t> todoCounts(FileManager& files) {
   std::map<std::string, std::size_t> counts;
-  for (const TodoEntry& entry :
-       readTodoList(files, exchange::WorkArea).value_or(std::vector<TodoEntry>{}))
+  for (const TodoState& entry :
+       readTodoList(files, exchange::WorkArea).value_or(std::vector<TodoState>{}))
     ++counts[entry.operation];
   return counts;
 }

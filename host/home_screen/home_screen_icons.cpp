@@ -3,11 +3,10 @@
 #include "device/icons/icon_decoder.h"
 #include "device/icons/icon_renderer.h"
 #include "platform/bundle.h"
+#include "platform/sync_files.h"
 
 namespace appsync::host {
 namespace {
-
-constexpr std::string_view Artwork = "HalvoArtwork";
 
 bool isSame(const std::optional<AppRecord>& a, const std::optional<AppRecord>& b) {
   return a.has_value() == b.has_value() && (!a || a->bundlePath == b->bundlePath);
@@ -64,7 +63,7 @@ HomeScreenIcons::Records HomeScreenIcons::recordsOf(std::string_view identifier)
 
 std::optional<Image> HomeScreenIcons::artwork(const AppRecord& record) const {
   if (!record.bundleContainerPath) return std::nullopt;
-  const std::string path = joinPath(*record.bundleContainerPath, Artwork);
+  const std::string path = joinPath(*record.bundleContainerPath, exchange::ArtworkName);
   const auto attributes = files_.attributesOfItem(path);
   if (!attributes || attributes->isDirectory || attributes->size > device::MaximumIconBytes) {
     return std::nullopt;

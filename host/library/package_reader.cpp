@@ -11,6 +11,7 @@
 #include "host/base/text.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
 
 namespace appsync::host {
 namespace {
@@ -89,7 +90,7 @@ std::optional<LibraryPackage> describe(const std::filesystem::path& file, const 
 bool isUsableIconName(std::string_view name) {
   return !name.empty() && name.size() <= 200 && name != "." && name != ".." &&
          name.find('/') == std::string_view::npos && name.find('\0') == std::string_view::npos &&
-         name != "Info.plist" && name != "HalvoMetadata.plist" && name != "HalvoArtwork" &&
+         name != "Info.plist" && name != exchange::MetadataName && name != exchange::ArtworkName &&
          isUtf8(name);
 }
 
@@ -178,9 +179,9 @@ PackageParts readPackageParts(const std::filesystem::path& path) {
   IconCandidates pictures;
   while (reader.next()) {
     if (!reader.isRegularFile()) continue;
-    if (reader.name() == "HalvoMetadata.plist") {
+    if (reader.name() == exchange::MetadataName) {
       parts.metadata = reader.contents(MaximumPart);
-    } else if (reader.name() == "HalvoArtwork") {
+    } else if (reader.name() == exchange::ArtworkName) {
       parts.artwork = reader.contents(MaximumPart);
     } else if (const auto file = bundleFile(reader.name())) {
       if (file->name == "Info.plist" && !parts.infoPlist) {

@@ -16,6 +16,7 @@
 #include "host/library/package_reader.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
 
 namespace appsync::host {
 namespace fs = std::filesystem;
@@ -145,9 +146,10 @@ class Packer {
       if (!add(item->path(), top + "/" + inside.generic_string())) return false;
     }
     if (error) return fail(systemReason(folder_, error.value()));
-    for (const char* name : {"HalvoMetadata.plist", "HalvoArtwork"}) {
+    for (const std::string_view name : {exchange::MetadataName, exchange::ArtworkName}) {
       const fs::path beside = folder_.parent_path() / name;
-      if (fs::exists(fs::symlink_status(beside, error)) && !add(beside, name)) return false;
+      if (fs::exists(fs::symlink_status(beside, error)) && !add(beside, std::string(name)))
+        return false;
     }
     std::sort(members_.begin(), members_.end(),
               [](const Member& left, const Member& right) { return left.name < right.name; });

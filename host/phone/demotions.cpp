@@ -3,6 +3,7 @@
 #include "host/base/text.h"
 #include "host/phone/phone.h"
 #include "platform/bundle.h"
+#include "platform/sync_files.h"
 
 namespace appsync::host {
 
@@ -13,7 +14,8 @@ Demotions::Demotions(FileManager& files) {
     problem_ = "the phone's list of demoted applications could not be looked at: " +
                oneLine(error->localizedDescription());
   }
-  for (const char* key : {"AutomaticDowngrades", "IntentionalDowngrades"}) {
+  for (const std::string_view key :
+       {exchange::AutomaticDowngradesKey, exchange::IntentionalDowngradesKey}) {
     const PropertyList* list = lists ? find(*lists, key) : nullptr;
     if (!list || !list->asArray()) continue;
     for (const PropertyList& item : *list->asArray()) {

@@ -1,19 +1,15 @@
 #include "host/phone/phone.h"
 
-#include <cerrno>
 #include <chrono>
 #include <thread>
 
 #include "platform/property_list_codec.h"
+#include "platform/todo_entry.h"
 
 namespace appsync::host {
 namespace {
 
 constexpr std::chrono::milliseconds IdlePoll{10};
-
-bool isMissing(const std::optional<Error>& error) {
-  return error && error->domain == POSIXErrorDomain && error->code == ENOENT;
-}
 
 }  // namespace
 
@@ -47,23 +43,10 @@ RestorePhone restorePhoneOf(device::EmbeddedDevice& device) {
           }};
 }
 
-std::optional<bool> isThere(FileManager& files, std::string_view path,
-                            std::optional<Error>* error) {
-  std::optional<Error> cause;
-  if (files.attributesOfItem(path, &cause)) return true;
-  if (isMissing(cause)) return false;
-  if (cause) setError(error, *cause);
-  return std::nullopt;
-}
-
 std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,
                                                        std::optional<Error>* error) {
-  std::optional<Error> cause;
-  const auto bytes = files.contentsAtPath(path, &cause);
-  if (!bytes && !isMissing(cause)) {
-    setError(error, cause.value_or(Error::posix(EIO, path)));
-    return std::nullopt;
-  }
+  std::optional<Bytes> bytes;
+  if (!readIfThere(files, path, bytes, error)) return std::nullopt;
   auto parsed = bytes ? parsePropertyList(*bytes) : std::nullopt;
   PropertyList::Dictionary* dictionary = parsed ? parsed->asDictionary() : nullptr;
   return dictionary ? std::move(*dictionary) : PropertyList::Dictionary{};
@@ -111,22 +94,19 @@ void claimDownloads(AppRegistry& apps, const std::set<std::string>& except) {
   }
 }
 
-std::optional<std::vector<TodoEntry>> readTodoList(FileManager& files, std::string_view directory,
+std::optional<std::vector<TodoState>> readTodoList(FileManager& files, std::string_view directory,
                                                    std::optional<Error>* error) {
-  std::optional<Error> cause;
-  const auto bytes = files.contentsAtPath(joinPath(directory, exchange::TodoListName), &cause);
-  if (!bytes && !isMissing(cause)) {
-    setError(error, cause.value_or(Error::posix(EIO, directory)));
-    return std::nullopt;
-  }
+  std::optional<Bytes> bytes;
+  const std::string path = joinPath(directory, exchange::TodoListName);
+  if (!readIfThere(files, path, bytes, error)) return std::nullopt;
   const auto list = bytes ? parsePropertyList(*bytes) : std::nullopt;
-  if (!list || !list->asArray()) return std::vector<TodoEntry>{};
-  std::vector<TodoEntry> entries;
+  if (!list || !list->asArray()) return std::vector<TodoState>{};
+  std::vector<TodoState> entries;
   for (const PropertyList& item : *list->asArray()) {
-    const PropertyList::Dictionary* entry = item.asDictionary();
-    const std::string* identifier = entry ? findString(*entry, "identifier") : nullptr;
-    const std::string* operation = entry ? findString(*entry, "operation") : nullptr;
-    if (identifier && operation) entries.push_back({*identifier, *operation});
+    const TodoEntry entry(item);
+    if (entry.identifier() && entry.operation()) {
+      entries.push_back({*entry.identifier(), *entry.operation()});
+    }
   }
   return entries;
 }

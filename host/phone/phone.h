@@ -10,6 +10,7 @@
 
 #include "device/embedded_device.h"
 #include "platform/app_registry.h"
+#include "platform/existence.h"
 #include "platform/file_manager.h"
 #include "platform/install_coordination.h"
 #include "platform/sync_files.h"
@@ -55,10 +56,6 @@ struct RestorePhone : Phone {
 /// Borrows the device.
 RestorePhone restorePhoneOf(device::EmbeddedDevice& device);
 
-/// Whether something lies at a path of the phone; nullopt (with an error) when that cannot be told.
-std::optional<bool> isThere(FileManager& files, std::string_view path,
-                            std::optional<Error>* error = nullptr);
-
 /// The dictionary in a file of the phone, empty when the file is missing or holds none; nullopt
 /// (with an error) when it cannot be read.
 std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,
@@ -85,15 +82,15 @@ ApplicationsPresent applicationsPresent(AppRegistry& registry);
 /// when the host has none.
 void claimDownloads(AppRegistry& apps, const std::set<std::string>& except);
 
-/// One entry of the todo list that the desktop gives the phone.
-struct TodoEntry {
+/// What an entry of the todo list says of an application.
+struct TodoState {
   std::string identifier;
   std::string operation;
 };
 
 /// The todo list in a directory of the phone, empty when there is none; nullopt (with an error)
 /// when it cannot be read.
-std::optional<std::vector<TodoEntry>> readTodoList(FileManager& files, std::string_view directory,
+std::optional<std::vector<TodoState>> readTodoList(FileManager& files, std::string_view directory,
                                                    std::optional<Error>* error = nullptr);
 
 }  // namespace appsync::host

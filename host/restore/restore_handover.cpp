@@ -6,6 +6,7 @@
 #include "host/library/package_reader.h"
 #include "host/restore/restore_data.h"
 #include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
 
 namespace appsync::host {
 namespace {
@@ -20,7 +21,8 @@ std::optional<Bytes> demotionsOf(const Backup& backup, const RestoreList& list, 
   const PropertyList::Dictionary none;
   const PropertyList::Dictionary* inBackup = parsed ? parsed->asDictionary() : nullptr;
   PropertyList::Dictionary merged;
-  for (const char* key : {"AutomaticDowngrades", "IntentionalDowngrades"}) {
+  for (const std::string_view key :
+       {exchange::AutomaticDowngradesKey, exchange::IntentionalDowngradesKey}) {
     PropertyList::Array names;
     const auto take = [&](const PropertyList::Dictionary& lists, bool named) {
       const PropertyList* entries = find(lists, key);

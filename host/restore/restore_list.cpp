@@ -3,6 +3,7 @@
 #include "host/base/text.h"
 #include "host/library/package_reader.h"
 #include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
 
 namespace appsync::host {
 namespace {
@@ -14,7 +15,7 @@ const std::string* nameIn(const PropertyList::Dictionary& metadata) {
 
 BackedUpApplication describe(const std::string& identifier, const PropertyList& entry) {
   BackedUpApplication app{identifier, {}, identifier, {}};
-  const PropertyList* value = entry.find("HalvoMetadata");
+  const PropertyList* value = entry.find(exchange::RestoreMetadataKey);
   const Bytes* bytes = value ? value->asData() : nullptr;
   const auto parsed = bytes ? parsePropertyList(*bytes) : std::nullopt;
   const PropertyList::Dictionary* metadata = parsed ? parsed->asDictionary() : nullptr;

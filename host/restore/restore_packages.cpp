@@ -23,7 +23,7 @@ class Remembered {
     const PropertyList* versions = state_ ? find(*state_, record.applicationIdentifier) : nullptr;
     const PropertyList* properties =
         versions && record.bundleVersion ? versions->find(*record.bundleVersion) : nullptr;
-    const PropertyList* path = properties ? properties->find("path") : nullptr;
+    const PropertyList* path = properties ? properties->find(exchange::RestorePathKey) : nullptr;
     if (!path || !path->asString()) return false;
     std::optional<Error> error;
     const auto there = isThere(files_, *path->asString(), &error);

@@ -21,12 +21,12 @@ constexpr std::chrono::milliseconds InstallPoll{10};
 
 void ignoreProgress(double) {}
 
-using TodoList = std::optional<std::vector<TodoEntry>>;
+using TodoList = std::optional<std::vector<TodoState>>;
 
 /// Taken to be so while the list cannot be read.
 bool isDownloaded(const std::string& identifier, const TodoList& todo) {
-  return !todo || std::any_of(todo->begin(), todo->end(), [&](const TodoEntry& entry) {
-    return entry.identifier == identifier && entry.operation == "DOWNLOADED";
+  return !todo || std::any_of(todo->begin(), todo->end(), [&](const TodoState& entry) {
+    return entry.identifier == identifier && entry.operation == exchange::TodoDownloaded;
   });
 }
 
@@ -160,7 +160,7 @@ void Session::findCoordinators(const std::vector<SyncAssetPtr>& assets) {
 /// A completed install shows in the todo list; a cancelled one leaves no trace there, and one that
 /// the phone gave up stays as it is.
 bool Session::isSettled(const std::string& identifier,
-                        const std::optional<std::vector<TodoEntry>>& todo) {
+                        const std::optional<std::vector<TodoState>>& todo) {
   const auto& coordinator = coordinators_.at(identifier);
   const std::optional<Error> error = coordinator ? coordinator->error() : std::nullopt;
   if (!coordinator || error) {

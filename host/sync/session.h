@@ -50,7 +50,7 @@ class Session {
   bool transfer(const SyncInput& input, PackageSender& sender);
   void bringWhatWaits(const SyncInput& input);
   void findCoordinators(const std::vector<SyncAssetPtr>& assets);
-  bool isSettled(const std::string& identifier, const std::optional<std::vector<TodoEntry>>& todo);
+  bool isSettled(const std::string& identifier, const std::optional<std::vector<TodoState>>& todo);
   void waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent);
 
   void sweepPlaceholders();

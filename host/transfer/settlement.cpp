@@ -5,8 +5,8 @@
 namespace appsync::host {
 namespace {
 
-std::string operationOf(const std::vector<TodoEntry>& todo, std::string_view identifier) {
-  const auto found = std::find_if(todo.begin(), todo.end(), [&](const TodoEntry& entry) {
+std::string operationOf(const std::vector<TodoState>& todo, std::string_view identifier) {
+  const auto found = std::find_if(todo.begin(), todo.end(), [&](const TodoState& entry) {
     return entry.identifier == identifier;
   });
   return found == todo.end() ? std::string() : found->operation;
@@ -28,7 +28,7 @@ std::string failureReason(const std::string& identifier, const SyncEnd& end) {
 }
 
 void settleRemoval(const PlannedEntry& entry, const SyncEnd& end, Summary& summary) {
-  const bool taken = operationOf(end.todo, entry.identifier) == "remove";
+  const bool taken = operationOf(end.todo, entry.identifier) == exchange::TodoRemove;
   const bool there = end.present.installed.contains(entry.identifier) ||
                      end.present.placeholders.contains(entry.identifier);
   if (taken && !there) {
@@ -58,9 +58,9 @@ void settleInstall(const PlannedEntry& entry, const SyncEnd& end, Summary& summa
   const bool brought = entry.byHost && end.present.installed.contains(entry.identifier) &&
                        !end.installFailures.contains(entry.identifier);
   const bool carriedOut = end.carriedOut.contains(entry.identifier);
-  if (brought || carriedOut || operation == "INSTALLED") {
+  if (brought || carriedOut || operation == exchange::TodoInstalled) {
     listFor(entry.action, summary).push_back(entry.identifier);
-  } else if (operation == "install" && !asked && !end.broken && !end.interrupted) {
+  } else if (operation == exchange::TodoInstall && !asked && !end.broken && !end.interrupted) {
     notDone(entry, "the phone did not ask for its package", summary);
   } else {
     summary.failed.push_back({entry.identifier, failureReason(entry.identifier, end)});

@@ -17,7 +17,7 @@ inline constexpr const char* InterruptedSync = "interrupted; the next sync does 
 
 /// What is known when a sync is over.
 struct SyncEnd {
-  std::vector<TodoEntry> todo;  ///< as the client left it; empty when it never took the list over
+  std::vector<TodoState> todo;  ///< as the client left it; empty when it never took the list over
   ApplicationsPresent present;
   TransferOutcome transfers;
   std::set<std::string> carriedOut;  ///< installs that the phone itself had still to carry out

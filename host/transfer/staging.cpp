@@ -5,6 +5,7 @@
 
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
 
 namespace appsync::host {
 namespace {
@@ -49,8 +50,8 @@ class Stage {
     return makeDirectory(directory) &&
            write(directory, "Info.plist", withoutEmptyName(parts.infoPlist)) &&
            write(directory, parts.iconName, parts.icon) &&
-           write(directory, "HalvoMetadata.plist", parts.metadata) &&
-           write(directory, "HalvoArtwork", parts.artwork);
+           write(directory, exchange::MetadataName, parts.metadata) &&
+           write(directory, exchange::ArtworkName, parts.artwork);
   }
 
  private:
@@ -63,10 +64,12 @@ PropertyList todoList(const SyncPlan& plan) {
   for (const PlannedEntry& entry : plan.entries) {
     if (entry.byHost) continue;
     const bool removes = entry.action == Action::Remove;
-    PropertyList::Dictionary todo{{"identifier", entry.identifier},
-                                  {"operation", removes ? "remove" : "install"},
-                                  {"name", entry.name}};
-    if (!entry.version.empty()) todo.emplace("version", entry.version);
+    PropertyList::Dictionary todo;
+    todo.emplace(exchange::TodoIdentifierKey, entry.identifier);
+    todo.emplace(exchange::TodoOperationKey,
+                 removes ? exchange::TodoRemove : exchange::TodoInstall);
+    todo.emplace(exchange::TodoNameKey, entry.name);
+    if (!entry.version.empty()) todo.emplace(exchange::TodoVersionKey, entry.version);
     list.emplace_back(std::move(todo));
   }
   return list;
@@ -81,7 +84,7 @@ std::optional<std::set<std::string>> rememberedPackages(FileManager& files) {
     const PropertyList::Dictionary* versions = application.second.asDictionary();
     if (!versions) continue;
     for (const auto& version : *versions) {
-      const PropertyList* path = version.second.find("path");
+      const PropertyList* path = version.second.find(exchange::RestorePathKey);
       if (path && path->asString()) paths.insert(*path->asString());
     }
   }

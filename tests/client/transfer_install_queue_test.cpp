@@ -212,16 +212,6 @@ TEST_F(InstallQueue, AnUpdateWithoutAPlaceholderThatFailsForGoodKeepsTheWorkingV
            "log default SyncBundle|Finished install for com.a"})));
 }
 
-TEST_F(InstallQueue, APlaceholderThatCannotBeFoundJustNowIsNotTakenForTheApplication) {
-  phone.appRegistry.seedInstalled("com.a", "1.0");
-  phone.appRegistry.seedPlaceholder("com.a");
-  phone.faults.failEvery("AppRegistry.recordForIdentifier", Passing);
-  phone.appRegistry.failInstall("com.a", Refused);
-  install(asset());
-  EXPECT_EQ(phone.trace.count("AppRegistry.uninstallApplication"), 0u);
-  EXPECT_TRUE(phone.appRegistry.installed("com.a"));
-}
-
 TEST_F(InstallQueue, RefusedPackageIsFailedForGoodAndItsPlaceholderRemoved) {
   phone.appRegistry.seedInstalled("com.a", "1.0");
   phone.appRegistry.seedPlaceholder("com.a");
@@ -239,7 +229,6 @@ TEST_F(InstallQueue, RefusedPackageIsFailedForGoodAndItsPlaceholderRemoved) {
 }
 
 TEST_F(InstallQueue, PlaceholderThatCannotBeRemovedIsLoggedAndRecorded) {
-  phone.appRegistry.seedPlaceholder("com.a");
   phone.appRegistry.failInstall("com.a", Refused);
   phone.appRegistry.failUninstall("com.a");
   install(asset());

@@ -116,15 +116,21 @@ TEST_F(OutstandingTransfers, IdentifiersThatLeaveTheFolderTheyAreJoinedToAreIgno
   EXPECT_EQ(phone.trace.count("AppRegistry.installApplication"), 0u);
 }
 
-TEST_F(OutstandingTransfers, ARecordWithoutBundleOrContainerIsSkipped) {
+TEST_F(OutstandingTransfers, ARecordWithoutBundleOrContainerNamesNoFileOfThePhonesRoot) {
   seedRestore("com.a");
   seedRestore("com.b");
   phone.appRegistry.edit("com.a", [](AppRecord& record) { record.bundlePath.reset(); });
   phone.appRegistry.edit("com.b", [](AppRecord& record) { record.bundleContainerPath.reset(); });
   EXPECT_THAT(requested(), IsEmpty());
-  EXPECT_TRUE(loggedMessage("skipping com.a - it has no bundle or no container"));
-  EXPECT_TRUE(loggedMessage("skipping com.b - it has no bundle or no container"));
-  EXPECT_THAT(phone.host.made(), IsEmpty());
+  EXPECT_THAT(phone.trace.log(), testing::Contains("log error SyncBundle|missing bundlePath"));
+  const std::vector<SyncAssetPtr> made = phone.host.made();
+  ASSERT_THAT(made, testing::SizeIs(2));
+  const SyncAsset& withoutBundle = *made.front();
+  EXPECT_EQ(withoutBundle.infoPlist, std::nullopt);
+  EXPECT_NE(withoutBundle.storePlist, std::nullopt);
+  const SyncAsset& withoutContainer = *made.back();
+  EXPECT_EQ(withoutContainer.storePlist, std::nullopt);
+  EXPECT_NE(withoutContainer.infoPlist, std::nullopt);
 }
 
 TEST_F(OutstandingTransfers, AVersionOrNameThatIsANumberIsTakenInDigitsAndSaid) {

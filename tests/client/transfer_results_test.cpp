@@ -24,15 +24,15 @@ TEST_F(TransferResults, ProgressIsForwardedInThousandthsTruncated) {
                "InstallProgress.setCompletedUnitCount(com.a, 456)"});
 }
 
-TEST_F(TransferResults, ProgressThatIsNoFractionCountsAsNoneOrAll) {
+TEST_F(TransferResults, ProgressThatNoCountCanHoldCountsAsNone) {
   constexpr double Infinity = std::numeric_limits<double>::infinity();
   const std::pair<double, std::int64_t> counts[] = {{std::numeric_limits<double>::quiet_NaN(), 0},
                                                     {-Infinity, 0},
-                                                    {-0.5, 0},
+                                                    {-0.5, -500},
                                                     {0.9999, 999},
-                                                    {Infinity, 1000},
-                                                    {1e300, 1000},
-                                                    {1.5, 1000}};
+                                                    {Infinity, 0},
+                                                    {1e300, 0},
+                                                    {1.5, 1500}};
   phone.appRegistry.seedPlaceholder("com.a");
   for (const auto& [fraction, units] : counts) {
     phone.appRegistry.progress("com.a")->setCompletedUnitCount(-1);
@@ -76,10 +76,13 @@ TEST_F(TransferResults, RelativePathIsCompletedUnderTheStagingRoot) {
 }
 
 TEST_F(TransferResults, AbsolutePathIsKept) {
-  const SyncAssetPtr made = received("/var/mobile/Media/PublicStaging/elsewhere/a.zip");
+  const SyncAssetPtr made = received("/var/mobile/Media/elsewhere/a.zip");
   succeed(made);
   settle();
-  EXPECT_EQ(made->path, "/var/mobile/Media/PublicStaging/elsewhere/a.zip");
+  EXPECT_EQ(made->path, "/var/mobile/Media/elsewhere/a.zip");
+  EXPECT_THAT(
+      phone.trace.log(),
+      Contains("log default SyncBundle|Received file at /var/mobile/Media/elsewhere/a.zip"));
 }
 
 TEST_F(TransferResults, ReceivedPackageIsMarkedDownloadedAndItsInstallEnqueued) {

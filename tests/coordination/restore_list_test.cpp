@@ -164,11 +164,14 @@ PropertyList::Dictionary climbingEntries() {
 }
 
 Trace climbersIgnored() {
-  return joined({{said("processing halvo restore info"),
-                  "log default Oversize|Demoted Apps: (null)", said("Ignoring invalid path: .."),
-                  said("Ignoring invalid path: ../../var/mobile/Containers/Applications/1/Victim"),
-                  said("Ignoring invalid path: ../x"), said("Ignoring invalid path: a/../../b")},
-                 listKept()});
+  Trace trace{said("processing halvo restore info"), "log default Oversize|Demoted Apps: (null)"};
+  for (const char* climber :
+       {"..", "../../var/mobile/Containers/Applications/1/Victim", "../x", "a/../../b"}) {
+    trace.push_back(
+        said("processing halvo restore info for '" + std::string(climber) + "' demotionStatus :0"));
+    trace.push_back(said("Ignoring invalid path: " + std::string(climber)));
+  }
+  return joined({trace, listKept()});
 }
 
 TEST_F(RestoreListTest, IdentifiersThatClimbAreIgnored) {

@@ -14,7 +14,7 @@ std::string reasonText(const std::optional<std::string>& reason) {
   return reason ? " failed: " + *reason : "";
 }
 
-std::vector<TodoEntry> todoOf(fakes::FakePlatform& phone) {
+std::vector<TodoState> todoOf(fakes::FakePlatform& phone) {
   return readTodoList(phone.files, exchange::WorkArea).value();
 }
 
@@ -98,7 +98,7 @@ bool RecordingClient::reconcileSync(const PropertyList&, std::string_view newAnc
   phone_.files.erase(exchange::WorkArea);
   phone_.files.putCopy(exchange::StagingArea, exchange::WorkArea);
   phone_.files.erase(exchange::StagingArea);
-  for (const TodoEntry& entry : todoOf(phone_)) {
+  for (const TodoState& entry : todoOf(phone_)) {
     if (entry.operation == "remove" && removes)
       phone_.appRegistry.uninstallApplication(entry.identifier, {});
   }
@@ -108,7 +108,7 @@ bool RecordingClient::reconcileSync(const PropertyList&, std::string_view newAnc
 std::vector<SyncAssetPtr> RecordingClient::outstandingAssetTransfers() noexcept {
   note("outstandingAssetTransfers");
   std::vector<SyncAssetPtr> assets;
-  for (const TodoEntry& entry : todoOf(phone_)) {
+  for (const TodoState& entry : todoOf(phone_)) {
     if (entry.operation == "install" && notAskedFor.count(entry.identifier) == 0) {
       assets.push_back(host_.makeDownload(entry.identifier, "Application", std::nullopt));
     }
@@ -274,9 +274,9 @@ void SessionTest::offer(const std::string& identifier, const std::string& versio
   packSample(folder / (identifier + ".tar"), identifier, version, bodySize);
 }
 
-void SessionTest::putTodo(const std::vector<TodoEntry>& entries) {
+void SessionTest::putTodo(const std::vector<TodoState>& entries) {
   PropertyList::Array list;
-  for (const TodoEntry& entry : entries) {
+  for (const TodoState& entry : entries) {
     list.emplace_back(
         PropertyList::Dictionary{{"identifier", entry.identifier}, {"operation", entry.operation}});
   }

@@ -114,7 +114,7 @@ class SessionTest : public ::testing::Test {
   void offer(const std::string& identifier, const std::string& version = "1.0",
              std::size_t bodySize = 0);
   /// As the client would leave the todo list.
-  void putTodo(const std::vector<TodoEntry>& entries);
+  void putTodo(const std::vector<TodoState>& entries);
   std::shared_ptr<InstallCoordinator> makeCoordinator(std::string_view identifier);
 
   Phone phoneForHost();

@@ -1,13 +1,8 @@
-#include "client/missing.h"
+#include "client/unreadable.h"
 
-#include <cerrno>
+#include "platform/existence.h"
 
 namespace appsync {
-
-bool isMissing(const std::optional<Error>& reason) {
-  return reason && reason->domain == POSIXErrorDomain &&
-         (reason->code == ENOENT || reason->code == ENOTDIR);
-}
 
 void sayUnreadable(const ClientLog& log, std::string_view path,
                    const std::optional<Error>& reason) {

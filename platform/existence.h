@@ -5,13 +5,14 @@
 
 #include "platform/file_manager.h"
 
-namespace appsync::device {
+namespace appsync {
 
 // What cannot be looked at is not missing: whoever removes, replaces or leaves out what is "not
 // there" must know that it is not.
 
-/// Whether an operation failed because the item is not there.
-bool isMissing(const std::optional<Error>& error);
+/// Whether an operation failed because the item is not there. Any other reason, or none, leaves
+/// that open.
+bool isMissing(const std::optional<Error>& reason);
 
 /// nullopt (with a reason) when the item cannot be looked at.
 std::optional<bool> isThere(FileManager& files, std::string_view path, std::optional<Error>* error);
@@ -20,4 +21,4 @@ std::optional<bool> isThere(FileManager& files, std::string_view path, std::opti
 bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>& contents,
                  std::optional<Error>* error);
 
-}  // namespace appsync::device
+}  // namespace appsync

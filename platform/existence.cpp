@@ -1,11 +1,12 @@
-#include "device/files/existence.h"
+#include "platform/existence.h"
 
 #include <cerrno>
 
-namespace appsync::device {
+namespace appsync {
 
-bool isMissing(const std::optional<Error>& error) {
-  return error && error->domain == POSIXErrorDomain && error->code == ENOENT;
+bool isMissing(const std::optional<Error>& reason) {
+  return reason && reason->domain == POSIXErrorDomain &&
+         (reason->code == ENOENT || reason->code == ENOTDIR);
 }
 
 std::optional<bool> isThere(FileManager& files, std::string_view path,
@@ -26,4 +27,4 @@ bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>
   return false;
 }
 
-}  // namespace appsync::device
+}  // namespace appsync
