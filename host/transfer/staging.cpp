@@ -75,12 +75,9 @@ PropertyList todoList(const SyncPlan& plan) {
   return list;
 }
 
-/// nullopt when that cannot be told.
-std::optional<std::set<std::string>> rememberedPackages(FileManager& files) {
-  const auto state = readDictionary(files, exchange::RestoreState, nullptr);
-  if (!state) return std::nullopt;
+std::set<std::string> rememberedPackages(const PropertyList::Dictionary& restoreState) {
   std::set<std::string> paths;
-  for (const auto& application : *state) {
+  for (const auto& application : restoreState) {
     const PropertyList::Dictionary* versions = application.second.asDictionary();
     if (!versions) continue;
     for (const auto& version : *versions) {
@@ -100,10 +97,30 @@ std::optional<std::string> packagedApplication(const std::string& name) {
                                                            : std::optional(identifier);
 }
 
+/// The applications whose packages a sync or restore may have sent. What is named like a package of
+/// any other is somebody's own file.
+std::set<std::string> everSent(const Phone& phone, const PropertyList::Dictionary& restoreState) {
+  std::set<std::string> identifiers;
+  for (const auto& application : restoreState) identifiers.insert(application.first);
+  for (const std::string_view directory :
+       {std::string_view(exchange::WorkArea), std::string_view(exchange::StagingArea)}) {
+    const auto todo = readTodoList(phone.files, directory);
+    if (!todo) continue;
+    for (const TodoEntry& entry : *todo) identifiers.insert(entry.identifier);
+  }
+  const ApplicationsPresent present = applicationsPresent(phone.apps);
+  identifiers.insert(present.installed.begin(), present.installed.end());
+  for (const auto& placeholder : present.placeholders) identifiers.insert(placeholder.first);
+  return identifiers;
+}
+
+/// Taken to be so when that cannot be told.
 bool isBeingInstalled(const Phone& phone, const std::string& identifier) {
-  return phone.coordination &&
-         phone.coordination->coordinatorFor(CoordinatorKind::Any, identifier, SyncHostClientID,
-                                            false, nullptr, nullptr);
+  if (!phone.coordination) return false;
+  std::optional<Error> error;
+  const auto coordinator = phone.coordination->coordinatorFor(
+      CoordinatorKind::Any, identifier, SyncHostClientID, false, nullptr, &error);
+  return coordinator || error;
 }
 
 }  // namespace
@@ -130,15 +147,18 @@ std::string stagedPackageName(const LibraryPackage& package) {
 }
 
 void removeLeftOverPackages(const Phone& phone) {
-  const auto remembered = rememberedPackages(phone.files);
-  if (!remembered) return;
+  const auto restoreState = readDictionary(phone.files, exchange::RestoreState, nullptr);
+  if (!restoreState) return;
+  const std::set<std::string> remembered = rememberedPackages(*restoreState);
+  const std::set<std::string> sent = everSent(phone, *restoreState);
   for (const std::string_view directory : {exchange::StagingRoot, exchange::Downloads}) {
     const auto names = phone.namesIn(directory, nullptr);
     if (!names) continue;
     for (const std::string& name : *names) {
       const std::string path = joinPath(directory, name);
       const auto identifier = packagedApplication(name);
-      if (!identifier || remembered->contains(path) || isBeingInstalled(phone, *identifier)) {
+      if (!identifier || !sent.contains(*identifier) || remembered.contains(path) ||
+          isBeingInstalled(phone, *identifier)) {
         continue;
       }
       phone.files.removeItem(path);

@@ -17,8 +17,9 @@ bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
 /// The name under which a package is sent: the identifier and the ending of the library's file.
 std::string stagedPackageName(const LibraryPackage& package);
 
-/// Removes packages that broken-off syncs and restores left where packages arrive, but none that
-/// the restore state remembers or that an install coordinator may still want.
+/// Removes packages that broken-off syncs and restores left where packages arrive: only those of
+/// applications that the phone, a todo list or the restore state names, and none that the restore
+/// state remembers or that an install coordinator may still want. Other files are a person's own.
 void removeLeftOverPackages(const Phone& phone);
 
 }  // namespace appsync::host

@@ -127,11 +127,22 @@ TEST_F(SessionTest, RemovesPackagesThatWereLeftBehind) {
           {"com.kept",
            PropertyList::Dictionary{
                {"1.0", PropertyList::Dictionary{{"path", std::string(Root) + "com.kept.zip"}}}}}});
-  for (const char* name : {"com.left.zip", "com.left.package", "com.kept.zip", "com.kept.tar",
-                           "notes.txt", "com.waits.tar.gz"}) {
+  putTodo({{"com.left", "install"}, {"com.waits", "DOWNLOADED"}});
+  phone.files.putPlist(joinPath(exchange::StagingArea, exchange::TodoListName),
+                       PropertyList::Array{PropertyList::Dictionary{{"identifier", "com.staged"},
+                                                                    {"operation", "install"}}});
+  phone.appRegistry.seedInstalled("com.there", "1.0");
+  phone.appRegistry.seedPlaceholder("com.restoring", InstallType::Restore);
+  for (const char* name :
+       {"com.left.zip", "com.left.package", "com.kept.zip", "com.kept.tar", "com.restoring.zip",
+        "com.staged.zip", "com.there.zip", "notes.txt", "com.waits.tar.gz"}) {
     phone.files.putFile(std::string(Root) + name, "package");
   }
   phone.files.putFile("/var/mobile/Media/Downloads/com.left.zip", "package");
+  for (const char* own : {"holiday.zip", "thesis.tar.gz"}) {
+    phone.files.putFile(std::string(Root) + own, "a person's");
+    phone.files.putFile(joinPath(exchange::Downloads, own), "a person's");
+  }
   coordination = true;
   makeCoordinator("com.waits");
   sync();
@@ -139,11 +150,28 @@ TEST_F(SessionTest, RemovesPackagesThatWereLeftBehind) {
               ElementsAre("FileManager.removeItem(STAGING/com.kept.tar)",
                           "FileManager.removeItem(STAGING/com.left.package)",
                           "FileManager.removeItem(STAGING/com.left.zip)",
+                          "FileManager.removeItem(STAGING/com.restoring.zip)",
+                          "FileManager.removeItem(STAGING/com.staged.zip)",
+                          "FileManager.removeItem(STAGING/com.there.zip)",
                           "FileManager.removeItem(/var/mobile/Media/Downloads/com.left.zip)",
                           "FileManager.removeItem(STAGING/ApplicationSync)"));
+  for (const char* own : {"holiday.zip", "thesis.tar.gz"}) {
+    EXPECT_TRUE(phone.files.exists(std::string(Root) + own)) << own;
+    EXPECT_TRUE(phone.files.exists(joinPath(exchange::Downloads, own))) << own;
+  }
+}
+
+TEST_F(SessionTest, RemovesNoPackageWhenItCannotBeSeenWhetherItIsBeingInstalled) {
+  putTodo({{"com.left", "install"}});
+  phone.files.putFile(std::string(Root) + "com.left.zip", "package");
+  coordination = true;
+  phone.faults.failWhere("InstallCoordination.coordinatorFor", "com.left", Error::posix(EMFILE));
+  sync();
+  EXPECT_TRUE(phone.files.exists(std::string(Root) + "com.left.zip"));
 }
 
 TEST_F(SessionTest, RemovesNoPackageWhenItCannotBeSeenWhatIsRemembered) {
+  putTodo({{"com.left", "install"}});
   phone.files.putFile(std::string(Root) + "com.left.zip", "package");
   phone.faults.failWhere("FileManager.contentsAtPath", exchange::RestoreState,
                          Error::posix(EMFILE));
