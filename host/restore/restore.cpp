@@ -111,7 +111,8 @@ void Restore::bringPackages(const RestoreList& list, const Library& library) {
 }
 
 void Restore::bringFromStore(const RestoreList& list, const Library& catalogue) {
-  Store store(host_, phone_, reporter_, interruption_, catalogue, InterruptedReason);
+  Store store(host_, phone_, reporter_, interruption_, catalogue, InterruptedReason,
+              InstallType::StoreDownload);
   std::set<std::string> wanted = waitingForStore(phone_);
   for (const std::string& identifier : leftOut(list)) wanted.erase(identifier);
   store.deliver(wanted);

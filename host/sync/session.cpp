@@ -144,7 +144,8 @@ bool Session::transfer(const SyncInput& input, PackageSender& sender) {
 
 /// Restored, demoted and asked-for applications whose packages the client leaves to the store.
 void Session::bringWhatWaits(const SyncInput& input) {
-  Store store(host_, phone_, reporter_, interruption_, input.library, InterruptedSync);
+  Store store(host_, phone_, reporter_, interruption_, input.library, InterruptedSync,
+              std::nullopt);
   store.deliver(identifiersOf(input.plan, true));
   failures_.insert(store.failures().begin(), store.failures().end());
 }

@@ -59,8 +59,10 @@ class CoordinatedDelivery final : public PackageDelivery {
 
 class RegistryDelivery final : public PackageDelivery {
  public:
-  RegistryDelivery(const Phone& phone, const AppRecord& placeholder)
+  RegistryDelivery(const Phone& phone, const AppRecord& placeholder,
+                   std::optional<InstallType> origin)
       : phone_(phone),
+        origin_(origin),
         identifier_(placeholder.applicationIdentifier),
         progress_(phone.apps.installProgress(placeholder, InstallPhase::Loading)) {}
 
@@ -79,10 +81,11 @@ class RegistryDelivery final : public PackageDelivery {
   }
 
   void arrived(const std::string& path) override {
-    const PropertyList::Dictionary options{
-        {std::string(SWPackageTypeKey), SWPackageTypeCustomer},
-        {std::string(KBBundleIdentifier), identifier_},
-        {std::string(SWInstallTypeKey), static_cast<std::uint64_t>(InstallType::StoreDownload)}};
+    PropertyList::Dictionary options{{std::string(SWPackageTypeKey), SWPackageTypeCustomer},
+                                     {std::string(KBBundleIdentifier), identifier_}};
+    if (origin_) {
+      options.emplace(std::string(SWInstallTypeKey), static_cast<std::uint64_t>(*origin_));
+    }
     std::optional<Error> error;
     if (!phone_.apps.installApplication(FileLocation::file(path), options, &error)) {
       failure_ = error ? oneLine(error->localizedDescription()) : NotInstalled;
@@ -94,6 +97,7 @@ class RegistryDelivery final : public PackageDelivery {
 
  private:
   const Phone& phone_;
+  const std::optional<InstallType> origin_;
   const std::string identifier_;
   const std::shared_ptr<InstallProgress> progress_;
   bool begun_ = false;
@@ -108,9 +112,9 @@ std::unique_ptr<PackageDelivery> deliverToCoordinator(
   return std::make_unique<CoordinatedDelivery>(phone, identifier, std::move(coordinator));
 }
 
-std::unique_ptr<PackageDelivery> deliverToRegistry(const Phone& phone,
-                                                   const AppRecord& placeholder) {
-  return std::make_unique<RegistryDelivery>(phone, placeholder);
+std::unique_ptr<PackageDelivery> deliverToRegistry(const Phone& phone, const AppRecord& placeholder,
+                                                   std::optional<InstallType> origin) {
+  return std::make_unique<RegistryDelivery>(phone, placeholder, origin);
 }
 
 }  // namespace appsync::host

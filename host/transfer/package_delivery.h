@@ -29,8 +29,9 @@ std::unique_ptr<PackageDelivery> deliverToCoordinator(
     const Phone& phone, const std::string& identifier,
     std::shared_ptr<InstallCoordinator> coordinator);
 
-/// Installs the package in the place of the application's placeholder.
-std::unique_ptr<PackageDelivery> deliverToRegistry(const Phone& phone,
-                                                   const AppRecord& placeholder);
+/// Installs the package in the place of the application's placeholder. The phone takes it for a
+/// sync's unless an origin is given.
+std::unique_ptr<PackageDelivery> deliverToRegistry(const Phone& phone, const AppRecord& placeholder,
+                                                   std::optional<InstallType> origin);
 
 }  // namespace appsync::host

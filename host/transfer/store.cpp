@@ -50,7 +50,7 @@ std::unique_ptr<PackageDelivery> Store::deliveryFor(const std::string& identifie
                                                      KQClientKiosk, false, nullptr, nullptr)
                                                : nullptr;
   if (coordinator && owed) return deliverToCoordinator(phone_, identifier, coordinator);
-  return placeholder && !coordinator ? deliverToRegistry(phone_, *placeholder) : nullptr;
+  return placeholder && !coordinator ? deliverToRegistry(phone_, *placeholder, origin_) : nullptr;
 }
 
 void Store::order(const std::string& identifier, const std::string& name,

@@ -2,6 +2,7 @@
 
 #include <map>
 #include <memory>
+#include <optional>
 #include <set>
 #include <string>
 
@@ -25,15 +26,17 @@ std::set<std::string> waitingForStore(const Phone& phone);
 /// of the application. Borrows everything; used once, by one thread.
 class Store {
  public:
-  /// `ifInterrupted` is the reason, for people, why a package was not sent.
+  /// `ifInterrupted` is the reason, for people, why a package was not sent. `origin` is how the
+  /// phone is to take what it installs by itself: none, for a sync's.
   Store(HostProcess& host, const Phone& phone, Reporter& reporter, const Interruption& interruption,
-        const Library& catalogue, std::string ifInterrupted)
+        const Library& catalogue, std::string ifInterrupted, std::optional<InstallType> origin)
       : host_(host),
         phone_(phone),
         reporter_(reporter),
         interruption_(interruption),
         catalogue_(catalogue),
-        ifInterrupted_(std::move(ifInterrupted)) {}
+        ifInterrupted_(std::move(ifInterrupted)),
+        origin_(origin) {}
 
   /// Returns when the phone has installed or refused what the catalogue has of these.
   void deliver(const std::set<std::string>& identifiers);
@@ -65,6 +68,7 @@ class Store {
   const Interruption& interruption_;
   const Library& catalogue_;
   const std::string ifInterrupted_;
+  const std::optional<InstallType> origin_;
   std::map<std::string, std::unique_ptr<Order>> orders_;  ///< by identifier
   std::map<std::string, std::string> failures_;
 };

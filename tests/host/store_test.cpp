@@ -40,7 +40,7 @@ class StoreTest : public RestoreTest {
     const Library catalogue = readLibrary(folder.path(), problem).value();
     const RestorePhone all = restorePhone();
     phone.trace.clear();
-    Store brings(host, all, watching, interruption, catalogue, "interrupted");
+    Store brings(host, all, watching, interruption, catalogue, "interrupted", origin);
     std::set<std::string> wanted = waitingForStore(all);
     for (const std::string& identifier : except) wanted.erase(identifier);
     brings.deliver(wanted);
@@ -52,6 +52,7 @@ class StoreTest : public RestoreTest {
   }
 
   Watching watching{reporter};
+  std::optional<InstallType> origin = InstallType::StoreDownload;
 };
 
 TEST_F(StoreTest, KeepsThePromiseOfACoordinatorsPackage) {
@@ -127,6 +128,18 @@ TEST_F(StoreTest, InstallsThroughTheRegistryWithoutCoordination) {
                           "{KBBundleIdentifier = com.a; SWInstallType = 1; "
                           "SWPackageTypeKey = SWPackageTypeCustomer})",
                           "FileManager.removeItem(/var/mobile/Media/Downloads/com.a.tar)"));
+}
+
+TEST_F(StoreTest, InstallsASyncsPackageAsASyncs) {
+  origin.reset();
+  seedRestoring("com.a");
+  offer("com.a");
+  deliver();
+  EXPECT_EQ(
+      phone.trace.count("AppRegistry.installApplication(/var/mobile/Media/Downloads/com.a.tar, "
+                        "{KBBundleIdentifier = com.a; "
+                        "SWPackageTypeKey = SWPackageTypeCustomer})"),
+      1);
 }
 
 TEST_F(StoreTest, RefusedPackageLeavesThePlaceholderAndNoFile) {
