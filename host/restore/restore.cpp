@@ -148,6 +148,7 @@ void Restore::explainPlaceholders(const RestoreInput& input, RestoreEnd& end) {
   end.missing = input.catalogue  ? "the store does not have it"
                 : input.packages ? "the library does not have it"
                                  : "waits for its package";
+  end.packagesGiven = input.catalogue || input.packages;
   const std::optional<Library>& library = input.catalogue ? input.catalogue : input.packages;
   const std::vector<std::string> owed = phone_.packagesOwedBy(KQClientKiosk);
   const Demotions demotions(phone_.files);

@@ -13,10 +13,16 @@ std::string absenceReason(const BackedUpApplication& app, const RestoreEnd& end)
   return "the phone made no placeholder of it (appsync log tells more)";
 }
 
-void settlePlaceholder(const std::string& identifier, const RestoreEnd& end, Summary& summary) {
-  const bool heldBack = end.heldBack.contains(identifier);
-  summary.skipped.push_back(
-      {identifier, heldBack ? "stays a placeholder until it is asked for" : end.missing, false});
+/// Whoever names an application and tells where its package is waits for it to come.
+void settlePlaceholder(const std::string& identifier, bool named, const RestoreEnd& end,
+                       Summary& summary) {
+  if (end.heldBack.contains(identifier)) {
+    summary.skipped.push_back({identifier, "stays a placeholder until it is asked for", false});
+  } else if (named && end.packagesGiven) {
+    summary.failed.push_back({identifier, end.missing});
+  } else {
+    summary.skipped.push_back({identifier, end.missing, false});
+  }
 }
 
 void settleInstalled(const std::string& identifier, const RestoreEnd& end, Summary& summary) {
@@ -49,7 +55,7 @@ Summary settleRestore(const RestoreList& list, const RestoreEnd& end) {
     } else if (end.present.installed.contains(identifier) || failures.contains(identifier)) {
       continue;
     } else if (end.present.placeholders.contains(identifier)) {
-      settlePlaceholder(identifier, end, summary);
+      settlePlaceholder(identifier, list.isPart(), end, summary);
     } else {
       failures.emplace(identifier, absenceReason(app, end));
     }

@@ -26,6 +26,7 @@ struct RestoreEnd {
   std::set<std::string> updated;                ///< installed before, and again
   std::map<std::string, std::string> failures;  ///< reason by identifier
   std::string missing;                          ///< why a placeholder has no package
+  bool packagesGiven = false;                   ///< by a store or a library
   bool interrupted = false;
   std::optional<std::string> broken;  ///< why the restore as a whole failed
 };

@@ -83,6 +83,8 @@ class Restores(RestoreCase):
         self.assertEqual(self.reasons(summary["skipped"]), {
             "com.a": NOT_IN_STORE, "com.c": DEMOTED, "com.d": DEMOTED,
             "broken.zip": "it is neither a zip nor a tar archive"})
+        summary = self.restore("--store", self.library, "--only", "com.a", code=1)
+        self.assertEqual(self.reasons(summary["failed"]), {"com.a": NOT_IN_STORE})
 
     def test_backup_restore_backup_gives_the_same(self):
         self.use("new")

@@ -14,7 +14,11 @@ class RestoreSettlementTest : public ::testing::Test {
     Backup backup;
     backup.applications = serializePropertyList(entries, PropertyListFormat::Xml).value();
     end.missing = "waits for its package";
-    return text(settleRestore(RestoreList::of(backup, problem).value(), end));
+    RestoreList list = RestoreList::of(backup, problem).value();
+    if (!only.empty()) {
+      EXPECT_TRUE(list.keepOnly(only, problem)) << problem;
+    }
+    return text(settleRestore(list, end));
   }
   void backUp(const std::string& identifier) {
     const auto metadata = serializePropertyList(metadataOf(identifier), PropertyListFormat::Xml);
@@ -23,6 +27,7 @@ class RestoreSettlementTest : public ::testing::Test {
 
   PropertyList::Dictionary entries;
   RestoreEnd end;
+  std::set<std::string> only;
 };
 
 TEST_F(RestoreSettlementTest, TellsInstalledFromWhatWasInstalledBefore) {
@@ -41,6 +46,20 @@ TEST_F(RestoreSettlementTest, TellsWhyAPlaceholderStays) {
   EXPECT_EQ(settled(),
             "skipped: com.a (waits for its package) com.b (stays a placeholder until it is asked "
             "for)");
+}
+
+TEST_F(RestoreSettlementTest, FailsWhatWasNamedAndThePackagesLack) {
+  backUp("com.a");
+  backUp("com.b");
+  end.present.placeholders = {{"com.a", {}}, {"com.b", {}}};
+  end.heldBack = {"com.b"};
+  only = {"com.a", "com.b"};
+  const std::string demoted = "com.b (stays a placeholder until it is asked for)";
+  EXPECT_EQ(settled(), "skipped: com.a (waits for its package) " + demoted);
+  end.packagesGiven = true;
+  EXPECT_EQ(settled(), "failed: com.a (waits for its package); skipped: " + demoted);
+  only.clear();
+  EXPECT_EQ(settled(), "skipped: com.a (waits for its package) " + demoted);
 }
 
 TEST_F(RestoreSettlementTest, TellsWhyNothingStands) {
