@@ -84,16 +84,17 @@ class Planner {
   }
 
   /// What nobody named may stay undone.
-  void refuse(std::string_view identifier, std::string_view reason, bool named) {
+  void refuse(std::string_view identifier, std::string_view reason, bool named,
+              bool ofRemoval = false) {
     if (!named) return skip(identifier, reason);
-    plan_.failed.push_back({std::string(identifier), std::string(reason)});
+    plan_.failed.push_back({std::string(identifier), std::string(reason), {}, ofRemoval});
   }
 
   void remove(const std::string& identifier, bool named) {
     const InstalledApplication* application = find(identifier);
     if (!application) return skip(identifier, "it is not installed");
-    if (application->isSystem) return refuse(identifier, BelongsToSystem, named);
-    if (!options_.removingAllowed) return refuse(identifier, RemovingForbidden, named);
+    if (application->isSystem) return refuse(identifier, BelongsToSystem, named, true);
+    if (!options_.removingAllowed) return refuse(identifier, RemovingForbidden, named, true);
     plan_.entries.push_back({Action::Remove, identifier, application->version, application->version,
                              application->name, false, named});
   }

@@ -36,7 +36,8 @@ struct SkippedEntry {
 struct FailedEntry {
   std::string identifier;  ///< a file name where no identifier could be read
   std::string reason;
-  std::string file{};  ///< name of the package's file; empty when there is none
+  std::string file{};      ///< name of the package's file; empty when there is none
+  bool ofRemoval = false;  ///< no package has to do with it
 };
 
 /// What a sync is to do, in the order in which the phone is told.

@@ -34,14 +34,14 @@ void settleRemoval(const PlannedEntry& entry, const SyncEnd& end, Summary& summa
   if (taken && !there) {
     summary.deleted.push_back(entry.identifier);
   } else {
-    summary.failed.push_back({entry.identifier, failureReason(entry.identifier, end)});
+    summary.failed.push_back({entry.identifier, failureReason(entry.identifier, end), {}, true});
   }
 }
 
 /// What nobody named may stay undone.
 void notDone(const PlannedEntry& entry, const std::string& reason, Summary& summary) {
   if (entry.named) {
-    summary.failed.push_back({entry.identifier, reason});
+    summary.failed.push_back({entry.identifier, reason, {}, entry.action == Action::Remove});
   } else {
     summary.skipped.push_back({entry.identifier, reason, false});
   }
@@ -71,6 +71,7 @@ void settleInstall(const PlannedEntry& entry, const SyncEnd& end, Summary& summa
 
 void nameFiles(const Library& library, Summary& summary) {
   for (FailedEntry& failure : summary.failed) {
+    if (failure.ofRemoval) continue;
     const LibraryPackage* package = library.find(failure.identifier);
     if (package && failure.file.empty()) failure.file = package->file.filename().string();
   }

@@ -27,7 +27,8 @@ struct SyncEnd {
   std::optional<std::string> broken;  ///< why the sync as a whole failed
 };
 
-/// Adds to each failure the file of the application's package, where the library has one.
+/// Adds to each failure but those of removals the file of the application's package, where the
+/// library has one.
 void nameFiles(const Library& library, Summary& summary);
 
 /// What became of each entry of the plan and each file of the library. Pure.

@@ -129,7 +129,10 @@ class Sync(support.Case):
         self.run_appsync("policy", "--installing", "allow", "--removing", "forbid")
         package.unlink()
         self.assertEqual(self.sync()["installed"], ["com.b"])
-        self.assertIn("forbidden", reasons(self.sync("--remove", "com.b", code=1)["failed"])["com.b"])
+        [refused] = self.sync("--remove", "com.b", code=1)["failed"]
+        self.assertEqual(refused["identifier"], "com.b")
+        self.assertIn("forbidden", refused["reason"])
+        self.assertNotIn("file", refused)
 
         self.run_appsync("policy", "--installing", "forbid")
         self.offer("com.c")
