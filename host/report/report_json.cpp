@@ -105,7 +105,8 @@ Json jsonOf(const SyncBroken& event) { return {{"event", "error"}, {"message", e
 Json reasons(const std::vector<SkippedEntry>& entries) {
   Json list = Json::array();
   for (const SkippedEntry& entry : entries) {
-    list.push_back({{"identifier", entry.identifier}, {"reason", entry.reason}});
+    list.push_back(
+        {{"identifier", entry.identifier}, {"reason", entry.reason}, {"upToDate", entry.upToDate}});
   }
   return list;
 }

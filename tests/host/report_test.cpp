@@ -153,7 +153,7 @@ TEST_F(Reporting, GivesTheSummaryAsPromised) {
   EXPECT_THAT(
       json({Mixed, Summary{}}),
       ElementsAre(
-          R"({"event":"summary","installed":["com.a"],"updated":["com.paint"],"downgraded":[],"deleted":["com.old"],"failed":[{"identifier":"com.bad","reason":"damaged","file":"bad.zip"},{"identifier":"x.zip","reason":"no archive","file":"x.zip"}],"skipped":[{"identifier":"com.same","reason":"version 1 is installed"},{"identifier":"com.no","reason":"forbidden"}],"dataRestored":[]})",
+          R"({"event":"summary","installed":["com.a"],"updated":["com.paint"],"downgraded":[],"deleted":["com.old"],"failed":[{"identifier":"com.bad","reason":"damaged","file":"bad.zip"},{"identifier":"x.zip","reason":"no archive","file":"x.zip"}],"skipped":[{"identifier":"com.same","reason":"version 1 is installed","upToDate":true},{"identifier":"com.no","reason":"forbidden","upToDate":false}],"dataRestored":[]})",
           R"({"event":"summary","installed":[],"updated":[],"downgraded":[],"deleted":[],"failed":[],"skipped":[],"dataRestored":[]})"));
 }
 
