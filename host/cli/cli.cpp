@@ -134,6 +134,10 @@ std::string checkPositive(const std::string& text) {
   return isNumber && isPositive ? "" : "must be a whole number from 1 to 999999999";
 }
 
+std::string checkIdentifier(const std::string& text) {
+  return text.empty() ? "an identifier is not empty" : "";
+}
+
 void addHelpCommand(CLI::App& app, Command& chosen) {
   CLI::App* help = app.add_subcommand("help", "Tell how a command is used");
   auto name = std::make_shared<std::string>();

@@ -72,6 +72,9 @@ using Command = std::function<ExitCode(CommandContext&)>;
 /// it.
 std::string checkPositive(const std::string& text);
 
+/// Check of an identifier's text: empty when it may be one, else what is wrong with it.
+std::string checkIdentifier(const std::string& text);
+
 /// "allow" or "forbid".
 std::string policyText(device::EmbeddedDevice& device, PolicySetting setting);
 

@@ -130,7 +130,8 @@ void addIdentifierCommand(CLI::App& app, Command& chosen, const char* name, cons
   auto identifier = std::make_shared<std::string>();
   command->add_option("identifier", *identifier, "Bundle identifier of the application")
       ->required()
-      ->type_name("ID");
+      ->type_name("ID")
+      ->check(checkIdentifier);
   command->callback([identifier, run, &chosen] {
     chosen = [identifier, run](CommandContext& context) { return run(*identifier, context); };
   });

@@ -92,6 +92,7 @@ void addRestoreCommand(CLI::App& app, Command& chosen) {
       ->type_name("LIBRARY");
   restore->add_option("--only", options->only, "Restore only this application (repeatable)")
       ->type_name("ID")
+      ->check(checkIdentifier)
       ->allow_extra_args(false);
   restore->add_flag("--overwrite-data", options->overwriteData,
                     "Give the backup's data back to installed applications too");

@@ -121,9 +121,11 @@ void addSyncCommands(CLI::App& app, Command& chosen) {
   sync->add_option("--install", options->plan.install,
                    "Install only this application, also anew in the same version (repeatable)")
       ->type_name("ID")
+      ->check(checkIdentifier)
       ->allow_extra_args(false);
   sync->add_option("--remove", options->plan.remove, "Remove this application (repeatable)")
       ->type_name("ID")
+      ->check(checkIdentifier)
       ->allow_extra_args(false);
   sync->add_flag("--mirror", options->plan.mirror, "Also remove what the library lacks");
   sync->add_option("--icon-layout", options->iconLayout,

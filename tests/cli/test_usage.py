@@ -75,6 +75,12 @@ class Usage(support.Case):
         self.one_line("history", "--limit", "many", code=2)
         self.one_line("log", "--level", "loud", code=2)
 
+    def test_an_empty_identifier(self):
+        for arguments in (("sync", self.library, "--install", ""), ("sync", self.library, "--remove", ""),
+                          ("restore", self.folder, "--only", ""), ("uninstall", ""), ("demote", ""),
+                          ("launch", ""), ("quit", ""), ("tap", ""), ("cancel", "")):
+            self.assertIn("an identifier is not empty", self.one_line(*arguments, code=2))
+
     def test_errors_are_objects_with_json(self):
         self.assertIn("unknown command", self.json_lines("dance", code=2)[0]["message"])
         self.assertEqual(self.json_lines("apps", code=3)[0]["event"], "error")
