@@ -56,8 +56,8 @@ void addBackupCommand(CLI::App& app, Command& chosen) {
                    "Replace an older backup also when an application of it cannot be saved now");
   backup->footer(
       "Packages are not saved: \"restore\" gets them from a store or a library. An older backup\n"
-      "is replaced when the new one is whole; it stays when the new one would lack an application\n"
-      "that it holds.\n"
+      "is replaced when the new one is whole; it stays when an application that it holds is on\n"
+      "the phone but cannot be saved.\n"
       "Example: appsync --device phone backup backup-of-phone");
   backup->callback([arguments, &chosen] {
     chosen = [arguments](CommandContext& context) { return runBackup(*arguments, context); };
