@@ -69,12 +69,6 @@ bool isToStay(SQLite::Database& database, const PlaceholderRow& placeholder) {
          present.placeholder && present.placeholder->installType != InstallType::Sync;
 }
 
-/// Whether a restored application waits on after its package has failed.
-bool waitsOn(SQLite::Database& database, const CoordinatorState& state) {
-  return state.coordinator.kind == CoordinatorKind::Restoring && state.placeholder->stands() &&
-         !findApplication(database, state.coordinator.identifier).installed;
-}
-
 bool isFile(FileManager& files, const std::string& path) {
   const auto attributes = files.attributesOfItem(path);
   return attributes && !attributes->isDirectory;
@@ -295,7 +289,8 @@ void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optio
           if (isOver) return complete(database, *row, error, consequences);
           row->error = bytesOf(*error);
           put(database, *row);
-          if (waitsOn(database, state)) left.presence = Presence::Adopted;
+          if (waitsOn(database, state.coordinator, *state.placeholder))
+            left.presence = Presence::Adopted;
           setPresence(database, left, left.presence);
         },
         commit);

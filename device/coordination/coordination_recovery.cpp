@@ -112,6 +112,10 @@ class Repair {
   /// Nobody is there yet who might have to be told.
   void giveUp(CoordinatorRow row, std::string_view why) {
     row.stage = Stage::Waiting;
+    const auto placeholder = findPlaceholder(database_, row.placeholder);
+    if (placeholder && waitsOn(database_, row, *placeholder)) {
+      setPresence(database_, *placeholder, Presence::Adopted);
+    }
     const std::string reason =
         fmt::format("the install of {} was given up: {}", shown(row.identifier), why);
     cancel(database_, row, Error::withDescription(POSIXErrorDomain, ECANCELED, reason), row.creator,

@@ -107,6 +107,13 @@ bool lostItsPlaceholder(SQLite::Database& database, const CoordinatorRow& coordi
          !findApplication(database, coordinator.identifier).placeholder;
 }
 
+bool waitsOn(SQLite::Database& database, const CoordinatorRow& coordinator,
+             const PlaceholderRow& placeholder) {
+  return coordinator.kind == CoordinatorKind::Restoring && placeholder.stands() &&
+         placeholder.identifier == coordinator.identifier &&
+         !findApplication(database, coordinator.identifier).installed;
+}
+
 void setPresence(SQLite::Database& database, PlaceholderRow placeholder, Presence presence) {
   placeholder.presence = presence;
   put(database, placeholder);

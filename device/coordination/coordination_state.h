@@ -55,6 +55,10 @@ void complete(SQLite::Database& database, CoordinatorRow coordinator,
 /// package is being installed it goes by itself.
 bool lostItsPlaceholder(SQLite::Database& database, const CoordinatorRow& coordinator);
 
+/// Whether a restored application waits on, as its placeholder, when its package does not come.
+bool waitsOn(SQLite::Database& database, const CoordinatorRow& coordinator,
+             const PlaceholderRow& placeholder);
+
 /// Changes a placeholder's presence.
 void setPresence(SQLite::Database& database, PlaceholderRow placeholder, Presence presence);
 

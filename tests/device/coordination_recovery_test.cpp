@@ -146,6 +146,19 @@ TEST_F(CoordinationRecoveryTest, APackageThatHasGoneCancelsItsCoordinator) {
       logMentions("The install coordinator of com.example.a is cancelled: its package is gone"));
 }
 
+TEST_F(CoordinationRecoveryTest, ARestoredApplicationWhosePackageHasGoneWaitsOn) {
+  prepareAndClose(CoordinatorKind::Restoring);
+  edit("UPDATE data_promises SET complete = 1, path = '/tmp/gone.qpk' WHERE name LIKE '%-Asset'");
+  reopen();
+  EXPECT_EQ(live(Id), nullptr);
+  waitUntilIdle(Id);
+  EXPECT_TRUE(
+      logMentions("The install coordinator of com.example.a is cancelled: its package is gone"));
+  EXPECT_EQ(registry(), Lines{"com.example.a 2.0 (placeholder)"});
+  reopen();
+  EXPECT_EQ(registry(), Lines{"com.example.a 2.0 (placeholder)"});
+}
+
 TEST_F(CoordinationRecoveryTest, APlaceholderThatWasTakenAwayEndsItsCoordinatorUntold) {
   prepareAndClose(CoordinatorKind::Restoring);
   reopen();
