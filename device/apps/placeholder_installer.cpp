@@ -64,7 +64,6 @@ bool fill(DeviceCore& core, const std::string& source, const InstallDetails& det
 /// that is left of its application.
 bool mustLast(const ApplicationRow& row) { return row.installType != InstallType::Sync; }
 
-/// Enters the placeholder; `replaced` is the one it takes the place of.
 bool isRestored(const ApplicationRow& placeholder) {
   return placeholder.installType == InstallType::Restore ||
          placeholder.installType == InstallType::Downgrade ||
@@ -79,6 +78,7 @@ HistoryEntry restorationOf(const ApplicationRow& placeholder) {
   return entry;
 }
 
+/// Enters the placeholder; `replaced` is the one it takes the place of.
 bool enter(DeviceCore& core, ApplicationRow& row, std::optional<ApplicationRow>& replaced,
            std::optional<Error>* error) {
   return core.database.change(
