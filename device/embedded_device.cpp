@@ -212,7 +212,10 @@ class FolderDevice final : public EmbeddedDevice {
 
   std::optional<Error> tap(std::string_view bundleId) {
     const bool isHeard = coordination_ && coordination_->tap(bundleId);
-    const bool isAsked = (!isHeard || registry_.isDemoted(bundleId)) && registry_.askFor(bundleId);
+    std::optional<Error> error;
+    const bool isAsked =
+        (!isHeard || registry_.isDemoted(bundleId)) && registry_.askFor(bundleId, &error);
+    if (error) return error;
     if (isHeard || isAsked) return std::nullopt;
     return registry_.isBeingInstalled(bundleId)
                ? tooLate(bundleId, "and this phone brings packages in their order")
@@ -222,10 +225,12 @@ class FolderDevice final : public EmbeddedDevice {
   /// What only waits for its restore goes like an application that is uninstalled.
   std::optional<Error> cancel(std::string_view bundleId) {
     if (coordination_ && coordination_->cancelInstall(bundleId)) {
-      if (!registry_.isApplicationInstalled(bundleId)) containers_.removeWaitingData(bundleId);
+      registry_.forgetWaitingData(bundleId);
       return std::nullopt;
     }
-    if (registry_.cancelRestore(bundleId)) return std::nullopt;
+    std::optional<Error> error;
+    if (registry_.cancelRestore(bundleId, &error)) return std::nullopt;
+    if (error) return error;
     const bool isLive =
         coordination_ && coordination_->coordinatorFor(CoordinatorKind::Any, bundleId,
                                                        PersonClientID, false, nullptr, nullptr);

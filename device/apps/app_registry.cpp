@@ -226,9 +226,9 @@ bool DeviceAppRegistry::demote(std::string_view bundleId, std::optional<Error>* 
   return changeApplication(bundleId, demote, error);
 }
 
-bool DeviceAppRegistry::askFor(std::string_view bundleId) noexcept {
+bool DeviceAppRegistry::askFor(std::string_view bundleId, std::optional<Error>* error) noexcept {
   bool asked = false;
-  const auto ask = [&](const std::string& identifier, std::optional<Error>* error) {
+  const auto ask = [&](const std::string& identifier, std::optional<Error>* why) {
     return core_.database.change(
         "the application could not be asked for", Database::Commit::OnDisk,
         [&](SQLite::Database& database) {
@@ -238,22 +238,35 @@ bool DeviceAppRegistry::askFor(std::string_view bundleId) noexcept {
           row->installType = InstallType::StoreDownload;
           putApplication(database, *row);
         },
-        error);
+        why);
   };
-  return changeApplication(bundleId, ask, nullptr) && asked;
+  return changeApplication(bundleId, ask, error) && asked;
 }
 
-bool DeviceAppRegistry::cancelRestore(std::string_view bundleId) noexcept {
-  const auto cancel = [&](const std::string& identifier, std::optional<Error>* error) {
+bool DeviceAppRegistry::cancelRestore(std::string_view bundleId,
+                                      std::optional<Error>* error) noexcept {
+  const auto cancel = [&](const std::string& identifier, std::optional<Error>* why) {
     ApplicationRows rows;
     const bool read = core_.database.read(
         ReadFailed,
-        [&](SQLite::Database& database) { rows = findApplication(database, identifier); }, error);
+        [&](SQLite::Database& database) { rows = findApplication(database, identifier); }, why);
     if (!read || rows.installed) return false;
     const bool waits = rows.placeholder && rows.placeholder->installType == InstallType::Restore;
-    return waits && removeForPerson(core_, identifier, error);
+    return waits && removeForPerson(core_, identifier, why);
   };
-  return changeApplication(bundleId, cancel, nullptr);
+  return changeApplication(bundleId, cancel, error);
+}
+
+void DeviceAppRegistry::forgetWaitingData(std::string_view bundleId) noexcept {
+  const auto forget = [&](const std::string& identifier, std::optional<Error>* error) {
+    bool isKnown = true;
+    const bool read = core_.database.read(
+        ReadFailed,
+        [&](SQLite::Database& database) { isKnown = findApplication(database, identifier).any(); },
+        error);
+    return read && !isKnown && core_.containers.removeWaitingData(identifier);
+  };
+  changeApplication(bundleId, forget, nullptr);
 }
 
 bool DeviceAppRegistry::isDemoted(std::string_view bundleId) noexcept {

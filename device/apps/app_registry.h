@@ -36,11 +36,15 @@ class DeviceAppRegistry final : public AppRegistry {
   /// What a person does: only the application's placeholder and data stay.
   bool demote(std::string_view bundleId, std::optional<Error>* error) noexcept;
   /// What a person does: a demoted or restored application is to come. Its placeholder becomes that
-  /// of a download from the store. False when there is no such placeholder.
-  bool askFor(std::string_view bundleId) noexcept;
+  /// of a download from the store. False when there is no such placeholder, and with an error when
+  /// that is not known or cannot be written.
+  bool askFor(std::string_view bundleId, std::optional<Error>* error) noexcept;
   /// What a person does: an application that only waits to be restored is not to come, and goes
-  /// with what the restore had for it. False when there is no such placeholder.
-  bool cancelRestore(std::string_view bundleId) noexcept;
+  /// with what the restore had for it. False when there is no such placeholder, and with an error
+  /// when that is not known or cannot be written.
+  bool cancelRestore(std::string_view bundleId, std::optional<Error>* error) noexcept;
+  /// Removes what a restore had for an application of which the registry knows nothing any more.
+  void forgetWaitingData(std::string_view bundleId) noexcept;
   /// Whether only the placeholder and the data are left of it until somebody asks for it.
   bool isDemoted(std::string_view bundleId) noexcept;
   /// Whether an install is under way; not while a placeholder only waits for somebody to begin one.

@@ -259,6 +259,27 @@ TEST_F(CoordinationObjectsTest, ARestoreThatThePersonCancelsIsGoneWithWhatItHadF
   EXPECT_FALSE(device->files().fileExists("/var/mobile/Media/HalvoRestore/Data/com.example.a"));
 }
 
+TEST_F(CoordinationObjectsTest, ARegistryThatCannotBeReadCostsNoWaitingDataAndThePersonIsToldSo) {
+  const std::string data = "/var/mobile/Media/HalvoRestore/Data/com.example.a/saved";
+  putFile(data, "old");
+  const auto coordinator = coordinatorFor(Id, CoordinatorKind::Restoring);
+  coordinator->setObserver(&recorder);
+  ASSERT_TRUE(
+      coordinator->setPlaceholderPromise(completePlaceholder(Id, InstallType::Restore), nullptr));
+  ASSERT_TRUE(recorder.waitFor("placeholder"));
+  SQLite::Database database((folder / "device.db").string(), SQLite::OPEN_READWRITE);
+  database.exec("ALTER TABLE applications RENAME TO hidden");
+  DeviceError problem;
+  EmbeddedDevice::cancel(folder, Id, problem, &error);
+  EXPECT_EQ(textAt(data), "old");
+  error.reset();
+  EXPECT_FALSE(EmbeddedDevice::cancel(folder, "com.example.b", problem, &error));
+  EXPECT_EQ(text().find("is not being installed"), std::string::npos) << text();
+  error.reset();
+  EXPECT_FALSE(EmbeddedDevice::tap(folder, "com.example.b", problem, &error));
+  EXPECT_EQ(text().find("is not being installed"), std::string::npos) << text();
+}
+
 TEST_F(CoordinationObjectsTest, ATapOfADemotedApplicationThatASyncBringsAsksForItToo) {
   ASSERT_TRUE(installPackage(Id, "1.0"));
   putFile("/var/mobile/Containers/Data/com.example.a/saved", "kept");
