@@ -106,7 +106,8 @@ void removeTemporaries(DeviceCore& core, const std::vector<ApplicationRow>& rows
   core.handles.removeTemporaries(Containers::DataDirectory, Reach::Here);
   for (const ApplicationRow& row : rows) {
     core.handles.removeTemporaries(row.container, Reach::Here);
-    core.handles.removeTemporaries(row.bundlePath(), Reach::Here);
+    // A package may have brought such a name; in the bundles of placeholders the device writes.
+    if (row.placeholder) core.handles.removeTemporaries(row.bundlePath(), Reach::Here);
   }
 }
 

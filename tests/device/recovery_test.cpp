@@ -52,12 +52,14 @@ TEST_F(RecoveryTest, AFileThatWasBeingReceivedIsRemoved) {
 
 TEST_F(RecoveryTest, TemporariesOfTheDeviceInContainersGoAndThoseOfApplicationsStay) {
   ASSERT_TRUE(installPackage(Id));
+  ASSERT_TRUE(installRestorePlaceholder("com.example.waiting"));
+  const std::string waiting = *record("com.example.waiting", true)->bundlePath;
   const std::string left = "/.appsync-0123456789abcdef";
   const std::string data = "/var/mobile/Containers/Data";
   const auto [container, bundle] =
       std::pair(*record(Id)->bundleContainerPath, *record(Id)->bundlePath);
-  const Lines swept = {container + left, bundle + left, data + left + "/half"};
-  const Lines kept = {bundle + "/inner" + left, data + "/com.example.a" + left};
+  const Lines swept = {container + left, waiting + left, data + left + "/half"};
+  const Lines kept = {bundle + left, bundle + "/inner" + left, data + "/com.example.a" + left};
   for (const std::string& path : swept) putFile(path, "half");
   for (const std::string& path : kept) putFile(path, "whole");
   reopen();
