@@ -2,6 +2,7 @@
 
 #include <algorithm>
 
+#include "device/base/temporary_file.h"
 #include "device/packages/package_names.h"
 #include "platform/installer_service.h"
 #include "platform/sync_files.h"
@@ -127,6 +128,9 @@ std::optional<Error> PackageEntryRules::plainPath(std::string_view name, std::st
       return refuseEntry(PackageRefusal::ParentName, name, "leads to a parent folder");
     if (component.size() > LongestName)
       return refuseEntry(PackageRefusal::UnsafeName, name, "has a part longer than 255 bytes");
+    if (isTemporaryName(component))
+      return refuseEntry(PackageRefusal::UnsafeName, name,
+                         "is called like the device's temporaries");
     if (++depth > DeepestPath)
       return refuseEntry(PackageRefusal::UnsafeName, name, "is nested deeper than 32 folders");
     if (!path.empty()) path += '/';

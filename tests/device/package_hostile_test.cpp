@@ -24,6 +24,7 @@ std::vector<Hostile> hostilePackages() {
     return path;
   }();
   return {
+      {"temporary", sampleEntriesAnd({"Sample.app/.appsync-0123456789abcdef", "x"}), "unsafe name"},
       {"parent", sampleEntriesAnd({"../evil", "x"}), "parent name"},
       {"parentInside", sampleEntriesAnd({"Sample.app/../../evil", "x"}), "parent name"},
       {"parentThatReturns", sampleEntriesAnd({"Sample.app/a/../b", "x"}), "parent name"},
