@@ -53,7 +53,7 @@ struct TransactionRecord {
   std::string description;
 };
 
-/// What happened to an application.
+/// What happened to an application. Stored: values do not change.
 enum class HistoryEvent {
   Installed,  ///< in the place of an older version, if there was one
   Failed,     ///< its package was not installed
@@ -62,7 +62,7 @@ enum class HistoryEvent {
   Restored,  ///< as a placeholder, from a backup
 };
 
-/// By whom.
+/// By whom. Stored: values do not change.
 enum class HistoryOrigin { Sync, Store, Person };
 
 struct HistoryEntry {
