@@ -5,8 +5,7 @@
 namespace appsync {
 
 bool isMissing(const std::optional<Error>& reason) {
-  return reason && reason->domain == POSIXErrorDomain &&
-         (reason->code == ENOENT || reason->code == ENOTDIR);
+  return reason && reason->domain == POSIXErrorDomain && reason->code == ENOENT;
 }
 
 std::optional<bool> isThere(FileManager& files, std::string_view path,
