@@ -106,7 +106,7 @@ std::set<std::string> everSent(const Phone& phone, const PropertyList::Dictionar
        {std::string_view(exchange::WorkArea), std::string_view(exchange::StagingArea)}) {
     const auto todo = readTodoList(phone.files, directory);
     if (!todo) continue;
-    for (const TodoEntry& entry : *todo) identifiers.insert(entry.identifier);
+    for (const TodoState& entry : *todo) identifiers.insert(entry.identifier);
   }
   const ApplicationsPresent present = applicationsPresent(phone.apps);
   identifiers.insert(present.installed.begin(), present.installed.end());
