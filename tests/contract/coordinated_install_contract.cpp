@@ -8,6 +8,10 @@ namespace {
 
 class CoordinatedInstallContract : public CoordinationContract {
  protected:
+  void tap(std::string_view identifier) {
+    EXPECT_TRUE(phone->tap(identifier));
+    phone->settle(identifier);
+  }
   std::unique_ptr<CoordinatorEventListener> listen(CoordinatorObserver& delegate,
                                                    CoordinationClientId client = SyncHostClientID) {
     return coordination.createEventListener("com.corvane.service", {client}, delegate);
@@ -23,7 +27,6 @@ TEST_P(CoordinatedInstallContract, APlaceholderStandsUntilItsPackageTakesItsPlac
   EXPECT_EQ(version("com.a"), "none");
   const auto promise = coordinator->appAssetPromise(nullptr);
   deliver(*coordinator, "com.a");
-  phone->settle("com.a");
   EXPECT_EQ(recorder.events(),
             (Events{"placeholder com.a", "begin " + std::to_string(promise->identifier()),
                     "complete com.a"}));
@@ -38,7 +41,6 @@ TEST_P(CoordinatedInstallContract, WhatIsOverStaysReadableAndTakesNoMoreChanges)
   const auto coordinator = prepare("com.a");
   const auto promise = coordinator->appAssetPromise(nullptr);
   deliver(*coordinator, "com.a");
-  phone->settle("com.a");
   ASSERT_EQ(version("com.a"), "2.0");
   promise->setPercentComplete(0.5);
   EXPECT_EQ(promise->percentComplete(), 1.0);
@@ -56,7 +58,6 @@ TEST_P(CoordinatedInstallContract, NothingIsInstalledBeforeTheClientIsReady) {
   coordinator->setObserver(&recorder);
   ASSERT_TRUE(coordinator->setAppAssetPromise(packagePromise("com.a"), nullptr));
   deliver(*coordinator, "com.a");
-  phone->settle("com.a");
   EXPECT_FALSE(hasPlaceholder("com.a")) << "nobody promised one";
   ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder("com.a"), nullptr));
   phone->settle("com.a");
@@ -81,7 +82,6 @@ TEST_P(CoordinatedInstallContract, APackageThatDoesNotFitFailsAndLeavesTheOldVer
   ASSERT_TRUE(installPackage("com.a", "1.0"));
   const auto coordinator = prepare("com.a", CoordinatorKind::Updating);
   deliver(*coordinator, "com.other");
-  phone->settle("com.a");
   EXPECT_EQ(recorder.count("failed com.a"), 1U);
   EXPECT_EQ(recorder.count("complete"), 0U);
   EXPECT_TRUE(coordinator->error());
@@ -93,8 +93,7 @@ TEST_P(CoordinatedInstallContract, APackageThatDoesNotFitFailsAndLeavesTheOldVer
 TEST_P(CoordinatedInstallContract, APersonsTapAndCancelReachTheClientOnce) {
   const auto coordinator = prepare("com.a");
   phone->settle("com.a");
-  EXPECT_TRUE(phone->tap("com.a"));
-  phone->settle("com.a");
+  tap("com.a");
   EXPECT_TRUE(phone->cancelInstall("com.a"));
   EXPECT_FALSE(phone->cancelInstall("com.a")) << "nothing is on its way any more";
   EXPECT_FALSE(phone->tap("com.a"));
@@ -141,14 +140,11 @@ TEST_P(CoordinatedInstallContract, AnEventGoesToTheCoordinatorsObserverElseToALi
   EventRecorder listening;
   const auto listener = listen(listening);
   const auto coordinator = make("com.a");
-  EXPECT_TRUE(phone->tap("com.a"));
-  phone->settle("com.a");
+  tap("com.a");
   coordinator->setObserver(&recorder);
-  EXPECT_TRUE(phone->tap("com.a"));
-  phone->settle("com.a");
+  tap("com.a");
   coordinator->setObserver(nullptr);
-  EXPECT_TRUE(phone->tap("com.a"));
-  phone->settle("com.a");
+  tap("com.a");
   EXPECT_EQ(listening.events(), (Events{"prioritize com.a", "prioritize com.a"}));
   EXPECT_EQ(recorder.events(), Events{"prioritize com.a"});
   EXPECT_NE(listening.thread(), std::this_thread::get_id());
@@ -172,7 +168,6 @@ TEST_P(CoordinatedInstallContract, AnEventThatNobodyIsThereForIsKeptAndToldOnce)
   prepare("com.a", CoordinatorKind::Initiating, nullptr);
   phone->settle("com.a");
   deliver(*live("com.a"), "com.a");
-  phone->settle("com.a");
   EXPECT_EQ(version("com.a"), "2.0");
   Events heard;
   for (int times = 0; times < 2; ++times) {
@@ -197,7 +192,6 @@ TEST_P(CoordinatedInstallContract, TheBeginningsOfIconAndPackageAreTold) {
   ASSERT_TRUE(coordinator->setPlaceholderPromise(shown, nullptr));
   phone->settle("com.a");
   deliver(*coordinator, "com.a");
-  phone->settle("com.a");
   const auto begin = [](const PathTransferPromise& promise) {
     return "begin " + std::to_string(promise.identifier());
   };
@@ -223,12 +217,10 @@ TEST_P(CoordinatedInstallContract, AnInstallIsOverWhenItsPlaceholderIsTakenOutOf
 TEST_P(CoordinatedInstallContract, ARestoredApplicationWaitsOnWhenItsPackageIsRefused) {
   const auto coordinator = prepare("com.a", CoordinatorKind::Restoring);
   deliver(*coordinator, "com.other");
-  phone->settle("com.a");
   EXPECT_EQ(recorder.count("failed com.a"), 1U);
   EXPECT_TRUE(hasPlaceholder("com.a"));
   EXPECT_EQ(live("com.a"), nullptr);
   deliver(*prepare("com.a", CoordinatorKind::Restoring), "com.a");
-  phone->settle("com.a");
   EXPECT_EQ(version("com.a"), "2.0");
 }
 
@@ -256,7 +248,6 @@ TEST_P(LastTraceContract, StandsInTheSteadOfASyncsPlaceholderUntilThePackageIsIn
   EXPECT_EQ(recorder.events(), Events{"placeholder com.a"});
   EXPECT_EQ(placeholderLeft(), "1.0 of type 8");
   deliver(*coordinator, "com.a");
-  phone->settle("com.a");
   EXPECT_EQ(recorder.count("complete com.a"), 1U);
   EXPECT_EQ(placeholderLeft(), "none");
   EXPECT_EQ(version("com.a"), "2.0");
@@ -264,7 +255,6 @@ TEST_P(LastTraceContract, StandsInTheSteadOfASyncsPlaceholderUntilThePackageIsIn
 
 TEST_P(LastTraceContract, StaysWhenThePackageIsRefused) {
   deliver(*coordinator, "com.other");
-  phone->settle("com.a");
   EXPECT_EQ(recorder.count("failed com.a"), 1U);
   EXPECT_EQ(placeholderLeft(), "1.0 of type 8");
 }

@@ -67,6 +67,7 @@ void CoordinationContract::deliver(InstallCoordinator& coordinator, std::string_
   promise->setTransferPath(FileLocation::file(path));
   promise->setPercentComplete(1.0);
   promise->setComplete(true);
+  phone->settle(*coordinator.bundleIdentifier());
 }
 
 std::string CoordinationContract::version(std::string_view identifier) {

@@ -33,7 +33,7 @@ class CoordinationContract : public ServiceContract {
                                               CoordinatorKind kind = CoordinatorKind::Initiating) {
     return prepare(identifier, kind, &recorder);
   }
-  /// A package of version 2.0 comes, of the application `content`.
+  /// A package of version 2.0 comes, of the application `content`, and all is done that follows.
   void deliver(InstallCoordinator& coordinator, std::string_view content);
 
   /// The version of the installed application; "none" without one.

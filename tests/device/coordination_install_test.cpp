@@ -11,9 +11,36 @@ constexpr std::string_view Id = "com.example.a";
 
 class CoordinationInstallTest : public CoordinationTest {
  protected:
+  ~CoordinationInstallTest() override {
+    if (device) device->setWatcher(nullptr);
+  }
+
   static void waitUntilTold(WaitingWatcher& watcher, std::size_t times) {
     while (watcher.entries().size() < times) std::this_thread::yield();
   }
+  /// The placeholder is complete, promised and laid.
+  void lay(InstallCoordinator& coordinator,
+           const std::shared_ptr<InstallPlaceholder>& placeholder) {
+    ASSERT_TRUE(placeholder->setConfigurationComplete(&error));
+    ASSERT_TRUE(coordinator.setPlaceholderPromise(placeholder, &error));
+    ASSERT_TRUE(recorder.waitFor("placeholder " + *coordinator.bundleIdentifier()));
+  }
+  /// An update of version 1.0, which is open, whose package has come.
+  std::shared_ptr<InstallCoordinator> updateWhileOpen() {
+    EXPECT_TRUE(installPackage(Id, "1.0") && launch(Id));
+    device->setWatcher(&watcher);
+    auto coordinator = prepare(Id, CoordinatorKind::Updating);
+    deliver(*coordinator, Id);
+    EXPECT_TRUE(watcher.waitFor("denied com.example.a"));
+    return coordinator;
+  }
+  void expectFailure(const FileLocation& package) {
+    deliver(*prepare(Id), package);
+    ASSERT_TRUE(recorder.waitFor("failed com.example.a: "));
+    EXPECT_EQ(registry(), Lines{});
+  }
+
+  WaitingWatcher watcher;
 };
 
 TEST_F(CoordinationInstallTest, APlaceholderStandsUntilItsPackageTakesItsPlace) {
@@ -67,8 +94,7 @@ TEST_F(CoordinationInstallTest, WhateverComesLastSetsTheInstallGoing) {
   do {
     std::string id = "com.example.order";
     for (const std::size_t piece : order) id += std::to_string(piece);
-    const auto coordinator = coordinatorFor(id);
-    coordinator->setObserver(&recorder);
+    const auto coordinator = observed(id);
     for (const std::size_t piece : order) pieces[piece](*coordinator);
     EXPECT_TRUE(recorder.waitFor("complete " + id));
     expected.push_back(id + " 2.0");
@@ -88,10 +114,8 @@ TEST_F(CoordinationInstallTest, AnUpdateLeavesTheOldVersionUsableUntilThePackage
 }
 
 TEST_F(CoordinationInstallTest, ADemotedRestoreEndsWithItsPlaceholder) {
-  const auto coordinator = coordinatorFor(Id, CoordinatorKind::RestoringDemoted);
-  coordinator->setObserver(&recorder);
-  ASSERT_TRUE(coordinator->setPlaceholderPromise(
-      completePlaceholder(Id, InstallType::IntentionalDowngrade), nullptr));
+  const auto coordinator = observed(Id, CoordinatorKind::RestoringDemoted);
+  lay(*coordinator, placeholderOf(Id, InstallType::IntentionalDowngrade));
   ASSERT_TRUE(recorder.waitFor("complete"));
   EXPECT_EQ(registry(), Lines{"com.example.a 2.0 (placeholder)"});
   EXPECT_EQ(record(Id, true)->installType, InstallType::IntentionalDowngrade);
@@ -102,14 +126,11 @@ TEST_F(CoordinationInstallTest, ADemotedRestoreEndsWithItsPlaceholder) {
 
 TEST_F(CoordinationInstallTest, ARestoredApplicationWaitsForTheStoreAndGetsItsDataBack) {
   putFile("/var/mobile/Media/HalvoRestore/Data/com.example.a/saved", "kept");
-  const auto coordinator = coordinatorFor(Id, CoordinatorKind::Restoring);
-  coordinator->setObserver(&recorder);
+  const auto coordinator = observed(Id, CoordinatorKind::Restoring);
   InstallOptions options{StoreMetadata{{{"title", "A"}}}, InstallType::Restore, 1, toBytes("sinf")};
   ASSERT_TRUE(coordinator->setInstallOptions(options, nullptr));
-  ASSERT_TRUE(
-      coordinator->setPlaceholderPromise(completePlaceholder(Id, InstallType::Restore), nullptr));
+  lay(*coordinator, placeholderOf(Id, InstallType::Restore));
   ASSERT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(KQClientKiosk, nullptr));
-  ASSERT_TRUE(recorder.waitFor("placeholder"));
   EXPECT_EQ(service().packagesOwedBy(KQClientKiosk), Lines{"com.example.a"});
   EXPECT_EQ(service().packagesOwedBy(SyncHostClientID), Lines{});
 
@@ -145,28 +166,22 @@ TEST_F(CoordinationInstallTest, ADamagedPackageFailsAndLeavesTheOldVersion) {
 }
 
 TEST_F(CoordinationInstallTest, APackageOfAnotherApplicationFails) {
-  deliver(*prepare(Id), stageApplication("com.example.b"));
-  ASSERT_TRUE(recorder.waitFor("failed com.example.a: "));
-  EXPECT_EQ(registry(), Lines{});
+  expectFailure(stageApplication("com.example.b"));
   EXPECT_TRUE(logMentions("The coordinated install of com.example.a failed"));
 }
 
 TEST_F(CoordinationInstallTest, APackageThatIsNotThereFails) {
-  deliver(*prepare(Id), FileLocation::file("/var/mobile/Media/PublicStaging/missing.pkg"));
-  ASSERT_TRUE(recorder.waitFor("failed com.example.a: "));
-  EXPECT_EQ(registry(), Lines{});
+  expectFailure(FileLocation::file("/var/mobile/Media/PublicStaging/missing.pkg"));
 }
 
 TEST_F(CoordinationInstallTest, ADirectoryInThePlaceOfAPackageFailsAndStays) {
   putFile("/var/mobile/Media/precious/file", "kept");
-  deliver(*prepare(Id), FileLocation::directory("/var/mobile/Media/precious"));
-  ASSERT_TRUE(recorder.waitFor("failed com.example.a: "));
+  expectFailure(FileLocation::directory("/var/mobile/Media/precious"));
   EXPECT_EQ(textAt("/var/mobile/Media/precious/file"), "kept");
 }
 
 TEST_F(CoordinationInstallTest, AFailedInstallCanBeBegunAnew) {
-  deliver(*prepare(Id), stageApplication("com.example.b"));
-  ASSERT_TRUE(recorder.waitFor("failed"));
+  expectFailure(stageApplication("com.example.b"));
   const auto again = prepare(Id);
   EXPECT_FALSE(again->error());
   deliver(*again, Id);
@@ -177,8 +192,7 @@ TEST_F(CoordinationInstallTest, AFailedInstallCanBeBegunAnew) {
 TEST_F(CoordinationInstallTest, APlaceholderWaitsForItsIconOrDoesWithoutACancelledOne) {
   for (const bool kept : {true, false}) {
     const std::string id = kept ? "com.example.kept" : "com.example.cancelled";
-    const auto coordinator = coordinatorFor(id);
-    coordinator->setObserver(&recorder);
+    const auto coordinator = observed(id);
     putFile("/tmp/icon-" + id, "picture");
     const auto icon = service().createPathTransferPromise(id + "-Icon", SyncHostClientID,
                                                           FileLocation::file("/tmp/icon-" + id), 7);
@@ -195,28 +209,22 @@ TEST_F(CoordinationInstallTest, APlaceholderWaitsForItsIconOrDoesWithoutACancell
 }
 
 TEST_F(CoordinationInstallTest, AMissingIconFileIsNotedAndDoesNotStopThePlaceholder) {
-  const auto coordinator = coordinatorFor(Id);
-  coordinator->setObserver(&recorder);
+  const auto coordinator = observed(Id);
   const auto placeholder = placeholderOf(Id);
-  ASSERT_TRUE(placeholder->setConfigurationComplete(nullptr));
   std::filesystem::remove(onDisk("/tmp/Icons/com.example.a.png"));
-  ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder, nullptr));
-  ASSERT_TRUE(recorder.waitFor("placeholder"));
+  lay(*coordinator, placeholder);
   EXPECT_TRUE(logMentions("The placeholder of com.example.a goes without its icon"));
 }
 
 TEST_F(CoordinationInstallTest, WhatTheInfoDictionarySaysStandsInThePlaceholder) {
-  const auto coordinator = coordinatorFor(Id);
-  coordinator->setObserver(&recorder);
+  const auto coordinator = observed(Id);
   const auto placeholder =
       service().createAppPlaceholder("Shown", Id, InstallType::Sync, SyncHostClientID);
   auto attributes = PlaceholderAttributes::fromInfoDictionary(
       {{"UIPeriodixApp", true}, {std::string(KBBundleIdentifier), "com.example.other"}});
   attributes.setLaunchProhibited(true);
   ASSERT_TRUE(placeholder->setPlaceholderAttributes(attributes, nullptr));
-  ASSERT_TRUE(placeholder->setConfigurationComplete(nullptr));
-  ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder, nullptr));
-  ASSERT_TRUE(recorder.waitFor("placeholder"));
+  lay(*coordinator, placeholder);
   const auto info = Bundle::open(device->files(), FileLocation::directory(*record(Id)->bundlePath))
                         ->infoDictionary();
   EXPECT_EQ(*appsync::find(info, KBBundleIdentifier), PropertyList(Id));
@@ -226,13 +234,7 @@ TEST_F(CoordinationInstallTest, WhatTheInfoDictionarySaysStandsInThePlaceholder)
 }
 
 TEST_F(CoordinationInstallTest, AnApplicationInTheForegroundIsUpdatedWhenItIsClosed) {
-  ASSERT_TRUE(installPackage(Id, "1.0"));
-  ASSERT_TRUE(launch(Id));
-  WaitingWatcher watcher;
-  device->setWatcher(&watcher);
-  const auto coordinator = prepare(Id, CoordinatorKind::Updating);
-  deliver(*coordinator, Id);
-  ASSERT_TRUE(watcher.waitFor("denied com.example.a"));
+  const auto coordinator = updateWhileOpen();
   EXPECT_EQ(version(Id), "1.0");
   EXPECT_TRUE(service().isBusy(Id));
   quit(Id);
@@ -240,33 +242,23 @@ TEST_F(CoordinationInstallTest, AnApplicationInTheForegroundIsUpdatedWhenItIsClo
   EXPECT_EQ(version(Id), "2.0");
   EXPECT_EQ(watcher.entries(), (Lines{"denied com.example.a", "installed com.example.a"}))
       << "people are told once";
-  device->setWatcher(nullptr);
 }
 
 TEST_F(CoordinationInstallTest, PeopleAreToldOfEachInstallThatWaitsForItsApplication) {
-  ASSERT_TRUE(installPackage(Id, "1.0"));
-  ASSERT_TRUE(launch(Id));
-  WaitingWatcher watcher;
-  device->setWatcher(&watcher);
-  deliver(*prepare(Id, CoordinatorKind::Updating), Id);
-  ASSERT_TRUE(watcher.waitFor("denied com.example.a"));
+  updateWhileOpen();
   ASSERT_TRUE(service().cancelInstall(Id));
   deliver(*prepare(Id, CoordinatorKind::Updating), Id);
   waitUntilTold(watcher, 2);
   EXPECT_EQ(watcher.entries(), (Lines{"denied com.example.a", "denied com.example.a"}));
-  device->setWatcher(nullptr);
 }
 
 TEST_F(CoordinationInstallTest, TheBlobOfAPlaceholderStaysWithTheApplication) {
-  const auto coordinator = coordinatorFor(Id);
-  coordinator->setObserver(&recorder);
+  const auto coordinator = observed(Id);
   const auto placeholder = placeholderOf(Id);
   ASSERT_TRUE(placeholder->setSinfData(toBytes("sinf"), nullptr));
-  ASSERT_TRUE(placeholder->setConfigurationComplete(nullptr));
   ASSERT_TRUE(coordinator->setInstallOptions({}, nullptr));
   ASSERT_TRUE(coordinator->setAppAssetPromise(packagePromise(Id), nullptr));
-  ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder, nullptr));
-  ASSERT_TRUE(recorder.waitFor("placeholder"));
+  lay(*coordinator, placeholder);
   EXPECT_EQ(device->opaqueBlob(Id), toBytes("sinf"));
   deliver(*coordinator, Id);
   ASSERT_TRUE(recorder.waitFor("complete"));
@@ -274,18 +266,12 @@ TEST_F(CoordinationInstallTest, TheBlobOfAPlaceholderStaysWithTheApplication) {
 }
 
 TEST_F(CoordinationInstallTest, WhenTheHostHurriesAWaitingInstallFails) {
-  ASSERT_TRUE(installPackage(Id, "1.0"));
-  ASSERT_TRUE(launch(Id));
-  WaitingWatcher watcher;
-  device->setWatcher(&watcher);
-  deliver(*prepare(Id, CoordinatorKind::Updating), Id);
-  ASSERT_TRUE(watcher.waitFor("denied com.example.a"));
+  updateWhileOpen();
   device->hurry();
   ASSERT_TRUE(recorder.waitFor("failed com.example.a: "));
   EXPECT_EQ(version(Id), "1.0");
   deliver(*prepare("com.example.b"), "com.example.b");
   EXPECT_TRUE(recorder.waitFor("complete com.example.b")) << "what need not wait is still done";
-  device->setWatcher(nullptr);
 }
 
 TEST_F(CoordinationInstallTest, ProgressOfThePackageShowsInTheRegistry) {
@@ -300,13 +286,10 @@ TEST_F(CoordinationInstallTest, ProgressOfThePackageShowsInTheRegistry) {
 }
 
 TEST_F(CoordinationInstallTest, OptionsReachTheApplicationThroughItsPlaceholder) {
-  const auto coordinator = coordinatorFor(Id);
-  coordinator->setObserver(&recorder);
+  const auto coordinator = observed(Id);
   const auto placeholder =
       service().createAppPlaceholder("A", Id, InstallType::None, SyncHostClientID);
-  ASSERT_TRUE(placeholder->setConfigurationComplete(nullptr));
-  ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder, nullptr));
-  ASSERT_TRUE(recorder.waitFor("placeholder"));
+  lay(*coordinator, placeholder);
   const InstallOptions options{StoreMetadata{{{"DeviceBasedQLP", true}}},
                                InstallType::StoreDownload, 1, std::nullopt};
   ASSERT_TRUE(coordinator->setInstallOptions(options, nullptr));

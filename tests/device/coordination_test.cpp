@@ -58,6 +58,13 @@ std::shared_ptr<InstallCoordinator> CoordinationTest::coordinatorFor(std::string
   return service().coordinatorFor(kind, identifier, client, true, nullptr, nullptr);
 }
 
+std::shared_ptr<InstallCoordinator> CoordinationTest::observed(std::string_view identifier,
+                                                               CoordinatorKind kind) {
+  const auto coordinator = coordinatorFor(identifier, kind);
+  coordinator->setObserver(&recorder);
+  return coordinator;
+}
+
 std::shared_ptr<InstallCoordinator> CoordinationTest::live(std::string_view identifier) {
   return service().coordinatorFor(CoordinatorKind::Any, identifier, SyncHostClientID, false,
                                   nullptr, nullptr);

@@ -41,6 +41,9 @@ class CoordinationTest : public DeviceTest {
   std::shared_ptr<InstallCoordinator> coordinatorFor(
       std::string_view identifier, CoordinatorKind kind = CoordinatorKind::Initiating,
       CoordinationClientId client = SyncHostClientID);
+  /// The same; `recorder` observes.
+  std::shared_ptr<InstallCoordinator> observed(std::string_view identifier,
+                                               CoordinatorKind kind = CoordinatorKind::Initiating);
   /// The live coordinator, or nullptr.
   std::shared_ptr<InstallCoordinator> live(std::string_view identifier);
   std::shared_ptr<PathTransferPromise> packagePromise(std::string_view identifier);
