@@ -13,6 +13,7 @@
 #include "device/apps/removal.h"
 #include "device/base/directory_tree.h"
 #include "device/base/temporary_file.h"
+#include "device/journal/history.h"
 #include "device/packages/data_archive.h"
 #include "device/packages/package_names.h"
 #include "device/state/application_rows.h"
@@ -127,6 +128,16 @@ std::optional<Error> restore(DeviceCore& core, const std::string& identifier,
   return Error::posix(EIO, path);
 }
 
+/// The data is in its place whether or not this can be written.
+void enterOverwriting(DeviceCore& core, const ApplicationRow& application) {
+  HistoryEntry entry;
+  entry.event = HistoryEvent::DataOverwritten;
+  entry.bundleId = application.identifier;
+  entry.version = application.version;
+  core.database.change("the history lacks an overwriting of data", Database::Commit::Ordinary,
+                       [&](SQLite::Database& database) { enterInHistory(database, entry); });
+}
+
 std::optional<Error> overwrite(DeviceCore& core, const std::string& identifier,
                                const DataSource& source) {
   const KeyedMutex::Guard guard(core.applicationLocks, identifier);
@@ -134,7 +145,11 @@ std::optional<Error> overwrite(DeviceCore& core, const std::string& identifier,
   const std::optional<IdleApplication> idle = holdIdle(core, identifier, &error);
   if (!idle) return error;
   std::uint64_t entries = 0;
-  return layOut(core, Containers::dataPath(identifier), source, true, entries);
+  if (auto failure = layOut(core, Containers::dataPath(identifier), source, true, entries)) {
+    return failure;
+  }
+  enterOverwriting(core, idle->row);
+  return std::nullopt;
 }
 
 /// Runs the work, which must not throw.

@@ -58,8 +58,9 @@ enum class HistoryEvent {
   Installed,  ///< in the place of an older version, if there was one
   Failed,     ///< its package was not installed
   Removed,
-  Demoted,   ///< its placeholder and data stay
-  Restored,  ///< as a placeholder, from a backup
+  Demoted,          ///< its placeholder and data stay
+  Restored,         ///< as a placeholder, from a backup
+  DataOverwritten,  ///< with a backup's
 };
 
 /// By whom. Stored: values do not change.

@@ -40,6 +40,8 @@ std::string_view nameOf(const HistoryEntry& entry) {
       return "demoted";
     case HistoryEvent::Restored:
       return "restored";
+    case HistoryEvent::DataOverwritten:
+      return "data-overwritten";
   }
   return "unknown";
 }

@@ -63,6 +63,9 @@ class Restores(RestoreCase):
         self.run_appsync("quit", "com.a")
         self.assertEqual(self.restore("--overwrite-data")["dataRestored"], ["com.a"])
         self.assertEqual(self.notes("com.a"), "notes of com.a")
+        last = self.json_lines("history")[-1]
+        self.assertEqual((last["event"], last["identifier"], last["version"]),
+                         ("data-overwritten", "com.a", "1.0"))
         self.assertEqual(self.restore("--overwrite-data")["dataRestored"], [])
 
     def test_only_what_is_named(self):

@@ -64,6 +64,13 @@ TEST_F(DataOverwriteTest, AnInstalledApplicationGetsTheDataInThePlaceOfItsOwn) {
   EXPECT_EQ(version(App), "1.0");
 }
 
+TEST_F(DataOverwriteTest, TheHistoryTellsOfIt) {
+  ASSERT_TRUE(overwrite(Archive));
+  EXPECT_FALSE(overwrite("no archive"));
+  EXPECT_EQ(history(), (Lines{"installed sync com.example.app 1.0",
+                              "data-overwritten sync com.example.app 1.0"}));
+}
+
 TEST_F(DataOverwriteTest, AnApplicationWithoutADataFolderGetsOne) {
   fs::remove_all(onDisk(Data));
   ASSERT_TRUE(overwrite(Archive));

@@ -1,8 +1,10 @@
 #include "tests/device/device_test.h"
 
+#include <fmt/format.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <array>
 #include <iterator>
 #include <stdexcept>
 
@@ -103,6 +105,24 @@ std::vector<std::string> DeviceTest::registry() {
 std::size_t DeviceTest::containerCount() const {
   const fs::directory_iterator entries(onDisk("/var/mobile/Containers/Applications"));
   return static_cast<std::size_t>(std::distance(entries, fs::directory_iterator()));
+}
+
+std::vector<std::string> DeviceTest::history() {
+  constexpr std::array events{"installed", "failed",   "removed",
+                              "demoted",   "restored", "data-overwritten"};
+  constexpr std::array origins{"sync", "store", "person"};
+  std::vector<std::string> lines;
+  std::optional<Error> failure;
+  for (const HistoryEntry& entry : device->history(&failure)) {
+    EXPECT_GT(entry.time, 1e9);
+    lines.push_back(fmt::format("{} {} {} {}{}{}", events.at(std::size_t(entry.event)),
+                                origins.at(std::size_t(entry.origin)), entry.bundleId,
+                                entry.version.value_or("-"),
+                                entry.replaced ? "<" + *entry.replaced : "",
+                                entry.reason.empty() ? "" : ": " + entry.reason));
+  }
+  EXPECT_FALSE(failure);
+  return lines;
 }
 
 std::vector<std::string> DeviceTest::logTexts() {

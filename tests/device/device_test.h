@@ -51,6 +51,8 @@ class DeviceTest : public ::testing::Test {
   std::vector<std::string> registry();
   /// The containers on disk, whether the registry names them or not.
   std::size_t containerCount() const;
+  /// "event origin identifier version<replaced: reason" of each entry.
+  std::vector<std::string> history();
   /// The texts of the device's own log lines.
   std::vector<std::string> logTexts();
 

@@ -1,5 +1,4 @@
 #include <SQLiteCpp/SQLiteCpp.h>
-#include <fmt/format.h>
 
 #include "device/embedded_device.h"
 #include "tests/device/device_test.h"
@@ -12,21 +11,6 @@ constexpr std::string_view Id = "com.example.a";
 
 class HistoryTest : public DeviceTest {
  protected:
-  /// "event origin identifier version<replaced: reason" of each entry.
-  Lines history() {
-    Lines lines;
-    for (const HistoryEntry& entry : device->history(&error)) {
-      EXPECT_GT(entry.time, 1e9);
-      lines.push_back(fmt::format("{} {} {} {}{}{}", Events.at(std::size_t(entry.event)),
-                                  Origins.at(std::size_t(entry.origin)), entry.bundleId,
-                                  entry.version.value_or("-"),
-                                  entry.replaced ? "<" + *entry.replaced : "",
-                                  entry.reason.empty() ? "" : ": " + entry.reason));
-    }
-    EXPECT_FALSE(error);
-    return lines;
-  }
-
   bool remove(bool placeholdersOnly = false) {
     PropertyList::Dictionary options;
     if (placeholdersOnly) options.emplace(UninstallPlaceholdersOnlyKey, true);
@@ -38,9 +22,6 @@ class HistoryTest : public DeviceTest {
     SQLite::Database((folder / "device.db").string(), SQLite::OPEN_READWRITE).exec(sql);
     reopen();
   }
-
-  const Lines Events = {"installed", "failed", "removed", "demoted", "restored"};
-  const Lines Origins = {"sync", "store", "person"};
 };
 
 TEST_F(HistoryTest, TellsWhatHappenedToAnApplicationWithItsVersionsAndByWhom) {
