@@ -12,8 +12,11 @@ constexpr const char* NotInstalled = "the phone did not install it (appsync log 
 class CoordinatedDelivery final : public PackageDelivery {
  public:
   CoordinatedDelivery(const Phone& phone, const std::string& identifier,
-                      std::shared_ptr<InstallCoordinator> coordinator)
-      : phone_(phone), identifier_(identifier), coordinator_(std::move(coordinator)) {}
+                      std::shared_ptr<InstallCoordinator> coordinator, CoordinationClientId client)
+      : phone_(phone),
+        identifier_(identifier),
+        coordinator_(std::move(coordinator)),
+        client_(client) {}
 
   void progressed(double fraction) override {
     if (const auto package = promise()) package->setPercentComplete(fraction);
@@ -44,7 +47,7 @@ class CoordinatedDelivery final : public PackageDelivery {
   std::shared_ptr<PathTransferPromise> promise() {
     if (!promise_) promise_ = coordinator_->appAssetPromise(nullptr);
     if (promise_) return promise_;
-    promise_ = phone_.coordination->createPathTransferPromise(identifier_ + "-Asset", KQClientKiosk,
+    promise_ = phone_.coordination->createPathTransferPromise(identifier_ + "-Asset", client_,
                                                               std::nullopt, 0);
     if (promise_ && !coordinator_->setAppAssetPromise(promise_, nullptr)) promise_.reset();
     return promise_;
@@ -53,6 +56,7 @@ class CoordinatedDelivery final : public PackageDelivery {
   const Phone& phone_;
   const std::string identifier_;
   const std::shared_ptr<InstallCoordinator> coordinator_;
+  const CoordinationClientId client_;
   std::shared_ptr<PathTransferPromise> promise_;
   std::string path_;
 };
@@ -108,8 +112,10 @@ class RegistryDelivery final : public PackageDelivery {
 
 std::unique_ptr<PackageDelivery> deliverToCoordinator(
     const Phone& phone, const std::string& identifier,
-    std::shared_ptr<InstallCoordinator> coordinator) {
-  return std::make_unique<CoordinatedDelivery>(phone, identifier, std::move(coordinator));
+    std::shared_ptr<InstallCoordinator> coordinator, std::optional<InstallType> origin) {
+  const bool isStores = origin == InstallType::StoreDownload;
+  return std::make_unique<CoordinatedDelivery>(phone, identifier, std::move(coordinator),
+                                               isStores ? KQClientKiosk : SyncHostClientID);
 }
 
 std::unique_ptr<PackageDelivery> deliverToRegistry(const Phone& phone, const AppRecord& placeholder,

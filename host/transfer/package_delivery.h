@@ -24,13 +24,14 @@ class PackageDelivery {
   virtual std::optional<std::string> settle() = 0;
 };
 
+// The phone takes the package for a sync's unless an origin is given.
+
 /// Keeps the promise of a package that an install coordinator expects of the store.
 std::unique_ptr<PackageDelivery> deliverToCoordinator(
     const Phone& phone, const std::string& identifier,
-    std::shared_ptr<InstallCoordinator> coordinator);
+    std::shared_ptr<InstallCoordinator> coordinator, std::optional<InstallType> origin);
 
-/// Installs the package in the place of the application's placeholder. The phone takes it for a
-/// sync's unless an origin is given.
+/// Installs the package in the place of the application's placeholder.
 std::unique_ptr<PackageDelivery> deliverToRegistry(const Phone& phone, const AppRecord& placeholder,
                                                    std::optional<InstallType> origin);
 

@@ -49,7 +49,9 @@ std::unique_ptr<PackageDelivery> Store::deliveryFor(const std::string& identifie
                                                      CoordinatorKind::Any, identifier,
                                                      KQClientKiosk, false, nullptr, nullptr)
                                                : nullptr;
-  if (coordinator && owed) return deliverToCoordinator(phone_, identifier, coordinator);
+  if (coordinator && owed) {
+    return deliverToCoordinator(phone_, identifier, coordinator, origin_);
+  }
   return placeholder && !coordinator ? deliverToRegistry(phone_, *placeholder, origin_) : nullptr;
 }
 

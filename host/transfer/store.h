@@ -27,7 +27,7 @@ std::set<std::string> waitingForStore(const Phone& phone);
 class Store {
  public:
   /// `ifInterrupted` is the reason, for people, why a package was not sent. `origin` is how the
-  /// phone is to take what it installs by itself: none, for a sync's.
+  /// phone is to take what it gets: none, for a sync's.
   Store(HostProcess& host, const Phone& phone, Reporter& reporter, const Interruption& interruption,
         const Library& catalogue, std::string ifInterrupted, std::optional<InstallType> origin)
       : host_(host),

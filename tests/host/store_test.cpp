@@ -75,6 +75,18 @@ TEST_F(StoreTest, KeepsThePromiseOfACoordinatorsPackage) {
                   "DataPromise.setComplete(com.a-Asset, true)"));
 }
 
+TEST_F(StoreTest, KeepsTheCoordinatorsPromiseOfASyncsPackageAsTheSync) {
+  coordination = true;
+  origin.reset();
+  seedRestoring("com.a");
+  offer("com.a");
+  EXPECT_THAT(deliver(), IsEmpty());
+  EXPECT_THAT(installed(), ElementsAre("com.a"));
+  EXPECT_EQ(
+      phone.trace.count("InstallCoordination.createPathTransferPromise(com.a-Asset, 3, none, 0)"),
+      1);
+}
+
 TEST_F(StoreTest, TakesUpAPromiseThatAKilledRestoreMade) {
   coordination = true;
   seedRestoring("com.a");
