@@ -8,6 +8,7 @@
 #include "device/apps/installs.h"
 #include "device/coordination/coordination_core.h"
 #include "device/coordination/coordination_values.h"
+#include "device/journal/history.h"
 #include "device/state/application_rows.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
@@ -56,9 +57,25 @@ PropertyList::Dictionary optionsOf(const PlaceholderRow& row) {
 
 /// What the options say of a package that takes its placeholder's place.
 InstallDetails detailsOf(const CoordinatorState& state) {
+/// Who brings the package.
+HistoryOrigin originOf(const CoordinatorState& state) {
+  const auto client = state.package ? state.package->client : state.coordinator.responsible;
+  return client == KQClientKiosk ? HistoryOrigin::Store : HistoryOrigin::Sync;
+}
+
   const auto given = optionsFrom(*state.coordinator.options).value_or(InstallOptions{});
-  return {given.installType, metadataFile(given.storeMetadata), given.sinfData,
-          state.package->client == KQClientKiosk ? HistoryOrigin::Store : HistoryOrigin::Sync};
+  return {given.installType, metadataFile(given.storeMetadata), given.sinfData, originOf(state)};
+}
+
+HistoryEntry failureOf(const CoordinatorState& state, const Error& reason) {
+  HistoryEntry entry;
+  entry.event = HistoryEvent::Failed;
+  entry.origin = originOf(state);
+  entry.bundleId = state.coordinator.identifier;
+  const auto attributes = attributesFrom(state.placeholder->attributes.value_or(Bytes{}));
+  if (attributes) entry.version = attributes->bundleVersion;
+  entry.reason = reason.localizedDescription();
+  return entry;
 }
 
 /// Whether a sync finds all that is left of an application: if the sync comes to nothing, that must
@@ -142,6 +159,10 @@ void CoordinatedInstalls::tidyUp(const std::string& identifier) {
   for (const PlaceholderRow& placeholder : left.placeholders) {
     removePlaceholder(identifier, placeholder);
     // What cannot be written is found, and tidied up, again.
+  if (placeholder.presence == Presence::Forsaken) {
+    core_.registry().cancelRestore(identifier, nullptr);
+    return;
+  }
     core_.change(
         [&](SQLite::Database& database, Consequences&) {
           const bool isAdopted = placeholder.presence == Presence::Adopted;
@@ -187,16 +208,9 @@ Presence CoordinatedInstalls::note(const CoordinatorState& state, Presence prese
 
 bool CoordinatedInstalls::installPlaceholder(const CoordinatorState& state) {
   // Noted first, so that whoever cancels meanwhile, or a crash, leaves no placeholder behind.
-  switch (note(state, Presence::Begun)) {
-    case Presence::None:
-    case Presence::Installed:
-      return false;
-    case Presence::Adopted:
-      core_.device().observers.installsChanged();
-      return true;
-    case Presence::Begun:
-      break;
-  }
+  const Presence noted = note(state, Presence::Begun);
+  if (noted == Presence::Adopted) core_.device().observers.installsChanged();
+  if (noted != Presence::Begun) return noted == Presence::Adopted;
   std::optional<Error> error;
   if (layPlaceholder(state, &error)) return note(state, Presence::Installed) != Presence::None;
   finish(state, error);
@@ -302,6 +316,8 @@ void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optio
     // opened.
     if (!end(false, Database::Commit::Ordinary)) return;
     // Before anybody hears of it, so that whoever does finds the phone as it is to stay.
+          // The installer tells of its own failures.
+          if (row->stage == Stage::Waiting) enterInHistory(database, failureOf(state, *error));
     if (left.presence != Presence::None) removePlaceholder(state.coordinator.identifier, left);
   }
   end(true, Database::Commit::OnDisk);

@@ -51,8 +51,8 @@ class CoordinatedInstalls {
   /// Marks the package as being installed, unless the coordinator is not ready any more.
   Beginning begin(const CoordinatorState& state);
   void finish(const CoordinatorState& state, const std::optional<Error>& error);
-  /// Takes away what the placeholder has in the registry, which stays as it was where it was only
-  /// adopted.
+  /// Takes away what the placeholder has in the registry, as a person does if it was forsaken; the
+  /// registry stays as it was where it was only adopted.
   void removePlaceholder(const std::string& identifier, const PlaceholderRow& placeholder);
 
   /// Comes back later; an error when that is not to be.

@@ -57,7 +57,8 @@ enum class Presence {
   None = 0,
   Begun = 1,  ///< perhaps there, perhaps not
   Installed = 2,
-  Adopted = 3,  ///< all that was left of the application stands in its stead, and is to stay
+  Adopted = 3,   ///< all that was left of the application stands in its stead, and is to stay
+  Forsaken = 4,  ///< perhaps there; goes like an application that a person uninstalls
 };
 
 struct PlaceholderRow {

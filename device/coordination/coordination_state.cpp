@@ -42,6 +42,16 @@ void noteBeginning(SQLite::Database& database, const CoordinatorRow& coordinator
   consequences.events = true;
 }
 
+/// A restored application that a person does not want goes with what the restore had for it.
+void forsake(SQLite::Database& database, const CoordinatorRow& coordinator) {
+  const auto placeholder = findPlaceholder(database, coordinator.placeholder);
+  const bool waits =
+      placeholder && placeholder->installType == InstallType::Restore &&
+      (placeholder->presence == Presence::Begun || placeholder->presence == Presence::Installed) &&
+      !findApplication(database, coordinator.identifier).installed;
+  if (waits) setPresence(database, *placeholder, Presence::Forsaken);
+}
+
 }  // namespace
 
 Step nextStep(const CoordinatorState& state) {
@@ -83,6 +93,7 @@ bool cancel(SQLite::Database& database, CoordinatorRow coordinator, const Error&
   settle(database, coordinator);
   consequences.over.insert(coordinator.identifier);
   if (client != coordinator.creator) {
+  if (client == PersonClientID) forsake(database, coordinator);
     addEvent(database, coordinator, EventKind::Cancelled, 0, coordinator.error, client);
     consequences.events = true;
   }

@@ -71,6 +71,20 @@ class History(support.Case):
             "installed com.a 1.0 by store", "installed com.b 1.0 by store",
             "removed com.b 1.0 by person"])
 
+    def test_a_restored_application_that_a_sync_brings_or_a_person_cancels(self):
+        self.offer("com.a")
+        self.offer("com.b")
+        self.sync()
+        backup = self.folder / "backup"
+        self.run_appsync("backup", backup)
+        self.environment["APPSYNC_DEVICE"] = str(self.folder / "other")
+        self.init(*self.options())
+        self.run_appsync("restore", backup)
+        self.run_appsync("cancel", "com.b")
+        self.sync("--install", "com.a")
+        self.assertEqual(self.history()[2:], [
+            "removed com.b 1.0 by person", "installed com.a 1.0 by sync"])
+
     def test_lines_for_people(self):
         self.assertEqual(self.run_appsync("history")[0], "No history yet.\n")
         self.offer("com.a")
