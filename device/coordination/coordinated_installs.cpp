@@ -20,6 +20,8 @@ constexpr std::string_view IconFile = "Icon.png";
 constexpr std::string_view LaunchProhibitedKey = "SWApplicationLaunchProhibited";
 /// Between two looks whether an application has left the foreground: a file's worth of work.
 constexpr std::chrono::milliseconds ForegroundPoll{200};
+/// Until a coordinator that could not be read is looked at again.
+constexpr std::chrono::milliseconds RetryDelay{200};
 
 PropertyList::Dictionary infoOf(const PlaceholderRow& row) {
   const auto attributes =
@@ -55,14 +57,14 @@ PropertyList::Dictionary optionsOf(const PlaceholderRow& row) {
   return options;
 }
 
-/// What the options say of a package that takes its placeholder's place.
-InstallDetails detailsOf(const CoordinatorState& state) {
 /// Who brings the package.
 HistoryOrigin originOf(const CoordinatorState& state) {
   const auto client = state.package ? state.package->client : state.coordinator.responsible;
   return client == KQClientKiosk ? HistoryOrigin::Store : HistoryOrigin::Sync;
 }
 
+/// What the options say of a package that takes its placeholder's place.
+InstallDetails detailsOf(const CoordinatorState& state) {
   const auto given = optionsFrom(*state.coordinator.options).value_or(InstallOptions{});
   return {given.installType, metadataFile(given.storeMetadata), given.sinfData, originOf(state)};
 }
@@ -114,33 +116,53 @@ bool CoordinatedInstalls::isLeaving() {
   return leaving_;
 }
 
-void CoordinatedInstalls::advance(const std::string& identifier) {
+void CoordinatedInstalls::advance(const std::string& identifier, std::int64_t coordinator) {
   tidyUp(identifier);
-  for (bool more = true; more && !isLeaving();) {
+  if (carryOn(coordinator, nullptr)) return;
+  // Once more, when whatever it was may have passed.
+  const auto again = [this, coordinator] {
+    std::optional<Error> error;
+    if (!carryOn(coordinator, &error)) core_.noteTrouble(coordinator, *error);
+  };
+  core_.workers().add(identifier, again, RetryDelay);
+}
+
+bool CoordinatedInstalls::carryOn(std::int64_t coordinator, std::optional<Error>* error) {
+  while (!isLeaving()) {
     std::optional<CoordinatorState> state;
-    core_.read([&](SQLite::Database& database) {
-      const auto live = findLiveCoordinator(database, identifier);
-      if (live) state = loadState(database, *live);
-    });
-    switch (state ? nextStep(*state) : Step::None) {
-      case Step::None:
-        more = false;
-        break;
-      case Step::InstallPlaceholder:
-        more = installPlaceholder(*state);
-        break;
-      case Step::InstallPackage:
-        more = installPackage(*state);
-        break;
-      case Step::Complete:
-        more = completeDemoted(*state);
-        break;
-    }
+    const bool read = core_.read(
+        [&](SQLite::Database& database) {
+          const auto row = findCoordinator(database, coordinator);
+          if (row) state = loadState(database, *row);
+        },
+        error);
+    if (!read) return false;
+    if (!state || !take(nextStep(*state), *state)) break;
   }
+  return true;
+}
+
+bool CoordinatedInstalls::take(Step step, const CoordinatorState& state) {
+  switch (step) {
+    case Step::None:
+      break;
+    case Step::InstallPlaceholder:
+      return installPlaceholder(state);
+    case Step::InstallPackage:
+      return installPackage(state);
+    case Step::Complete:
+      finish(state, std::nullopt);
+      break;
+  }
+  return false;
 }
 
 void CoordinatedInstalls::removePlaceholder(const std::string& identifier,
                                             const PlaceholderRow& placeholder) {
+  if (placeholder.presence == Presence::Forsaken) {
+    core_.registry().cancelRestore(identifier, nullptr);
+    return;
+  }
   if (placeholder.presence != Presence::Adopted) {
     const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
     core_.registry().uninstallApplication(identifier, options);
@@ -159,10 +181,6 @@ void CoordinatedInstalls::tidyUp(const std::string& identifier) {
   for (const PlaceholderRow& placeholder : left.placeholders) {
     removePlaceholder(identifier, placeholder);
     // What cannot be written is found, and tidied up, again.
-  if (placeholder.presence == Presence::Forsaken) {
-    core_.registry().cancelRestore(identifier, nullptr);
-    return;
-  }
     core_.change(
         [&](SQLite::Database& database, Consequences&) {
           const bool isAdopted = placeholder.presence == Presence::Adopted;
@@ -254,11 +272,6 @@ void CoordinatedInstalls::copyIcon(const CoordinatorState& state, const std::str
                         state.coordinator.identifier, error->localizedDescription()));
 }
 
-bool CoordinatedInstalls::completeDemoted(const CoordinatorState& state) {
-  finish(state, std::nullopt);
-  return false;
-}
-
 bool CoordinatedInstalls::installPackage(const CoordinatorState& state) {
   const std::string& identifier = state.coordinator.identifier;
   const Foreground::HoldResult held = core_.device().foreground.hold(identifier);
@@ -303,6 +316,8 @@ void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optio
           if (isOver) return complete(database, *row, error, consequences);
           row->error = bytesOf(*error);
           put(database, *row);
+          // The installer tells of its own failures.
+          if (row->stage == Stage::Waiting) enterInHistory(database, failureOf(state, *error));
           if (waitsOn(database, state.coordinator, *state.placeholder))
             left.presence = Presence::Adopted;
           setPresence(database, left, left.presence);
@@ -316,19 +331,17 @@ void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optio
     // opened.
     if (!end(false, Database::Commit::Ordinary)) return;
     // Before anybody hears of it, so that whoever does finds the phone as it is to stay.
-          // The installer tells of its own failures.
-          if (row->stage == Stage::Waiting) enterInHistory(database, failureOf(state, *error));
     if (left.presence != Presence::None) removePlaceholder(state.coordinator.identifier, left);
   }
   end(true, Database::Commit::OnDisk);
 }
 
-void CoordinatedInstalls::lookAgain(const std::string& identifier) {
+void CoordinatedInstalls::lookAgain(const std::string& identifier, std::int64_t coordinator) {
   {
     const std::lock_guard lock(mutex_);
     waiting_[identifier].lookIsDue = false;
   }
-  advance(identifier);
+  advance(identifier, coordinator);
   const std::lock_guard lock(mutex_);
   if (const auto place = waiting_.find(identifier); place != waiting_.end()) {
     if (!place->second.lookIsDue) waiting_.erase(place);
@@ -349,7 +362,9 @@ std::optional<Error> CoordinatedInstalls::waitForForeground(const CoordinatorRow
   if (isNew) core_.device().watcher.assertionDenied(identifier);
   if (!isDue) {
     core_.workers().add(
-        identifier, [this, identifier] { lookAgain(identifier); }, ForegroundPoll);
+        identifier,
+        [this, identifier, number = coordinator.number] { lookAgain(identifier, number); },
+        ForegroundPoll);
   }
   return std::nullopt;
 }

@@ -18,8 +18,8 @@ class CoordinatedInstalls {
  public:
   explicit CoordinatedInstalls(CoordinationCore& core) : core_(core) {}
 
-  /// Goes on with the application's live coordinator as far as it can.
-  void advance(const std::string& identifier);
+  /// Goes on with the application's coordinator as far as it can.
+  void advance(const std::string& identifier, std::int64_t coordinator);
   /// Removes what coordinators that are over leave behind: their package and, if they failed or
   /// were cancelled, their placeholder.
   void tidyUp(const std::string& identifier);
@@ -30,10 +30,13 @@ class CoordinatedInstalls {
   void leaveWaiting();
 
  private:
+  /// False when the coordinator cannot be read.
+  bool carryOn(std::int64_t coordinator, std::optional<Error>* error);
+
   // False when there is nothing more to be done now.
+  bool take(Step step, const CoordinatorState& state);
   bool installPlaceholder(const CoordinatorState& state);
   bool installPackage(const CoordinatorState& state);
-  bool completeDemoted(const CoordinatorState& state);
 
   /// A change for a live coordinator; false, and trouble of the coordinator's, when it fails.
   bool change(const CoordinatorState& state,
@@ -57,7 +60,7 @@ class CoordinatedInstalls {
 
   /// Comes back later; an error when that is not to be.
   std::optional<Error> waitForForeground(const CoordinatorRow& coordinator);
-  void lookAgain(const std::string& identifier);
+  void lookAgain(const std::string& identifier, std::int64_t coordinator);
   bool isLeaving();
 
   /// An application in the foreground.

@@ -83,8 +83,9 @@ bool CoordinationCore::read(const Database::Work& work, std::optional<Error>* er
 
 void CoordinationCore::apply(const Consequences& consequences) {
   for (const std::string& identifier : consequences.over) tidyUp(identifier);
-  for (const std::string& identifier : consequences.ready) {
-    workers_.add(identifier, [this, identifier] { installs_.advance(identifier); });
+  for (const auto& [identifier, coordinator] : consequences.ready) {
+    workers_.add(identifier,
+                 [this, id = identifier, number = coordinator] { installs_.advance(id, number); });
   }
   if (consequences.events) events_.check();
 }

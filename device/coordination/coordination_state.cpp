@@ -81,7 +81,9 @@ void follow(SQLite::Database& database, const CoordinatorRow& coordinator,
   const CoordinatorState state = loadState(database, coordinator);
   noteBeginning(database, coordinator, state.icon, consequences);
   noteBeginning(database, coordinator, state.package, consequences);
-  if (nextStep(state) != Step::None) consequences.ready.insert(coordinator.identifier);
+  if (nextStep(state) != Step::None) {
+    consequences.ready.insert_or_assign(coordinator.identifier, coordinator.number);
+  }
 }
 
 bool cancel(SQLite::Database& database, CoordinatorRow coordinator, const Error& reason,
@@ -91,9 +93,9 @@ bool cancel(SQLite::Database& database, CoordinatorRow coordinator, const Error&
   coordinator.error = bytesOf(reason);
   put(database, coordinator);
   settle(database, coordinator);
+  if (client == PersonClientID) forsake(database, coordinator);
   consequences.over.insert(coordinator.identifier);
   if (client != coordinator.creator) {
-  if (client == PersonClientID) forsake(database, coordinator);
     addEvent(database, coordinator, EventKind::Cancelled, 0, coordinator.error, client);
     consequences.events = true;
   }

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <map>
 #include <set>
 
 #include "device/coordination/coordination_rows.h"
@@ -29,8 +30,8 @@ Step nextStep(const CoordinatorState& state);
 
 /// What is to be done when a change has been committed.
 struct Consequences {
-  std::set<std::string> ready;  ///< applications with a next step
-  std::set<std::string> over;   ///< applications with something to tidy up
+  std::map<std::string, std::int64_t> ready;  ///< applications with a next step; coordinators
+  std::set<std::string> over;                 ///< applications with something to tidy up
   bool events = false;
 };
 
