@@ -1,6 +1,8 @@
 // One platform call after another refuses while an install is prepared.
 
+#include <algorithm>
 #include <cerrno>
+#include <iterator>
 
 #include "tests/coordination/install_trace.h"
 
@@ -175,6 +177,37 @@ TEST_P(InstallFaultTest, LeavesTheSameTraceOfAnUpdate) {
             asUpdate(joined({upTo(preparedInstall(), fault.firstLineLost), fault.instead})));
 }
 
+/// What a service that does not insist on a configured placeholder takes is prepared.
+class LenientServiceTest : public InstallFaultTest {};
+
+TEST_P(LenientServiceTest, DecidesThatAnInstallIsPrepared) {
+  const FaultCase& fault = GetParam();
+  const SyncAssetPtr asset = syncedAsset(phone);
+  phone.installCoordination.takeUnfinishedPlaceholders();
+  phone.faults.failCall(fault.operation, fault.call, Refused);
+
+  EXPECT_TRUE(client->prepareAppForInstallUsingCoordination(asset, false));
+
+  constexpr std::string_view handedOver = "InstallCoordinator.setPlaceholderPromise";
+  Trace expected =
+      joined({upTo(preparedInstall(), fault.firstLineLost), upTo(fault.instead, handedOver),
+              onwards(preparedInstall(), handedOver)});
+  // Of a placeholder that could not be configured the end tells why.
+  if (fault.instead.at(1).find(" setting ") != std::string::npos) {
+    std::string& end = expected.at(expected.size() - 2);
+    end.replace(end.find("(null)"), 6, "Error Domain=Fault Code=7");
+  }
+  EXPECT_EQ(effects(), expected);
+}
+
+std::vector<FaultCase> unfinishedPlaceholders() {
+  std::vector<FaultCase> cases;
+  std::ranges::copy_if(FaultCases, std::back_inserter(cases), [](const FaultCase& fault) {
+    return !fault.prepared && std::ranges::count(fault.instead, refusedUnfinished().front()) > 0;
+  });
+  return cases;
+}
+
 class OldIconTest : public CoordinationTest, public testing::WithParamInterface<bool> {};
 
 TEST_P(OldIconTest, ThatCannotBeRemovedCostsTheNewOne) {
@@ -199,6 +232,10 @@ TEST_P(OldIconTest, ThatCannotBeRemovedCostsTheNewOne) {
 
 INSTANTIATE_TEST_SUITE_P(InstallAndUpdate, OldIconTest, testing::Bool(),
                          [](const auto& given) { return given.param ? "Update" : "Install"; });
+
+INSTANTIATE_TEST_SUITE_P(OneRefusal, LenientServiceTest,
+                         testing::ValuesIn(unfinishedPlaceholders()),
+                         [](const auto& given) { return std::string(given.param.name); });
 
 INSTANTIATE_TEST_SUITE_P(OneRefusal, InstallFaultTest, testing::ValuesIn(FaultCases),
                          [](const auto& given) { return std::string(given.param.name); });

@@ -17,12 +17,13 @@ bool isOver(const DataPromise& promise) {
 }
 
 std::optional<Error> objection(const std::shared_ptr<InstallPlaceholder>& placeholder,
-                               const std::string& bundleId) {
+                               const std::string& bundleId, bool takesUnfinished) {
   if (!placeholder || placeholder->bundleIdentifier() != bundleId) return Error::posix(EINVAL);
   const auto* const fake = dynamic_cast<const FakeInstallPlaceholder*>(placeholder.get());
   if (!fake) return std::nullopt;
   if (fake->state().isOver()) return Error::posix(ECANCELED);
-  return fake->state().configurationComplete ? std::nullopt : std::optional(Error::posix(EINVAL));
+  if (fake->state().configurationComplete || takesUnfinished) return std::nullopt;
+  return Error::posix(EINVAL);
 }
 
 std::string optionsText(const InstallOptions& options) {
@@ -187,7 +188,7 @@ bool FakeInstallCoordinator::setPlaceholderPromise(
   return change(
       "setPlaceholderPromise", placeholder ? placeholder->description() : "none", error,
       [&](State& state) { state.placeholder = placeholder; },
-      fakes::objection(placeholder, label()));
+      fakes::objection(placeholder, label(), context_.service.takesUnfinishedPlaceholders()));
 }
 
 bool FakeInstallCoordinator::cancel(const Error& reason, CoordinationClientId client) noexcept {

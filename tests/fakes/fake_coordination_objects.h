@@ -31,6 +31,7 @@ class CoordinatorOwner {
   /// Whether another live coordinator has the promise.
   virtual bool isPromisedElsewhere(const DataPromise& promise,
                                    const FakeInstallCoordinator& coordinator) = 0;
+  virtual bool takesUnfinishedPlaceholders() const = 0;
 
  protected:
   ~CoordinatorOwner() = default;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <condition_variable>
 #include <deque>
 #include <functional>
@@ -55,6 +56,8 @@ class FakeInstallCoordination : public InstallCoordination, private CoordinatorO
 
   /// Off at first.
   void setEnabled(bool enabled);
+  /// From now on it is laxer than its contract: placeholders need not be configured.
+  void takeUnfinishedPlaceholders() { takesUnfinished_ = true; }
   /// From now on lookups give this error as well, whether or not a coordinator comes with it.
   void giveErrorWithEveryLookup(Error error);
   /// A coordinator that somebody made before; none: one whose application is not known any more.
@@ -112,6 +115,7 @@ class FakeInstallCoordination : public InstallCoordination, private CoordinatorO
               CoordinationClientId client) override;
   bool isPromisedElsewhere(const DataPromise& promise,
                            const FakeInstallCoordinator& coordinator) override;
+  bool takesUnfinishedPlaceholders() const override { return takesUnfinished_; }
   /// Ends a live coordinator that does not serve who asks for one of this kind; an error when it
   /// is not this client's to end. Neither if it does. The lock is held.
   bool makesRoom(FakeInstallCoordinator& live, CoordinatorKind kind, CoordinationClientId client,
@@ -138,6 +142,7 @@ class FakeInstallCoordination : public InstallCoordination, private CoordinatorO
   mutable std::mutex mutex_;
   std::condition_variable delivered_;
   bool enabled_ = false;
+  std::atomic<bool> takesUnfinished_ = false;
   std::optional<Error> lookupError_;
   std::uint64_t nextPromise_ = 1;
   std::vector<std::shared_ptr<FakeInstallCoordinator>> coordinators_;
