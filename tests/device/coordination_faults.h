@@ -75,13 +75,24 @@ class DatabaseFaults {
   std::atomic<bool> struck_ = false;
 };
 
-/// What a client does, as far as it gets: it gives up when it is refused. The coordinator whose
-/// package has come; nullptr when it gave up.
-inline std::shared_ptr<InstallCoordinator> install(DeviceInstallCoordination& service,
-                                                   CoordinatorObserver& observer) {
+/// An install that waits for its package.
+struct BegunInstall {
+  std::shared_ptr<InstallCoordinator> coordinator;  ///< nullptr: its client gave up
+  std::shared_ptr<PathTransferPromise> package;
+
+  void bringPackage() const {
+    package->setTransferPath(Package);
+    package->setPercentComplete(1.0);
+    package->setComplete(true);
+  }
+};
+
+/// What a client does, as far as it gets: it gives up when it is refused.
+inline BegunInstall beginInstall(DeviceInstallCoordination& service,
+                                 CoordinatorObserver& observer) {
   const auto coordinator = service.coordinatorFor(CoordinatorKind::Initiating, Id, SyncHostClientID,
                                                   true, nullptr, nullptr);
-  if (!coordinator) return nullptr;
+  if (!coordinator) return {};
   coordinator->setObserver(&observer);
   const auto package =
       service.createPathTransferPromise("com.example.a-Asset", SyncHostClientID, std::nullopt, 0);
@@ -102,12 +113,17 @@ inline std::shared_ptr<InstallCoordinator> install(DeviceInstallCoordination& se
                      coordinator->setPlaceholderPromise(placeholder, nullptr);
   if (!ready) {
     coordinator->cancel(Error::posix(ECANCELED), SyncHostClientID);
-    return nullptr;
+    return {};
   }
-  package->setTransferPath(Package);
-  package->setPercentComplete(1.0);
-  package->setComplete(true);
-  return coordinator;
+  return {coordinator, package};
+}
+
+/// The same, and the package comes.
+inline std::shared_ptr<InstallCoordinator> install(DeviceInstallCoordination& service,
+                                                   CoordinatorObserver& observer) {
+  const BegunInstall begun = beginInstall(service, observer);
+  if (begun.coordinator) begun.bringPackage();
+  return begun.coordinator;
 }
 
 inline std::shared_ptr<InstallCoordinator> find(DeviceInstallCoordination& service) {
