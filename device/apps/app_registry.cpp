@@ -127,13 +127,17 @@ std::optional<Bytes> DeviceAppRegistry::opaqueBlob(std::string_view bundleId,
   return blob;
 }
 
-void DeviceAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept {
-  const std::vector<AppRecord> all = records();
+bool DeviceAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor,
+                                         std::optional<Error>* error) noexcept {
+  std::optional<Error> reason;
+  const std::vector<AppRecord> all = records(&reason);
   bool stop = false;
   for (const AppRecord& record : kind == BundleKind::All ? all : onePerApplication(all, kind)) {
     visitor(record, stop);
-    if (stop) return;
+    if (stop) break;
   }
+  if (reason) setError(error, *reason);
+  return !reason;
 }
 
 bool DeviceAppRegistry::changeApplication(

@@ -43,7 +43,7 @@ std::optional<std::vector<InstalledApplication>> installedApplications(const Pho
   }
   const ClientsWishes wishes(phone);
   std::map<std::string, InstalledApplication> found;
-  phone.apps.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
+  const auto take = [&](const AppRecord& record, bool&) {
     if (!record.isApplication || (record.isPlaceholder && isLeftOver(phone, record))) return;
     const auto [place, isNew] = found.try_emplace(record.applicationIdentifier);
     InstalledApplication& application = place->second;
@@ -57,7 +57,12 @@ std::optional<std::vector<InstalledApplication>> installedApplications(const Pho
                      application.waits};
     }
     if (record.isPlaceholder) application.waits = wishes.leaveOut(record);
-  });
+  };
+  std::optional<Error> error;
+  if (!phone.apps.enumerateBundles(BundleKind::All, take, &error)) {
+    problem = withReason(CannotTellApplications, error);
+    return std::nullopt;
+  }
   std::vector<InstalledApplication> result;
   result.reserve(found.size());
   for (auto& [identifier, application] : found) result.push_back(std::move(application));

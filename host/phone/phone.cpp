@@ -3,6 +3,7 @@
 #include <chrono>
 #include <thread>
 
+#include "host/base/text.h"
 #include "platform/property_list_codec.h"
 #include "platform/todo_entry.h"
 
@@ -71,27 +72,39 @@ void waitUntilIdle(const Phone& phone, const std::set<std::string>& identifiers)
   }
 }
 
-ApplicationsPresent applicationsPresent(AppRegistry& registry) {
+std::optional<ApplicationsPresent> applicationsPresent(AppRegistry& registry,
+                                                       std::optional<Error>* error) {
   ApplicationsPresent present;
-  registry.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
+  const auto sort = [&](const AppRecord& record, bool&) {
     if (!record.isApplication) return;
     if (record.isPlaceholder) {
       present.placeholders.insert_or_assign(record.applicationIdentifier, record);
     } else {
       present.installed.insert(record.applicationIdentifier);
     }
-  });
+  };
+  if (!registry.enumerateBundles(BundleKind::All, sort, error)) return std::nullopt;
   return present;
 }
 
-void claimDownloads(AppRegistry& apps, const std::set<std::string>& except) {
-  for (const auto& item : applicationsPresent(apps).placeholders) {
+std::string withReason(std::string_view what, const std::optional<Error>& error) {
+  std::string text(what);
+  if (error) text += ": " + oneLine(error->localizedDescription());
+  return text;
+}
+
+bool claimDownloads(AppRegistry& apps, const std::set<std::string>& except,
+                    std::optional<Error>* error) {
+  const auto present = applicationsPresent(apps, error);
+  if (!present) return false;
+  for (const auto& item : present->placeholders) {
     const AppRecord& record = item.second;
     if (record.installType != InstallType::StoreDownload || except.contains(item.first)) continue;
     if (const auto progress = apps.installProgressSync(record)) {
       progress->setInstallState(InstallState::Active);
     }
   }
+  return true;
 }
 
 std::optional<std::vector<TodoState>> readTodoList(FileManager& files, std::string_view directory,

@@ -75,12 +75,21 @@ struct ApplicationsPresent {
   std::set<std::string, std::less<>> installed;
   std::map<std::string, AppRecord, std::less<>> placeholders;
 };
-ApplicationsPresent applicationsPresent(AppRegistry& registry);
+/// nullopt (with an error) when the registry cannot be read.
+std::optional<ApplicationsPresent> applicationsPresent(AppRegistry& registry,
+                                                       std::optional<Error>* error);
+
+/// "<what>: <the error's description>", or only what, for people.
+std::string withReason(std::string_view what, const std::optional<Error>& error);
+
+inline constexpr std::string_view CannotTellApplications =
+    "the phone's applications cannot be told";
 
 /// Shows the store's downloads but `except` as under way, which they are once a person has asked
 /// for them: the client asks the host for the package of every other placeholder, and takes it away
-/// when the host has none.
-void claimDownloads(AppRegistry& apps, const std::set<std::string>& except);
+/// when the host has none. False (with an error) when the registry cannot be read.
+bool claimDownloads(AppRegistry& apps, const std::set<std::string>& except,
+                    std::optional<Error>* error);
 
 /// What an entry of the todo list says of an application.
 struct TodoState {

@@ -1,7 +1,5 @@
 #include "host/restore/restore.h"
 
-#include <fmt/format.h>
-
 #include <algorithm>
 
 #include "host/base/text.h"
@@ -84,7 +82,7 @@ bool Restore::callClient(const RestoreInput& input) {
   }
   client_.reconcileRestoreOfType(FromDesktopBackup, &error);
   waitUntilIdle(phone_, handover_.listed);
-  claimDownloads(phone_.apps, {});
+  if (!claimDownloads(phone_.apps, {}, &error)) return broken(CannotTellApplications, error);
   reportPlaceholders(input.list);
   transfer(input);
   return !interruption_.requested();
@@ -105,23 +103,25 @@ void Restore::transfer(const RestoreInput& input) {
 
 /// Also what an earlier restore has sent, whatever the library holds now.
 void Restore::bringPackages(const RestoreList& list, const Library& library) {
+  const ApplicationsPresent present = applicationsNow();
   RestorePackages packages(client_, host_, phone_, reporter_, interruption_, library);
-  packages.deliver(leftOut(list));
+  packages.deliver(present, leftOut(list, present));
   note(packages.failures());
 }
 
 void Restore::bringFromStore(const RestoreList& list, const Library& catalogue) {
   Store store(host_, phone_, reporter_, interruption_, catalogue, InterruptedReason,
               InstallType::StoreDownload);
-  std::set<std::string> wanted = waitingForStore(phone_);
-  for (const std::string& identifier : leftOut(list)) wanted.erase(identifier);
+  const ApplicationsPresent present = applicationsNow();
+  std::set<std::string> wanted = waitingForStore(phone_, present);
+  for (const std::string& identifier : leftOut(list, present)) wanted.erase(identifier);
   store.deliver(wanted);
   note(store.failures());
 }
 
 void Restore::reportPlaceholders(const RestoreList& list) {
   const Demotions demotions(phone_.files);
-  const ApplicationsPresent present = applicationsPresent(phone_.apps);
+  const ApplicationsPresent present = applicationsNow();
   for (const BackedUpApplication& app : list.applications()) {
     const auto found = present.placeholders.find(app.identifier);
     if (found == present.placeholders.end()) continue;
@@ -130,11 +130,19 @@ void Restore::reportPlaceholders(const RestoreList& list) {
   }
 }
 
-std::set<std::string> Restore::leftOut(const RestoreList& list) const {
+ApplicationsPresent Restore::applicationsNow() {
+  std::optional<Error> error;
+  auto present = applicationsPresent(phone_.apps, &error);
+  if (!present) broken(CannotTellApplications, error);
+  return present ? std::move(*present) : ApplicationsPresent();
+}
+
+std::set<std::string> Restore::leftOut(const RestoreList& list,
+                                       const ApplicationsPresent& present) const {
   std::set<std::string> identifiers;
   for (const auto& failure : handover_.failures) identifiers.insert(failure.first);
   if (!list.isPart()) return identifiers;
-  for (const auto& placeholder : applicationsPresent(phone_.apps).placeholders) {
+  for (const auto& placeholder : present.placeholders) {
     if (!list.names(placeholder.first)) identifiers.insert(placeholder.first);
   }
   return identifiers;
@@ -174,7 +182,7 @@ Summary Restore::settle(const RestoreInput& input) {
   note(watch_.failures());
   RestoreEnd end;
   end.installedBefore = handover_.installed;
-  end.present = applicationsPresent(phone_.apps);
+  end.present = applicationsNow();
   for (const std::string& identifier : sent_) {
     if (handover_.installed.contains(identifier)) end.updated.insert(identifier);
   }
@@ -190,8 +198,7 @@ Summary Restore::settle(const RestoreInput& input) {
 }
 
 bool Restore::broken(std::string_view what, const std::optional<Error>& error) {
-  broken_ = error ? fmt::format("{}: {}", what, oneLine(error->localizedDescription()))
-                  : std::string(what);
+  broken_ = withReason(what, error);
   reporter_.report(SyncBroken{*broken_});
   return false;
 }

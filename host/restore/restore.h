@@ -41,8 +41,10 @@ class Restore {
   void bringPackages(const RestoreList& list, const Library& library);
   void bringFromStore(const RestoreList& list, const Library& catalogue);
   void reportPlaceholders(const RestoreList& list);
+  /// None when it cannot be told, which breaks the restore off.
+  ApplicationsPresent applicationsNow();
   /// The applications that nothing must be brought to.
-  std::set<std::string> leftOut(const RestoreList& list) const;
+  std::set<std::string> leftOut(const RestoreList& list, const ApplicationsPresent& present) const;
   void note(const std::map<std::string, std::string>& failures);
   /// Why a placeholder has no package.
   void explainPlaceholders(const RestoreInput& input, RestoreEnd& end);

@@ -49,7 +49,7 @@ class HandoverInProgress {
         interruption_(interruption) {}
 
   Handover run() {
-    look();
+    if (!look()) return std::move(result_);
     sweepPlaceholders();
     chooseForClient();
     giveBackData();
@@ -59,13 +59,19 @@ class HandoverInProgress {
 
  private:
   /// What a restore that was killed began is carried on by the phone itself.
-  void look() {
+  bool look() {
     std::set<std::string> all;
     for (const BackedUpApplication& app : list_.applications()) all.insert(app.identifier);
     waitUntilIdle(phone_, all);
-    ApplicationsPresent present = applicationsPresent(phone_.apps);
-    result_.installed = std::move(present.installed);
-    placeholders_ = std::move(present.placeholders);
+    std::optional<Error> error;
+    auto present = applicationsPresent(phone_.apps, &error);
+    if (!present) {
+      breakOff(CannotTellApplications, error);
+      return false;
+    }
+    result_.installed = std::move(present->installed);
+    placeholders_ = std::move(present->placeholders);
+    return true;
   }
 
   /// A broken-off sync's would keep the client from making a restore's.
@@ -142,7 +148,7 @@ class HandoverInProgress {
       if (older == false || (older && phone_.files.removeItem(exchange::RestoreList, &error))) {
         return;
       }
-      return breakOff("an older list of applications to restore could not be removed: ", error);
+      return breakOff("an older list of applications to restore could not be removed", error);
     }
     if (!list_.isPart()) putBackLayout();
     std::optional<Error> error;
@@ -150,12 +156,11 @@ class HandoverInProgress {
     const auto list = list_.only(result_.listed, &error);
     const bool done = demotions && write(exchange::DemotedApplications, *demotions, &error) &&
                       list && write(exchange::RestoreList, *list, &error);
-    if (!done) breakOff("the phone does not take the backup: ", error);
+    if (!done) breakOff("the phone does not take the backup", error);
   }
 
   void breakOff(std::string_view what, const std::optional<Error>& error) {
-    result_.broken =
-        std::string(what) + oneLine(error.value_or(Error::posix(EIO)).localizedDescription());
+    result_.broken = withReason(what, error);
   }
 
   /// The home screen keeps places for what is still to come.

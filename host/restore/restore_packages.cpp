@@ -47,8 +47,9 @@ class Remembered {
 
 }  // namespace
 
-void RestorePackages::deliver(const std::set<std::string>& except) {
-  const std::vector<AppRecord> records = wanted(except);
+void RestorePackages::deliver(const ApplicationsPresent& present,
+                              const std::set<std::string>& except) {
+  const std::vector<AppRecord> records = wanted(present, except);
   Remembered before(phone_.files);
   std::vector<SyncAssetPtr> assets;
   for (const AppRecord& record : records) {
@@ -75,10 +76,11 @@ void RestorePackages::fail(const std::vector<AppRecord>& records, const std::str
   for (const AppRecord& record : records) failures_.emplace(record.applicationIdentifier, reason);
 }
 
-std::vector<AppRecord> RestorePackages::wanted(const std::set<std::string>& except) const {
+std::vector<AppRecord> RestorePackages::wanted(const ApplicationsPresent& present,
+                                               const std::set<std::string>& except) const {
   const Demotions demotions(phone_.files);
   std::vector<AppRecord> records;
-  for (const auto& [identifier, record] : applicationsPresent(phone_.apps).placeholders) {
+  for (const auto& [identifier, record] : present.placeholders) {
     if (record.installType == InstallType::Restore && !demotions.holdBack(record) &&
         !except.contains(identifier)) {
       records.push_back(record);

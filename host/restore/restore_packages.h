@@ -27,16 +27,17 @@ class RestorePackages {
         library_(library),
         sender_(client, host.transfers(), phone, reporter, interruption, library) {}
 
-  /// For the placeholders of a restore that are not demoted, but `except`. The installs end with
-  /// the client's transfers.
-  void deliver(const std::set<std::string>& except);
+  /// For those of the applications present that are placeholders of a restore and not demoted, but
+  /// `except`. The installs end with the client's transfers.
+  void deliver(const ApplicationsPresent& present, const std::set<std::string>& except);
 
   /// Reason by identifier.
   const std::map<std::string, std::string>& failures() const { return failures_; }
 
  private:
   void fail(const std::vector<AppRecord>& records, const std::string& reason);
-  std::vector<AppRecord> wanted(const std::set<std::string>& except) const;
+  std::vector<AppRecord> wanted(const ApplicationsPresent& present,
+                                const std::set<std::string>& except) const;
   SyncAssetPtr makeAsset(const AppRecord& record, std::uint32_t parts) const;
 
   SyncClient& client_;

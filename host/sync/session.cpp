@@ -1,7 +1,5 @@
 #include "host/sync/session.h"
 
-#include <fmt/format.h>
-
 #include <algorithm>
 #include <chrono>
 #include <thread>
@@ -74,7 +72,7 @@ SyncResult Session::run(const SyncInput& input) {
   // What the client hears late, of a killed sync or of a person's cancel, must not reach this sync.
   waitUntilIdle(phone_, identifiersOf(input.plan));
   host_.transfers().forgetCancelled();
-  sweepPlaceholders();
+  const bool swept = sweepPlaceholders();
   removeLeftOverPackages(phone_);
   SyncResult result;
   SyncInput rest = input;
@@ -84,7 +82,7 @@ SyncResult Session::run(const SyncInput& input) {
     return isDone;
   });
   watch_.tellInstalled(carriedOut_);
-  const bool good = callClient(rest, sender);
+  const bool good = swept && callClient(rest, sender);
   result.summary = settle(input.plan, input.library, end(sender));
   result.completed = good && !broken_;
   return result;
@@ -128,18 +126,21 @@ bool Session::reconcile(const SyncInput& input) {
 }
 
 bool Session::transfer(const SyncInput& input, PackageSender& sender) {
-  if (!interruption_.requested()) {
-    claimDownloads(phone_.apps, identifiersOf(input.plan, false));
+  std::optional<Error> error;
+  const bool claimed = claimDownloads(phone_.apps, identifiersOf(input.plan, false), &error) ||
+                       broken(CannotTellApplications, error);
+  if (claimed && !interruption_.requested()) {
     const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
     if (phone_.coordination) findCoordinators(assets);
     sender.send(assets);
   }
-  bringWhatWaits(input);
+  if (claimed) bringWhatWaits(input);
   if (phone_.coordination) waitForCoordination(input.plan, sender.outcome().sent);
-  client_.assetTransferEndedWithSuccess(!interruption_.requested());
+  const bool success = claimed && !interruption_.requested();
+  client_.assetTransferEndedWithSuccess(success);
   // A coordinated install takes its package away itself, perhaps later.
   if (!phone_.coordination) sender.removeSentPackages();
-  return !interruption_.requested();
+  return success && !interruption_.requested();
 }
 
 /// Restored, demoted and asked-for applications whose packages the client leaves to the store.
@@ -188,21 +189,26 @@ void Session::waitForCoordination(const SyncPlan& plan, const std::set<std::stri
 }
 
 /// The client never asks for a package whose placeholder stands already.
-void Session::sweepPlaceholders() {
+bool Session::sweepPlaceholders() {
   std::vector<std::string> leftOver;
-  phone_.apps.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
+  const auto look = [&](const AppRecord& record, bool&) {
     if (!record.isPlaceholder || !isLeftOver(phone_, record)) return;
     const auto progress = phone_.apps.installProgressSync(record);
     const bool onItsWay = progress && progress->installState() == InstallState::Active &&
                           progress->installPhase() == InstallPhase::Installing;
     if (!onItsWay) leftOver.push_back(record.applicationIdentifier);
-  });
+  };
+  std::optional<Error> error;
+  if (!phone_.apps.enumerateBundles(BundleKind::All, look, &error)) {
+    return broken(CannotTellApplications, error);
+  }
   for (const std::string& identifier : leftOver) {
     const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
     if (phone_.apps.uninstallApplication(identifier, options)) {
       reporter_.report(PlaceholderSwept{identifier});
     }
   }
+  return true;
 }
 
 void Session::reportDeletions(const PropertyList::Dictionary& inventory) {
@@ -219,14 +225,17 @@ void Session::reportDeletions(const PropertyList::Dictionary& inventory) {
 /// when a sync ends.
 void Session::writeApplicationsPresent() {
   PropertyList::Array present;
-  phone_.apps.enumerateBundles(BundleKind::All, [&](const AppRecord& record, bool&) {
+  const auto take = [&](const AppRecord& record, bool&) {
     if (record.isApplication && !record.isPlaceholder &&
         record.applicationType == ApplicationTypeUser) {
       present.emplace_back(record.applicationIdentifier);
     }
-  });
+  };
   std::optional<Error> error;
-  const auto bytes = serializePropertyList(std::move(present), PropertyListFormat::Binary, &error);
+  const bool read = phone_.apps.enumerateBundles(BundleKind::All, take, &error);
+  const auto bytes =
+      read ? serializePropertyList(std::move(present), PropertyListFormat::Binary, &error)
+           : std::nullopt;
   if (!bytes || !phone_.files.writeAtomically(exchange::LastSyncState, *bytes, &error)) {
     broken("the list of applications present could not be written", error);
   }
@@ -240,7 +249,9 @@ SyncEnd Session::end(const PackageSender& sender) {
     if (todo) end.todo = *todo;
     if (!todo) broken("it cannot be seen what the phone has done", error);
   }
-  end.present = applicationsPresent(phone_.apps);
+  std::optional<Error> error;
+  end.present = applicationsPresent(phone_.apps, &error);
+  if (!end.present) broken(CannotTellApplications, error);
   end.transfers = sender.outcome();
   end.installFailures = watch_.failures();
   end.installFailures.insert(failures_.begin(), failures_.end());
@@ -252,8 +263,7 @@ SyncEnd Session::end(const PackageSender& sender) {
 }
 
 bool Session::broken(std::string_view what, const std::optional<Error>& error) {
-  broken_ = error ? fmt::format("{}: {}", what, oneLine(error->localizedDescription()))
-                  : std::string(what);
+  broken_ = withReason(what, error);
   reporter_.report(SyncBroken{*broken_});
   return false;
 }

@@ -53,7 +53,7 @@ class Session {
   bool isSettled(const std::string& identifier, const std::optional<std::vector<TodoState>>& todo);
   void waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent);
 
-  void sweepPlaceholders();
+  bool sweepPlaceholders();
   void reportDeletions(const PropertyList::Dictionary& inventory);
   void writeApplicationsPresent();
   SyncEnd end(const PackageSender& sender);

@@ -29,9 +29,9 @@ std::string failureReason(const std::string& identifier, const SyncEnd& end) {
 
 void settleRemoval(const PlannedEntry& entry, const SyncEnd& end, Summary& summary) {
   const bool taken = operationOf(end.todo, entry.identifier) == exchange::TodoRemove;
-  const bool there = end.present.installed.contains(entry.identifier) ||
-                     end.present.placeholders.contains(entry.identifier);
-  if (taken && !there) {
+  const bool gone = end.present && !end.present->installed.contains(entry.identifier) &&
+                    !end.present->placeholders.contains(entry.identifier);
+  if (taken && gone) {
     summary.deleted.push_back(entry.identifier);
   } else {
     summary.failed.push_back({entry.identifier, failureReason(entry.identifier, end), {}, true});
@@ -55,7 +55,8 @@ std::vector<std::string>& listFor(Action action, Summary& summary) {
 void settleInstall(const PlannedEntry& entry, const SyncEnd& end, Summary& summary) {
   const std::string operation = operationOf(end.todo, entry.identifier);
   const bool asked = end.transfers.asked.count(entry.identifier) > 0;
-  const bool brought = entry.byHost && end.present.installed.contains(entry.identifier) &&
+  const bool brought = entry.byHost && end.present &&
+                       end.present->installed.contains(entry.identifier) &&
                        !end.installFailures.contains(entry.identifier);
   const bool carriedOut = end.carriedOut.contains(entry.identifier);
   if (brought || carriedOut || operation == exchange::TodoInstalled) {

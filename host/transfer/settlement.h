@@ -18,7 +18,7 @@ inline constexpr const char* InterruptedSync = "interrupted; the next sync does 
 /// What is known when a sync is over.
 struct SyncEnd {
   std::vector<TodoState> todo;  ///< as the client left it; empty when it never took the list over
-  ApplicationsPresent present;
+  std::optional<ApplicationsPresent> present;  ///< none when they cannot be told
   TransferOutcome transfers;
   std::set<std::string> carriedOut;  ///< installs that the phone itself had still to carry out
   std::map<std::string, std::string> installFailures;  ///< reason by identifier

@@ -108,9 +108,10 @@ std::set<std::string> everSent(const Phone& phone, const PropertyList::Dictionar
     if (!todo) continue;
     for (const TodoState& entry : *todo) identifiers.insert(entry.identifier);
   }
-  const ApplicationsPresent present = applicationsPresent(phone.apps);
-  identifiers.insert(present.installed.begin(), present.installed.end());
-  for (const auto& placeholder : present.placeholders) identifiers.insert(placeholder.first);
+  const auto present = applicationsPresent(phone.apps, nullptr);
+  if (!present) return identifiers;  // what is left over waits for the next sync
+  identifiers.insert(present->installed.begin(), present->installed.end());
+  for (const auto& placeholder : present->placeholders) identifiers.insert(placeholder.first);
   return identifiers;
 }
 

@@ -8,11 +8,11 @@
 
 namespace appsync::host {
 
-std::set<std::string> waitingForStore(const Phone& phone) {
+std::set<std::string> waitingForStore(const Phone& phone, const ApplicationsPresent& present) {
   const std::vector<std::string> owed = phone.packagesOwedBy(KQClientKiosk);
   std::set<std::string> waiting(owed.begin(), owed.end());
   const Demotions demotions(phone.files);
-  for (const auto& [identifier, record] : applicationsPresent(phone.apps).placeholders) {
+  for (const auto& [identifier, record] : present.placeholders) {
     const bool isStores = record.installType == InstallType::StoreDownload ||
                           record.installType == InstallType::Restore;
     if (isStores && !demotions.holdBack(record)) waiting.insert(identifier);
@@ -30,11 +30,18 @@ void Store::deliver(const std::set<std::string>& identifiers) {
 }
 
 void Store::takeOrders(const std::set<std::string>& identifiers) {
-  const ApplicationsPresent present = applicationsPresent(phone_.apps);
+  if (identifiers.empty()) return;
+  std::optional<Error> error;
+  const auto present = applicationsPresent(phone_.apps, &error);
+  if (!present) {
+    const std::string reason = withReason(CannotTellApplications, error);
+    for (const std::string& identifier : identifiers) failures_.emplace(identifier, reason);
+    return;
+  }
   const std::vector<std::string> owed = phone_.packagesOwedBy(KQClientKiosk);
   for (const std::string& identifier : identifiers) {
-    const auto found = present.placeholders.find(identifier);
-    const AppRecord* placeholder = found == present.placeholders.end() ? nullptr : &found->second;
+    const auto found = present->placeholders.find(identifier);
+    const AppRecord* placeholder = found == present->placeholders.end() ? nullptr : &found->second;
     const bool named = placeholder && !placeholder->displayName.empty();
     auto delivery = deliveryFor(identifier, placeholder, std::ranges::count(owed, identifier) > 0);
     if (delivery) {

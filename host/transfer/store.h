@@ -15,9 +15,9 @@
 
 namespace appsync::host {
 
-/// The applications that wait for a package of the store's. Demoted ones do not until a person asks
-/// for them.
-std::set<std::string> waitingForStore(const Phone& phone);
+/// Those of the applications present that wait for a package of the store's. Demoted ones do not
+/// until a person asks for them.
+std::set<std::string> waitingForStore(const Phone& phone, const ApplicationsPresent& present);
 
 /// The store's part: brings the packages of applications that have a placeholder, from a catalogue.
 ///

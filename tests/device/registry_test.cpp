@@ -1,3 +1,5 @@
+#include <SQLiteCpp/SQLiteCpp.h>
+
 #include "platform/bundle.h"
 #include "tests/device/device_test.h"
 
@@ -123,6 +125,22 @@ TEST_F(RegistryTest, AFolderCannotBeInstalledAsPackageNorAFileAsPlaceholder) {
   placeholder.insert_or_assign(std::string(SWPackageTypeKey), SWPackageTypePlaceholder);
   EXPECT_FALSE(registry.installApplication(file, placeholder, &error));
   EXPECT_EQ(containerCount(), 0U);
+}
+
+TEST_F(RegistryTest, AnEnumerationThatCannotBeReadVisitsNothingAndSaysWhy) {
+  ASSERT_TRUE(installPackage("com.example.a"));
+  device.reset();
+  {
+    SQLite::Database database((folder / "device.db").string(), SQLite::OPEN_READWRITE);
+    database.exec("ALTER TABLE applications RENAME COLUMN sinf TO other");
+  }
+  reopen(Access::ReadOnly);
+  int visits = 0;
+  const auto count = [&](const AppRecord&, bool&) { ++visits; };
+  EXPECT_FALSE(device->appRegistry().enumerateBundles(BundleKind::All, count, &error));
+  EXPECT_EQ(visits, 0);
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->localizedDescription(), "the phone's database: it cannot be read or written");
 }
 
 }  // namespace

@@ -40,7 +40,8 @@ std::optional<AppRecord> FakeAppRegistry::recordForIdentifier(std::string_view b
   return record ? record : placeholder(bundleId);
 }
 
-void FakeAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept {
+bool FakeAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor,
+                                       std::optional<Error>*) noexcept {
   trace_.add(TraceQuery,
              callText("AppRegistry.enumerateBundles", static_cast<std::uint32_t>(kind)));
   std::vector<AppRecord> records;
@@ -57,8 +58,9 @@ void FakeAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor) 
   bool stop = false;
   for (const AppRecord& record : records) {
     visitor(record, stop);
-    if (stop) return;
+    if (stop) break;
   }
+  return true;
 }
 
 bool FakeAppRegistry::installApplication(const FileLocation& package,

@@ -25,8 +25,10 @@ class FaultyAppRegistry : public AppRegistry {
     if (plan_.next("AppRegistry.recordForIdentifier", bundleId)) return std::nullopt;
     return registry_.recordForIdentifier(bundleId, placeholder);
   }
-  void enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept override {
-    registry_.enumerateBundles(kind, visitor);
+  bool enumerateBundles(BundleKind kind, const Visitor& visitor,
+                        std::optional<Error>* error) noexcept override {
+    return !plan_.strikes("AppRegistry.enumerateBundles", "", error) &&
+           registry_.enumerateBundles(kind, visitor, error);
   }
   bool installApplication(const FileLocation& package, const PropertyList::Dictionary& options,
                           std::optional<Error>* error) noexcept override {

@@ -78,5 +78,11 @@ TEST_F(InstalledApplicationsTest, AreNotToldWhenItCannotBeSeenWhatIsDemoted) {
                                    "at: Too many open files"));
 }
 
+TEST_F(InstalledApplicationsTest, AreNotToldWhenTheRegistryCannotBeRead) {
+  phone.appRegistry.seedInstalled("com.a", "1.0");
+  phone.faults.failEvery("AppRegistry.enumerateBundles", Error::posix(EMFILE));
+  EXPECT_THAT(found(), ElementsAre("the phone's applications cannot be told: Too many open files"));
+}
+
 }  // namespace
 }  // namespace appsync::host

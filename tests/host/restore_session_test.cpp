@@ -195,6 +195,28 @@ TEST_F(RestoreTest, IsNotCompleteWhenTheHomeScreenTakesNoLayout) {
               ElementsAre(HasSubstr("broken the home screen does not take its layout: ")));
 }
 
+TEST_F(RestoreTest, IsBrokenOffWhereverTheApplicationsCannotBeTold) {
+  backUp("com.a");
+  offer("com.a");
+  store = true;
+  const std::string reason = "the phone's applications cannot be told: Too many open files";
+  // When it begins, before the client is asked, before and after that for what stands, and at the
+  // end.
+  std::size_t told = 0;
+  for (const unsigned call : {1U, 3U, 4U, 5U, 6U, 8U}) {
+    SCOPED_TRACE(call);
+    phone.appRegistry.removeAll("com.a");
+    phone.faults.failCall("AppRegistry.enumerateBundles", call, Error::posix(EMFILE));
+    restore();
+    phone.faults.clear();
+    EXPECT_THAT(reporter.lines("broken"), ::testing::SizeIs(++told));
+    EXPECT_EQ(reporter.lines("broken").back(), "broken " + reason);
+  }
+  phone.appRegistry.removeAll("com.a");
+  phone.faults.failCall("AppRegistry.enumerateBundles", 7, Error::posix(EMFILE));
+  EXPECT_EQ(restore(), "failed: com.a (" + reason + ")") << "the store's orders";
+}
+
 TEST_F(RestoreTest, IsNotCompleteWhenItCannotBeSeenWhatIsDemoted) {
   backUp("com.a");
   offer("com.a");

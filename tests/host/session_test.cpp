@@ -107,6 +107,29 @@ TEST_F(SessionTest, IsBrokenWhenItCannotBeSeenWhatThePhoneHasDone) {
             "failed: com.a (it cannot be seen what the phone has done: Too many open files)");
 }
 
+TEST_F(SessionTest, IsBrokenWhereverTheApplicationsCannotBeTold) {
+  // Before the client is called, before it is asked, for the next inventory, and at the end.
+  const std::map<unsigned, std::string> calls{
+      {2, "the phone's applications cannot be told: Too many open files"},
+      {4, "the phone's applications cannot be told: Too many open files"},
+      {5, "the list of applications present could not be written: Too many open files"},
+      {6, "the phone's applications cannot be told: Too many open files"}};
+  phone.appRegistry.seedInstalled("com.old");
+  offer("com.a");
+  options.remove = {"com.old"};
+  for (const auto& [call, reason] : calls) {
+    SCOPED_TRACE(call);
+    phone.appRegistry.removeAll("com.a");
+    phone.appRegistry.seedInstalled("com.old");
+    phone.faults.failCall("AppRegistry.enumerateBundles", call, Error::posix(EMFILE));
+    const SyncResult result = sync();
+    EXPECT_FALSE(result.completed);
+    EXPECT_EQ(result.summary.deleted.empty(), call == 2 || call == 6);
+    EXPECT_THAT(reporter.lines(), Contains("broken " + reason));
+    phone.faults.clear();
+  }
+}
+
 TEST_F(SessionTest, WritesTheApplicationsPresentAfterTheEnd) {
   offer("com.a");
   phone.appRegistry.seedInstalled("com.b", "1.0");

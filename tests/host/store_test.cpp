@@ -41,7 +41,8 @@ class StoreTest : public RestoreTest {
     const RestorePhone all = restorePhone();
     phone.trace.clear();
     Store brings(host, all, watching, interruption, catalogue, "interrupted", origin);
-    std::set<std::string> wanted = waitingForStore(all);
+    std::set<std::string> wanted =
+        waitingForStore(all, applicationsPresent(all.apps, nullptr).value());
     for (const std::string& identifier : except) wanted.erase(identifier);
     brings.deliver(wanted);
     return brings.failures();
@@ -255,7 +256,7 @@ TEST_F(StoreTest, ClaimsOnlyWhatWasAskedForOfIt) {
   seedRestoring("com.b");
   seedRestoring("com.without-progress", InstallType::StoreDownload);
   phone.appRegistry.dropProgress("com.without-progress");
-  claimDownloads(phone.appRegistry, {});
+  EXPECT_TRUE(claimDownloads(phone.appRegistry, {}, nullptr));
   EXPECT_EQ(phone.appRegistry.progress("com.asked")->installState(), InstallState::Active);
   EXPECT_EQ(phone.appRegistry.progress("com.b")->installState(), InstallState::Waiting);
 }
