@@ -69,6 +69,16 @@ void removeAllAbandonedData(DeviceCore& core) {
   for (const std::string& identifier : identifiers) removeAbandonedData(core, identifier, nullptr);
 }
 
+/// The installs that set data aside never came to their end, or the data would be abandoned.
+void undoAdoptions(DeviceCore& core) {
+  for (const std::string& identifier : core.containers.setAside()) {
+    std::optional<Error> error;
+    const auto abandoned = isAbandoned(core, Containers::asideName(identifier), &error);
+    const bool done = abandoned && (*abandoned || core.containers.undoAdoption(identifier, &error));
+    if (!done) note(core, error->localizedDescription());
+  }
+}
+
 void pauseInstalls(DeviceCore& core) {
   core.database.change("the installs under way could not be paused", Database::Commit::Ordinary,
                        [](SQLite::Database& database) {
@@ -123,6 +133,7 @@ void finishInterruptedWork(DeviceCore& core) {
   removeUnnamedContainers(core, rows);
   const std::set<std::string> installed = installedAmong(rows);
   removeAllAbandonedData(core);
+  undoAdoptions(core);
   // What a first install left that did not come to its end. Data with something in it is never
   // removed without an order to do so.
   core.containers.removeEmptyData(installed);

@@ -52,7 +52,8 @@ CREATE UNIQUE INDEX installs_running ON installs (identifier) WHERE NOT over;
 
 CREATE TABLE uninstalled (identifier TEXT PRIMARY KEY, time REAL NOT NULL) WITHOUT ROWID;
 
--- Applications that are gone and whose data, also what a restore still had for them, is to be removed.
+-- Applications that are gone and whose data, also what a restore still had for them, is to be removed;
+-- and the names of data that was set aside for what a restore gave back.
 CREATE TABLE abandoned_data (identifier TEXT PRIMARY KEY) WITHOUT ROWID;
 
 CREATE TABLE policies (setting INTEGER PRIMARY KEY, value INTEGER NOT NULL);

@@ -28,11 +28,27 @@ bool carryOver(DeviceCore& core, std::string_view file, const ApplicationRows& b
   return true;
 }
 
+/// An earlier install may have set data aside and then failed.
+bool undoEarlierAdoption(DeviceCore& core, const std::string& identifier,
+                         std::optional<Error>* error) {
+  const std::string aside = Containers::asideName(identifier);
+  const auto there = isThere(core.files, Containers::dataPath(aside), error);
+  if (!there || !*there) return there.has_value();
+  if (!core.database.settle()) {
+    setError(error, Error::posix(EIO, Containers::dataPath(aside)));
+    return false;
+  }
+  return removeAbandonedData(core, aside, error) && core.containers.undoAdoption(identifier, error);
+}
+
 /// Done before the switch: if that fails or never comes, the data waits where the next attempt
 /// leaves it.
 bool prepareData(DeviceCore& core, const std::string& identifier, const ApplicationRows& before,
                  std::optional<Error>* error) {
-  if (!removeAbandonedData(core, identifier, error)) return false;
+  if (!removeAbandonedData(core, identifier, error) ||
+      !undoEarlierAdoption(core, identifier, error)) {
+    return false;
+  }
   // What the person has made with an installed version since is worth more than old data.
   const bool comesBack =
       !before.installed ||
@@ -101,7 +117,10 @@ HistoryEntry installOf(const ApplicationRow& row, const ApplicationRows& before,
 
 bool switchTo(DeviceCore& core, const ApplicationRow& row, const ApplicationRows& before,
               HistoryOrigin origin, std::optional<Error>* error) {
-  return core.database.change(
+  const std::string aside = Containers::asideName(row.identifier);
+  const auto isAside = isThere(core.files, Containers::dataPath(aside), error);
+  if (!isAside) return false;
+  const bool switched = core.database.change(
       fmt::format("{} could not be entered in the registry", row.identifier),
       Database::Commit::OnDisk,
       [&](SQLite::Database& database) {
@@ -111,8 +130,11 @@ bool switchTo(DeviceCore& core, const ApplicationRow& row, const ApplicationRows
         forgetUninstalled(database, row.identifier);
         appendToIconOrder(database, row.identifier);
         enterInHistory(database, installOf(row, before, origin));
+        if (*isAside) abandonData(database, aside);
       },
       error);
+  if (switched && *isAside) removeAbandonedData(core, aside, nullptr);
+  return switched;
 }
 
 bool replaceApplication(DeviceCore& core, const std::string& package, const std::string& identifier,

@@ -24,17 +24,17 @@ Error belongsToSystem(std::string_view identifier) {
       fmt::format("{} belongs to the system and cannot be removed", identifier));
 }
 
-/// The data is only named here, so that a crash before all of it is gone is made good later.
-void abandonData(SQLite::Database& database, std::string_view identifier) {
-  Query(database, "INSERT OR REPLACE INTO abandoned_data VALUES (?)", identifier).run();
+/// What the phone has of an application beside its rows.
+void forgetApplication(SQLite::Database& database, std::string_view identifier) {
+  removeFromIconOrder(database, identifier);
+  abandonData(database, identifier);
 }
 
 void eraseInstalled(SQLite::Database& database, const ApplicationRow& installed) {
   if (installed.type == ApplicationTypeSystem) throw Refused{belongsToSystem(installed.identifier)};
   eraseApplication(database, installed);
   recordUninstalled(database, installed.identifier);
-  removeFromIconOrder(database, installed.identifier);
-  abandonData(database, installed.identifier);
+  forgetApplication(database, installed.identifier);
 }
 
 void erasePlaceholder(SQLite::Database& database, const ApplicationRow& placeholder) {
@@ -114,8 +114,7 @@ bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optio
         if (!removed.placeholder) return;
         erasePlaceholder(database, *removed.placeholder);
         recordUninstalled(database, identifier);
-        removeFromIconOrder(database, identifier);
-        abandonData(database, identifier);
+        forgetApplication(database, identifier);
       },
       error);
   if (!erased) return false;
@@ -125,26 +124,36 @@ bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optio
   return true;
 }
 
-bool removeAbandonedData(DeviceCore& core, const std::string& identifier,
-                         std::optional<Error>* error) {
+void abandonData(SQLite::Database& database, std::string_view name) {
+  Query(database, "INSERT OR REPLACE INTO abandoned_data VALUES (?)", name).run();
+}
+
+std::optional<bool> isAbandoned(DeviceCore& core, std::string_view name,
+                                std::optional<Error>* error) {
   bool abandoned = false;
   const bool read = core.database.read(
       "the list of abandoned data could not be read",
       [&](SQLite::Database& database) {
         abandoned =
-            Query(database, "SELECT 1 FROM abandoned_data WHERE identifier = ?", identifier).next();
+            Query(database, "SELECT 1 FROM abandoned_data WHERE identifier = ?", name).next();
       },
       error);
-  if (!read || !abandoned) return read;
-  if (!core.containers.removeData(identifier) || !core.containers.removeWaitingData(identifier)) {
-    setError(error, Error::posix(EIO, Containers::dataPath(identifier)));
+  return read ? std::optional(abandoned) : std::nullopt;
+}
+
+bool removeAbandonedData(DeviceCore& core, const std::string& name, std::optional<Error>* error) {
+  const std::optional<bool> abandoned = isAbandoned(core, name, error);
+  if (!abandoned || !*abandoned) return abandoned.has_value();
+  if (!core.containers.removeData(Containers::asideName(name)) ||
+      !core.containers.removeData(name) || !core.containers.removeWaitingData(name)) {
+    setError(error, Error::posix(EIO, Containers::dataPath(name)));
     return false;
   }
   return core.database.change(
       // On disk before the application can have new data, which a list come back would name.
       "the list of abandoned data could not be changed", Database::Commit::OnDisk,
       [&](SQLite::Database& database) {
-        Query(database, "DELETE FROM abandoned_data WHERE identifier = ?", identifier).run();
+        Query(database, "DELETE FROM abandoned_data WHERE identifier = ?", name).run();
       },
       error);
 }

@@ -1,6 +1,8 @@
 #pragma once
 
+#include <optional>
 #include <string>
+#include <string_view>
 
 #include "device/state/device_core.h"
 
@@ -19,9 +21,15 @@ bool removeForClient(DeviceCore& core, const std::string& identifier, bool place
 /// had for it. Observers hear of an install that this breaks off.
 bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
 
-/// Ends the removal of an application's data, and of what a restore still had for it, that was
-/// begun earlier, if there is such. Comes before anything new is put in their places.
-bool removeAbandonedData(DeviceCore& core, const std::string& identifier,
-                         std::optional<Error>* error);
+/// Notes that an application's data, and what a restore still had for it, is to be removed, or what
+/// was set aside of it (Containers::asideName). It is only named in this change, so that a crash
+/// before all of it is gone is made good later.
+void abandonData(SQLite::Database& database, std::string_view name);
+/// Whether that was noted and is not done; nullopt with an error.
+std::optional<bool> isAbandoned(DeviceCore& core, std::string_view name,
+                                std::optional<Error>* error);
+/// Ends the removal of data that was noted, if there is such. Comes before anything new is put in
+/// its place.
+bool removeAbandonedData(DeviceCore& core, const std::string& name, std::optional<Error>* error);
 
 }  // namespace appsync::device

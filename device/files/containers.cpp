@@ -15,6 +15,8 @@
 namespace appsync::device {
 namespace {
 
+/// Begins with a character that no identifier has.
+constexpr std::string_view AsideEnding = "~older";
 constexpr std::string_view ApplicationsDirectory = "/var/mobile/Containers/Applications";
 
 /// A random UUID, as the names of containers are.
@@ -101,20 +103,47 @@ std::optional<bool> Containers::dataWaits(std::string_view identifier,
 
 bool Containers::adoptWaitingData(std::string_view identifier, std::optional<Error>* error) {
   const std::string data = dataPath(identifier);
-  // Out of the way rather than removed: until the new data is there, the old may have to return.
-  const std::string aside = joinPath(DataDirectory, makeTemporaryName());
+  const std::string aside = dataPath(asideName(identifier));
   if (!files_.createDirectory(DataDirectory, true, {}, error)) return false;
   std::optional<Error> reason;
   const bool hadData = files_.moveItem(data, aside, &reason);
   const bool adopted =
       (hadData || isMissing(reason)) && files_.moveItem(waitingDataPath(identifier), data, &reason);
-  if (!adopted) {
-    if (hadData) files_.moveItem(aside, data);
-    setError(error, reason.value_or(Error::posix(EIO, data)));
-    return false;
+  if (adopted) return true;
+  if (hadData) files_.moveItem(aside, data);
+  setError(error, reason.value_or(Error::posix(EIO, data)));
+  return false;
+}
+
+bool Containers::undoAdoption(std::string_view identifier, std::optional<Error>* error) {
+  const std::string data = dataPath(identifier);
+  const std::string aside = dataPath(asideName(identifier));
+  const std::string waiting = waitingDataPath(identifier);
+  const auto isAside = isThere(files_, aside, error);
+  if (!isAside || !*isAside) return isAside.has_value();
+  const auto adopted = isThere(files_, data, error);
+  const auto waits = adopted ? isThere(files_, waiting, error) : std::nullopt;
+  if (!waits) return false;
+  if (*adopted) {
+    // What waits by now has come later, and from a backup too.
+    const bool cleared = *waits ? files_.removeItem(data, error)
+                                : files_.createDirectory(exchange::WaitingData, true, {}, error) &&
+                                      files_.moveItem(data, waiting, error);
+    if (!cleared) return false;
   }
-  if (hadData) removeIfThere(aside);
-  return true;
+  return files_.moveItem(aside, data, error);
+}
+
+std::string Containers::asideName(std::string_view identifier) {
+  return std::string(identifier).append(AsideEnding);
+}
+
+std::vector<std::string> Containers::setAside() {
+  std::vector<std::string> names =
+      namesIn(DataDirectory, nullptr).value_or(std::vector<std::string>{});
+  std::erase_if(names, [](const std::string& name) { return !name.ends_with(AsideEnding); });
+  for (std::string& name : names) name.resize(name.size() - AsideEnding.size());
+  return names;
 }
 
 bool Containers::removeWaitingData(std::string_view identifier) {

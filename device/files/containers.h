@@ -38,9 +38,16 @@ class Containers {
   /// Whether a restore left data that is still to be given back to the application; nullopt (with
   /// a reason) when it cannot be looked at.
   std::optional<bool> dataWaits(std::string_view identifier, std::optional<Error>* error);
-  /// Gives the waiting data to the application in the place of what it has. On failure both are as
+  /// Gives the waiting data to the application; what it has is set aside. On failure both are as
   /// they were.
   bool adoptWaitingData(std::string_view identifier, std::optional<Error>* error);
+  /// Makes an adoption undone that set data aside: all waits, or is the application's, as before.
+  /// Broken off, it is done again. True when there is nothing to undo.
+  bool undoAdoption(std::string_view identifier, std::optional<Error>* error);
+  /// The name among the applications' data of what was set aside. No application can have it.
+  static std::string asideName(std::string_view identifier);
+  /// The applications of which data is set aside.
+  std::vector<std::string> setAside();
   bool removeWaitingData(std::string_view identifier);
   bool makeData(std::string_view identifier, std::optional<Error>* error);
   /// Removes the data directories that have nothing in them, but for those of these applications.

@@ -5,6 +5,7 @@
 #include <set>
 
 #include "platform/bundle.h"
+#include "platform/sync_files.h"
 #include "tests/device/device_parts.h"
 #include "tests/device/device_test.h"
 #include "tests/fakes/stepping_file_manager.h"
@@ -69,6 +70,11 @@ class CrashTest : public DeviceTest {
     }
     for (const auto& [file, contents] : fakes::snapshot(onDisk("/var/mobile/Containers/Data"))) {
       found["data " + file] = contents;
+    }
+    const fs::path waiting = onDisk(exchange::WaitingData);
+    if (!fs::exists(waiting)) return found;
+    for (const auto& [file, contents] : fakes::snapshot(waiting)) {
+      found["waiting " + file] = contents;
     }
     return found;
   }
@@ -148,6 +154,14 @@ TEST_F(CrashTest, APersonsUninstallDuringAnUpdate) {
   ASSERT_TRUE(installPlaceholder("com.example.a", "2.0"));
   expectOldOrNew(
       [](DeviceAppRegistry& target) { return target.removeApplication("com.example.a", nullptr); });
+}
+
+TEST_F(CrashTest, ARestoreOverDataThatIsThereAlready) {
+  ASSERT_TRUE(installRestorePlaceholder("com.example.a"));
+  putFile("/var/mobile/Containers/Data/com.example.a/notes", "older");
+  putFile("/var/mobile/Media/HalvoRestore/Data/com.example.a/notes", "from the backup");
+  expectOldOrNew(install("com.example.a", "1.0"));
+  EXPECT_EQ(textAt("/var/mobile/Containers/Data/com.example.a/notes"), "from the backup");
 }
 
 TEST_F(CrashTest, ARestoreNeverLosesItsData) {

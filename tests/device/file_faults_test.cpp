@@ -115,6 +115,41 @@ TEST_F(FileFaultsTest, WaitingDataComesWithItsPackageInTheEnd) {
   EXPECT_TRUE(done);
 }
 
+TEST_F(FileFaultsTest, WaitingDataAndWhatItReplacesAreNeverLostBetween) {
+  ASSERT_TRUE(installRestorePlaceholder(Id));
+  putFile(Notes, "older");
+  putFile(WaitingNotes, "from the backup");
+  const FileLocation package = stage(archive("1.0"));
+  bool done = false;
+  sweep(
+      [&] {
+        done = install(package);
+        openAnew();
+      },
+      [&] {
+        EXPECT_EQ(textAt(Notes), done ? "from the backup" : "older");
+        EXPECT_EQ(done, !device->files().fileExists(WaitingNotes));
+        EXPECT_TRUE(done || install(package));
+        EXPECT_EQ(textAt(Notes), "from the backup");
+        EXPECT_EQ(device->namesIn(Containers::DataDirectory, nullptr), Lines{std::string(Id)});
+      });
+  EXPECT_TRUE(done);
+}
+
+TEST_F(FileFaultsTest, AnInstallThatIsTriedAgainFindsBothDataAsTheyWere) {
+  ASSERT_TRUE(installRestorePlaceholder(Id));
+  putFile(Notes, "older");
+  putFile(WaitingNotes, "from the backup");
+  const FileLocation package = stage(archive("1.0"));
+  bool done = false;
+  sweep([&] { done = install(package) || install(package); },
+        [&] {
+          EXPECT_TRUE(done);
+          EXPECT_EQ(textAt(Notes), "from the backup");
+          EXPECT_EQ(device->namesIn(Containers::DataDirectory, nullptr), Lines{std::string(Id)});
+        });
+}
+
 TEST_F(FileFaultsTest, DataThatIsOverwrittenIsTheOldOrTheNew) {
   ASSERT_TRUE(installPackage(archive("1.0"), Id));
   putFile(Notes, "mine");
