@@ -79,10 +79,11 @@ bool removeForClient(DeviceCore& core, const std::string& identifier, bool place
       [&](SQLite::Database& database) {
         ApplicationRows present = findApplication(database, identifier);
         if (present.placeholder) {
+          erasePlaceholder(database, *present.placeholder);
           if (!isMerelyOfAnInstall(present)) {
             enterRemoval(database, *present.placeholder, HistoryOrigin::Sync);
+            if (!placeholderOnly) forgetApplication(database, identifier);
           }
-          erasePlaceholder(database, *present.placeholder);
           removed.placeholder = std::move(present.placeholder);
         } else if (present.installed && !placeholderOnly) {
           eraseInstalled(database, *present.installed);

@@ -13,7 +13,9 @@ namespace appsync::device {
 // anyone else has the device.
 
 /// What the registry's clients ask for: takes the placeholder if there is one, else (unless
-/// `placeholderOnly`) the application with its data.
+/// `placeholderOnly`) the application with its data. A placeholder that is all that is left of an
+/// application counts as that: unless `placeholderOnly`, its data goes too, and what a restore
+/// still had for it.
 bool removeForClient(DeviceCore& core, const std::string& identifier, bool placeholderOnly,
                      std::optional<Error>* error);
 

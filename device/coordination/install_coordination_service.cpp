@@ -9,6 +9,7 @@
 #include "device/base/identifiers.h"
 #include "device/coordination/coordination_handles.h"
 #include "device/state/application_rows.h"
+#include "platform/existence.h"
 
 namespace appsync::device {
 namespace {
@@ -165,22 +166,30 @@ void DeviceInstallCoordination::uninstallApp(
   const auto work = [this, identifier = std::string(bundleId), completion = std::move(completion)] {
     const Error reason = Error::withDescription(POSIXErrorDomain, ECANCELED,
                                                 fmt::format("{} was uninstalled", identifier));
-    bool ended = false;
-    bool placeholderOnly = false;
     std::optional<Error> error;
-    const bool changed = core_.change(
-        [&](SQLite::Database& database, Consequences& consequences) {
-          placeholderOnly = findApplication(database, identifier).placeholder.has_value();
-          const auto live = findLiveCoordinator(database, identifier);
-          ended = live && cancel(database, *live, reason, DeviceClientID, consequences);
-        },
+    ApplicationRows present;
+    bool going = core_.read(
+        [&](SQLite::Database& database) { present = findApplication(database, identifier); },
         &error);
-    // What a coordinator brought went with it; an installed version below it stays.
-    if (changed) {
+    const auto remove = [&] {
       const KeyedMutex::Guard guard(core_.device().applicationLocks, identifier);
-      removeForClient(core_.device(), identifier, placeholderOnly, &error);
-    }
-    if (ended && error && error->code == ENOENT) error.reset();
+      // What a coordinator brought goes with it; an installed version below it stays.
+      const bool placeholderOnly = present.installed && present.placeholder;
+      return removeForClient(core_.device(), identifier, placeholderOnly, &error);
+    };
+    // A placeholder that is all that is left takes its data along, if its install is not over yet.
+    const bool isAlone = present.placeholder && !present.installed;
+    if (going && isAlone) going = remove();
+    bool ended = false;
+    going = going && core_.change(
+                         [&](SQLite::Database& database, Consequences& consequences) {
+                           const auto live = findLiveCoordinator(database, identifier);
+                           ended = live &&
+                                   cancel(database, *live, reason, DeviceClientID, consequences);
+                         },
+                         &error);
+    if (going && !isAlone) remove();
+    if (ended && isMissing(error)) error.reset();
     core_.events().post([completion, error] { completion(error); });
   };
   core_.workers().add(bundleId, work);

@@ -2,6 +2,7 @@
 
 #include <fmt/format.h>
 
+#include <algorithm>
 #include <chrono>
 #include <thread>
 
@@ -111,7 +112,26 @@ std::optional<std::string> BackupRun::saveData(const AppRecord& record) {
   return "its data cannot be saved: " + reasonOf(error);
 }
 
+void BackupRun::noteUnlisted() {
+  for (const std::string& identifier : writer_.olderApplications()) {
+    const auto isIt = [&](const auto& entry) { return entry == identifier; };
+    if (std::ranges::any_of(saved_, isIt, &AppRecord::applicationIdentifier) ||
+        std::ranges::any_of(summary_.failed, isIt, &FailedEntry::identifier)) {
+      continue;
+    }
+    bool any = false;
+    const auto look = [&](ByteView bytes) {
+      any = !bytes.empty();
+      return !any;
+    };
+    const bool read = phone_.saveData(identifier, look, nullptr);
+    if (read && !any) continue;
+    summary_.failed.push_back({identifier, "the phone does not list it, but has data of it"});
+  }
+}
+
 bool BackupRun::mayReplaceOlder() {
+  noteUnlisted();
   std::string lost;
   for (const FailedEntry& entry : summary_.failed) {
     if (!writer_.olderHolds(entry.identifier)) continue;

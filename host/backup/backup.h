@@ -41,6 +41,8 @@ class BackupRun {
   std::optional<std::string> saveData(const AppRecord& record);
   /// False when the older backup would be replaced by one that lacks what it holds.
   bool mayReplaceOlder();
+  /// Notes those applications of the older backup that the phone does not list, but has data of.
+  void noteUnlisted();
   bool saveLists();
   bool addList(std::string_view name, const PropertyList& list, PropertyListFormat format);
   void reportProgress(const AppRecord& record, std::uint64_t bytes);

@@ -85,6 +85,8 @@ class BackupWriter {
   /// Whether the older backup, which this one is to replace, holds the application; true too when
   /// that cannot be told. False when there is no older one.
   virtual bool olderHolds(std::string_view identifier) = 0;
+  /// The applications that the older backup holds; none when that cannot be told.
+  virtual std::vector<std::string> olderApplications() = 0;
 
   // False when the file could not be written; problem() then tells why, and nothing more succeeds.
 

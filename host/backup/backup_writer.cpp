@@ -155,14 +155,16 @@ class FolderWriter final : public BackupWriter {
 
   bool olderHolds(std::string_view identifier) override {
     if (!target_.replaces) return false;
-    if (!older_) {
-      std::string ignored;
-      const auto backup = readBackup(target_.path, ignored);
-      older_ = PropertyList();
-      if (backup) older_ = parsePropertyList(backup->applications).value_or(PropertyList());
-    }
-    const PropertyList::Dictionary* applications = older_->asDictionary();
+    const PropertyList::Dictionary* applications = older();
     return !applications || find(*applications, identifier);
+  }
+
+  std::vector<std::string> olderApplications() override {
+    std::vector<std::string> identifiers;
+    const PropertyList::Dictionary* applications = target_.replaces ? older() : nullptr;
+    if (!applications) return identifiers;
+    for (const auto& application : *applications) identifiers.push_back(application.first);
+    return identifiers;
   }
 
   bool addFile(std::string_view name, ByteView contents) override {
@@ -203,6 +205,17 @@ class FolderWriter final : public BackupWriter {
   const std::string& problem() const override { return problem_; }
 
  private:
+  /// The older backup's list of applications, read once; nullptr when it cannot be.
+  const PropertyList::Dictionary* older() {
+    if (!older_) {
+      std::string ignored;
+      const auto backup = readBackup(target_.path, ignored);
+      older_ = PropertyList();
+      if (backup) older_ = parsePropertyList(backup->applications).value_or(PropertyList());
+    }
+    return older_->asDictionary();
+  }
+
   using Entries = std::map<std::string, ManifestEntry, std::less<>>;
 
   // Both are always false.

@@ -98,8 +98,31 @@ ExitCode runSync(const SyncOptions& options, CommandContext& context) {
   return code;
 }
 
-ExitCode runClear(CommandContext& context) {
+/// Clearing takes every placeholder away, and with it what is left of its application.
+void refuseToLoseData(device::EmbeddedDevice& device) {
+  const Phone phone = phoneOf(device);
+  std::optional<Error> error;
+  const auto present = applicationsPresent(phone.apps, &error);
+  if (!present) {
+    throw CommandError(ExitCode::SomeFailed, withReason(CannotTellApplications, error));
+  }
+  std::string losers;
+  for (const auto& [identifier, record] : present->placeholders) {
+    if (present->installed.contains(identifier)) continue;
+    // What cannot be looked at may be there.
+    if (!ownsData(phone, identifier, nullptr).value_or(true)) continue;
+    losers += (losers.empty() ? "" : ", ") + printable(identifier);
+  }
+  if (losers.empty()) return;
+  throw CommandError(ExitCode::SomeFailed,
+                     fmt::format("nothing is cleared: {} would lose data that is nowhere else; "
+                                 "have it installed first, or use --with-data",
+                                 losers));
+}
+
+ExitCode runClear(bool withData, CommandContext& context) {
   const auto device = context.openDevice(device::Access::Write);
+  if (!withData) refuseToLoseData(*device);
   const auto plugin = loadPlugin(context);
   const Interruption interruption;
   PluginSession loaded(*plugin, QueryToolBundleIdentifier, *device, interruption, nullptr);
@@ -140,9 +163,15 @@ void addSyncCommands(CLI::App& app, Command& chosen) {
   });
 
   CLI::App* clear = app.add_subcommand("clear", "Clear all sync data of the phone");
+  auto withData = std::make_shared<bool>(false);
+  clear->add_flag("--with-data", *withData,
+                  "Also when a demoted application loses data of its own by it");
   clear->footer(
-      "Placeholders that wait for their packages go too.\nExample: appsync --device phone clear");
-  clear->callback([&chosen] { chosen = &runClear; });
+      "Placeholders that wait for their packages go too, with what a restore had for them.\n"
+      "Example: appsync --device phone clear");
+  clear->callback([withData, &chosen] {
+    chosen = [withData](CommandContext& context) { return runClear(*withData, context); };
+  });
 }
 
 }  // namespace appsync::host

@@ -159,6 +159,23 @@ class Backups(BackupCase):
         self.assertEqual(summary["saved"], ["com.b", "com.c"])
         self.assertEqual(sorted(self.list()), ["com.b", "com.c"])
 
+    def test_an_older_backup_stays_while_the_phone_has_data_that_it_does_not_list(self):
+        self.fill()
+        self.backup()
+        older = self.tree(self.target)
+        for identifier in ("com.a", "com.b"):
+            self.run_appsync("uninstall", identifier)
+        self.put_data("com.a")
+        self.put_data("com.unknown")
+        summary = self.backup(code=1)
+        self.assertEqual(summary["failed"], [
+            {"identifier": "com.a", "reason": "the phone does not list it, but has data of it"}])
+        self.assertEqual(self.events[-2]["event"], "error")
+        self.assertEqual(self.tree(self.target), older)
+        self.backup("--allow-missing", self.target)
+        self.assertEqual(sorted(self.list()), ["com.c"])
+        self.backup()
+
     def test_plain_lines(self):
         self.fill()
         self.assertEqual(self.run_appsync("backup", self.target), ("done       3 saved\n", ""))

@@ -128,5 +128,37 @@ TEST_F(RemovalTest, AReinstalledApplicationBeginsWithoutTheOldData) {
   EXPECT_TRUE(device->files().directoryExists("/var/mobile/Containers/Data/com.example.a"));
 }
 
+TEST_F(RemovalTest, WhatWaitsTakesItsDataAlongWhenAClientRemovesIt) {
+  const std::string waiting = "/var/mobile/Media/HalvoRestore/Data/com.example.a";
+  for (const InstallType type : {InstallType::Restore, InstallType::Downgrade,
+                                 InstallType::IntentionalDowngrade, InstallType::StoreDownload}) {
+    ASSERT_TRUE(installPlaceholder(
+        Id, "1.0", {{std::string(SWInstallTypeKey), static_cast<std::uint64_t>(type)}}));
+    putFile(Notes, "mine");
+    putFile(waiting + "/notes", "from the backup");
+    EXPECT_TRUE(uninstall());
+    EXPECT_TRUE(registry().empty());
+    EXPECT_FALSE(device->files().fileExists("/var/mobile/Containers/Data/com.example.a"));
+    EXPECT_FALSE(device->files().fileExists(waiting));
+    EXPECT_EQ(device->homeScreenOrder(), Lines());
+    EXPECT_EQ(device->uninstalledApplications(), Lines());
+  }
+}
+
+TEST_F(RemovalTest, OfWhatWaitsOnlyThePlaceholderGoesWhenJustThatIsToGo) {
+  ASSERT_TRUE(installRestorePlaceholder(Id));
+  putFile(Notes, "mine");
+  EXPECT_TRUE(uninstall(true));
+  EXPECT_TRUE(registry().empty());
+  EXPECT_EQ(textAt(Notes), "mine");
+}
+
+TEST_F(RemovalTest, AnInstallThatComesToNothingLeavesTheDataThatWasThere) {
+  ASSERT_TRUE(installPlaceholder(Id));
+  putFile(Notes, "mine");
+  EXPECT_TRUE(uninstall());
+  EXPECT_EQ(textAt(Notes), "mine");
+}
+
 }  // namespace
 }  // namespace appsync::device

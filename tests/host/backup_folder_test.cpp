@@ -272,12 +272,14 @@ TEST_F(BackupFolderTest, ABackupOfANewerProgramIsNeitherReadNorReplaced) {
 TEST_F(BackupFolderTest, TellsWhatTheOlderBackupHolds) {
   const auto first = openWriter(folder_);
   EXPECT_FALSE(first->olderHolds("com.a"));
+  EXPECT_TRUE(first->olderApplications().empty());
   const auto list =
       serializePropertyList(PropertyList::Dictionary{{"com.a", 1}}, PropertyListFormat::Xml);
   makeBackup(folder_, asText(*list));
   const auto second = openWriter(folder_);
   EXPECT_TRUE(second->olderHolds("com.a"));
   EXPECT_FALSE(second->olderHolds("com.b"));
+  EXPECT_EQ(second->olderApplications(), std::vector<std::string>{"com.a"});
   flipByte(folder_ / "RestoreApplications.plist", 3);
   EXPECT_FALSE(second->olderHolds("com.b")) << "it has been read";
   EXPECT_TRUE(openWriter(folder_)->olderHolds("com.b")) << "a damaged one may hold anything";

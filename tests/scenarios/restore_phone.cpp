@@ -50,6 +50,7 @@ std::string text(const Summary& summary) {
   };
   for (const auto& identifier : summary.installed) add("installed", identifier);
   for (const auto& identifier : summary.updated) add("updated", identifier);
+  for (const auto& identifier : summary.deleted) add("deleted", identifier);
   for (const auto& identifier : summary.dataRestored) add("data restored", identifier);
   for (const auto& entry : summary.failed) add("failed", entry.identifier + ": " + entry.reason);
   for (const auto& entry : summary.skipped) add("skipped", entry.identifier + ": " + entry.reason);
