@@ -95,10 +95,11 @@ void addRestoreCommand(CLI::App& app, Command& chosen) {
       ->check(checkIdentifier)
       ->allow_extra_args(false);
   restore->add_flag("--overwrite-data", options->overwriteData,
-                    "Give the backup's data back to installed applications too");
+                    "Give the backup's data back also to applications that have data of their own");
   restore->footer(
       "Without packages, applications come back as placeholders with their data waiting.\n"
-      "Installed applications and their data are left as they are without --overwrite-data.\n"
+      "Installed applications, and the data of demoted ones, are left as they are without\n"
+      "--overwrite-data.\n"
       "A restore that was interrupted is finished by another one.\n"
       "Example: appsync --device new-phone restore backup --store catalogue");
   restore->callback([options, &chosen] {

@@ -37,7 +37,8 @@ Restore::Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Repo
       watch_(phone_, reporter, interruption) {}
 
 SyncResult Restore::run(const RestoreInput& input) {
-  handover_ = handOver(phone_, input.backup, input.list, reporter_, interruption_);
+  handover_ =
+      handOver(phone_, input.backup, input.list, input.overwriteData, reporter_, interruption_);
   host_.transfers().forgetCancelled();
   removeLeftOverPackages(phone_);
   failures_ = handover_.failures;
@@ -187,6 +188,7 @@ Summary Restore::settle(const RestoreInput& input) {
     if (handover_.installed.contains(identifier)) end.updated.insert(identifier);
   }
   end.installedData = installedData_;
+  end.overwritten = handover_.overwritten;
   explainPlaceholders(input, end);
   end.failures = failures_;
   end.interrupted = interruption_.requested();

@@ -41,10 +41,11 @@ std::optional<Bytes> demotionsOf(const Backup& backup, const RestoreList& list, 
 class HandoverInProgress {
  public:
   HandoverInProgress(const RestorePhone& phone, const Backup& backup, const RestoreList& list,
-                     Reporter& reporter, const Interruption& interruption)
+                     bool overwriteData, Reporter& reporter, const Interruption& interruption)
       : phone_(phone),
         backup_(backup),
         list_(list),
+        overwriteData_(overwriteData),
         reporter_(reporter),
         interruption_(interruption) {}
 
@@ -119,25 +120,27 @@ class HandoverInProgress {
       if (result_.installed.contains(app.identifier) || result_.failures.contains(app.identifier)) {
         continue;
       }
-      if (isRestoring(app.identifier)) {
-        std::optional<Error> error;
-        const auto owns = ownsData(phone_, app.identifier, &error);
-        if (!owns) {
-          result_.failures[app.identifier] =
-              "its data on the phone could not be looked at: " +
-              oneLine(error.value_or(Error::posix(EIO)).localizedDescription());
-        }
-        if (owns.value_or(true)) continue;
+      if (const auto failure = giveBackData(app)) {
+        // Without its data it would come back for good and forget what it was.
+        result_.listed.erase(app.identifier);
+        result_.failures[app.identifier] = *failure;
       }
-      const auto file = backup_.data.find(app.identifier);
-      const auto failure =
-          host::giveBackData(phone_, app, file == backup_.data.end() ? nullptr : &file->second,
-                             reporter_, interruption_);
-      if (!failure) continue;
-      // Without its data it would come back for good and forget what it was.
-      result_.listed.erase(app.identifier);
-      result_.failures[app.identifier] = *failure;
     }
+  }
+
+  /// Why the application's data is neither there nor waits.
+  std::optional<std::string> giveBackData(const BackedUpApplication& app) {
+    std::optional<Error> error;
+    const auto owns = ownsData(phone_, app.identifier, &error);
+    if (!owns) return withReason("its data on the phone could not be looked at", error);
+    const auto found = backup_.data.find(app.identifier);
+    const BackupFile* file = found == backup_.data.end() ? nullptr : &found->second;
+    const bool overwrites =
+        *owns && overwriteData_ && file && !hasData(phone_, app.identifier, *file);
+    if (*owns && !overwrites) return std::nullopt;
+    const auto failure = host::giveBackData(phone_, app, file, reporter_, interruption_);
+    if (!failure && overwrites) result_.overwritten.insert(app.identifier);
+    return failure;
   }
 
   void putBack() {
@@ -182,6 +185,7 @@ class HandoverInProgress {
   const RestorePhone& phone_;
   const Backup& backup_;
   const RestoreList& list_;
+  const bool overwriteData_;
   Reporter& reporter_;
   const Interruption& interruption_;
   std::map<std::string, AppRecord, std::less<>> placeholders_;
@@ -192,8 +196,8 @@ class HandoverInProgress {
 }  // namespace
 
 Handover handOver(const RestorePhone& phone, const Backup& backup, const RestoreList& list,
-                  Reporter& reporter, const Interruption& interruption) {
-  return HandoverInProgress(phone, backup, list, reporter, interruption).run();
+                  bool overwriteData, Reporter& reporter, const Interruption& interruption) {
+  return HandoverInProgress(phone, backup, list, overwriteData, reporter, interruption).run();
 }
 
 }  // namespace appsync::host

@@ -16,6 +16,7 @@ namespace appsync::host {
 struct Handover {
   std::set<std::string, std::less<>> installed;  ///< was on the phone before, all applications
   std::set<std::string> listed;                  ///< the client is to make placeholders of these
+  std::set<std::string> overwritten;             ///< had data of their own, and the backup's waits
   std::map<std::string, std::string> failures;   ///< reason by identifier of what was left out
   std::optional<std::string> broken;             ///< why it was broken off, for people
   std::optional<std::string> layoutRefused;      ///< why the home screen stays as it is, for people
@@ -24,8 +25,10 @@ struct Handover {
 /// Gives a phone what it lacks of a backup: first each application's data, then the order of the
 /// home screen (unless it is a part of a backup) and the demoted applications, and last the list
 /// that sets the client off. Broken off or killed anywhere, it has done no harm, and the next one
-/// carries on. What is installed is left alone, with its data.
+/// carries on. What is installed is left alone, with its data. So is the data that any other
+/// application has of its own, unless `overwriteData`: then the backup's waits for it, and takes
+/// the place of its own when its package comes.
 Handover handOver(const RestorePhone& phone, const Backup& backup, const RestoreList& list,
-                  Reporter& reporter, const Interruption& interruption);
+                  bool overwriteData, Reporter& reporter, const Interruption& interruption);
 
 }  // namespace appsync::host

@@ -16,7 +16,10 @@ std::string absenceReason(const BackedUpApplication& app, const RestoreEnd& end)
 /// Whoever names an application and tells where its package is waits for it to come.
 void settlePlaceholder(const std::string& identifier, bool named, const RestoreEnd& end,
                        Summary& summary) {
-  if (end.heldBack.contains(identifier)) {
+  const bool heldBack = end.heldBack.contains(identifier);
+  if (end.overwritten.contains(identifier) && (heldBack || !named || !end.packagesGiven)) {
+    summary.dataRestored.push_back(identifier);
+  } else if (heldBack) {
     summary.skipped.push_back({identifier, "stays a placeholder until it is asked for", false});
   } else if (named && end.packagesGiven) {
     summary.failed.push_back({identifier, end.missing});

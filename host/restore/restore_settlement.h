@@ -23,6 +23,7 @@ struct RestoreEnd {
   std::map<std::string, InstalledData> installedData;  ///< LeftAlone of what is not named
   ApplicationsPresent present;
   std::set<std::string> heldBack;               ///< demoted placeholders
+  std::set<std::string> overwritten;            ///< placeholders whose own data gave way
   std::set<std::string> updated;                ///< installed before, and again
   std::map<std::string, std::string> failures;  ///< reason by identifier
   std::string missing;                          ///< why a placeholder has no package

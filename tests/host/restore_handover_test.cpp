@@ -19,8 +19,8 @@ class HandoverTest : public RestoreTest {
     std::string problem;
     const Backup read = backup();
     phone.trace.clear();
-    return host::handOver(restorePhone(), read, RestoreList::of(read, problem).value(), reporter,
-                          interruption);
+    return host::handOver(restorePhone(), read, RestoreList::of(read, problem).value(),
+                          overwriteData, reporter, interruption);
   }
   std::string demotionsOnPhone() {
     return phone.files.textAt(exchange::DemotedApplications).value_or("none");
@@ -85,6 +85,9 @@ TEST_F(HandoverTest, LaysOutDataAnewThatIsOfAnotherBackup) {
   backUp("com.b", "data of b");
   backUp("com.c");
   waiting = {{"com.a", "data"}, {"com.b", "data of B"}, {"com.c", "data that is not wanted"}};
+  for (const auto& item : waiting) {
+    phone.files.putFile(joinPath(joinPath(exchange::WaitingData, item.first), "file"), "");
+  }
   handOver();
   EXPECT_THAT(waiting, ElementsAre(Pair("com.a", "data of a"), Pair("com.b", "data of b")));
 }
@@ -98,6 +101,36 @@ TEST_F(HandoverTest, LeavesTheDataOfADemotedApplicationAlone) {
   owned.clear();
   handOver();
   EXPECT_THAT(waiting, ElementsAre(Pair("com.a", "data of a")));
+}
+
+TEST_F(HandoverTest, LeavesDataAloneOfWhichNothingStands) {
+  backUp("com.a", "data of a");
+  owned["com.a"] = "made once";
+  const Handover given = handOver();
+  EXPECT_THAT(waiting, IsEmpty());
+  EXPECT_THAT(given.listed, ElementsAre("com.a"));
+}
+
+TEST_F(HandoverTest, OverwritesTheDataOfADemotedApplicationWhenAsked) {
+  overwriteData = true;
+  backUp("com.a", "data of a");
+  backUp("com.b", "data of b");
+  backUp("com.c");
+  for (const char* identifier : {"com.a", "com.b", "com.c"}) {
+    seedRestoring(identifier, InstallType::IntentionalDowngrade);
+    owned[identifier] = "made since";
+  }
+  owned["com.b"] = "data of b";
+  EXPECT_THAT(handOver().overwritten, ElementsAre("com.a"));
+  EXPECT_THAT(waiting, ElementsAre(Pair("com.a", "data of a")));
+}
+
+TEST_F(HandoverTest, GivesNothingWhenTheApplicationsCannotBeTold) {
+  backUp("com.a", "data of a");
+  phone.faults.failEvery("AppRegistry.enumerateBundles", Error::posix(EMFILE));
+  const Handover given = handOver();
+  EXPECT_EQ(given.broken, "the phone's applications cannot be told: Too many open files");
+  EXPECT_THAT(trace(), ElementsAre("fault AppRegistry.enumerateBundles()"));
 }
 
 TEST_F(HandoverTest, LeavesOutAnApplicationWhoseDataCannotBeLookedAt) {
@@ -127,8 +160,9 @@ TEST_F(HandoverTest, LeavesOutAnApplicationWhoseDataIsDamaged) {
   putFile(backups / "backup/Data/com.b.tar", "data of X");
   std::string problem;
   const Backup read = readBackup(backups / "backup", problem).value();
-  const Handover given = host::handOver(
-      restorePhone(), read, RestoreList::of(read, problem).value(), reporter, interruption);
+  const Handover given =
+      host::handOver(restorePhone(), read, RestoreList::of(read, problem).value(), overwriteData,
+                     reporter, interruption);
   EXPECT_THAT(given.failures,
               ElementsAre(Pair("com.b",
                                "its data in the backup is damaged: com.b.tar does not "
@@ -215,7 +249,8 @@ TEST_F(HandoverTest, GoesOnWithoutALayoutThatTheHomeScreenRefuses) {
   damaged.iconLayout = toBytes("damaged");
   std::string problem;
   const RestoreList list = RestoreList::of(damaged, problem).value();
-  const Handover given = host::handOver(restorePhone(), damaged, list, reporter, interruption);
+  const Handover given =
+      host::handOver(restorePhone(), damaged, list, overwriteData, reporter, interruption);
   EXPECT_FALSE(given.broken);
   EXPECT_THAT(namesOnList(), ElementsAre("com.a"));
   EXPECT_THAT(given.layoutRefused.value_or(""),

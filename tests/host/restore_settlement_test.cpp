@@ -62,6 +62,19 @@ TEST_F(RestoreSettlementTest, FailsWhatWasNamedAndThePackagesLack) {
   EXPECT_EQ(settled(), "skipped: com.a (waits for its package) " + demoted);
 }
 
+TEST_F(RestoreSettlementTest, TellsWhichPlaceholdersGetTheBackupsData) {
+  for (const char* identifier : {"com.a", "com.b", "com.c"}) backUp(identifier);
+  end.present.placeholders = {{"com.a", {}}, {"com.b", {}}, {"com.c", {}}};
+  end.heldBack = {"com.b", "com.c"};
+  end.overwritten = {"com.a", "com.b"};
+  const std::string demoted = "com.c (stays a placeholder until it is asked for)";
+  EXPECT_EQ(settled(), "data restored: com.a com.b; skipped: " + demoted);
+  end.packagesGiven = true;
+  only = {"com.a", "com.b", "com.c"};
+  EXPECT_EQ(settled(),
+            "data restored: com.b; failed: com.a (waits for its package); skipped: " + demoted);
+}
+
 TEST_F(RestoreSettlementTest, TellsWhyNothingStands) {
   backUp("com.a");
   entries["com.b"] = PropertyList::Dictionary{};
