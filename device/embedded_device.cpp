@@ -224,12 +224,14 @@ class FolderDevice final : public EmbeddedDevice {
 
   /// What only waits for its restore goes like an application that is uninstalled.
   std::optional<Error> cancel(std::string_view bundleId) {
+    std::optional<Error> error;
+    if (!registry_.mayCancel(bundleId, &error)) return error;
     if (coordination_ && coordination_->cancelInstall(bundleId)) {
+      registry_.undoAsking(bundleId);
       registry_.forgetWaitingData(bundleId);
       return std::nullopt;
     }
-    std::optional<Error> error;
-    if (registry_.cancelRestore(bundleId, &error)) return std::nullopt;
+    if (registry_.cancelWish(bundleId, &error)) return std::nullopt;
     if (error) return error;
     const bool isLive =
         coordination_ && coordination_->coordinatorFor(CoordinatorKind::Any, bundleId,

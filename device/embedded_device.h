@@ -128,7 +128,8 @@ class EmbeddedDevice {
   // writes the device; without one they are done here. False (with a reason) when no coordinated
   // install of the application is on its way, or it is past cancelling.
   // A restored application that waits is cancelled like one that is uninstalled, also without
-  // coordination.
+  // coordination, and not while the policy forbids to remove applications. Cancelling what was
+  // tapped leaves a demoted application as it was before.
 
   /// The install's client is asked to bring this application first. A demoted or restored
   /// application that waits is asked for: its placeholder's install type becomes

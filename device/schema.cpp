@@ -157,6 +157,10 @@ bool isCurrentDevice(SQLite::Database& database, const std::filesystem::path& fo
 
 /// Those that the devices of older programs lack.
 void makeLaterTables(SQLite::Database& database) {
+  // What the placeholders were that a person has asked for.
+  database.exec(
+      "CREATE TABLE IF NOT EXISTS asked_for "
+      "(identifier TEXT PRIMARY KEY, install_type INTEGER NOT NULL) WITHOUT ROWID");
   makeCoordinationTables(database);
   makeHistoryTable(database);
 }

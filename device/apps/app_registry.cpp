@@ -6,10 +6,10 @@
 
 #include "device/apps/demotion.h"
 #include "device/apps/installs.h"
+#include "device/apps/person_wishes.h"
 #include "device/apps/removal.h"
 #include "device/base/identifiers.h"
 #include "device/state/application_rows.h"
-#include "device/state/device_policy.h"
 #include "platform/bundle.h"
 
 namespace appsync::device {
@@ -44,31 +44,12 @@ std::optional<Bytes> dataOption(const PropertyList::Dictionary& options, std::st
   return data ? std::optional(*data) : std::nullopt;
 }
 
-bool isDemotion(InstallType placeholder) {
-  return placeholder == InstallType::Downgrade || placeholder == InstallType::IntentionalDowngrade;
-}
-
-/// What came from a backup may be demoted too, and asking twice is no harm.
-bool canBeAskedFor(InstallType placeholder) {
-  return isDemotion(placeholder) || placeholder == InstallType::Restore ||
-         placeholder == InstallType::StoreDownload;
-}
-
 /// Who brings a package.
 HistoryOrigin originOf(const PropertyList::Dictionary& options) {
   const PropertyList* type = find(options, SWInstallTypeKey);
   const auto number = type ? type->asUnsigned() : std::nullopt;
   return number == static_cast<std::uint64_t>(InstallType::StoreDownload) ? HistoryOrigin::Store
                                                                           : HistoryOrigin::Sync;
-}
-
-bool mayRemove(DeviceCore& core, std::optional<Error>* error) {
-  const PolicyValue wish =
-      StoredDevicePolicy(core.database).effectiveBoolValue(PolicySetting::AppRemovalAllowed);
-  if (wish != PolicyValue::ExplicitlyNo) return true;
-  setError(error, Error::withDescription(POSIXErrorDomain, EPERM,
-                                         "removing applications is forbidden on this phone"));
-  return false;
 }
 
 InstallDetails placeholderDetails(const PropertyList::Dictionary& options) {
@@ -231,34 +212,42 @@ bool DeviceAppRegistry::demote(std::string_view bundleId, std::optional<Error>* 
 }
 
 bool DeviceAppRegistry::askFor(std::string_view bundleId, std::optional<Error>* error) noexcept {
-  bool asked = false;
   const auto ask = [&](const std::string& identifier, std::optional<Error>* why) {
-    return core_.database.change(
-        "the application could not be asked for", Database::Commit::OnDisk,
-        [&](SQLite::Database& database) {
-          std::optional<ApplicationRow> row = findApplication(database, identifier).placeholder;
-          asked = row && canBeAskedFor(row->installType);
-          if (!asked) return;
-          row->installType = InstallType::StoreDownload;
-          putApplication(database, *row);
-        },
-        why);
+    return device::askFor(core_, identifier, why);
   };
-  return changeApplication(bundleId, ask, error) && asked;
+  return changeApplication(bundleId, ask, error);
 }
 
-bool DeviceAppRegistry::cancelRestore(std::string_view bundleId,
-                                      std::optional<Error>* error) noexcept {
+bool DeviceAppRegistry::mayCancel(std::string_view bundleId, std::optional<Error>* error) noexcept {
+  const auto effect = effectOfCancelling(core_, std::string(bundleId), error);
+  return effect && (*effect != Cancelling::Forbidden || mayRemove(core_, error));
+}
+
+bool DeviceAppRegistry::cancelWish(std::string_view bundleId,
+                                   std::optional<Error>* error) noexcept {
   const auto cancel = [&](const std::string& identifier, std::optional<Error>* why) {
-    ApplicationRows rows;
-    const bool read = core_.database.read(
-        ReadFailed,
-        [&](SQLite::Database& database) { rows = findApplication(database, identifier); }, why);
-    if (!read || rows.installed) return false;
-    const bool waits = rows.placeholder && rows.placeholder->installType == InstallType::Restore;
-    return waits && removeForPerson(core_, identifier, why);
+    const auto effect = effectOfCancelling(core_, identifier, why);
+    switch (effect.value_or(Cancelling::Nothing)) {
+      case Cancelling::Nothing:
+        return false;
+      case Cancelling::Undoing:
+        return device::undoAsking(core_, identifier, why);
+      case Cancelling::Forbidden:
+        mayRemove(core_, why);
+        return false;
+      case Cancelling::Forgetting:
+        return removeForPerson(core_, identifier, why);
+    }
+    return false;
   };
   return changeApplication(bundleId, cancel, error);
+}
+
+void DeviceAppRegistry::undoAsking(std::string_view bundleId) noexcept {
+  const auto undo = [&](const std::string& identifier, std::optional<Error>* why) {
+    return device::undoAsking(core_, identifier, why);
+  };
+  changeApplication(bundleId, undo, nullptr);
 }
 
 void DeviceAppRegistry::forgetWaitingData(std::string_view bundleId) noexcept {

@@ -40,10 +40,15 @@ class DeviceAppRegistry final : public AppRegistry {
   /// of a download from the store. False when there is no such placeholder, and with an error when
   /// that is not known or cannot be written.
   bool askFor(std::string_view bundleId, std::optional<Error>* error) noexcept;
-  /// What a person does: an application that only waits to be restored is not to come, and goes
-  /// with what the restore had for it. False when there is no such placeholder, and with an error
-  /// when that is not known or cannot be written.
-  bool cancelRestore(std::string_view bundleId, std::optional<Error>* error) noexcept;
+  /// What a person does: an application is not to come after all. One that was asked for is as it
+  /// was before; one that only waits to be restored goes with what the restore had for it. False
+  /// when neither can be, and with an error when it is forbidden, not known or cannot be written.
+  bool cancelWish(std::string_view bundleId, std::optional<Error>* error) noexcept;
+  /// False with an error when cancelling would take away what the policy forbids to remove, or that
+  /// is not known.
+  bool mayCancel(std::string_view bundleId, std::optional<Error>* error) noexcept;
+  /// Of an application that was asked for: its placeholder is what it was before.
+  void undoAsking(std::string_view bundleId) noexcept;
   /// Removes what a restore had for an application of which the registry knows nothing any more.
   void forgetWaitingData(std::string_view bundleId) noexcept;
   /// Whether only the placeholder and the data are left of it until somebody asks for it.

@@ -91,6 +91,9 @@ void eraseApplication(SQLite::Database& database, const ApplicationRow& row) {
   Query(database, "DELETE FROM applications WHERE identifier = ? AND placeholder = ?",
         row.identifier, row.placeholder)
       .run();
+  if (row.placeholder) {
+    Query(database, "DELETE FROM asked_for WHERE identifier = ?", row.identifier).run();
+  }
 }
 
 }  // namespace appsync::device

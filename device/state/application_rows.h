@@ -39,6 +39,11 @@ struct ApplicationRows {
   std::string type() const;
 };
 
+/// Whether a placeholder of this type is what a demotion left.
+inline bool isDemotion(InstallType placeholder) {
+  return placeholder == InstallType::Downgrade || placeholder == InstallType::IntentionalDowngrade;
+}
+
 /// Takes over what a bundle's information dictionary says.
 void describe(ApplicationRow& row, const PropertyList::Dictionary& info);
 

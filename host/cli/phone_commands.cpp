@@ -169,8 +169,11 @@ void addPhoneCommands(CLI::App& app, Command& chosen) {
                        "Works while a sync runs.\n", &runQuit);
   addIdentifierCommand(app, chosen, "tap", "Tap a placeholder: have its application come next",
                        "Works while a sync runs.\n", &runTap);
-  addIdentifierCommand(app, chosen, "cancel", "Cancel the install of an application on the phone",
-                       "Works while a sync runs.\n", &runCancel);
+  addIdentifierCommand(
+      app, chosen, "cancel", "Cancel the install of an application on the phone",
+      "Works while a sync runs. A demoted application that was tapped is demoted again; one\n"
+      "that waits to be restored goes, with what the restore had for it.\n",
+      &runCancel);
 
   CLI::App* policy = app.add_subcommand("policy", "Show or set the phone's restrictions");
   policy->footer(

@@ -291,7 +291,7 @@ TEST_F(CoordinationObjectsTest, ATapOfADemotedApplicationThatASyncBringsAsksForI
   EXPECT_TRUE(recorder.waitFor("prioritize"));
   EXPECT_EQ(record(Id, true)->installType, InstallType::StoreDownload);
   EXPECT_TRUE(EmbeddedDevice::cancel(folder, Id, problem, &error)) << text();
-  EXPECT_EQ(record(Id, true)->installType, InstallType::StoreDownload);
+  EXPECT_EQ(record(Id, true)->installType, InstallType::IntentionalDowngrade);
   EXPECT_EQ(textAt("/var/mobile/Containers/Data/com.example.a/saved"), "kept");
 }
 

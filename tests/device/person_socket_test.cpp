@@ -8,6 +8,7 @@
 
 #include <cerrno>
 
+#include "platform/sync_files.h"
 #include "tests/device/coordination_test.h"
 
 namespace appsync::device {
@@ -169,6 +170,9 @@ TEST_F(PersonSocketTest, SomethingElseOfItsNameIsLeftAloneAndTheDeviceOpensAllTh
 
 class UncoordinatedTest : public DeviceTest {
  protected:
+  static constexpr std::string_view OwnNotes = "/var/mobile/Containers/Data/com.example.a/notes";
+  static constexpr std::string_view WaitingNotes =
+      "/var/mobile/Media/HalvoRestore/Data/com.example.a/notes";
   bool demote(InstallType demotion) {
     return installPlaceholder(
         Id, "1.0", {{std::string(SWInstallTypeKey), static_cast<std::uint64_t>(demotion)}});
@@ -227,6 +231,60 @@ TEST_F(UncoordinatedTest, ADemotedApplicationIsNotBeingInstalled) {
   ASSERT_TRUE(demote(InstallType::IntentionalDowngrade));
   EXPECT_EQ(refusal(&EmbeddedDevice::cancel), "com.example.a is not being installed");
   EXPECT_EQ(placeholderType(), InstallType::IntentionalDowngrade);
+}
+
+TEST_F(UncoordinatedTest, WhatWasTappedIsAsItWasBeforeWhenItIsCancelled) {
+  for (const InstallType demotion : {InstallType::Downgrade, InstallType::IntentionalDowngrade}) {
+    ASSERT_TRUE(demote(demotion));
+    putFile(OwnNotes, "mine");
+    for (int tap = 0; tap < 2; ++tap) EXPECT_EQ(refusal(&EmbeddedDevice::tap), "none");
+    EXPECT_EQ(refusal(&EmbeddedDevice::cancel), "none");
+    EXPECT_EQ(placeholderType(), demotion);
+    EXPECT_EQ(textAt(OwnNotes), "mine");
+    EXPECT_EQ(refusal(&EmbeddedDevice::cancel), "com.example.a is not being installed");
+  }
+}
+
+TEST_F(UncoordinatedTest, ARestoredApplicationThatIsListedAsDemotedIsNoMoreThanDemoted) {
+  putFile(WaitingNotes, "old");
+  ASSERT_TRUE(demote(InstallType::Restore));
+  putFile(exchange::DemotedApplications,
+          xml(PropertyList::Dictionary{
+              {"AutomaticDowngrades", PropertyList::Array{PropertyList(Id)}}}));
+  EXPECT_EQ(refusal(&EmbeddedDevice::cancel), "com.example.a is not being installed");
+  EXPECT_EQ(refusal(&EmbeddedDevice::tap), "none");
+  EXPECT_EQ(refusal(&EmbeddedDevice::cancel), "none");
+  EXPECT_EQ(placeholderType(), InstallType::Restore);
+  EXPECT_EQ(textAt(WaitingNotes), "old");
+}
+
+TEST_F(UncoordinatedTest, NothingIsCancelledWhileItCannotBeSeenWhatIsDemoted) {
+  putFile(WaitingNotes, "old");
+  ASSERT_TRUE(demote(InstallType::Restore));
+  std::filesystem::create_directories(onDisk(exchange::DemotedApplications));
+  EXPECT_NE(refusal(&EmbeddedDevice::cancel), "none");
+  EXPECT_EQ(placeholderType(), InstallType::Restore);
+  EXPECT_EQ(textAt(WaitingNotes), "old");
+}
+
+TEST_F(UncoordinatedTest, ARestoredApplicationThatWasTappedIsGoneWithItsDataWhenItIsCancelled) {
+  putFile(WaitingNotes, "old");
+  ASSERT_TRUE(demote(InstallType::Restore));
+  EXPECT_EQ(refusal(&EmbeddedDevice::tap), "none");
+  EXPECT_EQ(refusal(&EmbeddedDevice::cancel), "none");
+  EXPECT_EQ(registry(), std::vector<std::string>{});
+  EXPECT_FALSE(device->files().fileExists(WaitingNotes));
+}
+
+TEST_F(UncoordinatedTest, WhatWasTappedAndIsComingIsTooLateToCancel) {
+  ASSERT_TRUE(demote(InstallType::IntentionalDowngrade));
+  EXPECT_EQ(refusal(&EmbeddedDevice::tap), "none");
+  device->appRegistry()
+      .installProgressSync(*record(Id, true))
+      ->setInstallState(InstallState::Active);
+  EXPECT_EQ(refusal(&EmbeddedDevice::cancel),
+            "com.example.a is just being installed, too late to cancel");
+  EXPECT_EQ(placeholderType(), InstallType::StoreDownload);
 }
 
 TEST_F(UncoordinatedTest, ATapWithoutAWriterStaysOnTheDevice) {

@@ -35,6 +35,28 @@ class WaitingSync : public ::testing::TestWithParam<bool> {
     device::DeviceError problem;
     ASSERT_TRUE(device::EmbeddedDevice::tap(phone.folder(), "com.a", problem, nullptr));
   }
+  /// Why it could not be done; "done" else.
+  std::string cancel() {
+    device::DeviceError problem;
+    std::optional<Error> error;
+    const bool done = device::EmbeddedDevice::cancel(phone.folder(), "com.a", problem, &error);
+    return done ? "done" : error ? error->localizedDescription() : problem.message;
+  }
+  static PlanOptions removal() {
+    PlanOptions options;
+    options.install = {"com.b"};
+    options.remove = {"com.a"};
+    return options;
+  }
+  /// Nothing of it, listed or not.
+  void expectGone() {
+    EXPECT_THAT(phone.applications(), ElementsAre("com.b 1.0"));
+    for (const std::string_view directory :
+         {"/var/mobile/Containers/Data", "/var/mobile/Media/HalvoRestore/Data"}) {
+      EXPECT_FALSE(phone.device().files().fileExists(joinPath(directory, "com.a")));
+    }
+    EXPECT_THAT(phone.device().homeScreenOrder(), ElementsAre("com.b"));
+  }
   void restore(Demotion demotion = Demotion::None) {
     backup.add("com.a", "notes of a", demotion);
     phone.restore(backup.read());
@@ -113,6 +135,63 @@ TEST_P(WaitingSync, ARestoredApplicationThatThePersonTookAwayIsInstalledAsNew) {
   EXPECT_EQ(sync(), "installed com.a; installed com.b");
   EXPECT_THAT(phone.applications(), ElementsAre("com.a 1.0", "com.b 1.0"));
   EXPECT_EQ(phone.notes("com.a"), "");
+}
+
+TEST_P(WaitingSync, ADemotedApplicationThatIsRemovedByNameLeavesNothing) {
+  installBoth();
+  demote();
+  EXPECT_THAT(sync(removal()), ::testing::HasSubstr("deleted com.a"));
+  expectGone();
+}
+
+TEST_P(WaitingSync, ATappedApplicationThatIsRemovedByNameLeavesNothing) {
+  installBoth();
+  demote();
+  tap();
+  EXPECT_THAT(sync(removal()), ::testing::HasSubstr("deleted com.a"));
+  expectGone();
+}
+
+TEST_P(WaitingSync, ARestoredApplicationThatIsRemovedByNameLeavesNothing) {
+  restore();
+  EXPECT_EQ(sync(removal()), "installed com.b; deleted com.a");
+  expectGone();
+}
+
+TEST_P(WaitingSync, ATapThatIsCancelledLeavesADemotedApplicationAsItWas) {
+  installBoth();
+  demote();
+  phone.open();
+  const auto before = phone.picture();
+  tap();
+  EXPECT_NE(phone.picture(), before);
+  EXPECT_EQ(cancel(), "done");
+  EXPECT_EQ(phone.picture(), before);
+  EXPECT_EQ(sync(),
+            "skipped com.a: stays a placeholder until it is asked for; "
+            "skipped com.b: version 1.0 is installed");
+}
+
+TEST_P(WaitingSync, ATapThatIsCancelledLeavesARestoredApplicationDemoted) {
+  restore(Demotion::Intentional);
+  const auto before = phone.picture();
+  tap();
+  EXPECT_EQ(cancel(), "done");
+  EXPECT_EQ(phone.picture(), before);
+  EXPECT_EQ(sync(), "installed com.b; skipped com.a: stays a placeholder until it is asked for");
+}
+
+TEST_P(WaitingSync, ARestoredApplicationIsNotCancelledWhileRemovingIsForbidden) {
+  restore();
+  const auto before = phone.picture();
+  auto& device = phone.device();
+  ASSERT_TRUE(
+      device.setPolicy(PolicySetting::AppRemovalAllowed, PolicyValue::ExplicitlyNo, nullptr));
+  EXPECT_EQ(cancel(), "removing applications is forbidden on this phone");
+  EXPECT_EQ(phone.picture(), before);
+  ASSERT_TRUE(device.setPolicy(PolicySetting::AppRemovalAllowed, PolicyValue::Yes, nullptr));
+  EXPECT_EQ(cancel(), "done");
+  EXPECT_THAT(phone.applications(), ElementsAre());
 }
 
 INSTANTIATE_TEST_SUITE_P(BothWays, WaitingSync, ::testing::Bool(),

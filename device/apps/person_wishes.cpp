@@ -1,0 +1,121 @@
+#include "device/apps/person_wishes.h"
+
+#include <cerrno>
+
+#include "device/apps/installs.h"
+#include "device/state/application_rows.h"
+#include "device/state/device_policy.h"
+#include "platform/existence.h"
+#include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
+
+namespace appsync::device {
+namespace {
+
+/// What came from a backup may be demoted too, and asking twice is no harm.
+bool canBeAskedFor(InstallType placeholder) {
+  return isDemotion(placeholder) || placeholder == InstallType::Restore ||
+         placeholder == InstallType::StoreDownload;
+}
+
+/// A placeholder with what it was before a person asked for it.
+struct Asked {
+  std::optional<ApplicationRow> placeholder;
+  std::optional<InstallType> before;
+};
+
+Asked findAsked(SQLite::Database& database, std::string_view identifier) {
+  ApplicationRows rows = findApplication(database, identifier);
+  if (rows.installed || !rows.placeholder) return {};
+  Asked asked{std::move(rows.placeholder), std::nullopt};
+  if (asked.placeholder->installType != InstallType::StoreDownload) return asked;
+  Query query(database, "SELECT install_type FROM asked_for WHERE identifier = ?", identifier);
+  if (query.next()) asked.before = query.as<InstallType>(0);
+  return asked;
+}
+
+/// Whether a restore was told to leave the application demoted, which its placeholder does not show
+/// without coordination; nullopt (with an error) when that cannot be read.
+std::optional<bool> isListedAsDemoted(FileManager& files, const std::string& identifier,
+                                      std::optional<Error>* error) {
+  std::optional<Bytes> bytes;
+  if (!readIfThere(files, exchange::DemotedApplications, bytes, error)) return std::nullopt;
+  const auto lists = bytes ? parsePropertyList(*bytes) : std::nullopt;
+  for (const std::string_view key :
+       {exchange::AutomaticDowngradesKey, exchange::IntentionalDowngradesKey}) {
+    const PropertyList* list = lists ? lists->find(key) : nullptr;
+    if (!list || !list->asArray()) continue;
+    for (const PropertyList& item : *list->asArray()) {
+      if (item.asString() && *item.asString() == identifier) return true;
+    }
+  }
+  return false;
+}
+
+bool isComing(DeviceCore& core, const std::string& identifier) {
+  const auto progress = currentProgress(core.database, core.observers, identifier);
+  return progress && progress->installState() == InstallState::Active;
+}
+
+}  // namespace
+
+bool askFor(DeviceCore& core, const std::string& identifier, std::optional<Error>* error) {
+  bool asked = false;
+  const bool changed = core.database.change(
+      "the application could not be asked for", Database::Commit::OnDisk,
+      [&](SQLite::Database& database) {
+        std::optional<ApplicationRow> row = findApplication(database, identifier).placeholder;
+        asked = row && canBeAskedFor(row->installType);
+        if (!asked || row->installType == InstallType::StoreDownload) return;
+        Query(database, "INSERT OR REPLACE INTO asked_for VALUES (?, ?)", identifier,
+              row->installType)
+            .run();
+        row->installType = InstallType::StoreDownload;
+        putApplication(database, *row);
+      },
+      error);
+  return changed && asked;
+}
+
+std::optional<Cancelling> effectOfCancelling(DeviceCore& core, const std::string& identifier,
+                                             std::optional<Error>* error) {
+  Asked asked;
+  const bool read = core.database.read(
+      "the registry could not be read",
+      [&](SQLite::Database& database) { asked = findAsked(database, identifier); }, error);
+  if (!read) return std::nullopt;
+  if (!asked.placeholder) return Cancelling::Nothing;
+  if (asked.before && isComing(core, identifier)) return Cancelling::Nothing;
+  if (asked.before && *asked.before != InstallType::Restore) return Cancelling::Undoing;
+  if (asked.before.value_or(asked.placeholder->installType) != InstallType::Restore) {
+    return Cancelling::Nothing;
+  }
+  const std::optional<bool> demoted = isListedAsDemoted(core.files, identifier, error);
+  if (!demoted) return std::nullopt;
+  if (*demoted) return asked.before ? Cancelling::Undoing : Cancelling::Nothing;
+  return mayRemove(core, nullptr) ? Cancelling::Forgetting : Cancelling::Forbidden;
+}
+
+bool undoAsking(DeviceCore& core, const std::string& identifier, std::optional<Error>* error) {
+  return core.database.change(
+      "the application could not be demoted again", Database::Commit::OnDisk,
+      [&](SQLite::Database& database) {
+        Asked asked = findAsked(database, identifier);
+        if (!asked.before) return;
+        asked.placeholder->installType = *asked.before;
+        putApplication(database, *asked.placeholder);
+        Query(database, "DELETE FROM asked_for WHERE identifier = ?", identifier).run();
+      },
+      error);
+}
+
+bool mayRemove(DeviceCore& core, std::optional<Error>* error) {
+  const PolicyValue wish =
+      StoredDevicePolicy(core.database).effectiveBoolValue(PolicySetting::AppRemovalAllowed);
+  if (wish != PolicyValue::ExplicitlyNo) return true;
+  setError(error, Error::withDescription(POSIXErrorDomain, EPERM,
+                                         "removing applications is forbidden on this phone"));
+  return false;
+}
+
+}  // namespace appsync::device
