@@ -177,8 +177,9 @@ void addPhoneCommands(CLI::App& app, Command& chosen) {
 
   CLI::App* policy = app.add_subcommand("policy", "Show or set the phone's restrictions");
   policy->footer(
-      "What is forbidden is forbidden to syncs and persons alike; a restore still brings "
-      "packages.\n"
+      "What is forbidden is forbidden to syncs, restores and persons alike; a restore still "
+      "brings\n"
+      "placeholders.\n"
       "Example: appsync --device phone policy --removing forbid");
   auto wishes = std::make_shared<PolicyOptions>();
   policy->add_option("--installing", wishes->installing, "Whether applications may be installed")

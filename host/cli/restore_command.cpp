@@ -47,7 +47,7 @@ ExitCode exitCode(const SyncResult& result, bool interrupted) {
 }
 
 ExitCode runRestore(const RestoreOptions& options, CommandContext& context) {
-  const RestoreInput input = readInput(options);
+  RestoreInput input = readInput(options);
   const auto device = context.openDevice(device::Access::Write);
   if (input.packages && device->options().coordination) {
     throw CommandError(
@@ -55,6 +55,8 @@ ExitCode runRestore(const RestoreOptions& options, CommandContext& context) {
         "this phone takes the packages of restored applications only from the store: "
         "use --store instead of --packages");
   }
+  input.installingAllowed =
+      device->policy(PolicySetting::AppInstallationAllowed) != PolicyValue::ExplicitlyNo;
   const auto reporter = context.makeReporter();
   Interruption interruption;
   const auto plugin = loadPlugin(context);

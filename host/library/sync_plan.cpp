@@ -13,8 +13,6 @@
 namespace appsync::host {
 namespace {
 
-constexpr std::string_view InstallingForbidden =
-    "installing applications is forbidden on the phone (appsync policy --installing allow)";
 constexpr std::string_view RemovingForbidden =
     "removing applications is forbidden on the phone (appsync policy --removing allow)";
 

@@ -24,6 +24,9 @@ struct PlannedEntry {
   bool named = false;   ///< somebody asked for just this
 };
 
+/// Why nothing is installed.
+inline constexpr std::string_view InstallingForbidden =
+    "installing applications is forbidden on the phone (appsync policy --installing allow)";
 /// Why a demoted application stays as it is.
 inline constexpr std::string_view StaysDemoted = "stays a placeholder until it is asked for";
 

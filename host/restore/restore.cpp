@@ -46,7 +46,8 @@ SyncResult Restore::run(const RestoreInput& input) {
   if (given && input.overwriteData) overwriteData(input);
   SyncResult result;
   result.completed = given && !interruption_.requested() && callClient(input);
-  if (input.catalogue && !broken_) bringFromStore(input.list, *input.catalogue);
+  if (input.catalogue && input.installingAllowed && !broken_)
+    bringFromStore(input.list, *input.catalogue);
   if (handover_.layoutRefused && !broken_) broken(*handover_.layoutRefused, std::nullopt);
   result.summary = settle(input);
   result.completed = result.completed && !broken_;
@@ -96,7 +97,9 @@ void Restore::transfer(const RestoreInput& input) {
   if (!interruption_.requested()) sender.send(client_.outstandingAssetTransfers());
   sent_ = sender.outcome().sent;
   note(sender.outcome().failures);
-  if (!phone_.coordination) bringPackages(input.list, input.packages ? *input.packages : None);
+  if (!phone_.coordination && input.installingAllowed) {
+    bringPackages(input.list, input.packages ? *input.packages : None);
+  }
   waitUntilIdle(phone_, sent_);
   client_.assetTransferEndedWithSuccess(!interruption_.requested());
   if (!phone_.coordination) sender.removeSentPackages();
@@ -154,11 +157,16 @@ void Restore::note(const std::map<std::string, std::string>& failures) {
 }
 
 void Restore::explainPlaceholders(const RestoreInput& input, RestoreEnd& end) {
-  end.missing = input.catalogue  ? "the store does not have it"
-                : input.packages ? "the library does not have it"
-                                 : "waits for its package";
   end.packagesGiven = input.catalogue || input.packages;
-  const std::optional<Library>& library = input.catalogue ? input.catalogue : input.packages;
+  const bool forbidden = end.packagesGiven && !input.installingAllowed;
+  end.missing = forbidden         ? std::string(InstallingForbidden)
+                : input.catalogue ? "the store does not have it"
+                : input.packages  ? "the library does not have it"
+                                  : "waits for its package";
+  static const std::optional<Library> None;
+  const std::optional<Library>& library = forbidden         ? None
+                                          : input.catalogue ? input.catalogue
+                                                            : input.packages;
   const std::vector<std::string> owed = phone_.packagesOwedBy(KQClientKiosk);
   const Demotions demotions(phone_.files);
   if (demotions.problem()) broken(*demotions.problem(), std::nullopt);

@@ -20,7 +20,8 @@ struct RestoreInput {
   RestoreList list;                  ///< the backup's
   std::optional<Library> packages;   ///< what the host itself brings
   std::optional<Library> catalogue;  ///< the store's
-  bool overwriteData = false;        ///< of installed applications too
+  bool overwriteData = false;        ///< of applications that have data of their own too
+  bool installingAllowed = true;     ///< by the phone's policy; else only placeholders come
 };
 
 /// One restore of a backup: what the phone is given, the client's calls in their order, and the

@@ -68,6 +68,19 @@ class Restores(RestoreCase):
                          ("data-overwritten", "com.a", "1.0"))
         self.assertEqual(self.restore("--overwrite-data")["dataRestored"], [])
 
+    def test_no_package_is_installed_while_that_is_forbidden(self):
+        self.use("new")
+        self.run_appsync("policy", "--installing", "forbid")
+        forbidden = "installing applications is forbidden on the phone"
+        summary = self.restore("--store", self.library)
+        self.assertIn(forbidden, self.reasons(summary["skipped"])["com.a"])
+        summary = self.restore("--store", self.library, "--only", "com.a", code=1)
+        self.assertIn(forbidden, self.reasons(summary["failed"])["com.a"])
+        self.assertEqual(self.apps(), {"com.a?": "1.0", "com.b?": "1.0", "com.c?": "1.0",
+                                       "com.d?": "1.0"})
+        self.run_appsync("policy", "--installing", "allow")
+        self.assertEqual(self.restore("--store", self.library)["installed"], ["com.a", "com.b"])
+
     def test_only_what_is_named(self):
         self.use("new")
         before = self.phone_tree()

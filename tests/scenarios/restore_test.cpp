@@ -213,6 +213,38 @@ TEST_P(RestoreScenario, DataOfAnApplicationThatWasDemotedSinceIsLeftAlone) {
   EXPECT_EQ(phone.notes("com.a"), "made since");
 }
 
+TEST_P(RestoreScenario, DataOfADemotedApplicationIsOverwrittenWhenAsked) {
+  offerAll();
+  restoreWithStore();
+  const std::string notes = "/var/mobile/Containers/Data/com.a/notes";
+  ASSERT_TRUE(phone.device().files().createFile(notes, toBytes("made since"), {}));
+  ASSERT_TRUE(phone.device().demote("com.a", nullptr));
+  RestoreInput input = backup.read();
+  input.overwriteData = true;
+  EXPECT_THAT(phone.restore(input), ::testing::StartsWith("data restored com.a; "));
+  input.catalogue = shelf.library();
+  EXPECT_THAT(phone.restore(input), HasSubstr(std::string("skipped com.a") + Demoted));
+  device::DeviceError problem;
+  ASSERT_TRUE(device::EmbeddedDevice::tap(phone.folder(), "com.a", problem, nullptr));
+  EXPECT_THAT(phone.restore(input), HasSubstr("installed com.a"));
+  EXPECT_EQ(phone.notes("com.a"), "notes of a");
+  EXPECT_THAT(phone.device().namesIn("/var/mobile/Containers/Data", nullptr).value(),
+              ElementsAre("com.a", "com.b"));
+}
+
+TEST_P(RestoreScenario, NoPackageIsInstalledWhileThatIsForbidden) {
+  offerAll();
+  restore();
+  const auto before = phone.picture();
+  RestoreInput input = backup.read();
+  input.catalogue = shelf.library();
+  input.installingAllowed = false;
+  const std::string forbidden = ": " + std::string(InstallingForbidden);
+  EXPECT_EQ(phone.restore(input), "skipped com.a" + forbidden + "; skipped com.b" + forbidden +
+                                      "; skipped com.c" + Demoted + "; skipped com.d" + Demoted);
+  EXPECT_EQ(phone.picture(), before);
+}
+
 TEST_P(RestoreScenario, InterruptionAnywhereIsMadeGood) {
   offerAll();
   RestoringPhone undisturbed(coordination());
