@@ -150,7 +150,8 @@ void addSyncCommands(CLI::App& app, Command& chosen) {
       ->type_name("ID")
       ->check(checkIdentifier)
       ->allow_extra_args(false);
-  sync->add_flag("--mirror", options->plan.mirror, "Also remove what the library lacks");
+  sync->add_flag("--mirror", options->plan.mirror,
+                 "Also remove installed applications that the library lacks");
   sync->add_option("--icon-layout", options->iconLayout,
                    "Order of the home screen: a property list, JSON array or one ID per line")
       ->type_name("FILE");

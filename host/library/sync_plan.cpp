@@ -17,6 +17,8 @@ constexpr std::string_view RemovingForbidden =
     "removing applications is forbidden on the phone (appsync policy --removing allow)";
 
 constexpr std::string_view BelongsToSystem = "it is a system application";
+constexpr std::string_view WaitsUnmirrored =
+    "not removed: it waits as a placeholder (--remove takes it away with its data)";
 
 std::string versionText(std::string_view version) {
   return version.empty() ? std::string("a version without number")
@@ -100,8 +102,11 @@ class Planner {
   /// A file that cannot be read may be the package of any application.
   void mirror() {
     for (const auto& [identifier, application] : installed_) {
-      if (application.isSystem || application.isPlaceholder || library_.find(identifier) ||
-          unwanted_.count(identifier) > 0) {
+      if (application.isSystem || library_.find(identifier) || unwanted_.count(identifier) > 0) {
+        continue;
+      }
+      if (application.isPlaceholder) {
+        skip(identifier, WaitsUnmirrored);
         continue;
       }
       const auto unread = std::find_if(library_.unreadable.begin(), library_.unreadable.end(),

@@ -119,6 +119,57 @@ class Demotion(support.Case):
         self.assertEqual(self.apps(), {"com.a": "1.0", "com.b": "1.0"})
 
 
+class Clearing(support.Case):
+    coordination = "off"
+    data = "root/var/mobile/Containers/Data/com.a"
+
+    def setUp(self):
+        super().setUp()
+        self.init("--coordination", self.coordination)
+        self.offer("com.a")
+        self.sync()
+        (self.phone / self.data / "notes").write_text("notes")
+        self.run_appsync("demote", "com.a")
+
+    def test_a_demoted_application_with_data_is_cleared_only_when_asked(self):
+        [error] = self.json_lines("clear", code=1)
+        self.assertEqual(error["message"],
+                         "nothing is cleared: com.a would lose data that is nowhere else; "
+                         "have it installed first, or use --with-data")
+        self.assertEqual(self.apps(), {"com.a?": "1.0"})
+        self.run_appsync("clear", "--with-data")
+        self.assertEqual(self.apps(), {})
+        self.assertFalse((self.phone / self.data).exists())
+
+    def test_a_backup_after_a_clear(self):
+        backup = self.folder / "backup"
+        self.run_appsync("backup", backup)
+        self.run_appsync("clear", code=1)
+        self.run_appsync("backup", backup)
+        self.run_appsync("clear", "--with-data")
+        self.run_appsync("restore", backup)
+        self.assertEqual(self.apps(), {"com.a?": "1.0"})
+        self.assertEqual(
+            (self.phone / "root/var/mobile/Media/HalvoRestore/Data/com.a/notes").read_text(),
+            "notes")
+        self.run_appsync("clear")
+        self.assertEqual(self.apps(), {})
+
+    def test_a_mirror_leaves_it_and_says_why(self):
+        self.offer("com.b")
+        (self.library / "com.a.zip").unlink()
+        skipped = self.sync("--mirror")["skipped"]
+        self.assertEqual([entry["reason"] for entry in skipped if entry["identifier"] == "com.a"],
+                         ["not removed: it waits as a placeholder "
+                          "(--remove takes it away with its data)"])
+        self.assertEqual(self.sync("--mirror", "--remove", "com.a")["deleted"], ["com.a"])
+        self.assertFalse((self.phone / self.data).exists())
+
+
+class CoordinatedClearing(Clearing):
+    coordination = "on"
+
+
 class Leftovers(support.Case):
     """What an earlier command left is no dead end for the next sync."""
 
