@@ -19,13 +19,16 @@ const std::string WaitingNotes = Containers::waitingDataPath(Id) + "/notes";
 /// Each call to the system fails once.
 class FileFaultsTest : public DeviceTest {
  protected:
-  /// Begins with the present device over and over, lets one call after another of the work fail,
-  /// and looks at the device that is opened afterwards.
-  void sweep(const std::function<void()>& work, const std::function<void()>& look) {
+  /// Begins with the present device over and over, lets one call after another fail while the work
+  /// is done and the device is opened again, as a person's next command does, and looks at the
+  /// device that is opened after that. `look` is told whether the work said that it was done. At
+  /// last nothing fails, and it must be.
+  void sweep(const std::function<bool()>& work, const std::function<void(bool done)>& look) {
     device.reset();
     const fs::path origin = temporary.path() / "origin";
     fs::rename(folder, origin);
     bool struck = true;
+    bool done = false;
     for (int call = 0; struck; ++call) {
       SCOPED_TRACE("call " + std::to_string(call));
       device.reset();
@@ -34,21 +37,18 @@ class FileFaultsTest : public DeviceTest {
       reopen();
       {
         const FailingCalls failing(call);
-        work();
+        done = work();
+        device.reset();
+        DeviceError problem;
+        device = EmbeddedDevice::open(folder, Access::Write, problem);
         struck = failing.struck();
       }
       reopen();
-      look();
+      look(done);
       EXPECT_EQ(containerCount(), registry().size());
       ASSERT_FALSE(HasFailure());
     }
-  }
-
-  /// As a person's next command does; it may fail.
-  void openAnew() {
-    device.reset();
-    DeviceError problem;
-    device = EmbeddedDevice::open(folder, Access::Write, problem);
+    EXPECT_TRUE(done);
   }
 
   bool install(const FileLocation& package) {
@@ -74,17 +74,16 @@ TEST_F(FileFaultsTest, ADemotedAndTappedApplicationKeepsItsDataAndMetadata) {
   const Lines whole{"com.example.a 1.0"};
   const Lines demoted{"com.example.a 1.0 (placeholder)"};
   const Lines between{whole.front(), demoted.front()};
-  bool done = false;
   sweep(
       [&] {
-        done = device->demote(Id, nullptr);
+        const bool done = device->demote(Id, nullptr);
         device.reset();
         DeviceError problem;
         std::optional<Error> reason;
         EmbeddedDevice::tap(folder, Id, problem, &reason);
-        openAnew();
+        return done;
       },
-      [&] {
+      [&](bool done) {
         EXPECT_EQ(textAt(Notes), "mine");
         const Lines found = registry();
         EXPECT_TRUE(done ? found == demoted : found == whole || found == between);
@@ -100,19 +99,13 @@ TEST_F(FileFaultsTest, WaitingDataComesWithItsPackageInTheEnd) {
   ASSERT_TRUE(installRestorePlaceholder(Id));
   putFile(WaitingNotes, "from the backup");
   const FileLocation package = stage(archive("1.0"));
-  bool done = false;
-  sweep(
-      [&] {
-        done = install(package);
-        openAnew();
-      },
-      [&] {
-        EXPECT_EQ(done, version(Id) == "1.0");
-        EXPECT_TRUE(done || install(package));
-        EXPECT_EQ(textAt(Notes), "from the backup");
-        EXPECT_FALSE(device->files().fileExists(WaitingNotes));
-      });
-  EXPECT_TRUE(done);
+  sweep([&] { return install(package); },
+        [&](bool done) {
+          EXPECT_EQ(done, version(Id) == "1.0");
+          EXPECT_TRUE(done || install(package));
+          EXPECT_EQ(textAt(Notes), "from the backup");
+          EXPECT_FALSE(device->files().fileExists(WaitingNotes));
+        });
 }
 
 TEST_F(FileFaultsTest, WaitingDataAndWhatItReplacesAreNeverLostBetween) {
@@ -159,16 +152,10 @@ TEST_F(FileFaultsTest, DataThatIsOverwrittenIsTheOldOrTheNew) {
   const Snapshot after = {{"com.example.a", "folder 0755"},
                           {"com.example.a/kept", "folder 0755"},
                           {"com.example.a/kept/notes", "file 0644 given"}};
-  bool done = false;
-  sweep(
-      [&] {
-        done = device->overwriteData(Id, piecesOf(given), nullptr);
-        openAnew();
-      },
-      [&] {
-        EXPECT_EQ(fakes::snapshot(onDisk(Containers::DataDirectory)), done ? after : before);
-      });
-  EXPECT_TRUE(done);
+  sweep([&] { return device->overwriteData(Id, piecesOf(given), nullptr); },
+        [&](bool done) {
+          EXPECT_EQ(fakes::snapshot(onDisk(Containers::DataDirectory)), done ? after : before);
+        });
 }
 
 TEST_F(FileFaultsTest, AnUpdateLeavesTheOldVersionOrTheNewOneWhole) {
@@ -177,27 +164,21 @@ TEST_F(FileFaultsTest, AnUpdateLeavesTheOldVersionOrTheNewOneWhole) {
   ASSERT_TRUE(installPlaceholder(Id, "2.0"));
   const FileLocation package = stage(PackageArchive().addApplication(Id, "2.0"));
   const Snapshot old = containerOf(Id);
-  bool done = false;
-  sweep(
-      [&] {
-        done = install(package);
-        openAnew();
-      },
-      [&] {
-        EXPECT_EQ(textAt(Notes), "mine");
-        EXPECT_EQ(done, version(Id) == "2.0");
-        if (done) {
-          EXPECT_EQ(registry(), Lines{"com.example.a 2.0"});
-          EXPECT_EQ(textAt(*record(Id)->bundleContainerPath + "/HalvoMetadata.plist"),
-                    "metadata 1.0")
-              << "carried over";
-          EXPECT_EQ(textAt(*record(Id)->bundlePath + "/run.sh"), "#!/bin/sh\necho hello\n");
-        } else {
-          EXPECT_EQ(registry(), (Lines{"com.example.a 1.0", "com.example.a 2.0 (placeholder)"}));
-          EXPECT_TRUE(containerOf(Id) == old);
-        }
-      });
-  EXPECT_TRUE(done);
+  sweep([&] { return install(package); },
+        [&](bool done) {
+          EXPECT_EQ(textAt(Notes), "mine");
+          EXPECT_EQ(done, version(Id) == "2.0");
+          if (done) {
+            EXPECT_EQ(registry(), Lines{"com.example.a 2.0"});
+            EXPECT_EQ(textAt(*record(Id)->bundleContainerPath + "/HalvoMetadata.plist"),
+                      "metadata 1.0")
+                << "carried over";
+            EXPECT_EQ(textAt(*record(Id)->bundlePath + "/run.sh"), "#!/bin/sh\necho hello\n");
+          } else {
+            EXPECT_EQ(registry(), (Lines{"com.example.a 1.0", "com.example.a 2.0 (placeholder)"}));
+            EXPECT_TRUE(containerOf(Id) == old);
+          }
+        });
 }
 
 }  // namespace
