@@ -53,9 +53,18 @@ class InstallQueue : public ClientTest {
             "log default SyncBundle|Grabbing assertion for com.a",
             "HomeScreenService.createTerminationAssertion(com.a, 0)"};
   }
+  static Lines ended() {
+    return {"FileManager.removeItem(" + PackagePath + ")",
+            "log default SyncBundle|Finished install for com.a"};
+  }
   static Lines joined(Lines first, const Lines& second) {
     first.insert(first.end(), second.begin(), second.end());
     return first;
+  }
+  /// Compares the trace of one whole install but for how it begins and ends, which is always alike.
+  void expectInstall(const Lines& between) {
+    EXPECT_THAT(installTrace(),
+                testing::ElementsAreArray(joined(joined(begun(), between), ended())));
   }
 };
 

@@ -28,17 +28,12 @@ TEST(InstallPlan, DecidesByTheOutcomeAlone) {
 TEST_F(InstallQueue, InstallsUnderAnAssertionAndRemovesThePackage) {
   phone.appRegistry.seedPlaceholder("com.a");
   install(asset());
-  EXPECT_THAT(
-      installTrace(),
-      testing::ElementsAreArray(joined(
-          begun(),
-          {"log default SyncBundle|Assertion succeeded for com.a",
-           "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
-           InstallCall, "log default SyncBundle|com.a install succeeded",
-           "log default SyncBundle|Changing com.a from DOWNLOADED to INSTALLED",
-           "FileManager.writeAtomically(" + TodoListPath + ")",
-           "TerminationAssertion.release(com.a)", "FileManager.removeItem(" + PackagePath + ")",
-           "log default SyncBundle|Finished install for com.a"})));
+  expectInstall({"log default SyncBundle|Assertion succeeded for com.a",
+                 "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
+                 InstallCall, "log default SyncBundle|com.a install succeeded",
+                 "log default SyncBundle|Changing com.a from DOWNLOADED to INSTALLED",
+                 "FileManager.writeAtomically(" + TodoListPath + ")",
+                 "TerminationAssertion.release(com.a)"});
   EXPECT_EQ(todoOperation("com.a"), "INSTALLED");
   EXPECT_FALSE(phone.files.exists(PackagePath));
   EXPECT_THAT(phone.homeScreen.heldAssertions(), testing::IsEmpty());
@@ -47,16 +42,11 @@ TEST_F(InstallQueue, InstallsUnderAnAssertionAndRemovesThePackage) {
 TEST_F(InstallQueue, AssertionNotFoundInstallsAnyway) {
   phone.homeScreen.queueOutcomes("com.a", {AssertionOutcome::NotFound});
   install(asset());
-  EXPECT_THAT(installTrace(),
-              testing::ElementsAreArray(joined(
-                  begun(),
-                  {"log default SyncBundle|Assertion not found for com.a, installing anyway...",
-                   "transaction scenario \"Asset install\" step 0 ok com.a \"assertion not found\"",
-                   InstallCall, "log default SyncBundle|com.a install succeeded",
-                   "log default SyncBundle|Changing com.a from DOWNLOADED to INSTALLED",
-                   "FileManager.writeAtomically(" + TodoListPath + ")",
-                   "FileManager.removeItem(" + PackagePath + ")",
-                   "log default SyncBundle|Finished install for com.a"})));
+  expectInstall({"log default SyncBundle|Assertion not found for com.a, installing anyway...",
+                 "transaction scenario \"Asset install\" step 0 ok com.a \"assertion not found\"",
+                 InstallCall, "log default SyncBundle|com.a install succeeded",
+                 "log default SyncBundle|Changing com.a from DOWNLOADED to INSTALLED",
+                 "FileManager.writeAtomically(" + TodoListPath + ")"});
 }
 
 TEST_F(InstallQueue, AssertionDeniedRetriesAfterExactly30SecondsAndKeepsTheFile) {
@@ -126,20 +116,16 @@ TEST_F(InstallQueue, UnknownAssertionErrorFailsWithPosix22AndRemovesTheFile) {
   phone.homeScreen.queueOutcomes("com.a", {static_cast<AssertionOutcome>(3)});
   phone.homeScreen.setRefusalsCarryAssertion(true);
   install(asset());
-  EXPECT_THAT(
-      installTrace(),
-      testing::ElementsAreArray(joined(
-          begun(),
-          {"log error SyncBundle|Unknown error 3 getting assertion for com.a",
-           "transaction scenario \"Asset install\" step 0 failed com.a \"unknown error grabbing "
-           "assertion\"",
-           "log default SyncBundle|com.a install failed unrecoverably: Error Domain=POSIX Code=22",
-           "log default SyncBundle|Changing com.a from DOWNLOADED to FAILED",
-           "FileManager.writeAtomically(" + TodoListPath + ")",
-           "AppRegistry.uninstallApplication(com.a, {})",
-           "transaction scenario \"Aerix restore\" step 0 ok com.a \"placeholder removed\"",
-           "TerminationAssertion.release(com.a)", "FileManager.removeItem(" + PackagePath + ")",
-           "log default SyncBundle|Finished install for com.a"})));
+  expectInstall(
+      {"log error SyncBundle|Unknown error 3 getting assertion for com.a",
+       "transaction scenario \"Asset install\" step 0 failed com.a \"unknown error grabbing "
+       "assertion\"",
+       "log default SyncBundle|com.a install failed unrecoverably: Error Domain=POSIX Code=22",
+       "log default SyncBundle|Changing com.a from DOWNLOADED to FAILED",
+       "FileManager.writeAtomically(" + TodoListPath + ")",
+       "AppRegistry.uninstallApplication(com.a, {})",
+       "transaction scenario \"Aerix restore\" step 0 ok com.a \"placeholder removed\"",
+       "TerminationAssertion.release(com.a)"});
   EXPECT_EQ(client()._getAndResetNumAppInstallsAttempted(), 0u);
 }
 
@@ -147,19 +133,14 @@ TEST_F(InstallQueue, UnknownAssertionErrorThatTheHostWouldTryAgainKeepsTheTodoEn
   phone.appRegistry.seedPlaceholder("com.a");
   phone.homeScreen.queueOutcomes("com.a", {static_cast<AssertionOutcome>(3)});
   install(asset());
-  EXPECT_THAT(
-      installTrace(),
-      testing::ElementsAreArray(joined(
-          begun(),
-          {"log error SyncBundle|Unknown error 3 getting assertion for com.a",
-           "transaction scenario \"Asset install\" step 0 failed com.a \"unknown error grabbing "
-           "assertion\"",
-           "log default SyncBundle|com.a install failed but was recoverable: Error Domain=POSIX "
-           "Code=22",
-           "transaction scenario \"Aerix restore\" step 0 failed com.a \"install failed "
-           "recoverably\"",
-           "FileManager.removeItem(" + PackagePath + ")",
-           "log default SyncBundle|Finished install for com.a"})));
+  expectInstall(
+      {"log error SyncBundle|Unknown error 3 getting assertion for com.a",
+       "transaction scenario \"Asset install\" step 0 failed com.a \"unknown error grabbing "
+       "assertion\"",
+       "log default SyncBundle|com.a install failed but was recoverable: Error Domain=POSIX "
+       "Code=22",
+       "transaction scenario \"Aerix restore\" step 0 failed com.a \"install failed "
+       "recoverably\""});
   EXPECT_EQ(todoOperation("com.a"), "DOWNLOADED");
   EXPECT_TRUE(phone.appRegistry.placeholder("com.a"));
   EXPECT_FALSE(phone.files.exists(PackagePath));
@@ -195,21 +176,17 @@ TEST_F(InstallQueue, AnUpdateWithoutAPlaceholderThatFailsForGoodKeepsTheWorkingV
   phone.appRegistry.failInstall("com.a", Refused);
   install(asset());
   EXPECT_TRUE(phone.appRegistry.installed("com.a"));
-  EXPECT_THAT(
-      installTrace(),
-      testing::ElementsAreArray(joined(
-          begun(),
-          {"log default SyncBundle|Assertion succeeded for com.a",
-           "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
-           InstallCall,
-           "log default SyncBundle|com.a install failed unrecoverably: " + description(Refused),
-           "log default SyncBundle|Changing com.a from DOWNLOADED to FAILED",
-           "FileManager.writeAtomically(" + TodoListPath + ")",
-           "log error SyncBundle|Uninstall of com.a failed.",
-           "transaction scenario \"Aerix restore\" step 0 failed com.a \"failed to remove "
-           "placeholder\"",
-           "TerminationAssertion.release(com.a)", "FileManager.removeItem(" + PackagePath + ")",
-           "log default SyncBundle|Finished install for com.a"})));
+  expectInstall(
+      {"log default SyncBundle|Assertion succeeded for com.a",
+       "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
+       InstallCall,
+       "log default SyncBundle|com.a install failed unrecoverably: " + description(Refused),
+       "log default SyncBundle|Changing com.a from DOWNLOADED to FAILED",
+       "FileManager.writeAtomically(" + TodoListPath + ")",
+       "log error SyncBundle|Uninstall of com.a failed.",
+       "transaction scenario \"Aerix restore\" step 0 failed com.a \"failed to remove "
+       "placeholder\"",
+       "TerminationAssertion.release(com.a)"});
 }
 
 TEST_F(InstallQueue, RefusedPackageIsFailedForGoodAndItsPlaceholderRemoved) {
@@ -259,19 +236,14 @@ TEST_F(InstallQueue, FailedRestoreCountsAsRecoverableWhateverItsError) {
   const SyncAssetPtr made = asset();
   made->isRestore = true;
   install(made);
-  EXPECT_THAT(
-      installTrace(),
-      testing::ElementsAreArray(joined(
-          begun(),
-          {"log default SyncBundle|Assertion succeeded for com.a",
-           "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
-           InstallCall,
-           "log default SyncBundle|com.a install failed but was recoverable: " +
-               description(Refused),
-           "transaction scenario \"Aerix restore\" step 0 failed com.a \"install failed "
-           "recoverably\"",
-           "TerminationAssertion.release(com.a)", "FileManager.removeItem(" + PackagePath + ")",
-           "log default SyncBundle|Finished install for com.a"})));
+  expectInstall(
+      {"log default SyncBundle|Assertion succeeded for com.a",
+       "transaction scenario \"Asset install\" step 0 ok com.a \"assertion succeeded\"",
+       InstallCall,
+       "log default SyncBundle|com.a install failed but was recoverable: " + description(Refused),
+       "transaction scenario \"Aerix restore\" step 0 failed com.a \"install failed "
+       "recoverably\"",
+       "TerminationAssertion.release(com.a)"});
   EXPECT_EQ(todoOperation("com.a"), "DOWNLOADED");
   EXPECT_TRUE(phone.appRegistry.placeholder("com.a"));
 }
