@@ -152,13 +152,13 @@ TEST_F(TransferResults, AssetThatIsNoDownloadIsMarkedSentAndInstallsNothing) {
 TEST_F(TransferResults, RestoreWithBackupDataIsRememberedAndNotInstalled) {
   phone.backup.addRestoreData("com.a");
   phone.appRegistry.seedPlaceholder("com.a", InstallType::Restore);
+  const std::string progress = phone.appRegistry.progress("com.a")->description();
   succeed(restored("/var/mobile/Media/Downloads/a.zip"));
   EXPECT_EQ(phone.files.plistAt(RestoreStatePath),
             PropertyList(Dictionary{
                 {"com.a",
                  Dictionary{{"1.0", Dictionary{{"path", "/var/mobile/Media/Downloads/a.zip"}}}}}}));
   EXPECT_EQ(phone.appRegistry.progress("com.a")->installPhase(), InstallPhase::RestoringData);
-  const std::string progress = phone.appRegistry.progress("com.a")->description();
   settle();
   EXPECT_FALSE(phone.appRegistry.installed("com.a"));
   Lines trace = phone.trace.readable();
@@ -166,7 +166,7 @@ TEST_F(TransferResults, RestoreWithBackupDataIsRememberedAndNotInstalled) {
   EXPECT_THAT(trace, testing::ElementsAre(
                          "log default SyncBundle|transfer for asset com.a ended with success y "
                          "error (null) existingApp:0",
-                         testing::StartsWith("log error SyncBundle|Returning "),
+                         "log error SyncBundle|Returning " + progress + " progress for com.a",
                          "log default SyncBundle|asset transfer succeeded for com.a",
                          "AppRegistry.installPhaseFinished(com.a)",
                          "log default SyncBundle|Received file at "
