@@ -270,7 +270,8 @@ TEST_F(CoordinationObjectsTest, ARegistryThatCannotBeReadCostsNoWaitingDataAndTh
   SQLite::Database database((folder / "device.db").string(), SQLite::OPEN_READWRITE);
   database.exec("ALTER TABLE applications RENAME TO hidden");
   DeviceError problem;
-  EmbeddedDevice::cancel(folder, Id, problem, &error);
+  EXPECT_FALSE(EmbeddedDevice::cancel(folder, Id, problem, &error));
+  EXPECT_EQ(text().find("is not being installed"), std::string::npos) << text();
   EXPECT_EQ(textAt(data), "old");
   error.reset();
   EXPECT_FALSE(EmbeddedDevice::cancel(folder, "com.example.b", problem, &error));

@@ -1,6 +1,7 @@
 #include <SQLiteCpp/SQLiteCpp.h>
 
 #include "platform/bundle.h"
+#include "tests/device/device_parts.h"
 #include "tests/device/device_test.h"
 
 namespace appsync::device {
@@ -109,6 +110,25 @@ TEST_F(RegistryTest, IdentifiersThatAreNoFileNamesAreRefused) {
   EXPECT_TRUE(registry().empty());
   EXPECT_EQ(containerCount(), 0U);
   EXPECT_TRUE(installPackage(std::string(200, 'a')));
+}
+
+TEST_F(RegistryTest, WaitingDataIsForgottenOnlyWhenItIsKnownThatNothingIsLeftOfTheApplication) {
+  const std::string data = "/var/mobile/Media/HalvoRestore/Data/com.example.a/saved";
+  putFile(data, "old");
+  device.reset();
+  DeviceParts parts(folder);
+  const auto rename = [&](const std::string& from, const std::string& to) {
+    ASSERT_TRUE(
+        parts.database().change("", Database::Commit::Ordinary, [&](SQLite::Database& database) {
+          database.exec("ALTER TABLE " + from + " RENAME TO " + to);
+        }));
+  };
+  rename("applications", "hidden");
+  parts.registry().forgetWaitingData("com.example.a");
+  EXPECT_EQ(fakes::fileText(onDisk(data)), "old");
+  rename("hidden", "applications");
+  parts.registry().forgetWaitingData("com.example.a");
+  EXPECT_FALSE(std::filesystem::exists(onDisk(data)));
 }
 
 TEST_F(RegistryTest, AFolderCannotBeInstalledAsPackageNorAFileAsPlaceholder) {
