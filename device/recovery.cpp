@@ -8,13 +8,18 @@
 #include "device/apps/removal.h"
 #include "device/state/application_rows.h"
 #include "platform/existence.h"
+#include "platform/sync_files.h"
 
 namespace appsync::device {
 namespace {
 
 /// Where files are written piece by piece.
-constexpr std::string_view WrittenDirectories[] = {"/tmp", "/var/mobile/Library",
-                                                   "/var/mobile/Media"};
+constexpr std::string_view WrittenTrees[] = {"/tmp", "/var/mobile/Library", exchange::StagingRoot,
+                                             exchange::Downloads};
+/// The same, above what belongs to applications and people.
+constexpr std::string_view WrittenDirectories[] = {
+    "/var/mobile/Media", "/var/mobile/Media/HalvoRestore", exchange::WaitingData,
+    Containers::DataDirectory};
 
 void note(DeviceCore& core, std::string_view text) {
   core.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default, text);
@@ -107,13 +112,15 @@ void clearForeground(const Foreground& foreground, const std::set<std::string>& 
   }
 }
 
-/// Of an application's own data only what stands beside it is the device's; and what a package
-/// holds was written before its container was named.
+/// Of an application's own data only what stands beside it is the device's, also while it waits;
+/// and what a package holds was written before its container was named.
 void removeTemporaries(DeviceCore& core, const std::vector<ApplicationRow>& rows) {
-  for (const std::string_view directory : WrittenDirectories) {
-    core.handles.removeTemporaries(directory, Reach::AllBelow);
+  for (const std::string_view tree : WrittenTrees) {
+    core.handles.removeTemporaries(tree, Reach::AllBelow);
   }
-  core.handles.removeTemporaries(Containers::DataDirectory, Reach::Here);
+  for (const std::string_view directory : WrittenDirectories) {
+    core.handles.removeTemporaries(directory, Reach::Here);
+  }
   for (const ApplicationRow& row : rows) {
     core.handles.removeTemporaries(row.container, Reach::Here);
     // A package may have brought such a name; in the bundles of placeholders the device writes.

@@ -50,7 +50,7 @@ TEST_F(RecoveryTest, AFileThatWasBeingReceivedIsRemoved) {
   EXPECT_TRUE(std::filesystem::is_empty(staging));
 }
 
-TEST_F(RecoveryTest, TemporariesOfTheDeviceInContainersGoAndThoseOfApplicationsStay) {
+TEST_F(RecoveryTest, TemporariesOfTheDeviceGoAndThoseOfApplicationsStay) {
   ASSERT_TRUE(installPackage(Id));
   ASSERT_TRUE(installRestorePlaceholder("com.example.waiting"));
   const std::string waiting = *record("com.example.waiting", true)->bundlePath;
@@ -58,8 +58,19 @@ TEST_F(RecoveryTest, TemporariesOfTheDeviceInContainersGoAndThoseOfApplicationsS
   const std::string data = "/var/mobile/Containers/Data";
   const auto [container, bundle] =
       std::pair(*record(Id)->bundleContainerPath, *record(Id)->bundlePath);
-  const Lines swept = {container + left, waiting + left, data + left + "/half"};
-  const Lines kept = {bundle + left, bundle + "/inner" + left, data + "/com.example.a" + left};
+  const std::string media = "/var/mobile/Media";
+  const std::string restored = media + "/HalvoRestore/Data";
+  const Lines swept = {container + left,
+                       waiting + left,
+                       data + left + "/half",
+                       media + left,
+                       media + "/Downloads" + left,
+                       media + "/PublicStaging/ApplicationSync/com.example.b" + left,
+                       media + "/HalvoRestore" + left,
+                       restored + left + "/half"};
+  const Lines kept = {bundle + left, bundle + "/inner" + left, data + "/com.example.a" + left,
+                      restored + "/com.example.waiting" + left,
+                      restored + "/com.example.waiting/inner" + left};
   for (const std::string& path : swept) putFile(path, "half");
   for (const std::string& path : kept) putFile(path, "whole");
   reopen();
