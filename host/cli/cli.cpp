@@ -7,6 +7,7 @@
 #include <CLI/CLI.hpp>
 #include <algorithm>
 #include <cerrno>
+#include <sstream>
 #include <string_view>
 #include <system_error>
 
@@ -185,8 +186,11 @@ int runCommandLine(int argc, char** argv) {
   addHelpCommand(app, chosen);
   try {
     app.parse(argc, argv);
-  } catch (const CLI::Success& help) {
-    return app.exit(help);
+  } catch (const CLI::Success& asked) {
+    std::ostringstream help;
+    app.exit(asked, help, help);
+    context.out.write(help.str());
+    return static_cast<int>(withOutputChecked(ExitCode::Done, context));
   } catch (const CLI::ParseError& error) {
     context.json = asksForJson(argc, argv);
     context.tellError(usageMessage(app, error));

@@ -165,12 +165,12 @@ class Usage(support.Case):
 
     def test_output_that_cannot_be_written(self):
         self.init()
-        with open("/dev/full", "w") as full:
-            process = subprocess.run([support.APPSYNC, "policy"], stdout=full,
-                                             stderr=subprocess.PIPE, text=True,
-                                             env=self.environment)
-        self.assertEqual(process.returncode, 1)
-        self.assertIn("cannot write to standard output", process.stderr)
+        for arguments in (["policy"], ["--help"], ["help"], ["sync", "--help"], ["--version"]):
+            with open("/dev/full", "w") as full:
+                process = subprocess.run([support.APPSYNC, *arguments], stdout=full,
+                                         stderr=subprocess.PIPE, text=True, env=self.environment)
+            self.assertEqual(process.returncode, 1, arguments)
+            self.assertIn("cannot write to standard output", process.stderr)
 
 
 class ClosedDescriptors(support.Case):
