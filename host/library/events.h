@@ -90,6 +90,7 @@ inline constexpr int InstallRetrySeconds = 30;
 struct InstallEnded {
   std::string identifier;
   std::optional<std::string> failure;  ///< reason
+  std::string file{};                  ///< name of the package's file; empty when it is not known
 };
 
 /// One of the client's log lines.

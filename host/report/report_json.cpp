@@ -88,7 +88,10 @@ Json jsonOf(const InstallWaiting& event) {
 }
 
 Json jsonOf(const InstallEnded& event) {
-  return withFailure({{"event", "install-ended"}, {"identifier", event.identifier}}, event.failure);
+  Json object =
+      withFailure({{"event", "install-ended"}, {"identifier", event.identifier}}, event.failure);
+  if (event.failure && !event.file.empty()) object["file"] = event.file;
+  return object;
 }
 
 Json jsonOf(const ClientLogLine& event) {

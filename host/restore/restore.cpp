@@ -37,6 +37,9 @@ Restore::Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Repo
       watch_(phone_, reporter, interruption) {}
 
 SyncResult Restore::run(const RestoreInput& input) {
+  for (const auto* library : {&input.packages, &input.catalogue}) {
+    if (*library) watch_.nameFilesOf(**library);
+  }
   handover_ =
       handOver(phone_, input.backup, input.list, input.overwriteData, reporter_, interruption_);
   host_.transfers().forgetCancelled();

@@ -69,6 +69,7 @@ Session::Session(SyncClient& client, HostProcess& host, Phone phone, Reporter& r
 
 SyncResult Session::run(const SyncInput& input) {
   PackageSender sender(client_, host_.transfers(), phone_, reporter_, interruption_, input.library);
+  watch_.nameFilesOf(input.library);
   // What the client hears late, of a killed sync or of a person's cancel, must not reach this sync.
   waitUntilIdle(phone_, identifiersOf(input.plan));
   host_.transfers().forgetCancelled();

@@ -24,15 +24,23 @@ void InstallWatch::assertionDenied(std::string_view bundleId) noexcept {
 
 void InstallWatch::installFinished(std::string_view bundleId,
                                    const std::optional<Error>& error) noexcept {
-  const std::string identifier(bundleId);
-  std::optional<std::string> reason;
-  if (error) reason = oneLine(error->localizedDescription());
+  InstallEnded ended{std::string(bundleId), std::nullopt};
+  if (error) ended.failure = oneLine(error->localizedDescription());
   {
     const std::lock_guard lock(mutex_);
-    if (reason) failures_[identifier] = *reason;
-    if (!reason) installed_.insert(identifier);
+    if (ended.failure) failures_[ended.identifier] = *ended.failure;
+    if (!ended.failure) installed_.insert(ended.identifier);
+    const auto file = files_.find(ended.identifier);
+    if (file != files_.end()) ended.file = file->second;
   }
-  reporter_.report(InstallEnded{identifier, std::move(reason)});
+  reporter_.report(ended);
+}
+
+void InstallWatch::nameFilesOf(const Library& library) {
+  const std::lock_guard lock(mutex_);
+  for (const auto& [identifier, package] : library.packages) {
+    files_.emplace(identifier, package.file.filename().string());
+  }
 }
 
 void InstallWatch::tellInstalled(const std::set<std::string>& identifiers) {

@@ -25,6 +25,8 @@ class InstallWatch : public device::DeviceWatcher {
   void assertionDenied(std::string_view bundleId) noexcept override;
   void installFinished(std::string_view bundleId,
                        const std::optional<Error>& error) noexcept override;
+  /// Failed installs are told with the files of these packages from now on.
+  void nameFilesOf(const Library& library);
   /// Tells of installs that were over before it watched.
   void tellInstalled(const std::set<std::string>& identifiers);
   /// Reason by identifier.
@@ -37,6 +39,7 @@ class InstallWatch : public device::DeviceWatcher {
   mutable std::mutex mutex_;
   std::map<std::string, std::string> failures_;
   std::set<std::string> installed_;
+  std::map<std::string, std::string> files_;  // by identifier
 };
 
 }  // namespace appsync::host

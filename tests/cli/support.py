@@ -103,6 +103,8 @@ class Case(unittest.TestCase):
             allowed = {"event", *expected}
             if event.get("success") is False:
                 allowed.add("reason")
+                if event["event"] == "install-ended":
+                    allowed.add("file")
             self.assertEqual(set(event), allowed, event)
         self.assertEqual([event["event"] for event in events].count("summary"), 1)
         self.assertEqual(events[-1]["event"], "summary")

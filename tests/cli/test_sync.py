@@ -214,6 +214,9 @@ class OddPackages(support.Case):
         summary = self.sync(code=1)
         self.assertEqual(summary["installed"], ["com.good"])
         self.assertEqual(list(reasons(summary["failed"])), ["com.bad"])
+        self.assertEqual([event["file"] for event in self.events
+                          if event["event"] == "install-ended" and not event["success"]],
+                         ["com.bad.zip"])
         self.assertEqual(self.apps(), {"com.good": "1.0"})
 
         self.offer("com.bad", "1.1")

@@ -77,7 +77,8 @@ TEST_F(Reporting, GivesOneJsonObjectPerEvent) {
   EXPECT_THAT(
       json({PackageProblem{"x.zip", true, "bad"}, Paint, PlaceholderSwept{"a"}, DeletedOnPhone{"a"},
             TransferProgress{"a", "A", 5, 10}, TransferEnded{"a", "A", {}},
-            TransferEnded{"a", "A", "gone"}, InstallEnded{"a", {}}, InstallEnded{"a", "damaged"},
+            TransferEnded{"a", "A", "gone"}, InstallEnded{"a", {}, "a.zip"},
+            InstallEnded{"a", "damaged"}, InstallEnded{"a", "damaged", "a.zip"},
             ClientLogLine{LogChannel::TWLogCategorySyncBundle, LogLevel::Error, "oh"},
             Interrupted{}, SyncBroken{"why"}}),
       ElementsAre(
@@ -90,6 +91,7 @@ TEST_F(Reporting, GivesOneJsonObjectPerEvent) {
           R"({"event":"transfer-ended","identifier":"a","success":false,"reason":"gone"})",
           R"({"event":"install-ended","identifier":"a","success":true})",
           R"({"event":"install-ended","identifier":"a","success":false,"reason":"damaged"})",
+          R"({"event":"install-ended","identifier":"a","success":false,"reason":"damaged","file":"a.zip"})",
           R"({"event":"log","channel":"TWLogCategorySyncBundle","level":"error","text":"oh"})",
           R"({"event":"interrupted"})", R"({"event":"error","message":"why"})"));
 }
