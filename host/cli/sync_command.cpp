@@ -11,6 +11,7 @@
 #include "host/phone/installed_applications.h"
 #include "host/phone/plugin_loader.h"
 #include "host/sync/session.h"
+#include "host/transfer/staging.h"
 
 namespace appsync::host {
 namespace {
@@ -126,7 +127,11 @@ ExitCode runClear(bool withData, CommandContext& context) {
   const auto plugin = loadPlugin(context);
   const Interruption interruption;
   PluginSession loaded(*plugin, QueryToolBundleIdentifier, *device, interruption, nullptr);
+  const Phone phone = phoneOf(*device);
+  const std::set<std::string> sent = everSent(phone);
   loaded.client().clearSyncData();
+  waitUntilIdle(phone, sent);
+  removeLeftOverPackages(phone, sent);
   if (context.json || !context.quiet) {
     context.tell({{"event", "cleared"}}, "Cleared all sync data and took every placeholder away.");
   }

@@ -43,7 +43,7 @@ SyncResult Restore::run(const RestoreInput& input) {
   handover_ =
       handOver(phone_, input.backup, input.list, input.overwriteData, reporter_, interruption_);
   host_.transfers().forgetCancelled();
-  removeLeftOverPackages(phone_);
+  removeLeftOverPackages(phone_, everSent(phone_));
   failures_ = handover_.failures;
   const bool given = !handover_.broken || broken(*handover_.broken, std::nullopt);
   if (given && input.overwriteData) overwriteData(input);

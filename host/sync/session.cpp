@@ -74,7 +74,7 @@ SyncResult Session::run(const SyncInput& input) {
   waitUntilIdle(phone_, identifiersOf(input.plan));
   host_.transfers().forgetCancelled();
   const bool swept = sweepPlaceholders();
-  removeLeftOverPackages(phone_);
+  removeLeftOverPackages(phone_, everSent(phone_));
   SyncResult result;
   SyncInput rest = input;
   std::erase_if(rest.plan.entries, [&](const PlannedEntry& entry) {

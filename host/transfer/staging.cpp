@@ -97,24 +97,6 @@ std::optional<std::string> packagedApplication(const std::string& name) {
                                                            : std::optional(identifier);
 }
 
-/// The applications whose packages a sync or restore may have sent. What is named like a package of
-/// any other is somebody's own file.
-std::set<std::string> everSent(const Phone& phone, const PropertyList::Dictionary& restoreState) {
-  std::set<std::string> identifiers;
-  for (const auto& application : restoreState) identifiers.insert(application.first);
-  for (const std::string_view directory :
-       {std::string_view(exchange::WorkArea), std::string_view(exchange::StagingArea)}) {
-    const auto todo = readTodoList(phone.files, directory);
-    if (!todo) continue;
-    for (const TodoState& entry : *todo) identifiers.insert(entry.identifier);
-  }
-  const auto present = applicationsPresent(phone.apps, nullptr);
-  if (!present) return identifiers;  // what is left over waits for the next sync
-  identifiers.insert(present->installed.begin(), present->installed.end());
-  for (const auto& placeholder : present->placeholders) identifiers.insert(placeholder.first);
-  return identifiers;
-}
-
 /// Taken to be so when that cannot be told.
 bool isBeingInstalled(const Phone& phone, const std::string& identifier) {
   if (!phone.coordination) return false;
@@ -147,11 +129,29 @@ std::string stagedPackageName(const LibraryPackage& package) {
   return package.identifier + std::string(ending.empty() ? PlainEnding : ending);
 }
 
-void removeLeftOverPackages(const Phone& phone) {
+std::set<std::string> everSent(const Phone& phone) {
+  std::set<std::string> identifiers;
+  const auto restoreState = readDictionary(phone.files, exchange::RestoreState, nullptr);
+  if (restoreState) {
+    for (const auto& application : *restoreState) identifiers.insert(application.first);
+  }
+  for (const std::string_view directory :
+       {std::string_view(exchange::WorkArea), std::string_view(exchange::StagingArea)}) {
+    const auto todo = readTodoList(phone.files, directory);
+    if (!todo) continue;
+    for (const TodoState& entry : *todo) identifiers.insert(entry.identifier);
+  }
+  const auto present = applicationsPresent(phone.apps, nullptr);
+  if (!present) return identifiers;  // what is left over waits for the next sync
+  identifiers.insert(present->installed.begin(), present->installed.end());
+  for (const auto& placeholder : present->placeholders) identifiers.insert(placeholder.first);
+  return identifiers;
+}
+
+void removeLeftOverPackages(const Phone& phone, const std::set<std::string>& sent) {
   const auto restoreState = readDictionary(phone.files, exchange::RestoreState, nullptr);
   if (!restoreState) return;
   const std::set<std::string> remembered = rememberedPackages(*restoreState);
-  const std::set<std::string> sent = everSent(phone, *restoreState);
   for (const std::string_view directory : {exchange::StagingRoot, exchange::Downloads}) {
     const auto names = phone.namesIn(directory, nullptr);
     if (!names) continue;

@@ -1,6 +1,8 @@
 #pragma once
 
 #include <optional>
+#include <set>
+#include <string>
 
 #include "host/library/library.h"
 #include "host/library/sync_plan.h"
@@ -17,9 +19,13 @@ bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
 /// The name under which a package is sent: the identifier and the ending of the library's file.
 std::string stagedPackageName(const LibraryPackage& package);
 
-/// Removes packages that broken-off syncs and restores left where packages arrive: only those of
-/// applications that the phone, a todo list or the restore state names, and none that the restore
-/// state remembers or that an install coordinator may still want. Other files are a person's own.
-void removeLeftOverPackages(const Phone& phone);
+/// The applications whose packages a sync or restore may have sent: those that the phone, a todo
+/// list or the restore state names. What is named like a package of any other is somebody's own
+/// file.
+std::set<std::string> everSent(const Phone& phone);
+
+/// Removes packages of these applications that broken-off syncs and restores left where packages
+/// arrive, but none that the restore state remembers or that an install coordinator may still want.
+void removeLeftOverPackages(const Phone& phone, const std::set<std::string>& sent);
 
 }  // namespace appsync::host

@@ -184,6 +184,20 @@ class Sync(support.Case):
         self.offer("com.b")
         self.assertEqual(self.sync()["installed"], ["com.b"])
 
+    def test_clear_takes_sent_packages_along(self):
+        library = self.phone / "root/var/mobile/Library/ApplicationSync/HalvoStuff"
+        media = self.phone / "root/var/mobile/Media"
+        for folder in (library, media / "PublicStaging", media / "Downloads"):
+            folder.mkdir(parents=True, exist_ok=True)
+        (library / "ApplicationsSync.plist").write_bytes(
+            plistlib.dumps([{"identifier": "com.sent", "operation": "DOWNLOADED"}]))
+        for folder in ("PublicStaging", "Downloads"):
+            (media / folder / "com.sent.zip").write_text("sent")
+            (media / folder / "holiday.zip").write_text("a person's own")
+        self.run_appsync("clear")
+        self.assertEqual(sorted(str(path.relative_to(media)) for path in media.rglob("*.zip")),
+                         ["Downloads/holiday.zip", "PublicStaging/holiday.zip"])
+
     def test_an_account_other_than_root_may_sync(self):
         if os.getuid() != 0:
             self.skipTest("only root can become somebody else")
