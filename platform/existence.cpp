@@ -2,6 +2,8 @@
 
 #include <cerrno>
 
+#include "platform/bundle.h"
+
 namespace appsync {
 
 bool isMissing(const std::optional<Error>& reason) {
@@ -24,6 +26,14 @@ bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>
   if (contents || isMissing(reason)) return true;
   setError(error, reason.value_or(Error::posix(EIO, path)));
   return false;
+}
+
+std::optional<bool> isExecutableThere(FileManager& files, std::string_view bundlePath,
+                                      std::optional<Error>* error) {
+  const auto info = loadDictionary(files, joinPath(bundlePath, "Info.plist"), error);
+  if (!info) return std::nullopt;
+  const std::string* name = findString(*info, KBBundleExecutable);
+  return name ? isThere(files, joinPath(bundlePath, *name), error) : true;
 }
 
 }  // namespace appsync

@@ -21,4 +21,9 @@ std::optional<bool> isThere(FileManager& files, std::string_view path, std::opti
 bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>& contents,
                  std::optional<Error>* error);
 
+/// Whether the executable that a bundle's information names is in it; true when it names none.
+/// nullopt (with a reason) when that cannot be told.
+std::optional<bool> isExecutableThere(FileManager& files, std::string_view bundlePath,
+                                      std::optional<Error>* error);
+
 }  // namespace appsync

@@ -4,20 +4,14 @@
 
 #include "device/apps/idle_application.h"
 #include "device/state/application_rows.h"
-#include "platform/bundle.h"
 #include "platform/existence.h"
 
 namespace appsync::device {
 namespace {
 
-/// An application whose information names no executable needs none.
 std::optional<Error> objectionToExecutable(FileManager& files, const ApplicationRow& row) {
   std::optional<Error> error;
-  const auto info = loadDictionary(files, joinPath(row.bundlePath(), "Info.plist"), &error);
-  if (!info) return error;
-  const std::string* name = findString(*info, KBBundleExecutable);
-  if (!name) return std::nullopt;
-  const std::optional<bool> there = isThere(files, joinPath(row.bundlePath(), *name), &error);
+  const std::optional<bool> there = isExecutableThere(files, row.bundlePath(), &error);
   if (!there) return error;
   if (*there) return std::nullopt;
   return objection(ENOENT, row.identifier,

@@ -19,6 +19,9 @@ constexpr std::string_view RemovingForbidden =
 constexpr std::string_view BelongsToSystem = "it is a system application";
 constexpr std::string_view WaitsUnmirrored =
     "not removed: it waits as a placeholder (--remove takes it away with its data)";
+constexpr const char* Installed = " is installed";
+constexpr const char* InstalledInPart =
+    " is installed without its executable, and the library has only an older one";
 
 std::string versionText(std::string_view version) {
   return version.empty() ? std::string("a version without number")
@@ -137,8 +140,11 @@ class Planner {
       action = std::is_gt(order)   ? Action::Update
                : std::is_lt(order) ? Action::Downgrade
                                    : Action::Reinstall;
-      if (std::is_lteq(order) && !named) {
-        return skip(package.identifier, versionText(current) + " is installed", true);
+      const bool mends = application->isDamaged && std::is_eq(order);
+      if (std::is_lteq(order) && !named && !mends) {
+        return skip(package.identifier,
+                    versionText(current) + (application->isDamaged ? InstalledInPart : Installed),
+                    !application->isDamaged);
       }
     }
     if (!options_.installingAllowed) {

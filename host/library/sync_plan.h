@@ -59,6 +59,7 @@ struct InstalledApplication {
   bool isPlaceholder = false;  ///< no version of it is installed yet
   bool isDemoted = false;      ///< and is to stay so until somebody asks for it
   bool waits = false;          ///< for a package that the client does not ask the host for
+  bool isDamaged = false;      ///< its executable is gone
 };
 
 struct PlanOptions {

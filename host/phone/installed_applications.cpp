@@ -25,6 +25,12 @@ class ClientsWishes {
   std::set<std::string, std::less<>> owedByStore_;
 };
 
+/// Only what is known to be gone counts.
+bool isDamaged(FileManager& files, const AppRecord& record) {
+  return !record.isPlaceholder && record.applicationType == ApplicationTypeUser &&
+         record.bundlePath && isExecutableThere(files, *record.bundlePath, nullptr) == false;
+}
+
 }  // namespace
 
 bool isLeftOver(const Phone& phone, const AppRecord& placeholder) {
@@ -54,7 +60,8 @@ std::optional<std::vector<InstalledApplication>> installedApplications(const Pho
                      record.applicationType == ApplicationTypeSystem,
                      record.isPlaceholder,
                      record.isPlaceholder && demotions.holdBack(record),
-                     application.waits};
+                     application.waits,
+                     isDamaged(phone.files, record)};
     }
     if (record.isPlaceholder) application.waits = wishes.leaveOut(record);
   };

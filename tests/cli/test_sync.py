@@ -214,6 +214,34 @@ class Sync(support.Case):
         self.assertIn("1 installed", out)
 
 
+class Mending(support.Case):
+    """What is on the phone, and yet is not as it should be, with and without coordinators."""
+
+    def root(self):
+        return self.phone / "root"
+
+    def check_lost_executable(self, *options):
+        self.init(*options)
+        self.offer("com.a")
+        self.offer("com.b")
+        self.sync()
+        path = next(app["path"] for app in self.json_lines("apps") if app["identifier"] == "com.a")
+        (self.root() / path.lstrip("/") / "run").unlink()
+        self.run_appsync("launch", "com.a", code=1)
+        out, _ = self.run_appsync("sync", self.library, "--dry-run")
+        self.assertEqual(out, "reinstall  A 1.0 (com.a)\n")
+        summary = self.sync()
+        self.assertEqual(summary["updated"], ["com.a"])
+        self.assertEqual([entry["identifier"] for entry in summary["skipped"]], ["com.b"])
+        self.run_appsync("launch", "com.a")
+
+    def test_an_application_without_its_executable_is_installed_anew(self):
+        self.check_lost_executable()
+
+    def test_an_application_without_its_executable_is_installed_anew_where_coordinated(self):
+        self.check_lost_executable("--coordination", "on")
+
+
 class OddPackages(support.Case):
     def setUp(self):
         super().setUp()

@@ -3,6 +3,7 @@
 
 #include <cerrno>
 
+#include "platform/bundle.h"
 #include "tests/host/restore_fixture.h"
 
 namespace appsync::host {
@@ -18,11 +19,12 @@ class InstalledApplicationsTest : public RestoreTest {
     const auto all = installedApplications(phoneForHost(), problem);
     if (!all) return {problem};
     for (const auto& application : *all) {
-      lines.push_back(application.identifier + " " + application.version +
-                      (application.isSystem ? " system" : "") +
-                      (application.isPlaceholder ? " placeholder" : "") +
-                      (application.isDemoted ? " demoted" : "") +
-                      (application.waits ? " waits" : ""));
+      lines.push_back(
+          application.identifier + " " + application.version +
+          (application.isSystem ? " system" : "") +
+          (application.isPlaceholder ? " placeholder" : "") +
+          (application.isDemoted ? " demoted" : "") + (application.waits ? " waits" : "") +
+          (application.isDamaged ? " damaged" : ""));
     }
     return lines;
   }
@@ -67,6 +69,20 @@ TEST_F(InstalledApplicationsTest, TheClientAsksForWhatIsNotTheStoresWithCoordina
   phone.appRegistry.seedPlaceholder(tapped);
   EXPECT_THAT(found(), ElementsAre("com.a 1.0 placeholder", "com.b 1.0 placeholder demoted",
                                    "com.c 1.0 placeholder waits", "com.d 1.0 placeholder waits"));
+}
+
+TEST_F(InstalledApplicationsTest, AreDamagedWhenTheirExecutablesAreKnownToBeGone) {
+  for (const std::string identifier : {"com.gone", "com.there", "com.unseen"}) {
+    phone.appRegistry.seedInstalled(identifier);
+    const auto bundle = *phone.appRegistry.recordForIdentifier(identifier, false)->bundlePath;
+    phone.files.putPlist(bundle + "/Info.plist",
+                         PropertyList::Dictionary{{std::string(KBBundleExecutable), "run"}});
+    if (identifier == "com.there") phone.files.putFile(bundle + "/run", "");
+    if (identifier == "com.unseen") {
+      phone.faults.failWhere("FileManager.attributesOfItem", bundle + "/run", Error::posix(EMFILE));
+    }
+  }
+  EXPECT_THAT(found(), ElementsAre("com.gone 1.0 damaged", "com.there 1.0", "com.unseen 1.0"));
 }
 
 TEST_F(InstalledApplicationsTest, AreNotToldWhenItCannotBeSeenWhatIsDemoted) {

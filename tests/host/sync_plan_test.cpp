@@ -77,6 +77,18 @@ TEST_F(Planning, TakesOnlyWhatIsNamedAlsoAnewAndBackwards) {
   EXPECT_THAT(skipped, IsEmpty());
 }
 
+TEST_F(Planning, MendsWhatLostItsExecutableWithAPackageThatIsNotOlder) {
+  offer("com.older", "1.0");
+  offer("com.same", "2.0");
+  have("com.older", "1.1");
+  have("com.same", "2.0");
+  for (InstalledApplication& application : installed) application.isDamaged = true;
+  plan();
+  EXPECT_THAT(entries, ElementsAre("reinstall com.same 2.0 over 2.0"));
+  EXPECT_THAT(skipped, ElementsAre("com.older: version 1.1 is installed without its executable, "
+                                   "and the library has only an older one"));
+}
+
 TEST_F(Planning, RefusesAnIdentifierWithoutPackage) {
   options.install = {"com.unknown"};
   plan();
