@@ -71,7 +71,13 @@ class Planner {
     if (options_.mirror) mirror();
     for (const auto& [identifier, package] : library_.packages) {
       if (unwanted_.count(identifier) > 0) continue;
-      if (wanted_.empty() || wanted_.count(identifier) > 0) install(package);
+      const bool named = wanted_.count(identifier) > 0;
+      if (!named && isUntold(package)) {
+        plan_.entries.push_back(
+            {Action::Install, identifier, package.version, {}, package.name, false, false});
+      } else if (named || wanted_.empty()) {
+        install(package);
+      }
     }
     return std::move(plan_);
   }
@@ -121,6 +127,13 @@ class Planner {
                                      printable(unread->file)));
       }
     }
+  }
+
+  /// Whether all that is left to do for an install is to tell of it.
+  bool isUntold(const LibraryPackage& package) const {
+    const InstalledApplication* application = find(package.identifier);
+    return application && application->isUntold && !application->isDamaged &&
+           !package.version.empty() && application->version == package.version;
   }
 
   void install(const LibraryPackage& package) {

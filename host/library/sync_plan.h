@@ -60,6 +60,7 @@ struct InstalledApplication {
   bool isDemoted = false;      ///< and is to stay so until somebody asks for it
   bool waits = false;          ///< for a package that the client does not ask the host for
   bool isDamaged = false;      ///< its executable is gone
+  bool isUntold = false;       ///< a sync installed it and was broken off before it told so
 };
 
 struct PlanOptions {

@@ -25,6 +25,16 @@ class ClientsWishes {
   std::set<std::string, std::less<>> owedByStore_;
 };
 
+/// Those whose packages have come, with no word of their installs.
+std::set<std::string> withoutWord(FileManager& files) {
+  std::set<std::string> identifiers;
+  const auto todo = readTodoList(files, exchange::WorkArea);
+  for (const TodoState& entry : todo.value_or(std::vector<TodoState>{})) {
+    if (entry.operation == exchange::TodoDownloaded) identifiers.insert(entry.identifier);
+  }
+  return identifiers;
+}
+
 /// Only what is known to be gone counts.
 bool isDamaged(FileManager& files, const AppRecord& record) {
   return !record.isPlaceholder && record.applicationType == ApplicationTypeUser &&
@@ -48,6 +58,7 @@ std::optional<std::vector<InstalledApplication>> installedApplications(const Pho
     return std::nullopt;
   }
   const ClientsWishes wishes(phone);
+  const std::set<std::string> untold = withoutWord(phone.files);
   std::map<std::string, InstalledApplication> found;
   const auto take = [&](const AppRecord& record, bool&) {
     if (!record.isApplication || (record.isPlaceholder && isLeftOver(phone, record))) return;
@@ -61,7 +72,8 @@ std::optional<std::vector<InstalledApplication>> installedApplications(const Pho
                      record.isPlaceholder,
                      record.isPlaceholder && demotions.holdBack(record),
                      application.waits,
-                     isDamaged(phone.files, record)};
+                     isDamaged(phone.files, record),
+                     !record.isPlaceholder && untold.contains(record.applicationIdentifier)};
     }
     if (record.isPlaceholder) application.waits = wishes.leaveOut(record);
   };

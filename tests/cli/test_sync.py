@@ -241,6 +241,31 @@ class Mending(support.Case):
     def test_an_application_without_its_executable_is_installed_anew_where_coordinated(self):
         self.check_lost_executable("--coordination", "on")
 
+    def check_untold_install(self, *options):
+        self.init(*options)
+        self.offer("com.a")
+        self.offer("com.b")
+        self.sync()
+        # As a kill leaves it between the install and the word of it.
+        list_file = self.root() / "var/mobile/Library/ApplicationSync/HalvoStuff/ApplicationsSync.plist"
+        todo = plistlib.loads(list_file.read_bytes())
+        for entry in todo:
+            if entry["identifier"] == "com.a":
+                entry["operation"] = "DOWNLOADED"
+        list_file.write_bytes(plistlib.dumps(todo))
+        out, _ = self.run_appsync("sync", self.library, "--dry-run")
+        self.assertEqual(out, "install    A 1.0 (com.a)\n")
+        out, _ = self.run_appsync("sync", self.library)
+        self.assertEqual(out, "installed  A 1.0 (com.a)\n"
+                              "done       1 installed, 1 up to date\n")
+        self.assertEqual(self.sync()["installed"], [])
+
+    def test_an_install_that_a_kill_left_untold_is_told_once(self):
+        self.check_untold_install()
+
+    def test_an_install_that_a_kill_left_untold_is_told_once_where_coordinated(self):
+        self.check_untold_install("--coordination", "on")
+
 
 class OddPackages(support.Case):
     def setUp(self):

@@ -24,7 +24,7 @@ class InstalledApplicationsTest : public RestoreTest {
           (application.isSystem ? " system" : "") +
           (application.isPlaceholder ? " placeholder" : "") +
           (application.isDemoted ? " demoted" : "") + (application.waits ? " waits" : "") +
-          (application.isDamaged ? " damaged" : ""));
+          (application.isDamaged ? " damaged" : "") + (application.isUntold ? " untold" : ""));
     }
     return lines;
   }
@@ -83,6 +83,14 @@ TEST_F(InstalledApplicationsTest, AreDamagedWhenTheirExecutablesAreKnownToBeGone
     }
   }
   EXPECT_THAT(found(), ElementsAre("com.gone 1.0 damaged", "com.there 1.0", "com.unseen 1.0"));
+}
+
+TEST_F(InstalledApplicationsTest, AreUntoldWhenTheTodoListKnowsOnlyOfTheirPackages) {
+  phone.appRegistry.seedInstalled("com.a");
+  phone.appRegistry.seedInstalled("com.b");
+  seedRestoring("com.c");
+  putTodo({{"com.a", "DOWNLOADED"}, {"com.b", "INSTALLED"}, {"com.c", "DOWNLOADED"}});
+  EXPECT_THAT(found(), ElementsAre("com.a 1.0 untold", "com.b 1.0", "com.c 1.0 placeholder waits"));
 }
 
 TEST_F(InstalledApplicationsTest, AreNotToldWhenItCannotBeSeenWhatIsDemoted) {

@@ -89,6 +89,23 @@ TEST_F(Planning, MendsWhatLostItsExecutableWithAPackageThatIsNotOlder) {
                                    "and the library has only an older one"));
 }
 
+TEST_F(Planning, TellsOfAnInstallThatNobodyToldOfWhateverIsNamed) {
+  offer("com.other", "1.0");
+  offer("com.untold", "2.0");
+  have("com.untold", "2.0");
+  installed.back().isUntold = true;
+  options.install = {"com.other"};
+  plan();
+  EXPECT_THAT(entries, ElementsAre("install com.other 1.0", "install com.untold 2.0"));
+  options.install = {"com.untold"};
+  plan();
+  EXPECT_THAT(entries, ElementsAre("reinstall com.untold 2.0 over 2.0"));
+  options.install = {};
+  installed.back().isDamaged = true;
+  plan();
+  EXPECT_THAT(entries, ElementsAre("install com.other 1.0", "reinstall com.untold 2.0 over 2.0"));
+}
+
 TEST_F(Planning, RefusesAnIdentifierWithoutPackage) {
   options.install = {"com.unknown"};
   plan();
