@@ -8,8 +8,8 @@
 #include "host/restore/restore_packages.h"
 #include "host/restore/restore_settlement.h"
 #include "host/transfer/settlement.h"
+#include "host/transfer/shipments.h"
 #include "host/transfer/staging.h"
-#include "host/transfer/store.h"
 
 namespace appsync::host {
 namespace {
@@ -95,14 +95,15 @@ bool Restore::callClient(const RestoreInput& input) {
 
 void Restore::transfer(const RestoreInput& input) {
   static const Library None;
-  PackageSender sender(client_, host_.transfers(), phone_, reporter_, interruption_,
-                       input.packages ? *input.packages : None);
-  if (!interruption_.requested()) sender.send(client_.outstandingAssetTransfers());
+  const Library& library = input.packages ? *input.packages : None;
+  PackageSender sender(host_.transfers(), phone_, reporter_, interruption_);
+  if (!interruption_.requested()) {
+    sender.send(shipmentsTo(client_, client_.outstandingAssetTransfers(), library),
+                InterruptedTransfer);
+  }
   sent_ = sender.outcome().sent;
   note(sender.outcome().failures);
-  if (!phone_.coordination && input.installingAllowed) {
-    bringPackages(input.list, input.packages ? *input.packages : None);
-  }
+  if (!phone_.coordination && input.installingAllowed) bringPackages(input.list, library);
   waitUntilIdle(phone_, sent_);
   client_.assetTransferEndedWithSuccess(!interruption_.requested());
   if (!phone_.coordination) sender.removeSentPackages();
@@ -117,13 +118,15 @@ void Restore::bringPackages(const RestoreList& list, const Library& library) {
 }
 
 void Restore::bringFromStore(const RestoreList& list, const Library& catalogue) {
-  Store store(host_, phone_, reporter_, interruption_, catalogue, InterruptedReason,
-              InstallType::StoreDownload);
   const ApplicationsPresent present = applicationsNow();
   std::set<std::string> wanted = waitingForStore(phone_, present);
   for (const std::string& identifier : leftOut(list, present)) wanted.erase(identifier);
-  store.deliver(wanted);
-  note(store.failures());
+  PackageSender sender(host_.transfers(), phone_, reporter_, interruption_);
+  sender.send(shipmentsFromStore(host_, phone_, present, catalogue, InstallType::StoreDownload,
+                                 wanted),
+              InterruptedReason);
+  sender.settle();
+  note(sender.outcome().failures);
 }
 
 void Restore::reportPlaceholders(const RestoreList& list) {

@@ -4,6 +4,7 @@
 
 #include "host/base/text.h"
 #include "host/phone/demotions.h"
+#include "host/transfer/shipments.h"
 #include "platform/bundle.h"
 
 namespace appsync::host {
@@ -57,7 +58,7 @@ void RestorePackages::deliver(const ApplicationsPresent& present,
     assets.push_back(makeAsset(record, kTWAssetPartApplication | kTWAssetPartApplicationData));
   }
   if (before.problem()) return fail(records, *before.problem());
-  sender_.send(assets);
+  sender_.send(shipmentsTo(client_, assets, library_), InterruptedTransfer);
   failures_ = sender_.outcome().failures;
   Remembered after(phone_.files);
   for (const AppRecord& record : records) {

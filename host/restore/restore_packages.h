@@ -25,7 +25,7 @@ class RestorePackages {
         phone_(phone),
         interruption_(interruption),
         library_(library),
-        sender_(client, host.transfers(), phone, reporter, interruption, library) {}
+        sender_(host.transfers(), phone, reporter, interruption) {}
 
   /// For those of the applications present that are placeholders of a restore and not demoted, but
   /// `except`. The installs end with the client's transfers.

@@ -6,8 +6,8 @@
 
 #include "host/base/text.h"
 #include "host/phone/installed_applications.h"
+#include "host/transfer/shipments.h"
 #include "host/transfer/staging.h"
-#include "host/transfer/store.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 
@@ -68,7 +68,7 @@ Session::Session(SyncClient& client, HostProcess& host, Phone phone, Reporter& r
       watch_(phone_, reporter, interruption) {}
 
 SyncResult Session::run(const SyncInput& input) {
-  PackageSender sender(client_, host_.transfers(), phone_, reporter_, interruption_, input.library);
+  PackageSender sender(host_.transfers(), phone_, reporter_, interruption_);
   watch_.nameFilesOf(input.library);
   // What the client hears late, of a killed sync or of a person's cancel, must not reach this sync.
   waitUntilIdle(phone_, identifiersOf(input.plan));
@@ -133,7 +133,7 @@ bool Session::transfer(const SyncInput& input, PackageSender& sender) {
   if (claimed && !interruption_.requested()) {
     const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
     if (phone_.coordination) findCoordinators(assets);
-    sender.send(assets);
+    sender.send(shipmentsTo(client_, assets, input.library), InterruptedTransfer);
   }
   if (claimed) bringWhatWaits(input);
   if (phone_.coordination) waitForCoordination(input.plan, sender.outcome().sent);
@@ -146,10 +146,21 @@ bool Session::transfer(const SyncInput& input, PackageSender& sender) {
 
 /// Restored, demoted and asked-for applications whose packages the client leaves to the store.
 void Session::bringWhatWaits(const SyncInput& input) {
-  Store store(host_, phone_, reporter_, interruption_, input.library, InterruptedSync,
-              std::nullopt);
-  store.deliver(identifiersOf(input.plan, true));
-  failures_.insert(store.failures().begin(), store.failures().end());
+  const std::set<std::string> waiting = identifiersOf(input.plan, true);
+  if (waiting.empty()) return;
+  std::optional<Error> error;
+  const auto present = applicationsPresent(phone_.apps, &error);
+  if (!present) {
+    const std::string reason = withReason(CannotTellApplications, error);
+    for (const std::string& identifier : waiting) failures_.emplace(identifier, reason);
+    return;
+  }
+  PackageSender sender(host_.transfers(), phone_, reporter_, interruption_);
+  sender.send(
+      shipmentsFromStore(host_, phone_, *present, input.library, std::nullopt, waiting),
+      InterruptedSync);
+  sender.settle();
+  failures_.insert(sender.outcome().failures.begin(), sender.outcome().failures.end());
 }
 
 /// Before anything is sent, so that an install that is over by then can only have been cancelled.

@@ -9,6 +9,32 @@ namespace {
 constexpr std::int64_t ProgressUnits = 1000;
 constexpr const char* NotInstalled = "the phone did not install it (appsync log tells more)";
 
+class ClientDelivery final : public PackageDelivery {
+ public:
+  ClientDelivery(SyncClient& client, const SyncAssetPtr& asset, const std::string& name)
+      : client_(client), asset_(asset), name_(name) {}
+
+  void progressed(double fraction) override {
+    asset_->downloadProgress = fraction;
+    client_.assetTransferUpdatedProgress(asset_, fraction);
+  }
+
+  void gaveUp(const Error& why) override { client_.assetTransferSucceeded(asset_, false, why); }
+
+  void arrived(const std::string&) override {
+    asset_->path = name_;
+    asset_->completedAssetParts = kTWAssetPartApplication;
+    client_.assetTransferSucceeded(asset_, true, std::nullopt);
+  }
+
+  std::optional<std::string> settle() override { return std::nullopt; }
+
+ private:
+  SyncClient& client_;
+  const SyncAssetPtr asset_;
+  const std::string name_;
+};
+
 class CoordinatedDelivery final : public PackageDelivery {
  public:
   CoordinatedDelivery(const Phone& phone, const std::string& identifier,
@@ -22,7 +48,7 @@ class CoordinatedDelivery final : public PackageDelivery {
     if (const auto package = promise()) package->setPercentComplete(fraction);
   }
 
-  void gaveUp() override { progressed(0); }
+  void gaveUp(const Error&) override { progressed(0); }
 
   void arrived(const std::string& path) override {
     path_ = path;
@@ -80,7 +106,7 @@ class RegistryDelivery final : public PackageDelivery {
     progress_->setCompletedUnitCount(static_cast<std::int64_t>(fraction * ProgressUnits));
   }
 
-  void gaveUp() override {
+  void gaveUp(const Error&) override {
     if (progress_) progress_->setInstallState(InstallState::Paused);
   }
 
@@ -109,6 +135,11 @@ class RegistryDelivery final : public PackageDelivery {
 };
 
 }  // namespace
+
+std::unique_ptr<PackageDelivery> deliverToClient(SyncClient& client, const SyncAssetPtr& asset,
+                                                 const std::string& name) {
+  return std::make_unique<ClientDelivery>(client, asset, name);
+}
 
 std::unique_ptr<PackageDelivery> deliverToCoordinator(
     const Phone& phone, const std::string& identifier,

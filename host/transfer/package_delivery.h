@@ -5,6 +5,7 @@
 #include <string>
 
 #include "host/phone/phone.h"
+#include "platform/sync_client.h"
 
 namespace appsync::host {
 
@@ -16,13 +17,18 @@ class PackageDelivery {
   /// A fraction of the package has been sent.
   virtual void progressed(double fraction) = 0;
   /// The package will not come now.
-  virtual void gaveUp() = 0;
+  virtual void gaveUp(const Error& why) = 0;
   /// The package lies at `path` of the phone and is the delivery's from now on.
   virtual void arrived(const std::string& path) = 0;
   /// Waits until the phone has installed or refused the package that arrived; gives the reason, for
   /// people, when it was not installed.
   virtual std::optional<std::string> settle() = 0;
 };
+
+/// Hands the package to the client, which waits for its install at the end of the transfers. `name`
+/// is the file's in the staging root.
+std::unique_ptr<PackageDelivery> deliverToClient(SyncClient& client, const SyncAssetPtr& asset,
+                                                 const std::string& name);
 
 // The phone takes the package for a sync's unless an origin is given.
 

@@ -3,7 +3,6 @@
 #include <cerrno>
 
 #include "host/base/text.h"
-#include "host/transfer/staging.h"
 
 namespace appsync::host {
 namespace {
@@ -15,15 +14,20 @@ std::string nameOf(const SyncAsset& asset) { return asset.prettyName.value_or(as
 
 }  // namespace
 
-void PackageSender::send(const std::vector<SyncAssetPtr>& assets) {
-  for (const SyncAssetPtr& asset : assets) outcome_.asked.insert(asset->identifier);
-  queue_.add(assets);
+void PackageSender::send(std::vector<Shipment> shipments, std::string_view ifInterrupted) {
+  for (Shipment& shipment : shipments) {
+    const SyncAssetPtr asset = shipment.asset;
+    outcome_.asked.insert(asset->identifier);
+    queue_.add({asset});
+    onTheWay_.emplace(asset, std::move(shipment));
+  }
   for (auto next = queue_.next(); next.asset; next = queue_.next()) {
     if (interruption_.requested()) {
-      fail(next.asset, Error::posix(ECANCELED), "interrupted before it was sent");
+      finish(next.asset, Failure{Error::posix(ECANCELED), std::string(ifInterrupted)});
     } else if (next.cancelled) {
       const std::string reason = "cancelled on the phone";
-      fail(next.asset, Error::withDescription(TWErrorDomain, TransferFailedCode, reason), reason);
+      finish(next.asset,
+             Failure{Error::withDescription(TWErrorDomain, TransferFailedCode, reason), reason});
     } else {
       sendChunk(next.asset);
     }
@@ -31,58 +35,57 @@ void PackageSender::send(const std::vector<SyncAssetPtr>& assets) {
 }
 
 void PackageSender::sendChunk(const SyncAssetPtr& asset) {
-  auto& transfer = transfers_[asset];
-  if (!transfer) {
-    const LibraryPackage* package = library_.find(asset->identifier);
-    if (!package) {
-      const std::string reason = "the library has no package for it";
-      return fail(asset, Error::withDescription(POSIXErrorDomain, ENOENT, reason), reason);
-    }
-    transfer = std::make_unique<PackageTransfer>(
-        package->file, joinPath(exchange::StagingRoot, stagedPackageName(*package)));
+  Sending& sending = onTheWay_.at(asset);
+  if (!sending.shipment.package) {
+    const std::string reason = "the library has no package for it";
+    return finish(asset, Failure{Error::withDescription(POSIXErrorDomain, ENOENT, reason), reason});
   }
   std::optional<Error> error;
-  const PackageTransfer::Step step = transfer->sendChunk(phone_, &error);
+  const PackageTransfer::Step step = sending.transfer.sendChunk(phone_, &error);
   if (step == PackageTransfer::Step::Failed) {
-    const Error reason = error.value_or(Error::posix(EIO));
-    return fail(asset, reason, "could not be sent: " + oneLine(reason.localizedDescription()));
+    const Error cause = error.value_or(Error::posix(EIO));
+    return finish(asset,
+                  Failure{cause, "could not be sent: " + oneLine(cause.localizedDescription())});
   }
-  if (transfer->progressed()) reportProgress(asset, *transfer);
-  if (step == PackageTransfer::Step::Done) succeed(asset);
+  if (sending.transfer.progressed()) reportProgress(sending);
+  if (step == PackageTransfer::Step::Done) finish(asset, std::nullopt);
 }
 
-void PackageSender::reportProgress(const SyncAssetPtr& asset, const PackageTransfer& transfer) {
-  const auto total = static_cast<double>(transfer.total());
-  const double fraction = transfer.total() == 0 ? 1 : static_cast<double>(transfer.sent()) / total;
-  asset->downloadProgress = fraction;
-  client_.assetTransferUpdatedProgress(asset, fraction);
-  reporter_.report(
-      TransferProgress{asset->identifier, nameOf(*asset), transfer.sent(), transfer.total()});
+void PackageSender::reportProgress(Sending& sending) {
+  const SyncAsset& asset = *sending.shipment.asset;
+  const std::uint64_t sent = sending.transfer.sent();
+  const std::uint64_t total = sending.transfer.total();
+  sending.shipment.delivery->progressed(
+      total == 0 ? 1 : static_cast<double>(sent) / static_cast<double>(total));
+  reporter_.report(TransferProgress{asset.identifier, nameOf(asset), sent, total});
 }
 
-void PackageSender::succeed(const SyncAssetPtr& asset) {
-  asset->path = stagedPackageName(*library_.find(asset->identifier));
-  asset->completedAssetParts = kTWAssetPartApplication;
-  transfers_.erase(asset);
+void PackageSender::finish(const SyncAssetPtr& asset, const std::optional<Failure>& failure) {
+  const std::string& identifier = asset->identifier;
+  Shipment shipment = std::move(onTheWay_.at(asset).shipment);
+  // What the phone has of a package that was not sent whole goes with it.
+  onTheWay_.erase(asset);
   queue_.finish(asset);
-  outcome_.sent.insert(asset->identifier);
-  reporter_.report(TransferEnded{asset->identifier, nameOf(*asset), std::nullopt});
-  client_.assetTransferSucceeded(asset, true, std::nullopt);
+  reporter_.report(TransferEnded{identifier, nameOf(*asset),
+                                 failure ? std::optional(failure->reason) : std::nullopt});
+  if (failure) {
+    outcome_.failures[identifier] = failure->reason;
+    shipment.delivery->gaveUp(failure->error);
+  } else {
+    outcome_.sent.insert(identifier);
+    shipment.delivery->arrived(shipment.target);
+    arrived_.insert_or_assign(identifier, std::move(shipment));
+  }
 }
 
-void PackageSender::fail(const SyncAssetPtr& asset, const Error& error, const std::string& reason) {
-  transfers_.erase(asset);
-  queue_.finish(asset);
-  outcome_.failures[asset->identifier] = reason;
-  reporter_.report(TransferEnded{asset->identifier, nameOf(*asset), reason});
-  client_.assetTransferSucceeded(asset, false, error);
+void PackageSender::settle() {
+  for (const auto& [identifier, shipment] : arrived_) {
+    if (auto failure = shipment.delivery->settle()) outcome_.failures[identifier] = *failure;
+  }
 }
 
 void PackageSender::removeSentPackages() {
-  for (const std::string& identifier : outcome_.sent) {
-    const LibraryPackage* package = library_.find(identifier);
-    phone_.files.removeItem(joinPath(exchange::StagingRoot, stagedPackageName(*package)));
-  }
+  for (const auto& arrived : arrived_) phone_.files.removeItem(arrived.second.target);
 }
 
 }  // namespace appsync::host

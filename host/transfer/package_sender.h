@@ -2,60 +2,82 @@
 
 #include <map>
 #include <memory>
+#include <optional>
 #include <set>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "host/base/interruption.h"
 #include "host/library/events.h"
 #include "host/phone/phone.h"
 #include "host/phone/transfer_queue.h"
+#include "host/transfer/package_delivery.h"
 #include "host/transfer/package_transfer.h"
-#include "platform/sync_client.h"
 
 namespace appsync::host {
 
-/// What became of the packages that the client asked for.
+/// Why a package that the client asks for was not sent.
+inline constexpr const char* InterruptedTransfer = "interrupted before it was sent";
+
+/// A package that is to be sent, and what for.
+struct Shipment {
+  SyncAssetPtr asset;                       ///< stands for it in the queue
+  const LibraryPackage* package = nullptr;  ///< without one it fails when its turn comes
+  std::string target;                       ///< file of the phone
+  std::unique_ptr<PackageDelivery> delivery;
+};
+
+/// What became of the packages.
 struct TransferOutcome {
   std::set<std::string> asked;
   std::set<std::string> sent;
   std::map<std::string, std::string> failures;  ///< reason by identifier
 };
 
-/// Sends the packages that the client asks for, in the queue's order, and tells the client and the
-/// reporter how far they have come. Borrows everything; used by one thread.
+/// Sends packages in the queue's order, and tells their deliveries and the reporter how far they
+/// have come. Borrows everything; used by one thread.
 class PackageSender {
  public:
-  PackageSender(SyncClient& client, TransferQueue& queue, const Phone& phone, Reporter& reporter,
-                const Interruption& interruption, const Library& library)
-      : client_(client),
-        queue_(queue),
-        phone_(phone),
-        reporter_(reporter),
-        interruption_(interruption),
-        library_(library) {}
+  PackageSender(TransferQueue& queue, const Phone& phone, Reporter& reporter,
+                const Interruption& interruption)
+      : queue_(queue), phone_(phone), reporter_(reporter), interruption_(interruption) {}
 
-  /// Returns when every asset was sent or has failed. After an interruption what remains fails with
-  /// an error that lets the phone ask again.
-  void send(const std::vector<SyncAssetPtr>& assets);
+  /// Returns when every package was sent or has failed. After an interruption what remains fails
+  /// with this reason, and with an error that lets the phone ask again.
+  void send(std::vector<Shipment> shipments, std::string_view ifInterrupted);
+  /// Waits until the phone has installed or refused what was sent.
+  void settle();
 
   const TransferOutcome& outcome() const { return outcome_; }
-  /// Removes packages sent that still lie in the staging root.
+  /// Removes packages sent that still lie where they arrived.
   void removeSentPackages();
 
  private:
-  void sendChunk(const SyncAssetPtr& asset);
-  void reportProgress(const SyncAssetPtr& asset, const PackageTransfer& transfer);
-  void succeed(const SyncAssetPtr& asset);
-  void fail(const SyncAssetPtr& asset, const Error& error, const std::string& reason);
+  struct Sending {
+    explicit Sending(Shipment what)
+        : shipment(std::move(what)),
+          transfer(shipment.package ? shipment.package->file : std::filesystem::path(),
+                   shipment.target) {}
 
-  SyncClient& client_;
+    Shipment shipment;
+    PackageTransfer transfer;
+  };
+  struct Failure {
+    Error error;         ///< for the phone
+    std::string reason;  ///< for people
+  };
+
+  void sendChunk(const SyncAssetPtr& asset);
+  void reportProgress(Sending& sending);
+  void finish(const SyncAssetPtr& asset, const std::optional<Failure>& failure);
+
   TransferQueue& queue_;
   const Phone& phone_;
   Reporter& reporter_;
   const Interruption& interruption_;
-  const Library& library_;
-  std::map<SyncAssetPtr, std::unique_ptr<PackageTransfer>> transfers_;
+  std::map<SyncAssetPtr, Sending> onTheWay_;
+  std::map<std::string, Shipment> arrived_;  ///< by identifier
   TransferOutcome outcome_;
 };
 

@@ -1,5 +1,5 @@
 // What the store brings to a fake phone, through coordinators and without them.
-#include "host/transfer/store.h"
+#include "host/transfer/shipments.h"
 
 #include <cerrno>
 
@@ -40,12 +40,13 @@ class StoreTest : public RestoreTest {
     const Library catalogue = readLibrary(folder.path(), problem).value();
     const RestorePhone all = restorePhone();
     phone.trace.clear();
-    Store brings(host, all, watching, interruption, catalogue, "interrupted", origin);
-    std::set<std::string> wanted =
-        waitingForStore(all, applicationsPresent(all.apps, nullptr).value());
+    PackageSender sender(host.transfers(), all, watching, interruption);
+    const ApplicationsPresent present = applicationsPresent(all.apps, nullptr).value();
+    std::set<std::string> wanted = waitingForStore(all, present);
     for (const std::string& identifier : except) wanted.erase(identifier);
-    brings.deliver(wanted);
-    return brings.failures();
+    sender.send(shipmentsFromStore(host, all, present, catalogue, origin, wanted), "interrupted");
+    sender.settle();
+    return sender.outcome().failures;
   }
   std::vector<std::string> installed() { return phone.appRegistry.installedIdentifiers(); }
   SyncAssetPtr named(const std::string& identifier) {
