@@ -2,10 +2,8 @@
 
 #include <algorithm>
 
-#include "host/base/text.h"
 #include "host/phone/demotions.h"
 #include "host/restore/restore_data.h"
-#include "host/restore/restore_packages.h"
 #include "host/restore/restore_settlement.h"
 #include "host/transfer/settlement.h"
 #include "host/transfer/shipments.h"
@@ -29,29 +27,23 @@ void addUnreadable(const std::optional<Library>& library, Summary& summary) {
 
 Restore::Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Reporter& reporter,
                  Interruption& interruption)
-    : client_(client),
-      host_(host),
-      phone_(std::move(phone)),
-      reporter_(reporter),
-      interruption_(interruption),
-      watch_(phone_, reporter, interruption) {}
+    : Visit(client, host, phone, reporter, interruption), restorePhone_(std::move(phone)) {}
 
 SyncResult Restore::run(const RestoreInput& input) {
   for (const auto* library : {&input.packages, &input.catalogue}) {
     if (*library) watch_.nameFilesOf(**library);
   }
-  handover_ =
-      handOver(phone_, input.backup, input.list, input.overwriteData, reporter_, interruption_);
+  handover_ = handOver(restorePhone_, input.backup, input.list, input.overwriteData, reporter_,
+                       interruption_);
   host_.transfers().forgetCancelled();
   removeLeftOverPackages(phone_, everSent(phone_));
   failures_ = handover_.failures;
-  const bool given = !handover_.broken || broken(*handover_.broken, std::nullopt);
+  const bool given = !handover_.broken || breakOff(*handover_.broken);
   if (given && input.overwriteData) overwriteData(input);
   SyncResult result;
   result.completed = given && !interruption_.requested() && callClient(input);
-  if (input.catalogue && input.installingAllowed && !broken_)
-    bringFromStore(input.list, *input.catalogue);
-  if (handover_.layoutRefused && !broken_) broken(*handover_.layoutRefused, std::nullopt);
+  if (input.catalogue && input.installingAllowed && !broken_) bringFromStore(input);
+  if (handover_.layoutRefused && !broken_) breakOff(*handover_.layoutRefused);
   result.summary = settle(input);
   result.completed = result.completed && !broken_;
   return result;
@@ -63,12 +55,12 @@ void Restore::overwriteData(const RestoreInput& input) {
     const auto file = input.backup.data.find(app.identifier);
     if (file == input.backup.data.end()) {
       installedData_[app.identifier] = InstalledData::NoneInBackup;
-    } else if (hasData(phone_, app.identifier, file->second)) {
+    } else if (hasData(restorePhone_, app.identifier, file->second)) {
       installedData_[app.identifier] = InstalledData::SameAlready;
     } else if (interruption_.requested()) {
       failures_[app.identifier] = InterruptedReason;
-    } else if (const auto failure =
-                   host::overwriteData(phone_, app, file->second, reporter_, interruption_)) {
+    } else if (const auto failure = host::overwriteData(restorePhone_, app, file->second, reporter_,
+                                                        interruption_)) {
       failures_[app.identifier] = *failure;
     } else {
       installedData_[app.identifier] = InstalledData::Overwritten;
@@ -77,17 +69,13 @@ void Restore::overwriteData(const RestoreInput& input) {
 }
 
 bool Restore::callClient(const RestoreInput& input) {
-  if (!servesApplications(client_)) {
-    return broken("the plug-in does not serve applications", std::nullopt);
+  if (!isServed() || !begin(client_.currentSyncAnchor(), "the phone cannot begin a restore")) {
+    return false;
   }
   std::optional<Error> error;
-  const auto ignoreProgress = [](double) {};
-  if (!client_.prepareForSyncWithHostAnchor(client_.currentSyncAnchor(), ignoreProgress, &error)) {
-    return broken("the phone cannot begin a restore", error);
-  }
   client_.reconcileRestoreOfType(FromDesktopBackup, &error);
   waitUntilIdle(phone_, handover_.listed);
-  if (!claimDownloads(phone_.apps, {}, &error)) return broken(CannotTellApplications, error);
+  if (!claimDownloads(phone_.apps, {}, &error)) return breakOff(CannotTellApplications, error);
   reportPlaceholders(input.list);
   transfer(input);
   return !interruption_.requested();
@@ -96,55 +84,33 @@ bool Restore::callClient(const RestoreInput& input) {
 void Restore::transfer(const RestoreInput& input) {
   static const Library None;
   const Library& library = input.packages ? *input.packages : None;
-  PackageSender sender(host_.transfers(), phone_, reporter_, interruption_);
-  if (!interruption_.requested()) {
-    sender.send(shipmentsTo(client_, client_.outstandingAssetTransfers(), library),
-                InterruptedTransfer);
-  }
-  sent_ = sender.outcome().sent;
-  note(sender.outcome().failures);
+  if (!interruption_.requested()) sendToClient(client_.outstandingAssetTransfers(), library);
+  note(sender_.outcome().failures);
+  // Also what an earlier restore has sent, whatever the library holds now.
   if (!phone_.coordination && input.installingAllowed) bringPackages(input.list, library);
-  waitUntilIdle(phone_, sent_);
-  client_.assetTransferEndedWithSuccess(!interruption_.requested());
-  if (!phone_.coordination) sender.removeSentPackages();
+  waitUntilIdle(phone_, sender_.outcome().sent);
+  endTransfers();
 }
 
-/// Also what an earlier restore has sent, whatever the library holds now.
-void Restore::bringPackages(const RestoreList& list, const Library& library) {
-  const ApplicationsPresent present = applicationsNow();
-  RestorePackages packages(client_, host_, phone_, reporter_, interruption_, library);
-  packages.deliver(present, leftOut(list, present));
-  note(packages.failures());
-}
-
-void Restore::bringFromStore(const RestoreList& list, const Library& catalogue) {
-  const ApplicationsPresent present = applicationsNow();
-  std::set<std::string> wanted = waitingForStore(phone_, present);
-  for (const std::string& identifier : leftOut(list, present)) wanted.erase(identifier);
-  PackageSender sender(host_.transfers(), phone_, reporter_, interruption_);
-  sender.send(shipmentsFromStore(host_, phone_, present, catalogue, InstallType::StoreDownload,
-                                 wanted),
-              InterruptedReason);
-  sender.settle();
-  note(sender.outcome().failures);
+void Restore::bringFromStore(const RestoreInput& input) {
+  const auto present = applicationsNow();
+  if (!present) return;
+  std::set<std::string> wanted = waitingForStore(phone_, *present);
+  for (const std::string& identifier : leftOut(input.list, *present)) wanted.erase(identifier);
+  Visit::bringFromStore(*present, *input.catalogue, InstallType::StoreDownload, wanted,
+                        InterruptedReason);
 }
 
 void Restore::reportPlaceholders(const RestoreList& list) {
   const Demotions demotions(phone_.files);
-  const ApplicationsPresent present = applicationsNow();
+  const auto present = applicationsNow();
+  if (!present) return;
   for (const BackedUpApplication& app : list.applications()) {
-    const auto found = present.placeholders.find(app.identifier);
-    if (found == present.placeholders.end()) continue;
+    const auto found = present->placeholders.find(app.identifier);
+    if (found == present->placeholders.end()) continue;
     reporter_.report(
         PlaceholderStands{app.identifier, app.name, demotions.holdBack(found->second)});
   }
-}
-
-ApplicationsPresent Restore::applicationsNow() {
-  std::optional<Error> error;
-  auto present = applicationsPresent(phone_.apps, &error);
-  if (!present) broken(CannotTellApplications, error);
-  return present ? std::move(*present) : ApplicationsPresent();
 }
 
 std::set<std::string> Restore::leftOut(const RestoreList& list,
@@ -156,10 +122,6 @@ std::set<std::string> Restore::leftOut(const RestoreList& list,
     if (!list.names(placeholder.first)) identifiers.insert(placeholder.first);
   }
   return identifiers;
-}
-
-void Restore::note(const std::map<std::string, std::string>& failures) {
-  failures_.insert(failures.begin(), failures.end());
 }
 
 void Restore::explainPlaceholders(const RestoreInput& input, RestoreEnd& end) {
@@ -175,7 +137,7 @@ void Restore::explainPlaceholders(const RestoreInput& input, RestoreEnd& end) {
                                                             : input.packages;
   const std::vector<std::string> owed = phone_.packagesOwedBy(KQClientKiosk);
   const Demotions demotions(phone_.files);
-  if (demotions.problem()) broken(*demotions.problem(), std::nullopt);
+  if (demotions.problem()) breakOff(*demotions.problem());
   for (const auto& [identifier, record] : end.present.placeholders) {
     if (demotions.holdBack(record)) {
       end.heldBack.insert(identifier);
@@ -197,8 +159,8 @@ Summary Restore::settle(const RestoreInput& input) {
   note(watch_.failures());
   RestoreEnd end;
   end.installedBefore = handover_.installed;
-  end.present = applicationsNow();
-  for (const std::string& identifier : sent_) {
+  end.present = applicationsNow().value_or(ApplicationsPresent());
+  for (const std::string& identifier : sender_.outcome().sent) {
     if (handover_.installed.contains(identifier)) end.updated.insert(identifier);
   }
   end.installedData = installedData_;
@@ -211,12 +173,6 @@ Summary Restore::settle(const RestoreInput& input) {
   addUnreadable(input.packages, summary);
   addUnreadable(input.catalogue, summary);
   return summary;
-}
-
-bool Restore::broken(std::string_view what, const std::optional<Error>& error) {
-  broken_ = withReason(what, error);
-  reporter_.report(SyncBroken{*broken_});
-  return false;
 }
 
 }  // namespace appsync::host

@@ -10,8 +10,7 @@
 #include "host/restore/restore_handover.h"
 #include "host/restore/restore_list.h"
 #include "host/restore/restore_settlement.h"
-#include "host/sync/session.h"
-#include "host/transfer/install_watch.h"
+#include "host/transfer/visit.h"
 
 namespace appsync::host {
 
@@ -28,7 +27,7 @@ struct RestoreInput {
 /// packages that the host or the store brings. It does what is missing on the phone, so that
 /// another restore of the same backup carries on wherever this one ended, and changes nothing once
 /// all is there. Borrows everything; used once, by one thread.
-class Restore {
+class Restore : Visit {
  public:
   Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Reporter& reporter,
           Interruption& interruption);
@@ -39,31 +38,22 @@ class Restore {
   void overwriteData(const RestoreInput& input);
   bool callClient(const RestoreInput& input);
   void transfer(const RestoreInput& input);
+  /// For the placeholders of a restore that are not demoted or left out, on a phone that does not
+  /// coordinate installs. The client installs such a package at once, or, when data waits for its
+  /// application, remembers it until the data is delivered too; one that an interrupted restore
+  /// left remembered is not sent again. The installs end with the client's transfers.
   void bringPackages(const RestoreList& list, const Library& library);
-  void bringFromStore(const RestoreList& list, const Library& catalogue);
+  void bringFromStore(const RestoreInput& input);
   void reportPlaceholders(const RestoreList& list);
-  /// None when it cannot be told, which breaks the restore off.
-  ApplicationsPresent applicationsNow();
   /// The applications that nothing must be brought to.
   std::set<std::string> leftOut(const RestoreList& list, const ApplicationsPresent& present) const;
-  void note(const std::map<std::string, std::string>& failures);
   /// Why a placeholder has no package.
   void explainPlaceholders(const RestoreInput& input, RestoreEnd& end);
   Summary settle(const RestoreInput& input);
-  /// Always false.
-  bool broken(std::string_view what, const std::optional<Error>& error);
 
-  SyncClient& client_;
-  HostProcess& host_;
-  const RestorePhone phone_;
-  Reporter& reporter_;
-  Interruption& interruption_;
-  InstallWatch watch_;
+  const RestorePhone restorePhone_;
   Handover handover_;
   std::map<std::string, InstalledData> installedData_;
-  std::set<std::string> sent_;                   ///< what the client asked for
-  std::map<std::string, std::string> failures_;  ///< reason by identifier
-  std::optional<std::string> broken_;
 };
 
 }  // namespace appsync::host

@@ -1,9 +1,9 @@
-#include "host/restore/restore_packages.h"
-
+// Packages of restored applications that the host itself brings.
 #include <cerrno>
 
 #include "host/base/text.h"
 #include "host/phone/demotions.h"
+#include "host/restore/restore.h"
 #include "host/transfer/shipments.h"
 #include "platform/bundle.h"
 
@@ -46,40 +46,9 @@ class Remembered {
   std::optional<std::string> problem_;
 };
 
-}  // namespace
-
-void RestorePackages::deliver(const ApplicationsPresent& present,
-                              const std::set<std::string>& except) {
-  const std::vector<AppRecord> records = wanted(present, except);
-  Remembered before(phone_.files);
-  std::vector<SyncAssetPtr> assets;
-  for (const AppRecord& record : records) {
-    if (before.holds(record) || !library_.find(record.applicationIdentifier)) continue;
-    assets.push_back(makeAsset(record, kTWAssetPartApplication | kTWAssetPartApplicationData));
-  }
-  if (before.problem()) return fail(records, *before.problem());
-  sender_.send(shipmentsTo(client_, assets, library_), InterruptedTransfer);
-  failures_ = sender_.outcome().failures;
-  Remembered after(phone_.files);
-  for (const AppRecord& record : records) {
-    if (interruption_.requested()) return;
-    if (!after.holds(record)) continue;
-    // The data itself lies on the phone already.
-    const SyncAssetPtr asset = makeAsset(record, kTWAssetPartApplicationData);
-    asset->completedAssetParts = kTWAssetPartApplicationData;
-    client_.assetTransferSucceeded(asset, true, std::nullopt);
-  }
-  if (after.problem()) fail(records, *after.problem());
-}
-
-/// What comes after all counts in spite of it.
-void RestorePackages::fail(const std::vector<AppRecord>& records, const std::string& reason) {
-  for (const AppRecord& record : records) failures_.emplace(record.applicationIdentifier, reason);
-}
-
-std::vector<AppRecord> RestorePackages::wanted(const ApplicationsPresent& present,
-                                               const std::set<std::string>& except) const {
-  const Demotions demotions(phone_.files);
+std::vector<AppRecord> restoredPlaceholders(const Phone& phone, const ApplicationsPresent& present,
+                                            const std::set<std::string>& except) {
+  const Demotions demotions(phone.files);
   std::vector<AppRecord> records;
   for (const auto& [identifier, record] : present.placeholders) {
     if (record.installType == InstallType::Restore && !demotions.holdBack(record) &&
@@ -90,14 +59,48 @@ std::vector<AppRecord> RestorePackages::wanted(const ApplicationsPresent& presen
   return records;
 }
 
-SyncAssetPtr RestorePackages::makeAsset(const AppRecord& record, std::uint32_t parts) const {
+SyncAssetPtr makeAsset(HostProcess& host, const AppRecord& record, std::uint32_t parts) {
   const std::string& name =
       record.displayName.empty() ? record.applicationIdentifier : record.displayName;
-  SyncAssetPtr asset = host_.makeDownload(record.applicationIdentifier, ApplicationDataclass, name);
+  SyncAssetPtr asset = host.makeDownload(record.applicationIdentifier, ApplicationDataclass, name);
   asset->isRestore = true;
   asset->variantOptions.emplace(AssetPartsKey, static_cast<std::int64_t>(parts));
   if (record.bundleVersion) asset->variantOptions.emplace(AssetVersionKey, *record.bundleVersion);
   return asset;
+}
+
+}  // namespace
+
+void Restore::bringPackages(const RestoreList& list, const Library& library) {
+  const auto present = applicationsNow();
+  if (!present) return;
+  const std::vector<AppRecord> records =
+      restoredPlaceholders(phone_, *present, leftOut(list, *present));
+  // What comes after all counts in spite of it.
+  const auto failAll = [&](const std::string& reason) {
+    for (const AppRecord& record : records) failures_.emplace(record.applicationIdentifier, reason);
+  };
+  Remembered before(phone_.files);
+  std::vector<SyncAssetPtr> assets;
+  for (const AppRecord& record : records) {
+    if (before.holds(record) || !library.find(record.applicationIdentifier)) continue;
+    assets.push_back(
+        makeAsset(host_, record, kTWAssetPartApplication | kTWAssetPartApplicationData));
+  }
+  if (before.problem()) return failAll(*before.problem());
+  PackageSender sender = makeSender();
+  sender.send(shipmentsTo(client_, assets, library), InterruptedTransfer);
+  note(sender.outcome().failures);
+  Remembered after(phone_.files);
+  for (const AppRecord& record : records) {
+    if (interruption_.requested()) return;
+    if (!after.holds(record)) continue;
+    // The data itself lies on the phone already.
+    const SyncAssetPtr asset = makeAsset(host_, record, kTWAssetPartApplicationData);
+    asset->completedAssetParts = kTWAssetPartApplicationData;
+    client_.assetTransferSucceeded(asset, true, std::nullopt);
+  }
+  if (after.problem()) failAll(*after.problem());
 }
 
 }  // namespace appsync::host

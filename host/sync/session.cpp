@@ -6,7 +6,6 @@
 
 #include "host/base/text.h"
 #include "host/phone/installed_applications.h"
-#include "host/transfer/shipments.h"
 #include "host/transfer/staging.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
@@ -16,8 +15,6 @@ namespace {
 
 constexpr const char* CancelledOnPhone = "cancelled on the phone";
 constexpr std::chrono::milliseconds InstallPoll{10};
-
-void ignoreProgress(double) {}
 
 using TodoList = std::optional<std::vector<TodoState>>;
 
@@ -53,22 +50,7 @@ bool isCarriedOut(AppRegistry& apps, const PlannedEntry& entry) {
 
 }  // namespace
 
-bool servesApplications(SyncClient& client) {
-  const auto dataclasses = client.supportedDataclasses();
-  return std::ranges::find(dataclasses, ApplicationDataclass) != dataclasses.end();
-}
-
-Session::Session(SyncClient& client, HostProcess& host, Phone phone, Reporter& reporter,
-                 Interruption& interruption)
-    : client_(client),
-      host_(host),
-      phone_(std::move(phone)),
-      reporter_(reporter),
-      interruption_(interruption),
-      watch_(phone_, reporter, interruption) {}
-
 SyncResult Session::run(const SyncInput& input) {
-  PackageSender sender(host_.transfers(), phone_, reporter_, interruption_);
   watch_.nameFilesOf(input.library);
   // What the client hears late, of a killed sync or of a person's cancel, must not reach this sync.
   waitUntilIdle(phone_, identifiersOf(input.plan));
@@ -83,32 +65,28 @@ SyncResult Session::run(const SyncInput& input) {
     return isDone;
   });
   watch_.tellInstalled(carriedOut_);
-  const bool good = swept && callClient(rest, sender);
-  result.summary = settle(input.plan, input.library, end(sender));
+  const bool good = swept && callClient(rest);
+  result.summary = settle(input.plan, input.library, end());
   result.completed = good && !broken_;
   return result;
 }
 
-bool Session::callClient(const SyncInput& input, PackageSender& sender) {
-  if (!isServed()) return !broken_;
+bool Session::callClient(const SyncInput& input) {
+  if (!prepare()) return !broken_;
   bool success = reconcile(input);
-  if (reconciled_) success = transfer(input, sender);
+  if (reconciled_) success = transfer(input);
   client_.syncEndedWithSuccess(success);
   if (success) writeApplicationsPresent();
   return success && !broken_;
 }
 
-bool Session::isServed() {
-  if (!servesApplications(client_)) {
-    return broken("the plug-in does not serve applications", std::nullopt);
-  }
+bool Session::prepare() {
+  if (!isServed()) return false;
   const std::string hostAnchor = client_.currentSyncAnchor();
   const auto disabledTypes = client_.disabledAssetTypes();
   disabled_ = disabledTypes && disabledTypes->count(std::string(ApplicationDataclass)) > 0;
   if (disabled_) return false;
-  std::optional<Error> error;
-  if (client_.prepareForSyncWithHostAnchor(hostAnchor, ignoreProgress, &error)) return true;
-  broken("the phone cannot begin a sync", error);
+  if (begin(hostAnchor, "the phone cannot begin a sync")) return true;
   client_.syncEndedWithSuccess(false);
   return false;
 }
@@ -118,49 +96,31 @@ bool Session::reconcile(const SyncInput& input) {
   if (interruption_.requested()) return false;
   std::optional<Error> error;
   if (!stage(phone_.files, input.plan, input.library, input.iconLayout, &error)) {
-    return broken("the phone did not take the list of what is to be done", error);
+    return breakOff("the phone did not take the list of what is to be done", error);
   }
   const PropertyList::Dictionary description{{"Dataclass", ApplicationDataclass}};
-  reconciled_ = client_.reconcileSync(description, input.newAnchor, ignoreProgress, &error);
-  if (!reconciled_) broken("the phone could not take over what is to be done", error);
+  reconciled_ = client_.reconcileSync(
+      description, input.newAnchor, [](double) {}, &error);
+  if (!reconciled_) breakOff("the phone could not take over what is to be done", error);
   return reconciled_;
 }
 
-bool Session::transfer(const SyncInput& input, PackageSender& sender) {
+bool Session::transfer(const SyncInput& input) {
   std::optional<Error> error;
   const bool claimed = claimDownloads(phone_.apps, identifiersOf(input.plan, false), &error) ||
-                       broken(CannotTellApplications, error);
+                       breakOff(CannotTellApplications, error);
   if (claimed && !interruption_.requested()) {
     const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
     if (phone_.coordination) findCoordinators(assets);
-    sender.send(shipmentsTo(client_, assets, input.library), InterruptedTransfer);
+    sendToClient(assets, input.library);
   }
-  if (claimed) bringWhatWaits(input);
-  if (phone_.coordination) waitForCoordination(input.plan, sender.outcome().sent);
-  const bool success = claimed && !interruption_.requested();
-  client_.assetTransferEndedWithSuccess(success);
-  // A coordinated install takes its package away itself, perhaps later.
-  if (!phone_.coordination) sender.removeSentPackages();
-  return success && !interruption_.requested();
-}
-
-/// Restored, demoted and asked-for applications whose packages the client leaves to the store.
-void Session::bringWhatWaits(const SyncInput& input) {
+  // Restored, demoted and asked-for applications whose packages the client leaves to the store.
   const std::set<std::string> waiting = identifiersOf(input.plan, true);
-  if (waiting.empty()) return;
-  std::optional<Error> error;
-  const auto present = applicationsPresent(phone_.apps, &error);
-  if (!present) {
-    const std::string reason = withReason(CannotTellApplications, error);
-    for (const std::string& identifier : waiting) failures_.emplace(identifier, reason);
-    return;
-  }
-  PackageSender sender(host_.transfers(), phone_, reporter_, interruption_);
-  sender.send(
-      shipmentsFromStore(host_, phone_, *present, input.library, std::nullopt, waiting),
-      InterruptedSync);
-  sender.settle();
-  failures_.insert(sender.outcome().failures.begin(), sender.outcome().failures.end());
+  const auto present = claimed && !waiting.empty() ? applicationsNow() : std::nullopt;
+  if (present) bringFromStore(*present, input.library, std::nullopt, waiting, InterruptedSync);
+  if (phone_.coordination) waitForCoordination(input.plan);
+  endTransfers();
+  return !broken_ && !interruption_.requested();
 }
 
 /// Before anything is sent, so that an install that is over by then can only have been cancelled.
@@ -189,7 +149,8 @@ bool Session::isSettled(const std::string& identifier,
 
 /// Coordinators settle, and the phone removes and tidies up, after the client's calls have
 /// returned, which would be too late for this sync's result.
-void Session::waitForCoordination(const SyncPlan& plan, const std::set<std::string>& sent) {
+void Session::waitForCoordination(const SyncPlan& plan) {
+  const std::set<std::string>& sent = sender_.outcome().sent;
   const auto installsSettled = [&] {
     if (interruption_.requested()) return true;
     const auto todo = readTodoList(phone_.files, exchange::WorkArea);
@@ -212,7 +173,7 @@ bool Session::sweepPlaceholders() {
   };
   std::optional<Error> error;
   if (!phone_.apps.enumerateBundles(BundleKind::All, look, &error)) {
-    return broken(CannotTellApplications, error);
+    return breakOff(CannotTellApplications, error);
   }
   for (const std::string& identifier : leftOver) {
     const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
@@ -249,22 +210,20 @@ void Session::writeApplicationsPresent() {
       read ? serializePropertyList(std::move(present), PropertyListFormat::Binary, &error)
            : std::nullopt;
   if (!bytes || !phone_.files.writeAtomically(exchange::LastSyncState, *bytes, &error)) {
-    broken("the list of applications present could not be written", error);
+    breakOff("the list of applications present could not be written", error);
   }
 }
 
-SyncEnd Session::end(const PackageSender& sender) {
+SyncEnd Session::end() {
   SyncEnd end;
   if (reconciled_) {
     std::optional<Error> error;
     const TodoList todo = readTodoList(phone_.files, exchange::WorkArea, &error);
     if (todo) end.todo = *todo;
-    if (!todo) broken("it cannot be seen what the phone has done", error);
+    if (!todo) breakOff("it cannot be seen what the phone has done", error);
   }
-  std::optional<Error> error;
-  end.present = applicationsPresent(phone_.apps, &error);
-  if (!end.present) broken(CannotTellApplications, error);
-  end.transfers = sender.outcome();
+  end.present = applicationsNow();
+  end.transfers = sender_.outcome();
   end.installFailures = watch_.failures();
   end.installFailures.insert(failures_.begin(), failures_.end());
   end.carriedOut = carriedOut_;
@@ -272,12 +231,6 @@ SyncEnd Session::end(const PackageSender& sender) {
   end.interrupted = interruption_.requested();
   end.broken = broken_;
   return end;
-}
-
-bool Session::broken(std::string_view what, const std::optional<Error>& error) {
-  broken_ = withReason(what, error);
-  reporter_.report(SyncBroken{*broken_});
-  return false;
 }
 
 }  // namespace appsync::host
