@@ -47,4 +47,23 @@ PluginSession::PluginSession(Plugin& plugin, std::string_view mainBundleIdentifi
   }
 }
 
+ExitCode runVisit(CommandContext& context, device::EmbeddedDevice& device, std::string_view work,
+                  const std::function<SyncResult(PluginSession& loaded, Reporter& reporter,
+                                                 Interruption& interruption)>& run) {
+  const auto reporter = context.makeReporter();
+  Interruption interruption;
+  const auto plugin = loadPlugin(context);
+  PluginSession loaded(*plugin, SyncHostBundleIdentifier, device, interruption,
+                       context.verbose ? reporter.get() : nullptr);
+  const SignalWatcher signals(interruption);
+  const SyncResult result = run(loaded, *reporter, interruption);
+  reporter->report(result.summary);
+  context.tellIfUnseen(work);
+  return interruption.requested() ? ExitCode::Interrupted : exitCodeOf(result);
+}
+
+ExitCode exitCodeOf(const SyncResult& result) {
+  return result.completed && result.summary.failed.empty() ? ExitCode::Done : ExitCode::SomeFailed;
+}
+
 }  // namespace appsync::host

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <string>
 
@@ -9,6 +10,7 @@
 #include "host/library/events.h"
 #include "host/phone/plugin_loader.h"
 #include "host/phone/sync_host.h"
+#include "host/transfer/visit.h"
 
 namespace appsync::host {
 
@@ -43,5 +45,14 @@ class PluginSession {
   ReportingLog log_;
   std::shared_ptr<SyncClient> client_;
 };
+
+/// Runs a sync or a restore, tells its result, and gives the exit code. A first signal interrupts
+/// it; `work` is what it is called in front of people.
+ExitCode runVisit(CommandContext& context, device::EmbeddedDevice& device, std::string_view work,
+                  const std::function<SyncResult(PluginSession& loaded, Reporter& reporter,
+                                                 Interruption& interruption)>& run);
+
+/// That of a visit that was not interrupted.
+ExitCode exitCodeOf(const SyncResult& result);
 
 }  // namespace appsync::host

@@ -41,11 +41,6 @@ void reportUnreadable(const std::optional<Library>& library, Reporter& reporter)
   for (const UnreadablePackage& file : library->unreadable) reporter.report(file);
 }
 
-ExitCode exitCode(const SyncResult& result, bool interrupted) {
-  if (interrupted) return ExitCode::Interrupted;
-  return result.completed && result.summary.failed.empty() ? ExitCode::Done : ExitCode::SomeFailed;
-}
-
 ExitCode runRestore(const RestoreOptions& options, CommandContext& context) {
   RestoreInput input = readInput(options);
   const auto device = context.openDevice(device::Access::Write);
@@ -57,23 +52,14 @@ ExitCode runRestore(const RestoreOptions& options, CommandContext& context) {
   }
   input.installingAllowed =
       device->policy(PolicySetting::AppInstallationAllowed) != PolicyValue::ExplicitlyNo;
-  const auto reporter = context.makeReporter();
-  Interruption interruption;
-  const auto plugin = loadPlugin(context);
-  PluginSession loaded(*plugin, SyncHostBundleIdentifier, *device, interruption,
-                       context.verbose ? reporter.get() : nullptr);
-  reportUnreadable(input.packages, *reporter);
-  reportUnreadable(input.catalogue, *reporter);
-  const SignalWatcher signals(interruption);
-  SyncResult result;
-  {
-    Restore restore(loaded.client(), loaded.host(), restorePhoneOf(*device), *reporter,
-                    interruption);
-    result = restore.run(input);
-  }
-  reporter->report(result.summary);
-  context.tellIfUnseen("restore");
-  return exitCode(result, interruption.requested());
+  return runVisit(context, *device, "restore",
+                  [&](PluginSession& loaded, Reporter& reporter, Interruption& interruption) {
+                    reportUnreadable(input.packages, reporter);
+                    reportUnreadable(input.catalogue, reporter);
+                    return Restore(loaded.client(), loaded.host(), restorePhoneOf(*device),
+                                   reporter, interruption)
+                        .run(input);
+                  });
 }
 
 }  // namespace

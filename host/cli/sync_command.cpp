@@ -58,18 +58,14 @@ void reportPlan(const SyncInput& input, Reporter& reporter) {
   for (const PlannedEntry& entry : input.plan.entries) reporter.report(entry);
 }
 
-ExitCode finish(const SyncResult& result, bool interrupted, Reporter& reporter) {
-  reporter.report(result.summary);
-  if (interrupted) return ExitCode::Interrupted;
-  const bool good = result.completed && result.summary.failed.empty();
-  return good ? ExitCode::Done : ExitCode::SomeFailed;
-}
-
 ExitCode dryRun(const SyncInput& input, Reporter& reporter) {
+  reportPlan(input, reporter);
   SyncPlan nothing;
   nothing.skipped = input.plan.skipped;
   nothing.failed = input.plan.failed;
-  return finish({settle(nothing, input.library, {}), true}, false, reporter);
+  const SyncResult result{settle(nothing, input.library, {}), true};
+  reporter.report(result.summary);
+  return exitCodeOf(result);
 }
 
 ExitCode runSync(const SyncOptions& options, CommandContext& context) {
@@ -77,26 +73,14 @@ ExitCode runSync(const SyncOptions& options, CommandContext& context) {
   const auto device =
       context.openDevice(options.dryRun ? device::Access::ReadOnly : device::Access::Write);
   plan(input, options.plan, *device);
-  const auto reporter = context.makeReporter(options.dryRun);
-  if (options.dryRun) {
-    reportPlan(input, *reporter);
-    return dryRun(input, *reporter);
-  }
-
-  Interruption interruption;
-  const auto plugin = loadPlugin(context);
-  PluginSession loaded(*plugin, SyncHostBundleIdentifier, *device, interruption,
-                       context.verbose ? reporter.get() : nullptr);
-  reportPlan(input, *reporter);
-  const SignalWatcher signals(interruption);
-  SyncResult result;
-  {
-    Session session(loaded.client(), loaded.host(), phoneOf(*device), *reporter, interruption);
-    result = session.run(input);
-  }
-  const ExitCode code = finish(result, interruption.requested(), *reporter);
-  context.tellIfUnseen("sync");
-  return code;
+  if (options.dryRun) return dryRun(input, *context.makeReporter(true));
+  return runVisit(context, *device, "sync",
+                  [&](PluginSession& loaded, Reporter& reporter, Interruption& interruption) {
+                    reportPlan(input, reporter);
+                    return Session(loaded.client(), loaded.host(), phoneOf(*device), reporter,
+                                   interruption)
+                        .run(input);
+                  });
 }
 
 /// Clearing takes every placeholder away, and with it what is left of its application.
