@@ -72,7 +72,7 @@ std::optional<LibraryPackage> describe(const std::filesystem::path& file, const 
     reason = "its Info.plist names no KBBundleIdentifier";
     return std::nullopt;
   }
-  if (!isUsableIdentifier(*identifier)) {
+  if (!isSendableIdentifier(*identifier)) {
     reason = fmt::format("its identifier \"{}\" cannot be used", printable(*identifier));
     return std::nullopt;
   }
@@ -128,7 +128,7 @@ bool isPicture(std::string_view name) {
 
 }  // namespace
 
-bool isUsableIdentifier(std::string_view identifier) {
+bool isSendableIdentifier(std::string_view identifier) {
   return device::isUsableIdentifier(identifier) && identifier.front() != '.' &&
          std::find(ReservedNames.begin(), ReservedNames.end(), identifier) == ReservedNames.end();
 }

@@ -13,7 +13,7 @@ namespace appsync::host {
 
 /// Whether an application of this identifier can be sent: the phone takes it, and it is no hidden
 /// name nor one that the exchange with the phone keeps for itself.
-bool isUsableIdentifier(std::string_view identifier);
+bool isSendableIdentifier(std::string_view identifier);
 
 /// The endings by which a file counts as a package, in lower case: ".zip", ".tar.gz", ...
 std::span<const std::string_view> packageEndings();

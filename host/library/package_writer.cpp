@@ -166,7 +166,7 @@ class Packer {
       return fail(printable(path.string()) + " is no property list with a dictionary");
     }
     const std::string* identifier = findString(*info->asDictionary(), KBBundleIdentifier);
-    if (!identifier || !isUsableIdentifier(*identifier)) {
+    if (!identifier || !isSendableIdentifier(*identifier)) {
       return fail(printable(path.string()) + " has no usable KBBundleIdentifier");
     }
     const std::string* executable = findString(*info->asDictionary(), KBBundleExecutable);

@@ -94,7 +94,7 @@ class HandoverInProgress {
     }
     for (const BackedUpApplication& app : list_.applications()) {
       if (result_.installed.contains(app.identifier) || isRestoring(app.identifier)) continue;
-      if (!isUsableIdentifier(app.identifier)) {
+      if (!isSendableIdentifier(app.identifier)) {
         result_.failures[app.identifier] = app.flaw;
         continue;
       }

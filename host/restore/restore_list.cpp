@@ -19,7 +19,7 @@ BackedUpApplication describe(const std::string& identifier, const PropertyList& 
   const Bytes* bytes = value ? value->asData() : nullptr;
   const auto parsed = bytes ? parsePropertyList(*bytes) : std::nullopt;
   const PropertyList::Dictionary* metadata = parsed ? parsed->asDictionary() : nullptr;
-  if (!isUsableIdentifier(identifier)) {
+  if (!isSendableIdentifier(identifier)) {
     app.flaw = "no application can have this identifier";
   } else if (!bytes) {
     app.flaw = "the backup holds no metadata of it";

@@ -93,8 +93,8 @@ std::optional<std::string> packagedApplication(const std::string& name) {
   std::string_view ending = packageEnding(name);
   if (ending.empty() && name.ends_with(PlainEnding)) ending = PlainEnding;
   const std::string identifier = name.substr(0, name.size() - ending.size());
-  return ending.empty() || !isUsableIdentifier(identifier) ? std::nullopt
-                                                           : std::optional(identifier);
+  return ending.empty() || !isSendableIdentifier(identifier) ? std::nullopt
+                                                             : std::optional(identifier);
 }
 
 /// Taken to be so when that cannot be told.

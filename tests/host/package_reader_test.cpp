@@ -99,14 +99,14 @@ TEST_F(PackageReading, TakesControlCharactersOutOfTheName) {
 }
 
 TEST(Identifiers, AreUsableWhenThePhoneCanKeepThemApart) {
-  EXPECT_TRUE(isUsableIdentifier("com.example.app-2_b"));
-  EXPECT_FALSE(isUsableIdentifier(""));
-  EXPECT_FALSE(isUsableIdentifier(".."));
-  EXPECT_FALSE(isUsableIdentifier(".hidden"));
-  EXPECT_FALSE(isUsableIdentifier("a/b"));
-  EXPECT_FALSE(isUsableIdentifier("a b"));
-  EXPECT_FALSE(isUsableIdentifier("ApplicationsSync.plist"));
-  EXPECT_FALSE(isUsableIdentifier(std::string(300, 'a')));
+  EXPECT_TRUE(isSendableIdentifier("com.example.app-2_b"));
+  EXPECT_FALSE(isSendableIdentifier(""));
+  EXPECT_FALSE(isSendableIdentifier(".."));
+  EXPECT_FALSE(isSendableIdentifier(".hidden"));
+  EXPECT_FALSE(isSendableIdentifier("a/b"));
+  EXPECT_FALSE(isSendableIdentifier("a b"));
+  EXPECT_FALSE(isSendableIdentifier("ApplicationsSync.plist"));
+  EXPECT_FALSE(isSendableIdentifier(std::string(300, 'a')));
 }
 
 TEST_F(PackageReading, CollectsWhatThePhoneShowsBeforeThePackageArrives) {
