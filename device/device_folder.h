@@ -5,8 +5,8 @@
 #include <string>
 #include <string_view>
 
+#include "base/file_descriptor.h"
 #include "device/base/device_types.h"
-#include "device/base/file_descriptor.h"
 
 namespace appsync::device {
 

@@ -5,12 +5,12 @@
 #include <algorithm>
 #include <cerrno>
 
+#include "base/identifiers.h"
 #include "device/apps/app_registry.h"
 #include "device/apps/application_data.h"
 #include "device/apps/installer_service.h"
 #include "device/apps/installs.h"
 #include "device/apps/launching.h"
-#include "device/base/identifiers.h"
 #include "device/coordination/install_coordination_service.h"
 #include "device/coordination/no_coordination.h"
 #include "device/files/file_receiver.h"

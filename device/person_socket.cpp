@@ -15,7 +15,7 @@
 #include <string>
 #include <system_error>
 
-#include "device/base/identifiers.h"
+#include "base/identifiers.h"
 
 namespace appsync::device {
 namespace {

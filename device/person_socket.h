@@ -6,7 +6,7 @@
 #include <string_view>
 #include <thread>
 
-#include "device/base/file_descriptor.h"
+#include "base/file_descriptor.h"
 #include "device/device_folder.h"
 #include "platform/error.h"
 

@@ -9,14 +9,15 @@
 #include <cstdlib>
 #include <filesystem>
 
-#include "device/base/directory_tree.h"
-#include "device/base/file_descriptor.h"
-#include "device/base/identifiers.h"
+#include "base/directory_tree.h"
+#include "base/file_descriptor.h"
+#include "base/identifiers.h"
 #include "device/packages/package_extractor.h"
 
 namespace {
 
 namespace fs = std::filesystem;
+using namespace appsync;
 using namespace appsync::device;
 
 void require(bool condition) {

@@ -1,8 +1,9 @@
 #!/usr/bin/env python3
 """Checks that every #include follows the layers: arrows only ever point down to platform/.
 
-    host/                                              may include platform/, device/
-    device/                                            may include platform/
+    host/                                              may include platform/, base/, device/
+    device/                                            may include platform/, base/
+    base/                                              may include platform/
     client/ sync/ transfer/ coordination/ restore/     the plug-in: may include platform/ and itself
     platform/                                          may include nothing of the others
 
@@ -21,11 +22,12 @@ import re
 import sys
 
 PLUGIN = {"client", "sync", "transfer", "coordination", "restore"}
-LAYERS = PLUGIN | {"platform", "device", "host"}
+LAYERS = PLUGIN | {"platform", "base", "device", "host"}
 MAY_INCLUDE = {folder: PLUGIN | {"platform"} for folder in PLUGIN} | {
     "platform": {"platform"},
-    "device": {"device", "platform"},
-    "host": {"host", "device", "platform"},
+    "base": {"base", "platform"},
+    "device": {"device", "base", "platform"},
+    "host": {"host", "device", "base", "platform"},
 }
 ORDER = {
     "device": "base files state journal icons packages home services apps coordination".split(),

@@ -4,11 +4,11 @@
 
 #include <cerrno>
 
+#include "base/identifiers.h"
 #include "device/apps/demotion.h"
 #include "device/apps/installs.h"
 #include "device/apps/person_wishes.h"
 #include "device/apps/removal.h"
-#include "device/base/identifiers.h"
 #include "device/state/application_rows.h"
 #include "platform/bundle.h"
 

@@ -9,10 +9,10 @@
 #include <cerrno>
 #include <new>
 
+#include "base/directory_tree.h"
+#include "base/temporary_file.h"
 #include "device/apps/idle_application.h"
 #include "device/apps/removal.h"
-#include "device/base/directory_tree.h"
-#include "device/base/temporary_file.h"
 #include "device/journal/history.h"
 #include "device/packages/data_archive.h"
 #include "device/packages/package_names.h"

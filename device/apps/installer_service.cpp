@@ -1,6 +1,6 @@
 #include "device/apps/installer_service.h"
 
-#include "device/base/clock.h"
+#include "device/state/clock.h"
 
 namespace appsync::device {
 

@@ -4,7 +4,7 @@
 
 #include <cerrno>
 
-#include "device/base/identifiers.h"
+#include "base/identifiers.h"
 #include "device/coordination/coordinated_installs.h"
 #include "device/coordination/coordination_values.h"
 #include "device/state/application_rows.h"

@@ -5,8 +5,8 @@
 #include <algorithm>
 #include <cerrno>
 
+#include "base/identifiers.h"
 #include "device/apps/removal.h"
-#include "device/base/identifiers.h"
 #include "device/coordination/coordination_handles.h"
 #include "device/state/application_rows.h"
 #include "platform/existence.h"

@@ -8,7 +8,7 @@
 #include <array>
 #include <cerrno>
 
-#include "device/base/temporary_file.h"
+#include "base/temporary_file.h"
 #include "platform/existence.h"
 #include "platform/sync_files.h"
 

@@ -11,7 +11,7 @@
 #include <cerrno>
 #include <new>
 
-#include "device/base/temporary_file.h"
+#include "base/temporary_file.h"
 
 namespace appsync::device {
 

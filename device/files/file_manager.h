@@ -4,8 +4,8 @@
 
 #include <filesystem>
 
-#include "device/base/confined_directory.h"
-#include "device/base/directory_tree.h"
+#include "base/confined_directory.h"
+#include "base/directory_tree.h"
 #include "platform/file_manager.h"
 
 namespace appsync::device {

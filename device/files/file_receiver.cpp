@@ -4,7 +4,7 @@
 
 #include <cerrno>
 
-#include "device/base/temporary_file.h"
+#include "base/temporary_file.h"
 
 namespace appsync::device {
 

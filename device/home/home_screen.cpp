@@ -3,7 +3,7 @@
 #include <cerrno>
 #include <set>
 
-#include "device/base/identifiers.h"
+#include "base/identifiers.h"
 #include "device/home/icon_order.h"
 #include "device/state/application_rows.h"
 #include "platform/property_list_codec.h"

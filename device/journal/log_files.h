@@ -6,8 +6,8 @@
 #include <mutex>
 #include <string>
 
+#include "base/file_descriptor.h"
 #include "device/base/device_types.h"
-#include "device/base/file_descriptor.h"
 #include "platform/log.h"
 
 namespace appsync::device {

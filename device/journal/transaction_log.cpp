@@ -1,6 +1,6 @@
 #include "device/journal/transaction_log.h"
 
-#include "device/base/clock.h"
+#include "device/state/clock.h"
 
 namespace appsync::device {
 namespace {

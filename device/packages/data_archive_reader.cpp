@@ -11,8 +11,8 @@
 #include <string>
 #include <vector>
 
-#include "device/base/confined_directory.h"
-#include "device/base/file_descriptor.h"
+#include "base/confined_directory.h"
+#include "base/file_descriptor.h"
 #include "device/packages/data_archive.h"
 #include "device/packages/package_names.h"
 

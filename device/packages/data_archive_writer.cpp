@@ -12,8 +12,8 @@
 #include <string>
 #include <vector>
 
-#include "device/base/directory_tree.h"
-#include "device/base/file_descriptor.h"
+#include "base/directory_tree.h"
+#include "base/file_descriptor.h"
 #include "device/packages/data_archive.h"
 
 namespace appsync::device {

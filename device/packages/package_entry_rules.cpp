@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "device/base/temporary_file.h"
+#include "base/temporary_file.h"
 #include "device/packages/package_names.h"
 #include "platform/installer_service.h"
 #include "platform/sync_files.h"

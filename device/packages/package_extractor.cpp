@@ -6,7 +6,7 @@
 #include <cerrno>
 #include <new>
 
-#include "device/base/identifiers.h"
+#include "base/identifiers.h"
 #include "device/packages/package_entry_rules.h"
 #include "device/packages/package_names.h"
 #include "device/packages/package_reader.h"

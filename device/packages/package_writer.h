@@ -4,7 +4,7 @@
 #include <string>
 #include <string_view>
 
-#include "device/base/confined_directory.h"
+#include "base/confined_directory.h"
 
 namespace appsync::device {
 

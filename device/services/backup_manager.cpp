@@ -1,6 +1,6 @@
 #include "device/services/backup_manager.h"
 
-#include "device/base/identifiers.h"
+#include "base/identifiers.h"
 
 namespace appsync::device {
 

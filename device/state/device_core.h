@@ -1,9 +1,9 @@
 #pragma once
 
-#include "device/base/keyed_mutex.h"
 #include "device/files/containers.h"
 #include "device/state/database.h"
 #include "device/state/foreground.h"
+#include "device/state/keyed_mutex.h"
 #include "device/state/registry_observers.h"
 #include "device/state/watcher_slot.h"
 

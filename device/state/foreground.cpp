@@ -9,7 +9,7 @@
 #include <algorithm>
 #include <cerrno>
 
-#include "device/base/directory_tree.h"
+#include "base/directory_tree.h"
 
 namespace appsync::device {
 namespace {

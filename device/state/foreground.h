@@ -8,7 +8,7 @@
 #include <string_view>
 #include <vector>
 
-#include "device/base/file_descriptor.h"
+#include "base/file_descriptor.h"
 #include "platform/error.h"
 #include "platform/home_screen_service.h"
 

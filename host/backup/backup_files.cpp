@@ -9,7 +9,7 @@
 #include <cerrno>
 #include <system_error>
 
-#include "device/base/confined_directory.h"
+#include "base/confined_directory.h"
 #include "host/base/text.h"
 #include "platform/property_list_codec.h"
 
@@ -38,10 +38,10 @@ bool readWhole(int fd, Bytes& bytes) {
 
 }  // namespace
 
-device::FileDescriptor openBackupFile(const std::filesystem::path& path, std::uint64_t& size,
-                                      BackupProblem& problem) {
+FileDescriptor openBackupFile(const std::filesystem::path& path, std::uint64_t& size,
+                              BackupProblem& problem) {
   const std::string name = printable(path.filename().string());
-  const auto top = device::ConfinedDirectory::open("/", device::Confinement::Beneath);
+  const auto top = ConfinedDirectory::open("/", Confinement::Beneath);
   if (!top.isOpen()) {
     problem = problemOf(name, errno);
     return {};

@@ -5,7 +5,7 @@
 #include <optional>
 #include <string>
 
-#include "device/base/file_descriptor.h"
+#include "base/file_descriptor.h"
 #include "host/backup/backup_folder.h"
 #include "host/backup/backup_manifest.h"
 
@@ -14,8 +14,8 @@ namespace appsync::host {
 // How a backup is read from its folder, whose path must hold no link.
 
 /// A regular file reached through no link. Not valid, with a problem, for anything else.
-device::FileDescriptor openBackupFile(const std::filesystem::path& path, std::uint64_t& size,
-                                      BackupProblem& problem);
+FileDescriptor openBackupFile(const std::filesystem::path& path, std::uint64_t& size,
+                              BackupProblem& problem);
 /// The number of bytes read, 0 at the end, -1 with errno set.
 std::int64_t readSome(int fd, std::uint8_t* bytes, std::size_t size);
 std::optional<BackupManifest> readBackupManifest(const std::filesystem::path& folder,

@@ -4,7 +4,7 @@
 
 #include <algorithm>
 
-#include "device/base/identifiers.h"
+#include "base/identifiers.h"
 #include "host/backup/backup_folder.h"
 #include "host/base/text.h"
 #include "platform/property_list_codec.h"
@@ -70,7 +70,7 @@ std::string backupDataName(std::string_view identifier) {
 std::string_view identifierOfBackupData(std::string_view name) {
   if (!name.ends_with(ArchiveSuffix)) return {};
   name.remove_suffix(ArchiveSuffix.size());
-  return device::isUsableIdentifier(name) ? name : std::string_view();
+  return isUsableIdentifier(name) ? name : std::string_view();
 }
 
 std::optional<BackupManifest> parseManifest(ByteView bytes, std::string& problem) {

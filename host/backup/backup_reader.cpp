@@ -105,7 +105,7 @@ struct BackupFileReader::State {
   }
 
   const BackupFile file;
-  device::FileDescriptor descriptor;
+  FileDescriptor descriptor;
   Sha256 digest;
   std::uint64_t position = 0;
   bool ended = false;

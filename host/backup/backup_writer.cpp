@@ -12,9 +12,9 @@
 #include <system_error>
 #include <vector>
 
-#include "device/base/directory_tree.h"
-#include "device/base/file_descriptor.h"
-#include "device/base/identifiers.h"
+#include "base/directory_tree.h"
+#include "base/file_descriptor.h"
+#include "base/identifiers.h"
 #include "host/backup/backup_files.h"
 #include "host/backup/backup_folder.h"
 #include "host/backup/backup_manifest.h"
@@ -26,7 +26,6 @@ namespace appsync::host {
 namespace {
 
 namespace fs = std::filesystem;
-using device::FileDescriptor;
 
 constexpr std::string_view UnfinishedMark = ".partial-";
 constexpr std::size_t UnfinishedDigits = 6;
@@ -69,7 +68,7 @@ bool isForeign(const std::string& name) {
 std::optional<BackupProblem> objectionToContents(Target& target) {
   std::vector<std::string> names;
   const FileDescriptor folder = openFolder(target.parent.get(), target.name());
-  if (!folder || !device::listNames(folder.get(), names)) return refusedBySystem(errno);
+  if (!folder || !listNames(folder.get(), names)) return refusedBySystem(errno);
   if (names.empty()) return std::nullopt;
   BackupProblem problem;
   if (!readBackupManifest(target.path, problem)) {
@@ -126,7 +125,7 @@ void sweep(const Target& target) {
   for (const std::string& name : names) {
     if (!isUnfinished(name, target.name())) continue;
     const FileDescriptor folder = openFolder(target.parent.get(), name);
-    if (folder && lockFolder(folder.get())) device::removeTree(target.parent.get(), name);
+    if (folder && lockFolder(folder.get())) removeTree(target.parent.get(), name);
   }
 }
 
@@ -136,7 +135,7 @@ class FolderWriter final : public BackupWriter {
 
   ~FolderWriter() override {
     file_.reset();
-    if (!unfinished_.empty()) device::removeTree(target_.parent.get(), unfinished_);
+    if (!unfinished_.empty()) removeTree(target_.parent.get(), unfinished_);
   }
 
   bool begin() {
@@ -174,13 +173,13 @@ class FolderWriter final : public BackupWriter {
 
   bool beginData(std::string_view identifier) override {
     identifier_ = identifier;
-    if (!device::isUsableIdentifier(identifier)) return fail(identifier_, EINVAL);
+    if (!isUsableIdentifier(identifier)) return fail(identifier_, EINVAL);
     return create(data_.get(), backupDataName(identifier));
   }
 
   bool append(ByteView contents) override {
     if (!problem_.empty()) return false;
-    if (!device::writeAll(file_.get(), contents)) return fail(name_, errno);
+    if (!writeAll(file_.get(), contents)) return fail(name_, errno);
     digest_.add(contents);
     size_ += contents.size();
     return true;
@@ -248,7 +247,7 @@ class FolderWriter final : public BackupWriter {
 
   bool syncFile(int directory, const std::string& name) {
     const FileDescriptor file(::openat(directory, name.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
-    return (file && device::syncToDisk(file.get())) || fail(name, errno);
+    return (file && syncToDisk(file.get())) || fail(name, errno);
   }
 
   /// All at the end: one by one would wait for the disk as often as there are files.
@@ -259,8 +258,8 @@ class FolderWriter final : public BackupWriter {
     for (const auto& [name, entry] : manifest_.files) {
       if (!syncFile(folder_.get(), name)) return false;
     }
-    return (device::syncToDisk(data_.get()) || fail(std::string(BackupDataFolder), errno)) &&
-           (device::syncToDisk(folder_.get()) || fail("", errno));
+    return (syncToDisk(data_.get()) || fail(std::string(BackupDataFolder), errno)) &&
+           (syncToDisk(folder_.get()) || fail("", errno));
   }
 
   bool takePlace() {
@@ -276,9 +275,9 @@ class FolderWriter final : public BackupWriter {
     } else {
       unfinished_.clear();
     }
-    if (!device::syncToDisk(parent)) return fail("", errno);
+    if (!syncToDisk(parent)) return fail("", errno);
     // The older backup, now under the other name. What cannot be removed is swept the next time.
-    if (!unfinished_.empty()) device::removeTree(parent, std::exchange(unfinished_, {}));
+    if (!unfinished_.empty()) removeTree(parent, std::exchange(unfinished_, {}));
     return true;
   }
 

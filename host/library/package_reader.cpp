@@ -6,7 +6,7 @@
 #include <array>
 #include <map>
 
-#include "device/base/identifiers.h"
+#include "base/identifiers.h"
 #include "host/base/archive_reader.h"
 #include "host/base/text.h"
 #include "platform/bundle.h"
@@ -129,7 +129,7 @@ bool isPicture(std::string_view name) {
 }  // namespace
 
 bool isSendableIdentifier(std::string_view identifier) {
-  return device::isUsableIdentifier(identifier) && identifier.front() != '.' &&
+  return isUsableIdentifier(identifier) && identifier.front() != '.' &&
          std::find(ReservedNames.begin(), ReservedNames.end(), identifier) == ReservedNames.end();
 }
 

@@ -8,7 +8,7 @@
 
 #include <algorithm>
 
-#include "device/base/temporary_file.h"
+#include "base/temporary_file.h"
 #include "device/files/containers.h"
 #include "device/packages/data_archive.h"
 #include "tests/device/data_trees.h"

@@ -1,11 +1,11 @@
-#include "device/base/directory_tree.h"
+#include "base/directory_tree.h"
 
 #include <fcntl.h>
 #include <grp.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "device/base/file_descriptor.h"
+#include "base/file_descriptor.h"
 #include "tests/device/device_test.h"
 
 namespace appsync::device {

@@ -7,7 +7,7 @@
 #include <string_view>
 #include <vector>
 
-#include "device/base/file_descriptor.h"
+#include "base/file_descriptor.h"
 #include "device/packages/package_extractor.h"
 #include "tests/fakes/temporary_folder.h"
 

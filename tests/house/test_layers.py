@@ -53,6 +53,13 @@ class Layers(unittest.TestCase):
         self.assertRefused("device/a.h", '#include "transfer/queue.h"\n', "must not know transfer/")
         self.assertRefused("device/a.h", '#include "host/loader.h"\n', "must not know host/")
 
+    def test_base_knows_only_the_platform_and_the_plugin_does_not_know_it(self):
+        self.assertAllowed("base/a.cpp", '#include "platform/log.h"\n#include <unistd.h>\n')
+        for header in ("device/b.h", "host/b.h", "client/b.h"):
+            self.assertRefused("base/a.h", f'#include "{header}"\n', "must not know")
+        for path in ("sync/a.cpp", "platform/a.h"):
+            self.assertRefused(path, '#include "base/b.h"\n', "must not know base/")
+
     def test_host_meets_the_plugin_only_through_the_platform(self):
         for folder in ("client", "sync", "transfer", "coordination", "restore"):
             self.assertRefused("host/a.cpp", f'#include "{folder}/x.h"\n', "must not know")
@@ -82,6 +89,8 @@ class Layers(unittest.TestCase):
         self.assertAllowed("sync/a.cpp", '// #include "host/a.h"\n/*\n#include "host/b.h"\n*/\n')
 
     def test_what_the_layers_allow(self):
+        self.assertAllowed("device/a.cpp", '#include "base/b.h"\n')
+        self.assertAllowed("host/a.cpp", '#include "base/b.h"\n')
         self.assertAllowed("sync/a.cpp", '#include "transfer/b.h"\n#include "platform/log.h"\n')
         self.assertAllowed("host/a.cpp", '#include "device/b.h"\n#include <unistd.h>\n')
         self.assertAllowed("device/a.cpp", '#include "platform/log.h"\n#include <sqlite3.h>\n')

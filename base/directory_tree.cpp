@@ -1,4 +1,4 @@
-#include "device/base/directory_tree.h"
+#include "base/directory_tree.h"
 
 #include <dirent.h>
 #include <fcntl.h>
@@ -10,10 +10,10 @@
 #include <climits>
 #include <vector>
 
-#include "device/base/file_descriptor.h"
-#include "device/base/temporary_file.h"
+#include "base/file_descriptor.h"
+#include "base/temporary_file.h"
 
-namespace appsync::device {
+namespace appsync {
 
 namespace {
 
@@ -176,4 +176,4 @@ void removeTemporaryFiles(int directory, Reach reach) noexcept {
   removeTemporaries(directory, reach, 0);
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -1,4 +1,4 @@
-#include "device/base/temporary_file.h"
+#include "base/temporary_file.h"
 
 #include <fcntl.h>
 #include <sys/random.h>
@@ -8,7 +8,7 @@
 #include <cerrno>
 #include <cstdio>
 
-namespace appsync::device {
+namespace appsync {
 
 namespace {
 
@@ -52,4 +52,4 @@ bool TemporaryFile::takePlaceOf(const std::string& name, Durability durability) 
   return !durable || syncToDisk(directory_);
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

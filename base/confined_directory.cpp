@@ -1,4 +1,4 @@
-#include "device/base/confined_directory.h"
+#include "base/confined_directory.h"
 
 #include <fcntl.h>
 #include <linux/openat2.h>
@@ -8,7 +8,7 @@
 #include <cerrno>
 #include <string>
 
-namespace appsync::device {
+namespace appsync {
 
 namespace {
 
@@ -52,4 +52,4 @@ FileDescriptor ConfinedDirectory::openDirectoryAt(std::string_view path) const n
   return openAt(path, O_RDONLY | O_DIRECTORY);
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -5,7 +5,7 @@
 
 #include "platform/bytes.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// Owns an open descriptor and closes it. Not valid: -1.
 class FileDescriptor {
@@ -39,4 +39,4 @@ bool syncToDisk(int fd) noexcept;
 /// Puts everything of the descriptor's file system on disk.
 bool syncFileSystem(int fd) noexcept;
 
-}  // namespace appsync::device
+}  // namespace appsync

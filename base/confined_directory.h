@@ -5,9 +5,9 @@
 #include <filesystem>
 #include <string_view>
 
-#include "device/base/file_descriptor.h"
+#include "base/file_descriptor.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// How names are resolved below a directory. Neither way ever leads out of it, also while others
 /// move and link things about, and links of /proc that jump to open files are never followed.
@@ -44,4 +44,4 @@ class ConfinedDirectory {
   Confinement confinement_;
 };
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -3,7 +3,7 @@
 #include <string>
 #include <vector>
 
-namespace appsync::device {
+namespace appsync {
 
 /// The names in an open directory, in any order. False with errno set.
 bool listNames(int directory, std::vector<std::string>& names);
@@ -26,4 +26,4 @@ enum class Reach { Here, AllBelow };
 /// as that can be done.
 void removeTemporaryFiles(int directory, Reach reach) noexcept;
 
-}  // namespace appsync::device
+}  // namespace appsync

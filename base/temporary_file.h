@@ -3,9 +3,9 @@
 #include <string>
 #include <string_view>
 
-#include "device/base/file_descriptor.h"
+#include "base/file_descriptor.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// A name that nothing in any directory has by chance.
 std::string makeTemporaryName();
@@ -39,4 +39,4 @@ class TemporaryFile {
   FileDescriptor file_;
 };
 
-}  // namespace appsync::device
+}  // namespace appsync

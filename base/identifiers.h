@@ -2,11 +2,11 @@
 
 #include <string_view>
 
-namespace appsync::device {
+namespace appsync {
 
 /// Whether a bundle identifier from outside may become the name of a file or directory: letters,
 /// digits, '.', '_' and '-', at least one of them a letter or digit, at most 200 bytes, and no
 /// temporary name, which is swept.
 bool isUsableIdentifier(std::string_view identifier);
 
-}  // namespace appsync::device
+}  // namespace appsync

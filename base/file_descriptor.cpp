@@ -1,10 +1,10 @@
-#include "device/base/file_descriptor.h"
+#include "base/file_descriptor.h"
 
 #include <unistd.h>
 
 #include <cerrno>
 
-namespace appsync::device {
+namespace appsync {
 
 namespace {
 
@@ -47,4 +47,4 @@ bool syncToDisk(int fd) noexcept { return ::fsync(fd) == 0; }
 
 bool syncFileSystem(int fd) noexcept { return ::syncfs(fd) == 0; }
 
-}  // namespace appsync::device
+}  // namespace appsync

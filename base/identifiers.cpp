@@ -1,10 +1,10 @@
-#include "device/base/identifiers.h"
+#include "base/identifiers.h"
 
 #include <algorithm>
 
-#include "device/base/temporary_file.h"
+#include "base/temporary_file.h"
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 constexpr std::size_t MaximumLength = 200;  // leaves room for a suffix within NAME_MAX
@@ -22,4 +22,4 @@ bool isUsableIdentifier(std::string_view identifier) {
          std::ranges::any_of(identifier, isAlphanumeric) && !isTemporaryName(identifier);
 }
 
-}  // namespace appsync::device
+}  // namespace appsync
