@@ -6,7 +6,7 @@
 #include <string_view>
 
 #include "base/file_descriptor.h"
-#include "device/base/device_types.h"
+#include "device/device_opening.h"
 
 namespace appsync::device {
 

@@ -8,7 +8,11 @@
 #include <string_view>
 #include <vector>
 
-#include "device/base/device_types.h"
+#include "base/data_stream.h"
+#include "device/device_opening.h"
+#include "device/files/file_receiver.h"
+#include "device/journal/records.h"
+#include "device/state/device_watcher.h"
 #include "platform/platform.h"
 
 namespace appsync::device {

@@ -3,7 +3,7 @@
 #include <filesystem>
 #include <memory>
 
-#include "device/base/device_types.h"
+#include "device/device_opening.h"
 #include "device/state/database.h"
 
 namespace appsync::device {

@@ -30,7 +30,7 @@ MAY_INCLUDE = {folder: PLUGIN | {"platform"} for folder in PLUGIN} | {
     "host": {"host", "device", "base", "platform"},
 }
 ORDER = {
-    "device": "base files state journal icons packages home services apps coordination".split(),
+    "device": "files state journal icons packages home services apps coordination".split(),
     "host": "base library report phone home_screen transfer sync backup restore cli".split(),
 }
 STANDARD_ONLY = PLUGIN | {"platform"}

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "device/base/device_types.h"
+#include "base/data_stream.h"
 #include "device/state/device_core.h"
 
 namespace appsync::device {

@@ -2,6 +2,7 @@
 
 #include <string>
 
+#include "device/journal/records.h"
 #include "device/packages/package_extractor.h"
 #include "device/state/application_rows.h"
 #include "device/state/device_core.h"

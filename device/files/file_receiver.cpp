@@ -5,6 +5,7 @@
 #include <cerrno>
 
 #include "base/temporary_file.h"
+#include "device/files/file_manager.h"
 
 namespace appsync::device {
 

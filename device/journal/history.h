@@ -4,7 +4,7 @@
 #include <optional>
 #include <vector>
 
-#include "device/base/device_types.h"
+#include "device/journal/records.h"
 #include "device/state/database.h"
 
 namespace appsync::device {

@@ -7,7 +7,7 @@
 #include <string>
 
 #include "base/file_descriptor.h"
-#include "device/base/device_types.h"
+#include "device/journal/records.h"
 #include "platform/log.h"
 
 namespace appsync::device {

@@ -5,7 +5,7 @@
 #include <string>
 #include <string_view>
 
-#include "device/base/device_types.h"
+#include "device/journal/records.h"
 
 namespace appsync::device {
 

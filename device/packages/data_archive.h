@@ -5,7 +5,7 @@
 #include <optional>
 #include <string_view>
 
-#include "device/base/device_types.h"
+#include "base/data_stream.h"
 #include "platform/error.h"
 
 namespace appsync::device {

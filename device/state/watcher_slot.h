@@ -5,7 +5,7 @@
 #include <shared_mutex>
 #include <string_view>
 
-#include "device/base/device_types.h"
+#include "device/state/device_watcher.h"
 
 namespace appsync::device {
 

@@ -96,8 +96,9 @@ PropertyList::Array arrayOf(const std::set<std::string>& identifiers) {
 BackupPhone backupPhoneOf(device::EmbeddedDevice& device, SyncHost& host) {
   return {device.platform(host),
           [&device](std::optional<Error>* error) { return device.applications(error); },
-          [&device](std::string_view bundleId, const device::DataSink& sink,
-                    std::optional<Error>* error) { return device.saveData(bundleId, sink, error); },
+          [&device](std::string_view bundleId, const DataSink& sink, std::optional<Error>* error) {
+            return device.saveData(bundleId, sink, error);
+          },
           [&device](std::string_view bundleId, std::optional<Error>* error) {
             return device.opaqueBlob(bundleId, error);
           },

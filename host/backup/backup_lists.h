@@ -16,8 +16,7 @@ struct BackupPhone {
   Platform services;
   // See EmbeddedDevice.
   std::function<std::vector<AppRecord>(std::optional<Error>* error)> applications;
-  std::function<bool(std::string_view bundleId, const device::DataSink& sink,
-                     std::optional<Error>* error)>
+  std::function<bool(std::string_view bundleId, const DataSink& sink, std::optional<Error>* error)>
       saveData;
   std::function<std::optional<Bytes>(std::string_view bundleId, std::optional<Error>* error)>
       opaqueBlob;

@@ -26,22 +26,22 @@ Phone phoneOf(device::EmbeddedDevice& device) {
           [&device](device::DeviceWatcher* watcher) { device.setWatcher(watcher); },
           [&device] { device.hurry(); },
           [&device](std::string_view bundleId) { return device.isBusyWith(bundleId); },
-          [&device](std::string_view bundleId, const device::DataSink& sink,
-                    std::optional<Error>* error) { return device.saveData(bundleId, sink, error); },
+          [&device](std::string_view bundleId, const DataSink& sink, std::optional<Error>* error) {
+            return device.saveData(bundleId, sink, error);
+          },
           [&device](CoordinationClientId client) { return device.packagesOwedBy(client); },
           device.options().coordination ? &device.installCoordination() : nullptr};
 }
 
 RestorePhone restorePhoneOf(device::EmbeddedDevice& device) {
-  return {phoneOf(device), device.homeScreen(),
-          [&device](std::string_view bundleId, const device::DataSource& source,
-                    std::optional<Error>* error) {
-            return device.restoreData(bundleId, source, error);
-          },
-          [&device](std::string_view bundleId, const device::DataSource& source,
-                    std::optional<Error>* error) {
-            return device.overwriteData(bundleId, source, error);
-          }};
+  return {
+      phoneOf(device), device.homeScreen(),
+      [&device](std::string_view bundleId, const DataSource& source, std::optional<Error>* error) {
+        return device.restoreData(bundleId, source, error);
+      },
+      [&device](std::string_view bundleId, const DataSource& source, std::optional<Error>* error) {
+        return device.overwriteData(bundleId, source, error);
+      }};
 }
 
 std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,

@@ -31,8 +31,7 @@ struct Phone {
   std::function<void(device::DeviceWatcher*)> setWatcher;
   std::function<void()> hurry;
   std::function<bool(std::string_view bundleId)> isBusyWith;
-  std::function<bool(std::string_view bundleId, const device::DataSink& sink,
-                     std::optional<Error>* error)>
+  std::function<bool(std::string_view bundleId, const DataSink& sink, std::optional<Error>* error)>
       saveData;
   std::function<std::vector<std::string>(CoordinationClientId client)> packagesOwedBy;
   /// nullptr when installs are not driven through coordinators.
@@ -45,10 +44,10 @@ Phone phoneOf(device::EmbeddedDevice& device);
 /// What a restore needs of a phone beside that. See EmbeddedDevice.
 struct RestorePhone : Phone {
   HomeScreenService& homeScreen;
-  std::function<bool(std::string_view bundleId, const device::DataSource& source,
+  std::function<bool(std::string_view bundleId, const DataSource& source,
                      std::optional<Error>* error)>
       restoreData;
-  std::function<bool(std::string_view bundleId, const device::DataSource& source,
+  std::function<bool(std::string_view bundleId, const DataSource& source,
                      std::optional<Error>* error)>
       overwriteData;
 };

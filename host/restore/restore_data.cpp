@@ -49,7 +49,7 @@ std::string cause(const std::optional<Error>& error) {
   return error ? oneLine(error->localizedDescription()) : "no reason is known";
 }
 
-using Taker = std::function<bool(std::string_view bundleId, const device::DataSource& source,
+using Taker = std::function<bool(std::string_view bundleId, const DataSource& source,
                                  std::optional<Error>* error)>;
 
 std::optional<std::string> giveData(const Taker& taker, const BackedUpApplication& app,

@@ -7,7 +7,7 @@
 #include <map>
 #include <string>
 
-#include "device/base/device_types.h"
+#include "base/data_stream.h"
 #include "tests/fakes/temporary_folder.h"
 
 namespace appsync::device {

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include "device/files/file_manager.h"
 #include "tests/fakes/temporary_folder.h"
 
 namespace appsync::device::testing {

@@ -39,8 +39,9 @@ class BackupRunTest : public ::testing::Test {
   BackupPhone backupPhone() {
     return {phone_.platform(),
             [this](std::optional<Error>* error) { return giveApplications(error); },
-            [this](std::string_view identifier, const device::DataSink& sink,
-                   std::optional<Error>* error) { return giveData(identifier, sink, error); },
+            [this](std::string_view identifier, const DataSink& sink, std::optional<Error>* error) {
+              return giveData(identifier, sink, error);
+            },
             [this](std::string_view identifier, std::optional<Error>* error) {
               const auto blob = blobs_.find(identifier);
               if (identifier == unreadableBlob_) setError(error, Error::posix(EIO));
@@ -61,8 +62,7 @@ class BackupRunTest : public ::testing::Test {
     return all;
   }
 
-  bool giveData(std::string_view identifier, const device::DataSink& sink,
-                std::optional<Error>* error) {
+  bool giveData(std::string_view identifier, const DataSink& sink, std::optional<Error>* error) {
     const auto found = data_.find(identifier);
     const std::string_view data = found == data_.end() ? "" : std::string_view(found->second);
     for (std::size_t begin = 0; begin < data.size(); begin += 1000) {

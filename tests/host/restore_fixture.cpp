@@ -112,40 +112,39 @@ Backup RestoreTest::backup() {
 RestorePhone RestoreTest::restorePhone() {
   Phone base = phoneForHost();
   base.setWatcher = [this](device::DeviceWatcher* watcher) { client.watcher = watcher; };
-  return {std::move(base), phone.homeScreen,
-          [this](std::string_view identifier, const device::DataSource& source,
-                 std::optional<Error>* error) {
-            if (phone.faults.strikes("phone.restoreData", identifier, error)) return false;
-            std::string bytes;
-            std::array<std::uint8_t, 1000> piece{};
-            std::int64_t count = 0;
-            while ((count = source(piece.data(), piece.size())) > 0) {
-              bytes.append(piece.begin(), piece.begin() + count);
-            }
-            if (count < 0) {
-              setError(error, Error::posix(ECANCELED));
-              return false;
-            }
-            phone.trace.add(fakes::TraceCall,
-                            fmt::format("phone.restoreData({}, {})", identifier, bytes));
-            waiting.erase(std::string(identifier));
-            if (!bytes.empty()) waiting.emplace(identifier, bytes);
-            return true;
-          },
-          [this](std::string_view identifier, const device::DataSource& source,
-                 std::optional<Error>* error) {
-            if (phone.faults.strikes("phone.overwriteData", identifier, error)) return false;
-            std::string bytes(1000, 0);
-            const std::int64_t count =
-                source(reinterpret_cast<std::uint8_t*>(bytes.data()), bytes.size());
-            if (count < 0) return false;
-            bytes.resize(static_cast<std::size_t>(count));
-            EXPECT_EQ(source(nullptr, 0), 0);
-            phone.trace.add(fakes::TraceCall,
-                            fmt::format("phone.overwriteData({}, {})", identifier, bytes));
-            owned[std::string(identifier)] = bytes;
-            return true;
-          }};
+  return {
+      std::move(base), phone.homeScreen,
+      [this](std::string_view identifier, const DataSource& source, std::optional<Error>* error) {
+        if (phone.faults.strikes("phone.restoreData", identifier, error)) return false;
+        std::string bytes;
+        std::array<std::uint8_t, 1000> piece{};
+        std::int64_t count = 0;
+        while ((count = source(piece.data(), piece.size())) > 0) {
+          bytes.append(piece.begin(), piece.begin() + count);
+        }
+        if (count < 0) {
+          setError(error, Error::posix(ECANCELED));
+          return false;
+        }
+        phone.trace.add(fakes::TraceCall,
+                        fmt::format("phone.restoreData({}, {})", identifier, bytes));
+        waiting.erase(std::string(identifier));
+        if (!bytes.empty()) waiting.emplace(identifier, bytes);
+        return true;
+      },
+      [this](std::string_view identifier, const DataSource& source, std::optional<Error>* error) {
+        if (phone.faults.strikes("phone.overwriteData", identifier, error)) return false;
+        std::string bytes(1000, 0);
+        const std::int64_t count =
+            source(reinterpret_cast<std::uint8_t*>(bytes.data()), bytes.size());
+        if (count < 0) return false;
+        bytes.resize(static_cast<std::size_t>(count));
+        EXPECT_EQ(source(nullptr, 0), 0);
+        phone.trace.add(fakes::TraceCall,
+                        fmt::format("phone.overwriteData({}, {})", identifier, bytes));
+        owned[std::string(identifier)] = bytes;
+        return true;
+      }};
 }
 
 /// A device installs a package that is complete by itself.

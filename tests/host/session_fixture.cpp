@@ -236,8 +236,7 @@ Phone SessionTest::phoneForHost() {
           [this](device::DeviceWatcher* watcher) { client.watcher = watcher; },
           [this] { phone.trace.add(fakes::TraceCall, "phone.hurry"); },
           [this](std::string_view bundleId) { return isBusyWith && isBusyWith(bundleId); },
-          [this](std::string_view identifier, const device::DataSink& sink,
-                 std::optional<Error>* error) {
+          [this](std::string_view identifier, const DataSink& sink, std::optional<Error>* error) {
             if (phone.faults.strikes("phone.saveData", identifier, error)) return false;
             const auto& all = waiting.contains(std::string(identifier)) ? waiting : owned;
             const auto found = all.find(std::string(identifier));

@@ -65,10 +65,10 @@ class Layers(unittest.TestCase):
             self.assertRefused("host/a.cpp", f'#include "{folder}/x.h"\n', "must not know")
 
     def test_folders_of_a_layer_know_only_those_before_them(self):
-        self.assertAllowed("device/apps/a.cpp", '#include "device/base/b.h"\n')
+        self.assertAllowed("device/apps/a.cpp", '#include "device/state/b.h"\n')
         self.assertAllowed("device/apps/a.cpp", '#include "device/apps/b.h"\n')
         self.assertAllowed("device/a.cpp", '#include "device/coordination/b.h"\n')
-        self.assertRefused("device/base/a.cpp", '#include "device/apps/b.h"\n', "must not know device/apps/")
+        self.assertRefused("device/state/a.cpp", '#include "device/apps/b.h"\n', "must not know device/apps/")
         self.assertRefused("device/apps/a.cpp", '#include "device/b.h"\n', "must not know device/")
         self.assertRefused("host/sync/a.cpp", '#include "host/restore/b.h"\n', "must not know host/restore/")
         self.assertRefused("host/new/a.cpp", '#include "host/base/b.h"\n', "no place in the order")

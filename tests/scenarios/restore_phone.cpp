@@ -103,7 +103,7 @@ RestorePhone stepping(const RestorePhone& phone, FileManager& files,
     step();
     return phone.receiveFile(path, error);
   };
-  const auto restoreData = [=](std::string_view identifier, const device::DataSource& source,
+  const auto restoreData = [=](std::string_view identifier, const DataSource& source,
                                std::optional<Error>* error) {
     const auto stepped = [&](std::uint8_t* bytes, std::size_t size) {
       step();
