@@ -8,7 +8,7 @@
 #include <random>
 #include <stdexcept>
 
-#include "device/icons/image_encoder.h"
+#include "icons/image_encoder.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::bench {
@@ -93,7 +93,7 @@ Bytes pngOf(std::uint32_t side) {
       pixel[3] = std::byte{255};
     }
   }
-  device::PngEncoderService service;
+  PngEncoderService service;
   Bytes png;
   const std::unique_ptr<ImageEncoder> encoder = service.create(png, "public.png", 1);
   encoder->addImage(image);

@@ -15,8 +15,6 @@
 #include "device/coordination/no_coordination.h"
 #include "device/files/file_receiver.h"
 #include "device/home/home_screen.h"
-#include "device/icons/icon_renderer.h"
-#include "device/icons/image_encoder.h"
 #include "device/journal/history.h"
 #include "device/journal/transaction_log.h"
 #include "device/open_folder.h"
@@ -27,6 +25,8 @@
 #include "device/services/system_notifier.h"
 #include "device/state/application_rows.h"
 #include "device/state/device_policy.h"
+#include "icons/icon_renderer.h"
+#include "icons/image_encoder.h"
 
 namespace appsync::device {
 namespace {

@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <cstdlib>
 
-#include "device/icons/icon_decoder.h"
+#include "icons/icon_decoder.h"
 
 namespace {
 
@@ -49,8 +49,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   constexpr std::uint32_t side = 16;
   const auto* begin = reinterpret_cast<const std::byte*>(data);
   Bytes file(begin, begin + size);
-  check(appsync::device::decodeJpegIcon(file, side), side);
+  check(appsync::decodeJpegIcon(file, side), side);
   mendChecksums(file);
-  check(appsync::device::decodePngIcon(file, side), side);
+  check(appsync::decodePngIcon(file, side), side);
   return 0;
 }

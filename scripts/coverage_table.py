@@ -8,7 +8,7 @@ import json
 import pathlib
 import sys
 
-SHIPPED = ["platform", "client", "sync", "transfer", "coordination", "restore", "base", "device", "host"]
+SHIPPED = ["platform", "client", "sync", "transfer", "coordination", "restore", "base", "icons", "device", "host"]
 
 
 def folders(summary, root):

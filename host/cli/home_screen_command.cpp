@@ -6,11 +6,11 @@
 #include <system_error>
 
 #include "device/files/file_manager.h"
-#include "device/icons/image_encoder.h"
 #include "host/base/text.h"
 #include "host/cli/cli.h"
 #include "host/home_screen/home_screen_icons.h"
 #include "host/home_screen/home_screen_picture.h"
+#include "icons/image_encoder.h"
 
 namespace appsync::host {
 namespace fs = std::filesystem;
@@ -42,7 +42,7 @@ ScreenView viewOf(std::size_t pages, std::size_t page) {
 
 Bytes encode(const Image& image) {
   Bytes file;
-  const auto encoder = device::PngEncoderService().create(file, "public.png", 1);
+  const auto encoder = PngEncoderService().create(file, "public.png", 1);
   if (encoder) encoder->addImage(image);
   if (!encoder || !encoder->finalize()) throw std::runtime_error("the picture cannot be encoded");
   return file;

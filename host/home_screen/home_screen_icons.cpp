@@ -1,7 +1,7 @@
 #include "host/home_screen/home_screen_icons.h"
 
-#include "device/icons/icon_decoder.h"
-#include "device/icons/icon_renderer.h"
+#include "icons/icon_decoder.h"
+#include "icons/icon_renderer.h"
 #include "platform/bundle.h"
 #include "platform/sync_files.h"
 
@@ -65,20 +65,20 @@ std::optional<Image> HomeScreenIcons::artwork(const AppRecord& record) const {
   if (!record.bundleContainerPath) return std::nullopt;
   const std::string path = joinPath(*record.bundleContainerPath, exchange::ArtworkName);
   const auto attributes = files_.attributesOfItem(path);
-  if (!attributes || attributes->isDirectory || attributes->size > device::MaximumIconBytes) {
+  if (!attributes || attributes->isDirectory || attributes->size > MaximumIconBytes) {
     return std::nullopt;
   }
   const auto file = files_.contentsAtPath(path);
-  if (!file || file->size() > device::MaximumIconBytes) return std::nullopt;
-  auto picture = device::decodePngIcon(*file, side_);
-  return picture ? picture : device::decodeJpegIcon(*file, side_);
+  if (!file || file->size() > MaximumIconBytes) return std::nullopt;
+  auto picture = decodePngIcon(*file, side_);
+  return picture ? picture : decodeJpegIcon(*file, side_);
 }
 
 std::optional<Image> HomeScreenIcons::picture(const AppRecord& record) const {
   const auto bundle =
       record.bundlePath ? Bundle::open(files_, {*record.bundlePath, true}) : std::nullopt;
-  auto icon = bundle ? device::DeviceIconRenderer(files_, side_).renderHomeScreenIcon(*bundle)
-                     : std::nullopt;
+  auto icon =
+      bundle ? DeviceIconRenderer(files_, side_).renderHomeScreenIcon(*bundle) : std::nullopt;
   return icon ? icon : artwork(record);
 }
 

@@ -1,4 +1,4 @@
-#include "device/icons/icon_renderer.h"
+#include "icons/icon_renderer.h"
 
 #include <gtest/gtest.h>
 

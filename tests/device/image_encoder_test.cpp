@@ -1,4 +1,4 @@
-#include "device/icons/image_encoder.h"
+#include "icons/image_encoder.h"
 
 #include <gtest/gtest.h>
 #include <png.h>

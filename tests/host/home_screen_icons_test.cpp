@@ -2,8 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include "device/icons/image_encoder.h"
 #include "host/phone/phone.h"
+#include "icons/image_encoder.h"
 #include "platform/property_list_codec.h"
 #include "tests/host/host_files.h"
 
@@ -23,7 +23,7 @@ std::string pictureFile(int red) {
     }
   }
   Bytes file;
-  const auto encoder = device::PngEncoderService().create(file, "public.png", 1);
+  const auto encoder = PngEncoderService().create(file, "public.png", 1);
   encoder->addImage(image);
   EXPECT_TRUE(encoder->finalize());
   return std::string(asText(file));

@@ -60,6 +60,11 @@ class Layers(unittest.TestCase):
         for path in ("sync/a.cpp", "platform/a.h"):
             self.assertRefused(path, '#include "base/b.h"\n', "must not know base/")
 
+    def test_rooms_for_what_comes_from_strangers_know_no_device(self):
+        self.assertAllowed("icons/a.cpp", '#include "base/b.h"\n#include <png.h>\n')
+        self.assertRefused("icons/a.h", '#include "device/b.h"\n', "must not know device/")
+        self.assertRefused("base/a.h", '#include "icons/b.h"\n', "must not know icons/")
+
     def test_host_meets_the_plugin_only_through_the_platform(self):
         for folder in ("client", "sync", "transfer", "coordination", "restore"):
             self.assertRefused("host/a.cpp", f'#include "{folder}/x.h"\n', "must not know")

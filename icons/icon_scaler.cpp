@@ -1,8 +1,8 @@
-#include "device/icons/icon_scaler.h"
+#include "icons/icon_scaler.h"
 
 #include <algorithm>
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 std::uint32_t fitted(std::uint32_t length, std::uint32_t longer, std::uint32_t side) {
@@ -73,4 +73,4 @@ Image IconScaler::finish() const {
   return image;
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -1,13 +1,13 @@
-#include "device/icons/image_encoder.h"
+#include "icons/image_encoder.h"
 
 #include <png.h>
 
 #include <csetjmp>
 #include <new>
 
-#include "device/icons/png_errors.h"
+#include "icons/png_errors.h"
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 constexpr std::uint32_t MaximumSide = 16384;
@@ -84,4 +84,4 @@ std::unique_ptr<ImageEncoder> PngEncoderService::create(Bytes& buffer, std::stri
   return std::unique_ptr<ImageEncoder>(new (std::nothrow) PngEncoder(buffer));
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -1,12 +1,12 @@
-#include "device/icons/icon_renderer.h"
+#include "icons/icon_renderer.h"
 
 #include <algorithm>
 #include <array>
 #include <cmath>
 
-#include "device/icons/icon_decoder.h"
+#include "icons/icon_decoder.h"
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 constexpr std::uint32_t MaximumRenderedSide = 1024;
@@ -74,4 +74,4 @@ std::optional<Image> DeviceIconRenderer::renderHomeScreenIcon(const Bundle& bund
   return std::nullopt;  // out of memory
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

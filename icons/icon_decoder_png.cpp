@@ -5,11 +5,11 @@
 #include <optional>
 #include <vector>
 
-#include "device/icons/icon_decoder.h"
-#include "device/icons/icon_scaler.h"
-#include "device/icons/png_errors.h"
+#include "icons/icon_decoder.h"
+#include "icons/icon_scaler.h"
+#include "icons/png_errors.h"
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 constexpr png_alloc_size_t MaximumChunkBytes = 4 << 20;
@@ -106,4 +106,4 @@ std::optional<Image> decodePngIcon(ByteView file, std::uint32_t side) {
   return PngDecoder(file, side).decode();
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -2,7 +2,7 @@
 
 #include "platform/icon_renderer.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// Encodes "public.png", one picture per file.
 class PngEncoderService final : public ImageEncoderService {
@@ -11,4 +11,4 @@ class PngEncoderService final : public ImageEncoderService {
                                        std::size_t imageCount) noexcept override;
 };
 
-}  // namespace appsync::device
+}  // namespace appsync

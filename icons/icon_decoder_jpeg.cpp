@@ -10,10 +10,10 @@
 #include <optional>
 #include <vector>
 
-#include "device/icons/icon_decoder.h"
-#include "device/icons/icon_scaler.h"
+#include "icons/icon_decoder.h"
+#include "icons/icon_scaler.h"
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 constexpr long MaximumMemory = 128l << 20;
@@ -144,4 +144,4 @@ std::optional<Image> decodeJpegIcon(ByteView file, std::uint32_t side) {
   return JpegDecoder(file, side).decode();
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

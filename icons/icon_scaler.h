@@ -5,7 +5,7 @@
 
 #include "platform/icon_renderer.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// Fits a picture that arrives row by row into a square, keeping its proportions and filling the
 /// rest with transparency. Every source pixel counts by the area it covers and by its opacity, in
@@ -54,4 +54,4 @@ class IconScaler {
   std::vector<Sum> sums_;     ///< the fitted picture
 };
 
-}  // namespace appsync::device
+}  // namespace appsync

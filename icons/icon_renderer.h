@@ -3,7 +3,7 @@
 #include "platform/file_manager.h"
 #include "platform/icon_renderer.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// Draws the icon file of a bundle: the PNG or JPEG picture named by KBBundleIconFile (".png" is
 /// added to a name without an extension), or "Icon.png". The picture is fitted into the device's
@@ -21,4 +21,4 @@ class DeviceIconRenderer final : public IconRenderer {
   const std::uint32_t side_;
 };
 
-}  // namespace appsync::device
+}  // namespace appsync

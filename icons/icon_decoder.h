@@ -5,7 +5,7 @@
 #include "platform/bytes.h"
 #include "platform/icon_renderer.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// The largest pictures that are decoded; larger ones are refused before memory is taken.
 inline constexpr std::uint32_t MaximumIconSide = 8192;
@@ -17,4 +17,4 @@ inline constexpr std::size_t MaximumIconBytes = std::size_t{32} << 20;
 std::optional<Image> decodePngIcon(ByteView file, std::uint32_t side);
 std::optional<Image> decodeJpegIcon(ByteView file, std::uint32_t side);
 
-}  // namespace appsync::device
+}  // namespace appsync
