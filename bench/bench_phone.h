@@ -4,9 +4,9 @@
 #include <memory>
 #include <string>
 
+#include "base/interruption.h"
 #include "client/apps_client.h"
 #include "device/embedded_device.h"
-#include "host/base/interruption.h"
 #include "host/phone/sync_host.h"
 
 namespace appsync::bench {
@@ -43,7 +43,7 @@ class BenchPhone {
 
  private:
   TemporaryFolder folder_;
-  host::Interruption interruption_;
+  Interruption interruption_;
   host::HostProcess host_;
   std::unique_ptr<device::EmbeddedDevice> device_;
   Platform platform_;

@@ -6,7 +6,7 @@
 #include <chrono>
 #include <thread>
 
-#include "host/base/text.h"
+#include "base/text.h"
 
 namespace appsync::host {
 namespace {

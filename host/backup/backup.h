@@ -4,9 +4,9 @@
 #include <string>
 #include <vector>
 
+#include "base/interruption.h"
 #include "host/backup/backup_folder.h"
 #include "host/backup/backup_lists.h"
-#include "host/base/interruption.h"
 #include "host/library/events.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_client.h"

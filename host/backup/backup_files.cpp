@@ -10,7 +10,7 @@
 #include <system_error>
 
 #include "base/confined_directory.h"
-#include "host/base/text.h"
+#include "base/text.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::host {

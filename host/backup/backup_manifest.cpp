@@ -5,8 +5,8 @@
 #include <algorithm>
 
 #include "base/identifiers.h"
+#include "base/text.h"
 #include "host/backup/backup_folder.h"
-#include "host/base/text.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::host {

@@ -3,11 +3,11 @@
 #include <cerrno>
 #include <system_error>
 
+#include "base/text.h"
 #include "host/backup/backup_files.h"
 #include "host/backup/backup_folder.h"
 #include "host/backup/backup_manifest.h"
-#include "host/base/digest.h"
-#include "host/base/text.h"
+#include "host/backup/digest.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::host {

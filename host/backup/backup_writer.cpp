@@ -15,11 +15,11 @@
 #include "base/directory_tree.h"
 #include "base/file_descriptor.h"
 #include "base/identifiers.h"
+#include "base/text.h"
 #include "host/backup/backup_files.h"
 #include "host/backup/backup_folder.h"
 #include "host/backup/backup_manifest.h"
-#include "host/base/digest.h"
-#include "host/base/text.h"
+#include "host/backup/digest.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::host {

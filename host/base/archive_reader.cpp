@@ -9,8 +9,8 @@
 #include <cerrno>
 #include <system_error>
 
-#include "host/base/text.h"
-#include "host/base/utf8_locale.h"
+#include "base/text.h"
+#include "base/utf8_locale.h"
 
 namespace appsync::host {
 namespace {

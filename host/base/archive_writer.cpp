@@ -12,7 +12,7 @@
 #include <cerrno>
 #include <system_error>
 
-#include "host/base/utf8_locale.h"
+#include "base/utf8_locale.h"
 
 namespace appsync::host {
 namespace {

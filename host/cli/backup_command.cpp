@@ -1,7 +1,7 @@
 #include <CLI/CLI.hpp>
 
+#include "base/interruption.h"
 #include "host/backup/backup.h"
-#include "host/base/interruption.h"
 #include "host/cli/cli.h"
 #include "host/cli/plugin_session.h"
 #include "host/phone/plugin_loader.h"

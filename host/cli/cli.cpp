@@ -11,7 +11,7 @@
 #include <string_view>
 #include <system_error>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/report/report.h"
 
 namespace appsync::host {

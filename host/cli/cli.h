@@ -7,9 +7,9 @@
 #include <string>
 
 #include "device/embedded_device.h"
-#include "host/base/json_line.h"
-#include "host/base/output.h"
 #include "host/library/events.h"
+#include "host/report/json_line.h"
+#include "host/report/output.h"
 
 namespace CLI {
 class App;

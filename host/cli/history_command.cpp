@@ -3,10 +3,10 @@
 #include <CLI/CLI.hpp>
 #include <memory>
 
-#include "host/base/text.h"
-#include "host/base/version.h"
+#include "base/text.h"
 #include "host/cli/cli.h"
 #include "host/cli/table.h"
+#include "host/library/version.h"
 
 namespace appsync::host {
 namespace {

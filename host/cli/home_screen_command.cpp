@@ -5,8 +5,8 @@
 #include <memory>
 #include <system_error>
 
+#include "base/text.h"
 #include "device/files/file_manager.h"
-#include "host/base/text.h"
 #include "host/cli/cli.h"
 #include "host/home_screen/home_screen_icons.h"
 #include "host/home_screen/home_screen_picture.h"

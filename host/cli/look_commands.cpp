@@ -7,7 +7,7 @@
 #include <memory>
 #include <thread>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/cli/cli.h"
 #include "host/cli/status.h"
 #include "host/cli/table.h"

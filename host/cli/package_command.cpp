@@ -3,7 +3,7 @@
 #include <CLI/CLI.hpp>
 #include <memory>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/cli/cli.h"
 #include "host/library/package_writer.h"
 

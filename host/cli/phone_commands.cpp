@@ -3,7 +3,7 @@
 #include <CLI/CLI.hpp>
 #include <memory>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/cli/cli.h"
 
 namespace appsync::host {

@@ -4,8 +4,8 @@
 #include <memory>
 #include <string>
 
+#include "base/interruption.h"
 #include "device/embedded_device.h"
-#include "host/base/interruption.h"
 #include "host/cli/cli.h"
 #include "host/library/events.h"
 #include "host/phone/plugin_loader.h"

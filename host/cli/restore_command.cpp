@@ -1,7 +1,7 @@
 #include <CLI/CLI.hpp>
 #include <set>
 
-#include "host/base/interruption.h"
+#include "base/interruption.h"
 #include "host/cli/cli.h"
 #include "host/cli/plugin_session.h"
 #include "host/phone/plugin_loader.h"

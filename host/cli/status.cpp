@@ -4,7 +4,7 @@
 
 #include <map>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/cli/plugin_session.h"
 #include "host/phone/phone.h"
 #include "platform/property_list_codec.h"

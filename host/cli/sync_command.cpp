@@ -3,8 +3,8 @@
 #include <CLI/CLI.hpp>
 #include <chrono>
 
-#include "host/base/interruption.h"
-#include "host/base/text.h"
+#include "base/interruption.h"
+#include "base/text.h"
 #include "host/cli/cli.h"
 #include "host/cli/plugin_session.h"
 #include "host/library/icon_layout.h"

@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "host/base/text.h"
+#include "base/text.h"
 
 namespace appsync::host {
 

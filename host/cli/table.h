@@ -3,7 +3,7 @@
 #include <string>
 #include <vector>
 
-#include "host/base/output.h"
+#include "host/report/output.h"
 
 namespace appsync::host {
 

@@ -9,7 +9,7 @@
 #include <string>
 #include <vector>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/home_screen/home_screen_surface.h"
 
 namespace appsync::host {

@@ -8,7 +8,7 @@
 #include <sstream>
 #include <system_error>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::host {

@@ -6,8 +6,8 @@
 #include <compare>
 #include <system_error>
 
-#include "host/base/text.h"
-#include "host/base/version.h"
+#include "base/text.h"
+#include "host/library/version.h"
 
 namespace appsync::host {
 namespace fs = std::filesystem;

@@ -7,11 +7,12 @@
 #include <map>
 
 #include "base/identifiers.h"
+#include "base/text.h"
 #include "host/base/archive_reader.h"
-#include "host/base/text.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
+#include "platform/utf8.h"
 
 namespace appsync::host {
 namespace {

@@ -10,13 +10,14 @@
 #include <system_error>
 #include <vector>
 
+#include "base/text.h"
 #include "device/packages/package_extractor.h"
 #include "host/base/archive_writer.h"
-#include "host/base/text.h"
 #include "host/library/package_reader.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
+#include "platform/utf8.h"
 
 namespace appsync::host {
 namespace fs = std::filesystem;

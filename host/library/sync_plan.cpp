@@ -7,8 +7,8 @@
 #include <map>
 #include <set>
 
-#include "host/base/text.h"
-#include "host/base/version.h"
+#include "base/text.h"
+#include "host/library/version.h"
 
 namespace appsync::host {
 namespace {

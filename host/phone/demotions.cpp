@@ -1,6 +1,6 @@
 #include "host/phone/demotions.h"
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/phone/phone.h"
 #include "platform/bundle.h"
 #include "platform/sync_files.h"

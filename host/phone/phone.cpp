@@ -3,7 +3,7 @@
 #include <chrono>
 #include <thread>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "platform/property_list_codec.h"
 #include "platform/todo_entry.h"
 

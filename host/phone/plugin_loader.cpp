@@ -7,7 +7,7 @@
 #include <iterator>
 #include <system_error>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "platform/bundle.h"
 #include "platform/plugin.h"
 #include "platform/property_list_codec.h"

@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "host/base/interruption.h"
+#include "base/interruption.h"
 #include "host/phone/transfer_queue.h"
 #include "platform/sync_host.h"
 #include "platform/system_notifier.h"

@@ -2,8 +2,8 @@
 
 #include <memory>
 
-#include "host/base/output.h"
 #include "host/library/events.h"
+#include "host/report/output.h"
 
 namespace appsync::host {
 

@@ -2,7 +2,7 @@
 
 #include <fmt/format.h>
 
-#include "host/base/json_line.h"
+#include "host/report/json_line.h"
 
 namespace appsync::host {
 namespace {

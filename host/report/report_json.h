@@ -1,7 +1,7 @@
 #pragma once
 
-#include "host/base/output.h"
 #include "host/library/events.h"
+#include "host/report/output.h"
 
 namespace appsync::host {
 

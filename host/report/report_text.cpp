@@ -4,7 +4,7 @@
 
 #include <algorithm>
 
-#include "host/base/text.h"
+#include "base/text.h"
 
 namespace appsync::host {
 namespace {

@@ -6,8 +6,8 @@
 #include <algorithm>
 #include <string_view>
 
-#include "host/base/interruption.h"
-#include "host/base/text.h"
+#include "base/interruption.h"
+#include "base/text.h"
 
 namespace appsync::host {
 namespace {

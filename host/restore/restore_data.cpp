@@ -1,7 +1,7 @@
 #include "host/restore/restore_data.h"
 
-#include "host/base/digest.h"
-#include "host/base/text.h"
+#include "base/text.h"
+#include "host/backup/digest.h"
 
 namespace appsync::host {
 namespace {

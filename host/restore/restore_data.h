@@ -3,8 +3,8 @@
 #include <optional>
 #include <string>
 
+#include "base/interruption.h"
 #include "host/backup/backup_folder.h"
-#include "host/base/interruption.h"
 #include "host/library/events.h"
 #include "host/phone/phone.h"
 #include "host/restore/restore_list.h"

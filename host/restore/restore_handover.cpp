@@ -2,7 +2,7 @@
 
 #include <cerrno>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/library/package_reader.h"
 #include "host/restore/restore_data.h"
 #include "platform/property_list_codec.h"

@@ -5,7 +5,7 @@
 #include <set>
 #include <string>
 
-#include "host/base/interruption.h"
+#include "base/interruption.h"
 #include "host/library/events.h"
 #include "host/phone/phone.h"
 #include "host/restore/restore_list.h"

@@ -1,6 +1,6 @@
 #include "host/restore/restore_list.h"
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/library/package_reader.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"

@@ -1,7 +1,7 @@
 // Packages of restored applications that the host itself brings.
 #include <cerrno>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/phone/demotions.h"
 #include "host/restore/restore.h"
 #include "host/transfer/shipments.h"

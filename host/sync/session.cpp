@@ -4,7 +4,7 @@
 #include <chrono>
 #include <thread>
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "host/phone/installed_applications.h"
 #include "host/transfer/staging.h"
 #include "platform/bundle.h"

@@ -1,6 +1,6 @@
 #include "host/transfer/install_watch.h"
 
-#include "host/base/text.h"
+#include "base/text.h"
 
 namespace appsync::host {
 

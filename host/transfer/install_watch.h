@@ -7,7 +7,7 @@
 #include <string>
 #include <string_view>
 
-#include "host/base/interruption.h"
+#include "base/interruption.h"
 #include "host/library/events.h"
 #include "host/phone/phone.h"
 

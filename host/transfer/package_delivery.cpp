@@ -1,6 +1,6 @@
 #include "host/transfer/package_delivery.h"
 
-#include "host/base/text.h"
+#include "base/text.h"
 #include "platform/bundle.h"
 
 namespace appsync::host {

@@ -8,7 +8,7 @@
 #include <string_view>
 #include <vector>
 
-#include "host/base/interruption.h"
+#include "base/interruption.h"
 #include "host/library/events.h"
 #include "host/phone/phone.h"
 #include "host/phone/transfer_queue.h"

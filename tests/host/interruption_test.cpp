@@ -1,4 +1,4 @@
-#include "host/base/interruption.h"
+#include "base/interruption.h"
 
 #include <gtest/gtest.h>
 #include <signal.h>

@@ -3,7 +3,7 @@
 #include <sys/mman.h>
 #include <unistd.h>
 
-#include "host/base/json_line.h"
+#include "host/report/json_line.h"
 #include "host/report/report_text.h"
 #include "tests/test_pch.h"
 

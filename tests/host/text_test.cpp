@@ -1,7 +1,8 @@
-#include "host/base/text.h"
+#include "base/text.h"
 
 #include <clocale>
 
+#include "platform/utf8.h"
 #include "tests/test_pch.h"
 
 namespace appsync::host {

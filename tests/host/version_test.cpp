@@ -1,4 +1,4 @@
-#include "host/base/version.h"
+#include "host/library/version.h"
 
 #include "tests/test_pch.h"
 

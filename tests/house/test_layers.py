@@ -76,7 +76,7 @@ class Layers(unittest.TestCase):
         self.assertRefused("device/state/a.cpp", '#include "device/apps/b.h"\n', "must not know device/apps/")
         self.assertRefused("device/apps/a.cpp", '#include "device/b.h"\n', "must not know device/")
         self.assertRefused("host/sync/a.cpp", '#include "host/restore/b.h"\n', "must not know host/restore/")
-        self.assertRefused("host/new/a.cpp", '#include "host/base/b.h"\n', "no place in the order")
+        self.assertRefused("host/new/a.cpp", '#include "host/library/b.h"\n', "no place in the order")
 
     def test_only_the_codec_uses_the_property_list_library(self):
         self.assertAllowed("platform/property_list_codec.cpp", "#include <plist/plist.h>\n")

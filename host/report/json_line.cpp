@@ -1,4 +1,4 @@
-#include "host/base/json_line.h"
+#include "host/report/json_line.h"
 
 namespace appsync::host {
 

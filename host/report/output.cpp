@@ -1,4 +1,4 @@
-#include "host/base/output.h"
+#include "host/report/output.h"
 
 #include <fcntl.h>
 #include <poll.h>

@@ -1,4 +1,4 @@
-#include "host/base/text.h"
+#include "base/text.h"
 
 #include <fmt/format.h>
 
@@ -8,7 +8,7 @@
 #include <ctime>
 #include <cwchar>
 
-namespace appsync::host {
+namespace appsync {
 namespace {
 
 constexpr char32_t Bad = 0xFFFD;
@@ -82,15 +82,6 @@ std::string oneLine(std::string_view text) {
   return result;
 }
 
-bool isUtf8(std::string_view text) {
-  while (!text.empty()) {
-    const Character c = decode(text);
-    if (c.value == Bad && c.length == 1) return false;
-    text.remove_prefix(c.length);
-  }
-  return true;
-}
-
 std::size_t displayWidth(std::string_view text) {
   std::size_t columns = 0;
   while (!text.empty()) {
@@ -141,4 +132,4 @@ std::string isoTime(double secondsSince1970) {
   return fmt::format("{}.{:03}Z", std::string_view(text.data(), length), milliseconds);
 }
 
-}  // namespace appsync::host
+}  // namespace appsync

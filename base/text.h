@@ -4,7 +4,7 @@
 #include <string>
 #include <string_view>
 
-namespace appsync::host {
+namespace appsync {
 
 /// Text from outside made safe for a terminal and for one line: control characters, escape
 /// sequences, direction overrides and bytes that are no UTF-8 become U+FFFD.
@@ -12,9 +12,6 @@ std::string printable(std::string_view text);
 
 /// A message without blank space at its end and with its line breaks as blanks.
 std::string oneLine(std::string_view text);
-
-/// Whether the bytes are well-formed UTF-8.
-bool isUtf8(std::string_view text);
 
 /// Columns that printable text takes on a terminal.
 std::size_t displayWidth(std::string_view text);
@@ -28,4 +25,4 @@ std::string byteCount(std::uint64_t bytes);
 /// Seconds since 1970 as "2026-01-31T12:00:00.250Z".
 std::string isoTime(double secondsSince1970);
 
-}  // namespace appsync::host
+}  // namespace appsync

@@ -2,7 +2,7 @@
 
 #include <nlohmann/json.hpp>
 
-#include "host/base/output.h"
+#include "host/report/output.h"
 
 namespace appsync::host {
 

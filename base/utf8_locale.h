@@ -2,7 +2,7 @@
 
 #include <locale.h>
 
-namespace appsync::host {
+namespace appsync {
 
 /// While it lives, the calling thread's character encoding is UTF-8 whatever the person's locale:
 /// the archive library asks the thread's for entry names.
@@ -21,4 +21,4 @@ class Utf8Locale {
   const locale_t previous_;
 };
 
-}  // namespace appsync::host
+}  // namespace appsync

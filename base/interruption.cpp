@@ -1,4 +1,4 @@
-#include "host/base/interruption.h"
+#include "base/interruption.h"
 
 #include <fcntl.h>
 #include <signal.h>
@@ -9,7 +9,7 @@
 #include <string_view>
 #include <utility>
 
-namespace appsync::host {
+namespace appsync {
 namespace {
 
 constexpr char SignalMark = 's';
@@ -95,4 +95,4 @@ SignalWatcher::~SignalWatcher() {
   ::close(std::exchange(readEnd, -1));
 }
 
-}  // namespace appsync::host
+}  // namespace appsync

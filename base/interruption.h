@@ -5,7 +5,7 @@
 #include <mutex>
 #include <thread>
 
-namespace appsync::host {
+namespace appsync {
 
 /// The person's wish to end early. Asked from any thread.
 class Interruption {
@@ -42,4 +42,4 @@ class SignalWatcher {
 /// While true, a process that ends at once first makes the terminal's cursor visible again.
 void setCursorHidden(bool hidden) noexcept;
 
-}  // namespace appsync::host
+}  // namespace appsync
