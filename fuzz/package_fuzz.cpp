@@ -12,13 +12,12 @@
 #include "base/directory_tree.h"
 #include "base/file_descriptor.h"
 #include "base/identifiers.h"
-#include "device/packages/package_extractor.h"
+#include "packages/package_extractor.h"
 
 namespace {
 
 namespace fs = std::filesystem;
 using namespace appsync;
-using namespace appsync::device;
 
 void require(bool condition) {
   if (!condition) std::abort();

@@ -8,7 +8,7 @@ import json
 import pathlib
 import sys
 
-SHIPPED = ["platform", "client", "sync", "transfer", "coordination", "restore", "base", "icons", "device", "host"]
+SHIPPED = ["platform", "client", "sync", "transfer", "coordination", "restore", "base", "icons", "packages", "device", "host"]
 
 
 def folders(summary, root):

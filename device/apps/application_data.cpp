@@ -14,9 +14,9 @@
 #include "device/apps/idle_application.h"
 #include "device/apps/removal.h"
 #include "device/journal/history.h"
-#include "device/packages/data_archive.h"
-#include "device/packages/package_names.h"
 #include "device/state/application_rows.h"
+#include "packages/data_archive.h"
+#include "packages/package_names.h"
 
 namespace appsync::device {
 namespace {

@@ -3,9 +3,9 @@
 #include <string>
 
 #include "device/journal/records.h"
-#include "device/packages/package_extractor.h"
 #include "device/state/application_rows.h"
 #include "device/state/device_core.h"
+#include "packages/package_extractor.h"
 
 namespace appsync::device {
 

@@ -5,7 +5,7 @@
 
 #include "base/text.h"
 #include "host/cli/cli.h"
-#include "host/library/package_writer.h"
+#include "packages/package_writer.h"
 
 namespace appsync::host {
 namespace {

@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "host/library/package_reader.h"
+#include "packages/package_facts.h"
 
 namespace appsync::host {
 

@@ -3,8 +3,8 @@
 #include <cerrno>
 
 #include "base/text.h"
-#include "host/library/package_reader.h"
 #include "host/restore/restore_data.h"
+#include "packages/package_facts.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
 

@@ -10,7 +10,7 @@
 
 #include "base/temporary_file.h"
 #include "device/files/containers.h"
-#include "device/packages/data_archive.h"
+#include "packages/data_archive.h"
 #include "tests/device/data_trees.h"
 #include "tests/device/device_test.h"
 #include "tests/device/package_builder.h"

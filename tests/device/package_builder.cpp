@@ -125,7 +125,7 @@ std::vector<RawEntry> sampleEntriesAnd(RawEntry entry) {
 std::string Outcome::result() const {
   if (package) return "ok";
   if (error->domain != InstallerServiceErrorDomain) return description(*error);
-  return std::string(device::name(static_cast<PackageRefusal>(error->code)));
+  return std::string(appsync::name(static_cast<PackageRefusal>(error->code)));
 }
 
 FileDescriptor memoryFile(std::string_view bytes) {

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "base/file_descriptor.h"
-#include "device/packages/package_extractor.h"
+#include "packages/package_extractor.h"
 #include "tests/fakes/temporary_folder.h"
 
 namespace appsync::device::testing {

@@ -1,6 +1,6 @@
 #include <cerrno>
 
-#include "device/packages/package_extractor.h"
+#include "packages/package_extractor.h"
 #include "platform/installer_service.h"
 #include "tests/device/device_test.h"
 

@@ -1,4 +1,4 @@
-#include "device/packages/package_names.h"
+#include "packages/package_names.h"
 
 #include <gtest/gtest.h>
 

@@ -1,4 +1,4 @@
-#include "host/base/archive_writer.h"
+#include "packages/archive_writer.h"
 
 #include <fcntl.h>
 #include <gtest/gtest.h>

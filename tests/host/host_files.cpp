@@ -8,8 +8,8 @@
 #include <iterator>
 #include <random>
 
-#include "host/base/archive_writer.h"
-#include "host/library/package_reader.h"
+#include "packages/archive_writer.h"
+#include "packages/package_facts.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 

@@ -1,6 +1,5 @@
-#include "host/library/package_reader.h"
-
 #include "host/library/library.h"
+#include "packages/package_facts.h"
 #include "platform/bundle.h"
 #include "tests/host/host_files.h"
 #include "tests/test_pch.h"

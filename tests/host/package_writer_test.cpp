@@ -1,9 +1,9 @@
-#include "host/library/package_writer.h"
+#include "packages/package_writer.h"
 
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "host/base/archive_reader.h"
+#include "packages/archive_reader.h"
 #include "platform/bundle.h"
 #include "tests/host/host_files.h"
 #include "tests/test_pch.h"

@@ -62,7 +62,11 @@ class Layers(unittest.TestCase):
 
     def test_rooms_for_what_comes_from_strangers_know_no_device(self):
         self.assertAllowed("icons/a.cpp", '#include "base/b.h"\n#include <png.h>\n')
-        self.assertRefused("icons/a.h", '#include "device/b.h"\n', "must not know device/")
+        self.assertAllowed("packages/a.cpp", '#include "base/b.h"\n#include <archive.h>\n')
+        for path in ("icons/a.h", "packages/a.h"):
+            self.assertRefused(path, '#include "device/b.h"\n', "must not know device/")
+            self.assertRefused(path, '#include "host/b.h"\n', "must not know host/")
+        self.assertRefused("packages/a.h", '#include "icons/b.h"\n', "must not know icons/")
         self.assertRefused("base/a.h", '#include "icons/b.h"\n', "must not know icons/")
 
     def test_host_meets_the_plugin_only_through_the_platform(self):

@@ -1,4 +1,4 @@
-#include "host/library/package_writer.h"
+#include "packages/package_writer.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -11,15 +11,15 @@
 #include <vector>
 
 #include "base/text.h"
-#include "device/packages/package_extractor.h"
-#include "host/base/archive_writer.h"
-#include "host/library/package_reader.h"
+#include "packages/archive_writer.h"
+#include "packages/package_extractor.h"
+#include "packages/package_facts.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
 #include "platform/utf8.h"
 
-namespace appsync::host {
+namespace appsync {
 namespace fs = std::filesystem;
 namespace {
 
@@ -203,7 +203,7 @@ class Packer {
     const Fd package(file, O_RDONLY);
     const Fd directory(target, O_RDONLY | O_DIRECTORY);
     std::optional<Error> error;
-    if (device::extractPackage(package, directory, result_.identifier, {}, &error)) return true;
+    if (extractPackage(package, directory, result_.identifier, {}, &error)) return true;
     return fail("the phone would refuse this package: " +
                 printable(error ? oneLine(error->localizedDescription()) : "unknown reason"));
   }
@@ -223,4 +223,4 @@ std::optional<WrittenPackage> writePackage(const fs::path& folder, const fs::pat
   return Packer(folder, fs::absolute(output), problem).run();
 }
 
-}  // namespace appsync::host
+}  // namespace appsync

@@ -9,7 +9,7 @@
 
 #include "platform/bytes.h"
 
-namespace appsync::host {
+namespace appsync {
 
 /// Whether an application of this identifier can be sent: the phone takes it, and it is no hidden
 /// name nor one that the exchange with the phone keeps for itself.
@@ -57,4 +57,4 @@ struct PackageParts {
 /// Collects the parts until the end of the package or the first damage.
 PackageParts readPackageParts(const std::filesystem::path& path);
 
-}  // namespace appsync::host
+}  // namespace appsync

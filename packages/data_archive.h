@@ -8,7 +8,7 @@
 #include "base/data_stream.h"
 #include "platform/error.h"
 
-namespace appsync::device {
+namespace appsync {
 
 // An application's data as a tar archive whose bytes depend only on what the data is: sorted by
 // name, owned by nobody, times in whole seconds. It holds files, folders and symbolic links, the
@@ -30,4 +30,4 @@ std::optional<Error> writeDataArchive(int directory, const DataSink& sink,
 std::optional<Error> readDataArchive(const DataSource& source, int directory,
                                      std::uint64_t& entries);
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -1,4 +1,4 @@
-#include "device/packages/package_extractor.h"
+#include "packages/package_extractor.h"
 
 #include <sys/stat.h>
 #include <unistd.h>
@@ -7,15 +7,15 @@
 #include <new>
 
 #include "base/identifiers.h"
-#include "device/packages/package_entry_rules.h"
-#include "device/packages/package_names.h"
-#include "device/packages/package_reader.h"
-#include "device/packages/package_writer.h"
+#include "packages/package_entry_rules.h"
+#include "packages/package_names.h"
+#include "packages/package_reader.h"
+#include "packages/unpack_target.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
 
-namespace appsync::device {
+namespace appsync {
 
 namespace {
 
@@ -31,9 +31,9 @@ std::optional<Error> badInfo(std::string_view detail) {
   return refusalError(PackageRefusal::BadInfo, detail);
 }
 
-std::optional<Error> writeFile(PackageReader& reader, PackageWriter& writer,
+std::optional<Error> writeFile(PackageReader& reader, UnpackTarget& target,
                                const PackageItem& item) {
-  const FileDescriptor file = writer.createFile(item.path, item.isExecutable);
+  const FileDescriptor file = target.createFile(item.path, item.isExecutable);
   if (!file) return systemError(errno, item.path);
   std::uint64_t end = 0;
   const auto write = [&](std::uint64_t offset, ByteView bytes) -> std::optional<Error> {
@@ -48,14 +48,14 @@ std::optional<Error> writeFile(PackageReader& reader, PackageWriter& writer,
   return std::nullopt;
 }
 
-std::optional<Error> unpack(PackageReader& reader, PackageWriter& writer) {
+std::optional<Error> unpack(PackageReader& reader, UnpackTarget& target) {
   PackageItem item;
   std::optional<Error> error;
   while (reader.next(item, error)) {
     if (item.path.empty()) continue;
     if (!item.isDirectory) {
-      error = writeFile(reader, writer, item);
-    } else if (!writer.makeDirectory(item.path)) {
+      error = writeFile(reader, target, item);
+    } else if (!target.makeDirectory(item.path)) {
       error = systemError(errno, item.path);
     }
     if (error) break;
@@ -64,10 +64,10 @@ std::optional<Error> unpack(PackageReader& reader, PackageWriter& writer) {
 }
 
 /// The information dictionary as it now stands in the target.
-std::optional<Error> readInfo(const PackageReader& reader, PackageWriter& writer,
+std::optional<Error> readInfo(const PackageReader& reader, UnpackTarget& target,
                               const std::string& path, PropertyList::Dictionary& info) {
   if (!reader.rules().holdsFile(path)) return badInfo("the application has no Info.plist");
-  const FileDescriptor file = writer.openFile(path);
+  const FileDescriptor file = target.openFile(path);
   struct stat status {};
   if (!file || ::fstat(file.get(), &status) != 0) return systemError(errno, path);
   const auto size = static_cast<std::size_t>(status.st_size);
@@ -107,7 +107,7 @@ std::optional<Error> checkIdentifier(const PropertyList::Dictionary& info,
   return std::nullopt;
 }
 
-std::optional<Error> prepareExecutable(const PackageReader& reader, PackageWriter& writer,
+std::optional<Error> prepareExecutable(const PackageReader& reader, UnpackTarget& target,
                                        const ExtractedPackage& package) {
   const PropertyList* named = find(package.info, KBBundleExecutable);
   if (!named) return std::nullopt;
@@ -116,7 +116,7 @@ std::optional<Error> prepareExecutable(const PackageReader& reader, PackageWrite
   const std::string path = package.bundleName + "/" + *executable;
   if (!reader.rules().holdsFile(path))
     return badInfo("the executable \"" + shown(*executable) + "\" is missing");
-  const FileDescriptor file = writer.openFile(path);
+  const FileDescriptor file = target.openFile(path);
   if (!file || !makeExecutable(file.get())) return systemError(errno, path);
   return std::nullopt;
 }
@@ -130,15 +130,15 @@ std::optional<Error> extract(int packageFd, int targetDirectoryFd,
                              std::optional<std::string_view> expectedIdentifier,
                              const PackageLimits& limits, ExtractedPackage& package) {
   PackageReader reader(packageFd, limits);
-  PackageWriter writer(targetDirectoryFd);
-  if (auto error = unpack(reader, writer)) return error;
+  UnpackTarget target(targetDirectoryFd);
+  if (auto error = unpack(reader, target)) return error;
   const PackageEntryRules& rules = reader.rules();
   package.bundleName = rules.bundleName();
-  if (auto error = readInfo(reader, writer, package.bundleName + "/Info.plist", package.info))
+  if (auto error = readInfo(reader, target, package.bundleName + "/Info.plist", package.info))
     return error;
   if (auto error = checkIdentifier(package.info, expectedIdentifier, package.identifier))
     return error;
-  if (auto error = prepareExecutable(reader, writer, package)) return error;
+  if (auto error = prepareExecutable(reader, target, package)) return error;
   package.version = stringIn(package.info, KBBundleVersion);
   package.displayName = stringIn(package.info, KBBundleDisplayName);
   package.hasMetadata = rules.holdsFile(exchange::MetadataName);
@@ -165,4 +165,4 @@ std::optional<ExtractedPackage> extractPackage(int packageFd, int targetDirector
   return std::nullopt;
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -6,14 +6,14 @@
 
 #include "base/confined_directory.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// Makes files and folders below a directory, each relative to a handle, through no link and never
 /// in the place of anything that stands there. Used by one thread.
-class PackageWriter {
+class UnpackTarget {
  public:
   /// Borrows an open directory.
-  explicit PackageWriter(int targetDirectory);
+  explicit UnpackTarget(int targetDirectory);
 
   // False, or not valid, with errno set. Missing parents are made.
 
@@ -35,4 +35,4 @@ class PackageWriter {
 /// Lets everybody who may read the file run it.
 bool makeExecutable(int fd) noexcept;
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -1,4 +1,4 @@
-#include "device/packages/zip_directory.h"
+#include "packages/zip_directory.h"
 
 #include <sys/stat.h>
 #include <unistd.h>
@@ -8,10 +8,10 @@
 #include <string>
 #include <string_view>
 
-#include "device/packages/package_entry_rules.h"
-#include "device/packages/package_names.h"
+#include "packages/package_entry_rules.h"
+#include "packages/package_names.h"
 
-namespace appsync::device {
+namespace appsync {
 
 namespace {
 
@@ -183,4 +183,4 @@ std::optional<Error> checkZipDirectory(int packageFd, std::uint64_t maximumEntri
   return ZipFile(packageFd, static_cast<std::uint64_t>(status.st_size)).check(maximumEntries);
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -1,4 +1,4 @@
-#include "host/base/archive_reader.h"
+#include "packages/archive_reader.h"
 
 #include <archive.h>
 #include <archive_entry.h>
@@ -12,7 +12,7 @@
 #include "base/text.h"
 #include "base/utf8_locale.h"
 
-namespace appsync::host {
+namespace appsync {
 namespace {
 
 constexpr std::size_t BlockSize = 64 << 10;
@@ -128,4 +128,4 @@ bool ArchiveReader::isReadable() {
   return readAll([](std::span<const std::byte>) { return true; });
 }
 
-}  // namespace appsync::host
+}  // namespace appsync

@@ -6,10 +6,10 @@
 #include <string_view>
 #include <unordered_map>
 
-#include "device/packages/package_extractor.h"
+#include "packages/package_extractor.h"
 #include "platform/error.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// The error of a refusal: "<name of the refusal>: <detail>".
 Error refusalError(PackageRefusal refusal, std::string_view detail);
@@ -85,4 +85,4 @@ class PackageEntryRules {
   std::unordered_map<std::string, Known> known_;  ///< by path without case
 };
 
-}  // namespace appsync::device
+}  // namespace appsync

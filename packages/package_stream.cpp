@@ -1,4 +1,4 @@
-#include "device/packages/package_stream.h"
+#include "packages/package_stream.h"
 
 #include <archive.h>
 #include <unistd.h>
@@ -8,9 +8,9 @@
 #include <cerrno>
 #include <vector>
 
-#include "device/packages/package_entry_rules.h"
+#include "packages/package_entry_rules.h"
 
-namespace appsync::device {
+namespace appsync {
 
 namespace {
 
@@ -122,4 +122,4 @@ std::unique_ptr<PackageStream> openPackageStream(int packageFd) {
   return std::make_unique<FilterStream>(packageFd);
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

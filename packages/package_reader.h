@@ -6,14 +6,14 @@
 #include <optional>
 #include <string>
 
-#include "device/packages/package_entry_rules.h"
-#include "device/packages/package_extractor.h"
-#include "device/packages/package_stream.h"
+#include "packages/package_entry_rules.h"
+#include "packages/package_extractor.h"
+#include "packages/package_stream.h"
 
 struct archive;
 struct archive_entry;
 
-namespace appsync::device {
+namespace appsync {
 
 /// Goes through a package from its first entry to its last and lets pass only what
 /// PackageEntryRules admits. Nothing of what a package holds reaches the file system through it.
@@ -63,4 +63,4 @@ class PackageReader {
   bool opened_ = false;
 };
 
-}  // namespace appsync::device
+}  // namespace appsync

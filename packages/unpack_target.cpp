@@ -1,4 +1,4 @@
-#include "device/packages/package_writer.h"
+#include "packages/unpack_target.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -6,16 +6,16 @@
 
 #include <cerrno>
 
-namespace appsync::device {
+namespace appsync {
 
-PackageWriter::PackageWriter(int targetDirectory)
+UnpackTarget::UnpackTarget(int targetDirectory)
     : target_(FileDescriptor(::fcntl(targetDirectory, F_DUPFD_CLOEXEC, 0)), Confinement::Beneath) {}
 
-bool PackageWriter::makeDirectory(std::string_view path) {
+bool UnpackTarget::makeDirectory(std::string_view path) {
   return static_cast<bool>(openOrMake(path));
 }
 
-FileDescriptor PackageWriter::openOrMake(std::string_view path) {
+FileDescriptor UnpackTarget::openOrMake(std::string_view path) {
   FileDescriptor directory = target_.openDirectoryAt(path);
   if (directory || errno != ENOENT) return directory;
   const std::size_t slash = path.rfind('/');
@@ -26,7 +26,7 @@ FileDescriptor PackageWriter::openOrMake(std::string_view path) {
   return target_.openDirectoryAt(path);
 }
 
-FileDescriptor PackageWriter::createFile(std::string_view path, bool executable) {
+FileDescriptor UnpackTarget::createFile(std::string_view path, bool executable) {
   const std::size_t slash = path.rfind('/');
   const std::string_view parent = slash == std::string_view::npos ? "." : path.substr(0, slash);
   if (!current_ || currentPath_ != parent) {
@@ -40,7 +40,7 @@ FileDescriptor PackageWriter::createFile(std::string_view path, bool executable)
                                  executable ? 0755 : 0644));
 }
 
-FileDescriptor PackageWriter::openFile(std::string_view path) const {
+FileDescriptor UnpackTarget::openFile(std::string_view path) const {
   return target_.openAt(path, O_RDONLY | O_NONBLOCK);
 }
 
@@ -50,4 +50,4 @@ bool makeExecutable(int fd) noexcept {
   return ::fchmod(fd, (status.st_mode & 0777) | (status.st_mode & 0444) >> 2) == 0;
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

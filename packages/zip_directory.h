@@ -5,7 +5,7 @@
 
 #include "platform/error.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// Whether the file begins as a zip archive does.
 bool looksLikeZip(int packageFd) noexcept;
@@ -17,4 +17,4 @@ bool looksLikeZip(int packageFd) noexcept;
 /// memory. The error is a refusal. Leaves the file's offset as it is.
 std::optional<Error> checkZipDirectory(int packageFd, std::uint64_t maximumEntries);
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -3,7 +3,7 @@
 #include <string>
 #include <string_view>
 
-namespace appsync::device {
+namespace appsync {
 
 /// Whether people could not see what the name really is: a control character (C0, DEL, C1), a line
 /// or paragraph separator, or a mark that turns the reading direction of what follows. `name` is
@@ -20,4 +20,4 @@ std::string foldCase(std::string_view name);
 /// off after 120 bytes.
 std::string shown(std::string_view name);
 
-}  // namespace appsync::device
+}  // namespace appsync

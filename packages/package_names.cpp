@@ -1,4 +1,4 @@
-#include "device/packages/package_names.h"
+#include "packages/package_names.h"
 
 #include <array>
 #include <cstdio>
@@ -6,7 +6,7 @@
 
 #include "platform/utf8.h"
 
-namespace appsync::device {
+namespace appsync {
 
 namespace {
 
@@ -118,4 +118,4 @@ std::string shown(std::string_view name) {
   return name.empty() ? result : result + "...";
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -1,4 +1,4 @@
-#include "device/packages/package_reader.h"
+#include "packages/package_reader.h"
 
 #include <archive.h>
 #include <archive_entry.h>
@@ -10,9 +10,9 @@
 #include <cerrno>
 #include <string_view>
 
-#include "device/packages/zip_directory.h"
+#include "packages/zip_directory.h"
 
-namespace appsync::device {
+namespace appsync {
 
 namespace {
 
@@ -207,4 +207,4 @@ Error PackageReader::failure() const {
   return refusalError(PackageRefusal::Damaged, text ? text : "it cannot be read");
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

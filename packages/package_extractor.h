@@ -8,7 +8,7 @@
 #include "platform/error.h"
 #include "platform/property_list.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// Why a package is refused: codes of InstallerServiceErrorDomain. The error's description is one
 /// line for people that begins with the name and tells the entry and the reason.
@@ -66,4 +66,4 @@ std::optional<ExtractedPackage> extractPackage(int packageFd, int targetDirector
                                                const PackageLimits& limits,
                                                std::optional<Error>* error) noexcept;
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -13,10 +13,10 @@
 
 #include "base/confined_directory.h"
 #include "base/file_descriptor.h"
-#include "device/packages/data_archive.h"
-#include "device/packages/package_names.h"
+#include "packages/data_archive.h"
+#include "packages/package_names.h"
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 constexpr std::size_t BlockSize = std::size_t{64} << 10;
@@ -260,4 +260,4 @@ std::optional<Error> readDataArchive(const DataSource& source, int directory,
   return DataArchiveReader(source, directory).read(entries);
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -6,7 +6,7 @@
 #include "platform/bytes.h"
 #include "platform/error.h"
 
-namespace appsync::device {
+namespace appsync {
 
 /// A package's bytes without their compression, checked against the checksums that the compression
 /// carries. Used by one thread.
@@ -24,4 +24,4 @@ class PackageStream {
 /// ever run as a program.
 std::unique_ptr<PackageStream> openPackageStream(int packageFd);
 
-}  // namespace appsync::device
+}  // namespace appsync

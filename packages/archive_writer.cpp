@@ -1,4 +1,4 @@
-#include "host/base/archive_writer.h"
+#include "packages/archive_writer.h"
 
 #include <archive.h>
 #include <archive_entry.h>
@@ -14,7 +14,7 @@
 
 #include "base/utf8_locale.h"
 
-namespace appsync::host {
+namespace appsync {
 namespace {
 
 struct Format {
@@ -148,4 +148,4 @@ bool ArchiveWriter::finish() {
   return problem_.empty();
 }
 
-}  // namespace appsync::host
+}  // namespace appsync

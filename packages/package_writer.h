@@ -5,7 +5,7 @@
 #include <optional>
 #include <string>
 
-namespace appsync::host {
+namespace appsync {
 
 struct WrittenPackage {
   std::string identifier;
@@ -22,4 +22,4 @@ std::optional<WrittenPackage> writePackage(const std::filesystem::path& folder,
                                            const std::filesystem::path& output,
                                            std::string& problem);
 
-}  // namespace appsync::host
+}  // namespace appsync

@@ -9,7 +9,7 @@
 struct archive;
 struct archive_entry;
 
-namespace appsync::host {
+namespace appsync {
 
 /// Writes a zip or tar archive whose bytes depend on nothing but what is added. Used by one thread.
 class ArchiveWriter {
@@ -40,4 +40,4 @@ class ArchiveWriter {
   std::string problem_;
 };
 
-}  // namespace appsync::host
+}  // namespace appsync

@@ -13,7 +13,7 @@
 struct archive;
 struct archive_entry;
 
-namespace appsync::host {
+namespace appsync {
 
 /// Walks the entries of a zip or tar archive of any compression. Used by one thread.
 class ArchiveReader {
@@ -56,4 +56,4 @@ class ArchiveReader {
   std::optional<std::string> problem_;
 };
 
-}  // namespace appsync::host
+}  // namespace appsync

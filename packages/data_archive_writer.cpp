@@ -14,9 +14,9 @@
 
 #include "base/directory_tree.h"
 #include "base/file_descriptor.h"
-#include "device/packages/data_archive.h"
+#include "packages/data_archive.h"
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 constexpr std::size_t BlockSize = std::size_t{64} << 10;
@@ -165,4 +165,4 @@ std::optional<Error> writeDataArchive(int directory, const DataSink& sink,
   return DataArchiveWriter(sink, skipped).write(directory);
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -1,4 +1,4 @@
-#include "host/library/package_reader.h"
+#include "packages/package_facts.h"
 
 #include <fmt/format.h>
 
@@ -8,13 +8,13 @@
 
 #include "base/identifiers.h"
 #include "base/text.h"
-#include "host/base/archive_reader.h"
+#include "packages/archive_reader.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
 #include "platform/utf8.h"
 
-namespace appsync::host {
+namespace appsync {
 namespace {
 
 constexpr std::size_t MaximumInfo = std::size_t{1} << 20;
@@ -198,4 +198,4 @@ PackageParts readPackageParts(const std::filesystem::path& path) {
   return parts;
 }
 
-}  // namespace appsync::host
+}  // namespace appsync

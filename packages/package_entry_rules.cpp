@@ -1,14 +1,14 @@
-#include "device/packages/package_entry_rules.h"
+#include "packages/package_entry_rules.h"
 
 #include <algorithm>
 
 #include "base/temporary_file.h"
-#include "device/packages/package_names.h"
+#include "packages/package_names.h"
 #include "platform/installer_service.h"
 #include "platform/sync_files.h"
 #include "platform/utf8.h"
 
-namespace appsync::device {
+namespace appsync {
 
 namespace {
 
@@ -228,4 +228,4 @@ bool PackageEntryRules::holdsFile(std::string_view path) const {
   return known != known_.end() && !known->second.isDirectory && known->second.path == path;
 }
 
-}  // namespace appsync::device
+}  // namespace appsync
