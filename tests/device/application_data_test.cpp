@@ -13,15 +13,15 @@
 #include "packages/data_archive.h"
 #include "tests/device/data_trees.h"
 #include "tests/device/device_test.h"
-#include "tests/device/package_builder.h"
+#include "tests/packages/package_builder.h"
 
 namespace appsync::device {
 namespace {
 
 namespace fs = std::filesystem;
-using testing::buildArchive;
+using package_tests::buildArchive;
+using package_tests::RawEntry;
 using ::testing::HasSubstr;
-using testing::RawEntry;
 
 constexpr const char* App = "com.example.app";
 const std::string Data = Containers::dataPath(App);
@@ -61,7 +61,7 @@ class ApplicationDataTest : public DeviceTest {
   }
 
   std::string refusalOf(std::vector<RawEntry> entries) {
-    return refusal(buildArchive(testing::ArchiveForm::Tar, entries));
+    return refusal(buildArchive(package_tests::ArchiveForm::Tar, entries));
   }
 
   /// The folder in which something came and went has a new time.
@@ -232,7 +232,7 @@ TEST_F(ApplicationDataTest, ALinkInThePlaceOfTheDataIsNotFollowed) {
 
   fs::create_directories(onDisk(Waiting).parent_path());
   fs::create_directory_symlink(temporary / "outside", onDisk(Waiting));
-  restore(buildArchive(testing::ArchiveForm::Tar, {{"file", "text"}}));
+  restore(buildArchive(package_tests::ArchiveForm::Tar, {{"file", "text"}}));
   EXPECT_EQ(textAt(Waiting + "/file"), "text");
   EXPECT_TRUE(fs::is_empty(temporary / "outside"));
 }
@@ -273,7 +273,7 @@ TEST_F(ApplicationDataTest, DataNestedTooDeepIsNeitherSavedNorRestored) {
   }
   EXPECT_THAT(refusalOf(entries), HasSubstr("lies too deep"));
   entries.pop_back();
-  restore(buildArchive(testing::ArchiveForm::Tar, entries));
+  restore(buildArchive(package_tests::ArchiveForm::Tar, entries));
   fs::create_directories(onDisk(path));
   EXPECT_FALSE(device->saveData(
       App, [](ByteView) { return true; }, &error));
@@ -284,9 +284,9 @@ TEST_F(ApplicationDataTest, WhatIsNoArchiveIsRefused) {
   putFile(Waiting + "/old", "old");
   EXPECT_THAT(refusal("nonsense"), HasSubstr("the archive of the data is damaged"));
   EXPECT_THAT(refusal(std::string(5000, 'x')), HasSubstr("damaged"));
-  EXPECT_THAT(refusal(buildArchive(testing::ArchiveForm::Zip, {{"file", "x"}})),
+  EXPECT_THAT(refusal(buildArchive(package_tests::ArchiveForm::Zip, {{"file", "x"}})),
               HasSubstr("damaged"));
-  EXPECT_THAT(refusal(buildArchive(testing::ArchiveForm::TarGz, {{"file", "x"}})),
+  EXPECT_THAT(refusal(buildArchive(package_tests::ArchiveForm::TarGz, {{"file", "x"}})),
               HasSubstr("damaged"));
 }
 

@@ -4,7 +4,7 @@
 #include "device/files/containers.h"
 #include "tests/device/data_trees.h"
 #include "tests/device/device_test.h"
-#include "tests/device/package_builder.h"
+#include "tests/packages/package_builder.h"
 
 namespace appsync::device {
 namespace {
@@ -14,9 +14,10 @@ using Lines = std::vector<std::string>;
 
 constexpr const char* App = "com.example.app";
 const std::string Data = Containers::dataPath(App);
-const std::string Archive = testing::buildArchive(
-    testing::ArchiveForm::Tar,
-    {testing::RawEntry::folder("kept/"), {"kept/notes", "from the backup"}, {"more", "more"}});
+const std::string Archive = package_tests::buildArchive(package_tests::ArchiveForm::Tar,
+                                                        {package_tests::RawEntry::folder("kept/"),
+                                                         {"kept/notes", "from the backup"},
+                                                         {"more", "more"}});
 
 /// An installed application with data of its own.
 class DataOverwriteTest : public DeviceTest {

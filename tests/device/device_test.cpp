@@ -1,8 +1,6 @@
 #include "tests/device/device_test.h"
 
 #include <fmt/format.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <array>
 #include <iterator>
@@ -13,14 +11,6 @@
 namespace appsync::device {
 
 namespace fs = std::filesystem;
-
-int inOtherProcess(const std::function<int()>& body) {
-  const pid_t child = fork();
-  if (child == 0) _exit(body());
-  int status = 0;
-  if (child < 0 || waitpid(child, &status, 0) != child) return -1;
-  return WIFSIGNALED(status) ? 128 + WTERMSIG(status) : WEXITSTATUS(status);
-}
 
 DeviceTest::DeviceTest() {
   DeviceError problem;

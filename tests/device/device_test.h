@@ -13,14 +13,13 @@
 #include "tests/device/package_archive.h"
 #include "tests/fakes/call_trace.h"
 #include "tests/fakes/fake_sync_host.h"
+#include "tests/fakes/other_process.h"
 #include "tests/fakes/temporary_folder.h"
 
 namespace appsync::device {
 
+using fakes::inOtherProcess;
 using fakes::TemporaryFolder;
-
-/// Runs `body` in a forked process; its exit status, or 128 and the signal that ended it.
-int inOtherProcess(const std::function<int()>& body);
 
 /// A new device in a temporary folder, open for writing.
 class DeviceTest : public ::testing::Test {

@@ -3,7 +3,7 @@
 #include "tests/device/data_trees.h"
 #include "tests/device/device_test.h"
 #include "tests/device/failing_calls.h"
-#include "tests/device/package_builder.h"
+#include "tests/packages/package_builder.h"
 
 namespace appsync::device {
 namespace {
@@ -146,8 +146,9 @@ TEST_F(FileFaultsTest, AnInstallThatIsTriedAgainFindsBothDataAsTheyWere) {
 TEST_F(FileFaultsTest, DataThatIsOverwrittenIsTheOldOrTheNew) {
   ASSERT_TRUE(installPackage(archive("1.0"), Id));
   putFile(Notes, "mine");
-  const std::string given = testing::buildArchive(
-      testing::ArchiveForm::Tar, {testing::RawEntry::folder("kept/"), {"kept/notes", "given"}});
+  const std::string given = package_tests::buildArchive(
+      package_tests::ArchiveForm::Tar,
+      {package_tests::RawEntry::folder("kept/"), {"kept/notes", "given"}});
   const Snapshot before = fakes::snapshot(onDisk(Containers::DataDirectory));
   const Snapshot after = {{"com.example.a", "folder 0755"},
                           {"com.example.a/kept", "folder 0755"},

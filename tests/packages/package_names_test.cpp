@@ -2,7 +2,7 @@
 
 #include <gtest/gtest.h>
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 TEST(PackageNames, FoldCaseOfTheAlphabetsNamed) {
@@ -38,4 +38,4 @@ TEST(PackageNames, AreShownOnOneLineOfReadableText) {
 }
 
 }  // namespace
-}  // namespace appsync::device
+}  // namespace appsync

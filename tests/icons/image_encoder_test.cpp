@@ -3,7 +3,7 @@
 #include <gtest/gtest.h>
 #include <png.h>
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 Image gradient(std::uint32_t width, std::uint32_t height) {
@@ -98,4 +98,4 @@ TEST(PngEncoder, WritesItsFileOnce) {
 }
 
 }  // namespace
-}  // namespace appsync::device
+}  // namespace appsync

@@ -7,7 +7,7 @@
 #include "platform/bytes.h"
 #include "platform/icon_renderer.h"
 
-namespace appsync::device {
+namespace appsync {
 
 using Pixel = std::array<std::uint8_t, 4>;  ///< red, green, blue, alpha
 
@@ -35,4 +35,4 @@ Bytes jpegFile(std::uint32_t width, std::uint32_t height, const Drawing& drawing
 /// Overwrites width and height in a PNG file's header and mends its checksum.
 void setPngSize(Bytes& file, std::uint32_t width, std::uint32_t height);
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -2,13 +2,17 @@
 
 #include <fcntl.h>
 #include <grp.h>
+#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "base/file_descriptor.h"
-#include "tests/device/device_test.h"
+#include <filesystem>
 
-namespace appsync::device {
+#include "base/file_descriptor.h"
+#include "tests/fakes/other_process.h"
+#include "tests/fakes/temporary_folder.h"
+
+namespace appsync {
 namespace {
 
 constexpr uid_t Nobody = 65534;
@@ -24,7 +28,7 @@ TEST(DirectoryTree, WithClosedDirectoriesInItIsRemovedByItsOwner) {
   if (geteuid() == 0) {
     ASSERT_EQ(chown(temporary.path().c_str(), Nobody, Nobody), 0);
   }
-  const int status = inOtherProcess([&] {
+  const int status = fakes::inOtherProcess([&] {
     if (!becomeOrdinaryUser()) return 2;
     for (const mode_t mode : {0000U, 0100U, 0400U, 0500U}) {
       const auto closed = temporary / "tree" / std::to_string(mode);
@@ -54,4 +58,4 @@ TEST(DirectoryTree, ALinkInItIsRemovedAndWhatItLeadsToIsNot) {
 }
 
 }  // namespace
-}  // namespace appsync::device
+}  // namespace appsync

@@ -11,7 +11,7 @@
 #include "packages/package_extractor.h"
 #include "tests/fakes/temporary_folder.h"
 
-namespace appsync::device::testing {
+namespace appsync::package_tests {
 
 /// An entry of an archive, put down exactly as it says.
 struct RawEntry {
@@ -62,4 +62,4 @@ Outcome unpackFile(const std::filesystem::path& file,
 /// The file with its bytes, in memory.
 FileDescriptor memoryFile(std::string_view bytes);
 
-}  // namespace appsync::device::testing
+}  // namespace appsync::package_tests

@@ -1,4 +1,4 @@
-#include "tests/device/package_builder.h"
+#include "tests/packages/package_builder.h"
 
 #include <archive.h>
 #include <archive_entry.h>
@@ -11,7 +11,7 @@
 #include "platform/installer_service.h"
 #include "platform/property_list_codec.h"
 
-namespace appsync::device::testing {
+namespace appsync::package_tests {
 
 namespace {
 
@@ -170,4 +170,4 @@ Outcome unpackFile(const std::filesystem::path& file, std::optional<std::string_
   return unpackFrom(package.get(), identifier, limits);
 }
 
-}  // namespace appsync::device::testing
+}  // namespace appsync::package_tests

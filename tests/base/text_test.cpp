@@ -5,7 +5,7 @@
 #include "platform/utf8.h"
 #include "tests/test_pch.h"
 
-namespace appsync::host {
+namespace appsync {
 namespace {
 
 TEST(PrintableText, KeepsOrdinaryTextOfAnyScript) {
@@ -68,4 +68,4 @@ TEST(IsoTime, TellsMilliseconds) {
 }
 
 }  // namespace
-}  // namespace appsync::host
+}  // namespace appsync

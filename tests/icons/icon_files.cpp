@@ -1,4 +1,4 @@
-#include "tests/device/icon_files.h"
+#include "tests/icons/icon_files.h"
 
 #include <png.h>
 
@@ -12,7 +12,7 @@
 #include <string>
 #include <vector>
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 using Row = std::vector<std::uint8_t>;
@@ -197,4 +197,4 @@ void setPngSize(Bytes& file, std::uint32_t width, std::uint32_t height) {
   putBigEndian(&file.at(header + headerSize), checksum(&file[header], headerSize));
 }
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -2,10 +2,10 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/device/icon_files.h"
 #include "tests/fakes/fake_file_manager.h"
+#include "tests/icons/icon_files.h"
 
-namespace appsync::device {
+namespace appsync {
 namespace {
 
 constexpr std::string_view BundlePath = "/var/mobile/Media/Chess.app";
@@ -283,4 +283,4 @@ TEST_F(DamagedIcon, NeverCrashesAndPngNoticesEveryChange) {
 
 }  // namespace
 
-}  // namespace appsync::device
+}  // namespace appsync

@@ -1,5 +1,6 @@
-#include "host/library/library.h"
 #include "packages/package_facts.h"
+
+#include "host/library/library.h"
 #include "platform/bundle.h"
 #include "tests/host/host_files.h"
 #include "tests/test_pch.h"

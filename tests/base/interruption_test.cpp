@@ -3,7 +3,7 @@
 #include <gtest/gtest.h>
 #include <signal.h>
 
-namespace appsync::host {
+namespace appsync {
 namespace {
 
 /// Whether a request stands after the signals, and after the watcher has come to its end.
@@ -53,4 +53,4 @@ TEST(SignalWatcher, AHangUpThatWasIgnoredStaysIgnored) {
 }
 
 }  // namespace
-}  // namespace appsync::host
+}  // namespace appsync

@@ -4,9 +4,9 @@
 
 #include <cstdlib>
 
-#include "tests/device/package_builder.h"
+#include "tests/packages/package_builder.h"
 
-namespace appsync::device::testing {
+namespace appsync::package_tests {
 namespace {
 
 namespace fs = std::filesystem;
@@ -157,4 +157,4 @@ TEST(PackageModes, OnlyTheOwnersRightToRunCounts) {
 }
 
 }  // namespace
-}  // namespace appsync::device::testing
+}  // namespace appsync::package_tests

@@ -3,9 +3,9 @@
 
 #include <algorithm>
 
-#include "tests/device/package_builder.h"
+#include "tests/packages/package_builder.h"
 
-namespace appsync::device::testing {
+namespace appsync::package_tests {
 namespace {
 
 using Kind = RawEntry::Kind;
@@ -189,4 +189,4 @@ TEST(ForeignFile, IsNoArchive) {
 }
 
 }  // namespace
-}  // namespace appsync::device::testing
+}  // namespace appsync::package_tests

@@ -7,9 +7,9 @@
 
 #include <cstdlib>
 
-#include "tests/device/package_builder.h"
+#include "tests/packages/package_builder.h"
 
-namespace appsync::device::testing {
+namespace appsync::package_tests {
 namespace {
 
 constexpr ArchiveForm Compressed[] = {ArchiveForm::Zip,    ArchiveForm::TarGz,
@@ -154,4 +154,4 @@ TEST(PackageLimits, FullDiskIsNamed) {
 }
 
 }  // namespace
-}  // namespace appsync::device::testing
+}  // namespace appsync::package_tests

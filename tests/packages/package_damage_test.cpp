@@ -1,8 +1,8 @@
 #include <gtest/gtest.h>
 
-#include "tests/device/package_builder.h"
+#include "tests/packages/package_builder.h"
 
-namespace appsync::device::testing {
+namespace appsync::package_tests {
 namespace {
 
 class DamagedPackage : public ::testing::TestWithParam<ArchiveForm> {
@@ -48,4 +48,4 @@ INSTANTIATE_TEST_SUITE_P(AllForms, DamagedPackage,
                          [](const auto& test) { return std::string(name(test.param)); });
 
 }  // namespace
-}  // namespace appsync::device::testing
+}  // namespace appsync::package_tests
