@@ -61,8 +61,8 @@ std::optional<PropertyList::Dictionary> parseInfo(const Bytes& bytes) {
   return std::move(*plist->asDictionary());
 }
 
-std::optional<LibraryPackage> describe(const std::filesystem::path& file, const Bytes& infoPlist,
-                                       const std::string& bundleName, std::string& reason) {
+std::optional<PackageFacts> describe(const std::filesystem::path& file, const Bytes& infoPlist,
+                                     const std::string& bundleName, std::string& reason) {
   const auto info = parseInfo(infoPlist);
   if (!info) {
     reason = "its Info.plist is no property list that can be read";
@@ -83,8 +83,8 @@ std::optional<LibraryPackage> describe(const std::filesystem::path& file, const 
     return std::nullopt;
   }
   const std::string* name = findString(*info, KBBundleDisplayName);
-  return LibraryPackage{file, *identifier, version ? *version : std::string(),
-                        printable(name && !name->empty() ? *name : bundleName)};
+  return PackageFacts{file, *identifier, version ? *version : std::string(),
+                      printable(name && !name->empty() ? *name : bundleName)};
 }
 
 /// Whether the name is one plain file name that cannot hide another part.
@@ -144,11 +144,11 @@ std::string_view packageEnding(std::string_view fileName) {
   return ending == Endings.end() ? std::string_view() : *ending;
 }
 
-std::optional<LibraryPackage> readPackage(const std::filesystem::path& path,
-                                          UnreadablePackage& failure) {
+std::optional<PackageFacts> readPackage(const std::filesystem::path& path,
+                                        UnreadablePackage& failure) {
   failure = {path.filename().string(), false, {}};
   ArchiveReader reader(path);
-  std::optional<LibraryPackage> package;
+  std::optional<PackageFacts> package;
   bool hasInfo = false;
   while (!hasInfo && reader.next()) {
     const auto file = bundleFile(reader.name());

@@ -20,8 +20,8 @@ std::span<const std::string_view> packageEndings();
 /// The one of them that a file's name has; empty when it has none.
 std::string_view packageEnding(std::string_view fileName);
 
-/// One application package of a desktop library, as its information dictionary describes it.
-struct LibraryPackage {
+/// An application package as its information dictionary describes it.
+struct PackageFacts {
   std::filesystem::path file;
   std::string identifier;
   std::string version;  ///< empty when the bundle gives none
@@ -30,7 +30,7 @@ struct LibraryPackage {
 
 /// Why a file cannot be offered to the phone.
 struct UnreadablePackage {
-  std::string file;  ///< its name in the library
+  std::string file;  ///< its name
   /// By its ending or its contents, and no other is used in its place.
   bool looksLikePackage = false;
   std::string reason;  ///< for people, one line
@@ -39,8 +39,8 @@ struct UnreadablePackage {
 /// Reads no further than the information dictionary: what lies behind may be damaged, the phone
 /// judges that. Memory and work are bounded whatever the file holds. nullopt (with the reason) when
 /// this is no package or its beginning cannot be read.
-std::optional<LibraryPackage> readPackage(const std::filesystem::path& path,
-                                          UnreadablePackage& failure);
+std::optional<PackageFacts> readPackage(const std::filesystem::path& path,
+                                        UnreadablePackage& failure);
 
 /// Reads all of a package. Why that cannot be done, for people; nullopt when it can.
 std::optional<std::string> damageOf(const std::filesystem::path& path);

@@ -14,9 +14,9 @@ namespace fs = std::filesystem;
 namespace {
 
 /// Packages of one application and version.
-using Rivals = std::vector<LibraryPackage>;
+using Rivals = std::vector<PackageFacts>;
 
-void add(LibraryPackage package, Rivals& rivals) {
+void add(PackageFacts package, Rivals& rivals) {
   const auto order = rivals.empty() ? std::weak_ordering::equivalent
                                     : compareVersions(package.version, rivals.front().version);
   if (std::is_gt(order)) rivals.clear();
@@ -25,10 +25,10 @@ void add(LibraryPackage package, Rivals& rivals) {
 
 /// The first that is whole. Only rivals are read to their ends: of a single package the phone
 /// judges what lies behind its beginning.
-const LibraryPackage& choose(const Rivals& rivals, std::vector<UnreadablePackage>& damaged) {
+const PackageFacts& choose(const Rivals& rivals, std::vector<UnreadablePackage>& damaged) {
   if (rivals.size() == 1) return rivals.front();
   std::vector<UnreadablePackage> passedOver;
-  for (const LibraryPackage& package : rivals) {
+  for (const PackageFacts& package : rivals) {
     const auto damage = damageOf(package.file);
     if (damage) {
       passedOver.push_back({package.file.filename().string(), false, *damage});
@@ -45,7 +45,7 @@ const LibraryPackage& choose(const Rivals& rivals, std::vector<UnreadablePackage
 
 }  // namespace
 
-const LibraryPackage* Library::find(std::string_view identifier) const {
+const PackageFacts* Library::find(std::string_view identifier) const {
   const auto found = packages.find(identifier);
   return found == packages.end() ? nullptr : &found->second;
 }

@@ -15,10 +15,10 @@ struct Library {
   std::filesystem::path folder;
   /// By identifier; of several packages of one application the one of the highest version, of
   /// several of that the first that is not damaged.
-  std::map<std::string, LibraryPackage, std::less<>> packages;
+  std::map<std::string, PackageFacts, std::less<>> packages;
   std::vector<UnreadablePackage> unreadable;  ///< in the order of their names
 
-  const LibraryPackage* find(std::string_view identifier) const;
+  const PackageFacts* find(std::string_view identifier) const;
 };
 
 /// nullopt, with one line for people, when the folder itself cannot be read.

@@ -130,13 +130,13 @@ class Planner {
   }
 
   /// Whether all that is left to do for an install is to tell of it.
-  bool isUntold(const LibraryPackage& package) const {
+  bool isUntold(const PackageFacts& package) const {
     const InstalledApplication* application = find(package.identifier);
     return application && application->isUntold && !application->isDamaged &&
            !package.version.empty() && application->version == package.version;
   }
 
-  void install(const LibraryPackage& package) {
+  void install(const PackageFacts& package) {
     const InstalledApplication* application = find(package.identifier);
     const bool isInstalled = application && !application->isPlaceholder;
     const std::string current = isInstalled ? application->version : std::string();

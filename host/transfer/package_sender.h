@@ -23,7 +23,7 @@ inline constexpr const char* InterruptedTransfer = "interrupted before it was se
 /// A package that is to be sent, and what for.
 struct Shipment {
   SyncAssetPtr asset;                       ///< stands for it in the queue
-  const LibraryPackage* package = nullptr;  ///< without one it fails when its turn comes
+  const PackageFacts* package = nullptr;  ///< without one it fails when its turn comes
   std::string target;                       ///< file of the phone
   std::unique_ptr<PackageDelivery> delivery;
 };

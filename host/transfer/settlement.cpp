@@ -73,7 +73,7 @@ void settleInstall(const PlannedEntry& entry, const SyncEnd& end, Summary& summa
 void nameFiles(const Library& library, Summary& summary) {
   for (FailedEntry& failure : summary.failed) {
     if (failure.ofRemoval) continue;
-    const LibraryPackage* package = library.find(failure.identifier);
+    const PackageFacts* package = library.find(failure.identifier);
     if (package && failure.file.empty()) failure.file = package->file.filename().string();
   }
 }

@@ -26,7 +26,7 @@ std::vector<Shipment> shipmentsTo(SyncClient& client, const std::vector<SyncAsse
                                   const Library& library) {
   std::vector<Shipment> shipments;
   for (const SyncAssetPtr& asset : assets) {
-    const LibraryPackage* package = library.find(asset->identifier);
+    const PackageFacts* package = library.find(asset->identifier);
     const std::string name = package ? stagedPackageName(*package) : std::string();
     shipments.push_back({asset, package, joinPath(exchange::StagingRoot, name),
                          deliverToClient(client, asset, name)});
@@ -58,7 +58,7 @@ std::vector<Shipment> shipmentsFromStore(HostProcess& host, const Phone& phone,
     const AppRecord* placeholder = found == present.placeholders.end() ? nullptr : &found->second;
     const bool isOwed = std::ranges::count(owed, identifier) > 0;
     auto delivery = deliveryOfStore(phone, identifier, placeholder, isOwed, origin);
-    const LibraryPackage* package = catalogue.find(identifier);
+    const PackageFacts* package = catalogue.find(identifier);
     if (!delivery || !package) continue;
     const bool named = placeholder && !placeholder->displayName.empty();
     shipments.push_back({host.makeDownload(identifier, ApplicationDataclass,

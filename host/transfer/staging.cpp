@@ -44,7 +44,7 @@ class Stage {
     return false;
   }
 
-  bool writeApplication(const LibraryPackage& package) {
+  bool writeApplication(const PackageFacts& package) {
     const std::string directory = joinPath(exchange::StagingArea, package.identifier);
     const PackageParts parts = readPackageParts(package.file);
     return makeDirectory(directory) &&
@@ -114,7 +114,7 @@ bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
   files.removeItem(exchange::StagingArea);
   if (!area.makeDirectory(exchange::StagingArea)) return false;
   for (const PlannedEntry& entry : plan.entries) {
-    const LibraryPackage* package = library.find(entry.identifier);
+    const PackageFacts* package = library.find(entry.identifier);
     if (entry.action == Action::Remove || entry.byHost || !package) continue;
     if (!area.writeApplication(*package)) return false;
   }
@@ -124,7 +124,7 @@ bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
          area.write(exchange::StagingArea, exchange::TodoListName, todo);
 }
 
-std::string stagedPackageName(const LibraryPackage& package) {
+std::string stagedPackageName(const PackageFacts& package) {
   const std::string_view ending = packageEnding(package.file.filename().string());
   return package.identifier + std::string(ending.empty() ? PlainEnding : ending);
 }

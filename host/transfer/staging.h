@@ -17,7 +17,7 @@ bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
            const std::optional<Bytes>& iconLayout, std::optional<Error>* error);
 
 /// The name under which a package is sent: the identifier and the ending of the library's file.
-std::string stagedPackageName(const LibraryPackage& package);
+std::string stagedPackageName(const PackageFacts& package);
 
 /// The applications whose packages a sync or restore may have sent: those that the phone, a todo
 /// list or the restore state names. What is named like a package of any other is somebody's own

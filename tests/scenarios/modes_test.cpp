@@ -43,7 +43,7 @@ struct Round {
 /// Packages, each made when it is first asked for.
 class Shelf {
  public:
-  LibraryPackage package(const Task& task) const {
+  PackageFacts package(const Task& task) const {
     const std::string kind = std::to_string(static_cast<int>(task.wish));
     const auto file = folder_ / (task.identifier + "-" + task.version + "-" + kind + ".zip");
     if (!std::filesystem::exists(file)) make(file, task);

@@ -93,7 +93,7 @@ class PersonRacesTest : public ::testing::Test {
       testing::packSample(file, idOf(number), version, 4000);
       options.install.push_back(idOf(number));
       input.library.packages.emplace(idOf(number),
-                                     LibraryPackage{file, idOf(number), version, "Sample"});
+                                     PackageFacts{file, idOf(number), version, "Sample"});
     }
     std::string problem;
     input.plan = makePlan(input.library, installedApplications(phoneOf(*device_), problem).value(),
