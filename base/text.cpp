@@ -6,72 +6,62 @@
 #include <array>
 #include <cmath>
 #include <ctime>
-#include <cwchar>
+#include <iterator>
+#include <optional>
+
+#include "platform/utf8.h"
 
 namespace appsync {
 namespace {
 
-constexpr char32_t Bad = 0xFFFD;
+constexpr char32_t Replacement = 0xfffd;
 
-struct Character {
-  char32_t value = Bad;
-  std::size_t length = 1;
-};
-
-std::size_t sequenceLength(unsigned char lead) {
-  if (lead < 0x80) return 1;
-  if (lead >= 0xC2 && lead <= 0xDF) return 2;
-  if (lead >= 0xE0 && lead <= 0xEF) return 3;
-  if (lead >= 0xF0 && lead <= 0xF4) return 4;
-  return 0;
-}
-
-/// The character at the beginning of `text`; `Bad` of length 1 where none is well formed.
-Character decode(std::string_view text) {
-  static constexpr std::array<char32_t, 5> Smallest = {0, 0, 0x80, 0x800, 0x10000};
-  const auto lead = static_cast<unsigned char>(text.front());
-  const std::size_t length = sequenceLength(lead);
-  if (length == 1) return {lead, 1};
-  if (length == 0 || length > text.size()) return {};
-  char32_t value = lead & (0x7Fu >> length);
-  for (std::size_t i = 1; i < length; ++i) {
-    const auto next = static_cast<unsigned char>(text[i]);
-    if ((next & 0xC0) != 0x80) return {};
-    value = (value << 6) | (next & 0x3Fu);
-  }
-  const bool surrogate = value >= 0xD800 && value <= 0xDFFF;
-  if (value < Smallest[length] || value > 0x10FFFF || surrogate) return {};
-  return {value, length};
-}
-
-bool isUnsafe(char32_t c) {
-  const bool control = c < 0x20 || (c >= 0x7F && c < 0xA0);
-  const bool lineBreak = c == 0x2028 || c == 0x2029;
-  const bool direction = c == 0x200E || c == 0x200F || c == 0x061C ||
-                         (c >= 0x202A && c <= 0x202E) || (c >= 0x2066 && c <= 0x2069);
-  return control || lineBreak || direction;
-}
-
-std::size_t columnsOf(char32_t c) {
-  const int width = ::wcwidth(static_cast<wchar_t>(c));
-  return width < 0 ? 1 : static_cast<std::size_t>(width);
+/// Takes the next character; nullopt, and one byte taken, where none is well formed or it is a
+/// control.
+std::optional<char32_t> takeVisible(std::string_view& text) {
+  const std::optional<char32_t> character = takeCharacter(text);
+  if (!character) text.remove_prefix(1);
+  return character && isControl(*character) ? std::nullopt : character;
 }
 
 }  // namespace
 
+bool isControl(char32_t character) {
+  const bool coded = character < 0x20 || (character >= 0x7f && character < 0xa0);
+  const bool lineEnd = character == 0x2028 || character == 0x2029;
+  const bool direction =
+      (character >= 0x202a && character <= 0x202e) || (character >= 0x2066 && character <= 0x2069);
+  return coded || lineEnd || direction;
+}
+
+bool holdsControls(std::string_view text) {
+  while (!text.empty())
+    if (!takeVisible(text)) return true;
+  return false;
+}
+
 std::string printable(std::string_view text) {
   std::string result;
   result.reserve(text.size());
-  while (!text.empty()) {
-    const Character c = decode(text);
-    if (c.value == Bad || isUnsafe(c.value)) {
-      result += "\xEF\xBF\xBD";
-    } else {
-      result += text.substr(0, c.length);
-    }
-    text.remove_prefix(c.length);
-  }
+  while (!text.empty()) appendUtf8(result, takeVisible(text).value_or(Replacement));
   return result;
+}
+
+std::string shown(std::string_view text) {
+  constexpr std::size_t longest = 120;
+  std::string result;
+  while (!text.empty() && result.size() < longest) {
+    const std::string_view before = text;
+    const bool visible = takeVisible(text).has_value();
+    const std::string_view taken = before.substr(0, before.size() - text.size());
+    if (visible) {
+      result += taken;
+      continue;
+    }
+    for (const char byte : taken)
+      fmt::format_to(std::back_inserter(result), "\\x{:02x}", static_cast<unsigned char>(byte));
+  }
+  return text.empty() ? result : result + "...";
 }
 
 std::string oneLine(std::string_view text) {
@@ -80,32 +70,6 @@ std::string oneLine(std::string_view text) {
   std::string result(text.substr(0, last == std::string_view::npos ? 0 : last + 1));
   std::replace(result.begin(), result.end(), '\n', ' ');
   return result;
-}
-
-std::size_t displayWidth(std::string_view text) {
-  std::size_t columns = 0;
-  while (!text.empty()) {
-    const Character c = decode(text);
-    columns += columnsOf(c.value);
-    text.remove_prefix(c.length);
-  }
-  return columns;
-}
-
-std::string fitted(std::string_view text, std::size_t columns) {
-  const std::string safe = printable(text);
-  std::string_view rest = safe;
-  std::string result;
-  std::size_t used = 0;
-  while (!rest.empty()) {
-    const Character c = decode(rest);
-    const std::size_t width = columnsOf(c.value);
-    if (used + width > columns) break;
-    result += rest.substr(0, c.length);
-    used += width;
-    rest.remove_prefix(c.length);
-  }
-  return result.append(columns - used, ' ');
 }
 
 std::string byteCount(std::uint64_t bytes) {

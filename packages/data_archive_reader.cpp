@@ -13,8 +13,8 @@
 
 #include "base/confined_directory.h"
 #include "base/file_descriptor.h"
+#include "base/text.h"
 #include "packages/data_archive.h"
-#include "packages/package_names.h"
 
 namespace appsync {
 namespace {

@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "base/temporary_file.h"
+#include "base/text.h"
 #include "packages/package_names.h"
 #include "platform/installer_service.h"
 #include "platform/sync_files.h"
@@ -108,7 +109,7 @@ std::optional<Error> PackageEntryRules::admit(const ArchiveEntry& entry, Package
 std::optional<Error> PackageEntryRules::checkName(std::string_view name) const {
   if (name.empty()) return refuse(PackageRefusal::UnsafeName, "an entry has no readable name");
   if (!isUtf8(name)) return refuseEntry(PackageRefusal::UnsafeName, name, "is not UTF-8");
-  if (holdsInvisibleControls(name))
+  if (holdsControls(name))
     return refuseEntry(PackageRefusal::UnsafeName, name, "holds a control character");
   if (name.size() > LongestPath)
     return refuseEntry(PackageRefusal::UnsafeName, name, "is longer than 1024 bytes");

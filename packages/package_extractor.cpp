@@ -7,8 +7,8 @@
 #include <new>
 
 #include "base/identifiers.h"
+#include "base/text.h"
 #include "packages/package_entry_rules.h"
-#include "packages/package_names.h"
 #include "packages/package_reader.h"
 #include "packages/unpack_target.h"
 #include "platform/bundle.h"

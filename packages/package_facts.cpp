@@ -78,7 +78,7 @@ std::optional<PackageFacts> describe(const std::filesystem::path& file, const By
     return std::nullopt;
   }
   const std::string* version = findString(*info, KBBundleVersion);
-  if (version && printable(*version) != *version) {
+  if (version && holdsControls(*version)) {
     reason = fmt::format("its version \"{}\" cannot be used", printable(*version));
     return std::nullopt;
   }

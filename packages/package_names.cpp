@@ -1,7 +1,6 @@
 #include "packages/package_names.h"
 
 #include <array>
-#include <cstdio>
 #include <optional>
 
 #include "platform/utf8.h"
@@ -9,34 +8,6 @@
 namespace appsync {
 
 namespace {
-
-/// Takes the first character off a non-empty text; nullopt (and nothing taken) when it is
-/// malformed.
-std::optional<char32_t> takeCharacter(std::string_view& text) {
-  const auto byteAt = [&](std::size_t i) { return static_cast<unsigned char>(text[i]); };
-  const unsigned char first = byteAt(0);
-  const std::size_t length = first < 0x80   ? 1
-                             : first < 0xc2 ? 0
-                             : first < 0xe0 ? 2
-                             : first < 0xf0 ? 3
-                                            : 4;
-  if (length == 0 || first > 0xf4 || text.size() < length) return std::nullopt;
-  char32_t value = length == 1 ? first : first & (0x7fU >> length);
-  for (std::size_t i = 1; i < length; ++i) {
-    if ((byteAt(i) & 0xc0) != 0x80) return std::nullopt;
-    value = value << 6 | (byteAt(i) & 0x3f);
-  }
-  const bool overlong = (length == 3 && value < 0x800) || (length == 4 && value < 0x10000);
-  const bool surrogate = value >= 0xd800 && value <= 0xdfff;
-  if (overlong || surrogate || value > 0x10ffff) return std::nullopt;
-  text.remove_prefix(length);
-  return value;
-}
-
-bool isInvisibleControl(char32_t c) {
-  return c < 0x20 || (c >= 0x7f && c < 0xa0) || c == 0x2028 || c == 0x2029 ||
-         (c >= 0x202a && c <= 0x202e) || (c >= 0x2066 && c <= 0x2069);
-}
 
 /// Capital letters that stand a fixed way before their small ones, or alternate with them.
 struct Range {
@@ -79,14 +50,6 @@ char32_t folded(char32_t c) {
 
 }  // namespace
 
-bool holdsInvisibleControls(std::string_view name) {
-  while (!name.empty()) {
-    const std::optional<char32_t> c = takeCharacter(name);
-    if (!c || isInvisibleControl(*c)) return true;
-  }
-  return false;
-}
-
 std::string foldCase(std::string_view name) {
   std::string result;
   result.reserve(name.size());
@@ -96,26 +59,6 @@ std::string foldCase(std::string_view name) {
     appendUtf8(result, folded(*c));
   }
   return result;
-}
-
-std::string shown(std::string_view name) {
-  constexpr std::size_t longest = 120;
-  std::string result;
-  while (!name.empty() && result.size() < longest) {
-    const std::string_view before = name;
-    const std::optional<char32_t> c = takeCharacter(name);
-    if (c && !isInvisibleControl(*c)) {
-      result.append(before.substr(0, before.size() - name.size()));
-      continue;
-    }
-    if (!c) name.remove_prefix(1);
-    for (const char byte : before.substr(0, before.size() - name.size())) {
-      std::array<char, 5> escape{};
-      std::snprintf(escape.data(), escape.size(), "\\x%02x", static_cast<unsigned char>(byte));
-      result += escape.data();
-    }
-  }
-  return name.empty() ? result : result + "...";
 }
 
 }  // namespace appsync

@@ -123,7 +123,7 @@ class Packer {
     const fs::file_status status = fs::symlink_status(path, error);
     const std::string shown = printable(path.string());
     if (error) return fail(systemReason(path, error.value()));
-    if (!isUtf8(name) || printable(name) != name) return fail(shown + " has an unusable name");
+    if (holdsControls(name)) return fail(shown + " has an unusable name");
     if (fs::is_symlink(status)) return fail(shown + " is a link, which packages may not hold");
     if (!fs::is_directory(status) && !fs::is_regular_file(status)) {
       return fail(shown + " is neither a file nor a folder");

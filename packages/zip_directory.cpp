@@ -8,8 +8,8 @@
 #include <string>
 #include <string_view>
 
+#include "base/text.h"
 #include "packages/package_entry_rules.h"
-#include "packages/package_names.h"
 
 namespace appsync {
 

@@ -36,19 +36,38 @@ std::size_t skipAscii(std::string_view text, std::size_t at) {
   return at;
 }
 
+/// Bytes of the character at the beginning of a text that is not empty; 0 where none is well
+/// formed.
+std::size_t lengthOfFirst(std::string_view text) {
+  const auto byte = [&](std::size_t i) { return static_cast<unsigned char>(text[i]); };
+  const Lead lead = leadOf(byte(0));
+  if (lead.length > text.size()) return 0;
+  if (lead.length > 1 && (byte(1) < lead.low || byte(1) > lead.high)) return 0;
+  for (std::size_t i = 2; i < lead.length; ++i)
+    if ((byte(i) & 0xc0) != 0x80) return 0;
+  return lead.length;
+}
+
 }  // namespace
 
 bool isUtf8(std::string_view text) {
   for (std::size_t at = skipAscii(text, 0); at < text.size(); at = skipAscii(text, at)) {
-    const auto byte = [&](std::size_t i) { return static_cast<unsigned char>(text[at + i]); };
-    const Lead lead = leadOf(byte(0));
-    if (lead.length == 0 || lead.length > text.size() - at) return false;
-    if (lead.length > 1 && (byte(1) < lead.low || byte(1) > lead.high)) return false;
-    for (std::size_t i = 2; i < lead.length; ++i)
-      if ((byte(i) & 0xc0) != 0x80) return false;
-    at += lead.length;
+    const std::size_t length = lengthOfFirst(text.substr(at));
+    if (length == 0) return false;
+    at += length;
   }
   return true;
+}
+
+std::optional<char32_t> takeCharacter(std::string_view& text) {
+  const std::size_t length = lengthOfFirst(text);
+  if (length == 0) return std::nullopt;
+  const auto first = static_cast<unsigned char>(text.front());
+  char32_t character = length == 1 ? first : first & (0x7fU >> length);
+  for (const char next : text.substr(1, length - 1))
+    character = character << 6 | (static_cast<unsigned char>(next) & 0x3fU);
+  text.remove_prefix(length);
+  return character;
 }
 
 void appendUtf8(std::string& out, char32_t character) {

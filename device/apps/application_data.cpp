@@ -11,12 +11,12 @@
 
 #include "base/directory_tree.h"
 #include "base/temporary_file.h"
+#include "base/text.h"
 #include "device/apps/idle_application.h"
 #include "device/apps/removal.h"
 #include "device/journal/history.h"
 #include "device/state/application_rows.h"
 #include "packages/data_archive.h"
-#include "packages/package_names.h"
 
 namespace appsync::device {
 namespace {

@@ -12,6 +12,7 @@
 #include <system_error>
 
 #include "base/text.h"
+#include "host/report/columns.h"
 #include "host/report/report.h"
 
 namespace appsync::host {

@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "base/text.h"
+#include "host/report/columns.h"
 
 namespace appsync::host {
 

@@ -8,6 +8,7 @@
 
 #include "base/interruption.h"
 #include "base/text.h"
+#include "host/report/columns.h"
 
 namespace appsync::host {
 namespace {

@@ -1,7 +1,5 @@
 #include "base/text.h"
 
-#include <clocale>
-
 #include "platform/utf8.h"
 #include "tests/test_pch.h"
 
@@ -24,11 +22,32 @@ TEST(PrintableText, ReplacesDirectionOverridesAndLineSeparators) {
   EXPECT_EQ(printable("a\u202Eb\u2066c\u2028d"), "a\uFFFDb\uFFFDc\uFFFDd");
 }
 
+TEST(PrintableText, KeepsTheDirectionMarksOfOrdinaryNames) {
+  EXPECT_EQ(printable("\u200Fעברית\u200E \u061Cعربي"), "\u200Fעברית\u200E \u061Cعربي");
+}
+
 TEST(PrintableText, ReplacesBytesThatAreNoUtf8) {
   EXPECT_EQ(printable("\xff"), "\uFFFD");
   EXPECT_EQ(printable("\xc0\xaf"), "\uFFFD\uFFFD");            // longer than need be
   EXPECT_EQ(printable("\xed\xa0\x80"), "\uFFFD\uFFFD\uFFFD");  // a surrogate
   EXPECT_EQ(printable("\xe5\x86"), "\uFFFD\uFFFD");            // cut off
+}
+
+TEST(ControlCharacters, AreFoundWhereverTheyHide) {
+  for (const std::string_view name :
+       {"a\x01", "\x7f", "\u0085", "a\u2028", "\u202e", "\u2066", "tab\there", "\xff"})
+    EXPECT_TRUE(holdsControls(name)) << shown(name);
+  for (const std::string_view name : {"a b", "naïve", "👩\u200d💻", "\u200fעברית"})
+    EXPECT_FALSE(holdsControls(name)) << shown(name);
+}
+
+TEST(QuotedText, IsShownOnOneLineOfReadableText) {
+  EXPECT_EQ(shown("plain é 😀"), "plain é 😀");
+  EXPECT_EQ(shown("a\nb\x1b\xff"), "a\\x0ab\\x1b\\xff");
+  EXPECT_EQ(shown("\xc3"), "\\xc3");
+  EXPECT_EQ(shown("\u202e"), "\\xe2\\x80\\xae");
+  EXPECT_TRUE(shown(std::string(500, 'x')).ends_with("xxx..."));
+  EXPECT_EQ(shown(std::string(500, 'x')).size(), 123u);
 }
 
 TEST(Utf8, IsToldFromOtherBytes) {
@@ -41,14 +60,6 @@ TEST(OneLine, DropsBlanksAtTheEndAndLineBreaksWithin) {
   EXPECT_EQ(oneLine("wrong size\n"), "wrong size");
   EXPECT_EQ(oneLine("two\nlines \n\n"), "two lines");
   EXPECT_EQ(oneLine(" \n"), "");
-}
-
-TEST(FittedText, HasExactlyTheColumnsAskedFor) {
-  ASSERT_NE(std::setlocale(LC_CTYPE, "C.UTF-8"), nullptr);
-  EXPECT_EQ(fitted("abc", 5), "abc  ");
-  EXPECT_EQ(fitted("abcdef", 3), "abc");
-  EXPECT_EQ(fitted("写真", 3), "写 ");  // two columns each
-  EXPECT_EQ(displayWidth("写真"), 4U);
 }
 
 TEST(ByteCount, IsShort) {
