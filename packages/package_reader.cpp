@@ -2,7 +2,6 @@
 
 #include <archive.h>
 #include <archive_entry.h>
-#include <locale.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -10,6 +9,7 @@
 #include <cerrno>
 #include <string_view>
 
+#include "base/utf8_locale.h"
 #include "packages/zip_directory.h"
 
 namespace appsync {
@@ -18,24 +18,6 @@ namespace {
 
 constexpr std::size_t BlockSize = std::size_t{128} << 10;
 constexpr std::uint64_t TarBlock = 512;
-
-/// The archive library turns names into the thread's character set: whatever the program's locale,
-/// that must be UTF-8.
-class Utf8Thread {
- public:
-  Utf8Thread() {
-    static const locale_t utf8 = ::newlocale(LC_CTYPE_MASK, "C.UTF-8", nullptr);
-    if (utf8) before_ = ::uselocale(utf8);
-  }
-  ~Utf8Thread() {
-    if (before_) ::uselocale(before_);
-  }
-  Utf8Thread(const Utf8Thread&) = delete;
-  Utf8Thread& operator=(const Utf8Thread&) = delete;
-
- private:
-  locale_t before_ = nullptr;
-};
 
 std::uint64_t fileSize(int fd) {
   struct stat status {};
@@ -118,7 +100,7 @@ std::int64_t PackageReader::readStream(archive* a, void* self, const void** bloc
 }
 
 bool PackageReader::next(PackageItem& item, std::optional<Error>& error) {
-  const Utf8Thread utf8;
+  const Utf8Locale utf8;
   if (!opened_) {
     opened_ = true;
     if (fileSize(fd_) == 0) {
