@@ -12,6 +12,7 @@
 #include <cerrno>
 #include <system_error>
 
+#include "base/file_descriptor.h"
 #include "base/utf8_locale.h"
 
 namespace appsync {
@@ -41,21 +42,6 @@ const Format* findFormat(std::string_view ending) {
                                   [&](const Format& format) { return format.ending == ending; });
   return found == Formats.end() ? nullptr : found;
 }
-
-class File {
- public:
-  explicit File(const std::filesystem::path& path)
-      : fd_(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW)) {}
-  ~File() {
-    if (fd_ >= 0) ::close(fd_);
-  }
-  File(const File&) = delete;
-  File& operator=(const File&) = delete;
-  int fd() const { return fd_; }
-
- private:
-  const int fd_;
-};
 
 }  // namespace
 
@@ -108,16 +94,16 @@ void ArchiveWriter::addFile(const std::string& name, const std::filesystem::path
                             bool executable) {
   if (!problem_.empty()) return;
   const Utf8Locale locale;
-  const File file(source);
+  const FileDescriptor file(::open(source.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW));
   struct stat status {};
-  if (file.fd() < 0 || ::fstat(file.fd(), &status) != 0) {
+  if (!file || ::fstat(file.get(), &status) != 0) {
     problem_ = fmt::format("{}: {}", source.string(), std::generic_category().message(errno));
     return;
   }
   archive_entry* entry = beginEntry(name, AE_IFREG, executable ? 0755 : 0644);
   ::archive_entry_set_size(entry, status.st_size);
   if (check(::archive_write_header(archive_.get(), entry))) {
-    copyFrom(file.fd(), static_cast<std::uint64_t>(status.st_size), source);
+    copyFrom(file.get(), static_cast<std::uint64_t>(status.st_size), source);
   }
 }
 

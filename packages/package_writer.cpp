@@ -10,6 +10,7 @@
 #include <system_error>
 #include <vector>
 
+#include "base/file_descriptor.h"
 #include "base/text.h"
 #include "packages/archive_writer.h"
 #include "packages/package_extractor.h"
@@ -56,19 +57,9 @@ class ScratchFolder {
   bool made_ = false;
 };
 
-class Fd {
- public:
-  Fd(const fs::path& path, int flags) : fd_(::open(path.c_str(), flags | O_CLOEXEC, 0644)) {}
-  ~Fd() {
-    if (fd_ >= 0) ::close(fd_);
-  }
-  Fd(const Fd&) = delete;
-  Fd& operator=(const Fd&) = delete;
-  operator int() const { return fd_; }
-
- private:
-  const int fd_;
-};
+FileDescriptor openPath(const fs::path& path, int flags) {
+  return FileDescriptor(::open(path.c_str(), flags | O_CLOEXEC, 0644));
+}
 
 class Packer {
  public:
@@ -182,9 +173,9 @@ class Packer {
   }
 
   bool write(const fs::path& file) {
-    const Fd fd(file, O_WRONLY | O_CREAT | O_EXCL);
-    if (fd < 0) return fail(systemReason(file, errno));
-    ArchiveWriter writer(fd, ending_);
+    const FileDescriptor made = openPath(file, O_WRONLY | O_CREAT | O_EXCL);
+    if (!made) return fail(systemReason(file, errno));
+    ArchiveWriter writer(made.get(), ending_);
     for (const Member& member : members_) {
       if (member.isDirectory) {
         writer.addDirectory(member.name);
@@ -193,17 +184,17 @@ class Packer {
       }
     }
     if (!writer.finish()) return fail(printable(oneLine(writer.problem())));
-    return ::fsync(fd) == 0 || fail(systemReason(file, errno));
+    return syncToDisk(made.get()) || fail(systemReason(file, errno));
   }
 
   /// The phone's own rules have the last word.
   bool verify(const fs::path& file, const fs::path& target) {
     std::error_code failed;
     fs::create_directory(target, failed);
-    const Fd package(file, O_RDONLY);
-    const Fd directory(target, O_RDONLY | O_DIRECTORY);
+    const FileDescriptor package = openPath(file, O_RDONLY);
+    const FileDescriptor directory = openPath(target, O_RDONLY | O_DIRECTORY);
     std::optional<Error> error;
-    if (extractPackage(package, directory, result_.identifier, {}, &error)) return true;
+    if (extractPackage(package.get(), directory.get(), result_.identifier, {}, &error)) return true;
     return fail("the phone would refuse this package: " +
                 printable(error ? oneLine(error->localizedDescription()) : "unknown reason"));
   }
