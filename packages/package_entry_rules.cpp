@@ -164,7 +164,7 @@ std::optional<Error> PackageEntryRules::checkTop(std::string_view path, bool isD
   if (!isBundle)
     return refuseEntry(PackageRefusal::ForeignEntry, path, "stands beside the application");
   if (bundleName_.empty()) bundleName_ = top;
-  if (bundleName_ == top || foldCase(bundleName_) == foldCase(top)) return std::nullopt;
+  if (bundleName_ == top || comparableName(bundleName_) == comparableName(top)) return std::nullopt;
   return refuse(PackageRefusal::SeveralApplications,
                 "\"" + shown(bundleName_) + "\" and \"" + shown(top) + "\"");
 }
@@ -173,7 +173,7 @@ std::optional<Error> PackageEntryRules::remember(std::string_view path, bool isD
   const std::size_t slash = path.rfind('/');
   if (slash != std::string_view::npos) {
     const std::string_view parent = path.substr(0, slash);
-    const auto known = known_.find(foldCase(parent));
+    const auto known = known_.find(comparableName(parent));
     if (known == known_.end()) {  // archives need not name the folders
       if (auto refusal = countEntry()) return refusal;
     }
@@ -181,12 +181,13 @@ std::optional<Error> PackageEntryRules::remember(std::string_view path, bool isD
       if (auto refusal = remember(parent, true)) return refusal;
   }
   const auto [place, isNew] =
-      known_.try_emplace(foldCase(path), Known{std::string(path), isDirectory});
+      known_.try_emplace(comparableName(path), Known{std::string(path), isDirectory});
   const Known& first = place->second;
   if (isNew || (isDirectory && first.isDirectory && first.path == path)) return std::nullopt;
   if (first.path != path)
-    return refuseEntry(PackageRefusal::DuplicateName, path,
-                       "differs from \"" + shown(first.path) + "\" only in case");
+    return refuseEntry(
+        PackageRefusal::DuplicateName, path,
+        "differs from \"" + shown(first.path) + "\" only in case or in the form of its letters");
   return refuseEntry(
       PackageRefusal::DuplicateName, path,
       first.isDirectory == isDirectory ? "comes twice" : "is both a file and a folder");
@@ -225,7 +226,7 @@ std::optional<Error> PackageEntryRules::finish() const {
 }
 
 bool PackageEntryRules::holdsFile(std::string_view path) const {
-  const auto known = known_.find(foldCase(path));
+  const auto known = known_.find(comparableName(path));
   return known != known_.end() && !known->second.isDirectory && known->second.path == path;
 }
 

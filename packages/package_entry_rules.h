@@ -82,7 +82,7 @@ class PackageEntryRules {
   std::uint64_t fileBytes_ = 0;
   std::uint64_t streamBytes_ = 0;
   std::string bundleName_;
-  std::unordered_map<std::string, Known> known_;  ///< by path without case
+  std::unordered_map<std::string, Known> known_;  ///< by comparable path
 };
 
 }  // namespace appsync

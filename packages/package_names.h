@@ -5,10 +5,10 @@
 
 namespace appsync {
 
-/// The name with case taken away, so that two names which a file system that ignores case takes
-/// for the same become equal. Folds single letters of ASCII, Latin-1, Latin Extended-A, Greek,
-/// Cyrillic, Armenian and full-width Latin, and the Kelvin and Angstrom signs and the long s; not
-/// letters that fold into several ("ß") and no composed against decomposed forms. `name` is UTF-8.
-std::string foldCase(std::string_view name);
+/// What two names have in common that some file system takes for one, because it ignores case or
+/// the form in which Unicode writes a letter ("é" as one character or two). Unicode calls that the
+/// canonical caseless match; letters that merely look or mean alike stay different. `name` is
+/// UTF-8.
+std::string comparableName(std::string_view name);
 
 }  // namespace appsync
