@@ -59,10 +59,8 @@ bool removeLevel(int directory, const std::string& name, int depth) {
 bool copyBytes(int from, int to) {
   std::vector<std::byte> buffer(std::size_t{256} << 10);
   while (true) {
-    const ssize_t count = ::read(from, buffer.data(), buffer.size());
-    if (count == 0) return true;
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return false;
+    const std::int64_t count = readSome(from, buffer);
+    if (count <= 0) return count == 0;
     if (!writeAll(to, ByteView(buffer.data(), static_cast<std::size_t>(count)))) return false;
   }
 }

@@ -32,6 +32,26 @@ void FileDescriptor::reset(int fd) noexcept {
   fd_ = fd;
 }
 
+std::int64_t readSome(int fd, std::span<std::byte> bytes) noexcept {
+  while (true) {
+    const ssize_t count = ::read(fd, bytes.data(), bytes.size());
+    if (count >= 0 || errno != EINTR) return count;
+  }
+}
+
+std::int64_t readAt(int fd, std::span<std::byte> bytes, std::uint64_t offset) noexcept {
+  std::size_t done = 0;
+  while (done < bytes.size()) {
+    const ssize_t count =
+        ::pread(fd, bytes.data() + done, bytes.size() - done, static_cast<off_t>(offset + done));
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return -1;
+    if (count == 0) break;
+    done += static_cast<std::size_t>(count);
+  }
+  return static_cast<std::int64_t>(done);
+}
+
 bool writeAll(int fd, ByteView bytes) noexcept {
   return putAll(
       bytes, [fd](ByteView piece, std::size_t) { return ::write(fd, piece.data(), piece.size()); });

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <span>
 #include <utility>
 
 #include "platform/bytes.h"
@@ -29,7 +30,14 @@ class FileDescriptor {
   int fd_ = -1;
 };
 
-// Each returns false with errno set. Interrupted calls are carried on.
+// Interrupted calls are carried on.
+
+/// Reads what there is, up to `bytes`: how many bytes, 0 at the end, -1 with errno set.
+std::int64_t readSome(int fd, std::span<std::byte> bytes) noexcept;
+/// Fills `bytes` from `offset` on, or as far as the file goes: how many bytes, -1 with errno set.
+std::int64_t readAt(int fd, std::span<std::byte> bytes, std::uint64_t offset) noexcept;
+
+// Each returns false with errno set.
 
 bool writeAll(int fd, ByteView bytes) noexcept;
 /// Writes at `offset`; past the end of the file this leaves a hole.

@@ -5,7 +5,6 @@
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <array>
@@ -108,10 +107,10 @@ void ArchiveWriter::addFile(const std::string& name, const std::filesystem::path
 }
 
 void ArchiveWriter::copyFrom(int fd, std::uint64_t size, const std::filesystem::path& source) {
-  std::array<char, 64 << 10> block;
+  std::array<std::byte, 64 << 10> block;
   while (size > 0) {
-    const ssize_t count = ::read(fd, block.data(), std::min<std::uint64_t>(size, block.size()));
-    if (count < 0 && errno == EINTR) continue;
+    const auto most = static_cast<std::size_t>(std::min<std::uint64_t>(size, block.size()));
+    const std::int64_t count = readSome(fd, std::span(block).first(most));
     if (count < 0) {
       problem_ = fmt::format("{}: {}", source.string(), std::generic_category().message(errno));
       return;

@@ -138,8 +138,8 @@ class DataArchiveWriter {
   bool addContents(int file, const std::string& path, const struct stat& status) {
     auto left = static_cast<std::uint64_t>(status.st_size);
     while (left > 0) {
-      const ssize_t count = ::read(file, buffer_.data(), std::min<std::uint64_t>(left, BlockSize));
-      if (count < 0 && errno == EINTR) continue;
+      const auto most = static_cast<std::size_t>(std::min<std::uint64_t>(left, BlockSize));
+      const std::int64_t count = readSome(file, std::span(buffer_).first(most));
       if (count < 0) return fail(errno, path);
       if (count == 0) return failChanged(path);
       const auto size = static_cast<std::size_t>(count);
@@ -152,7 +152,7 @@ class DataArchiveWriter {
 
   const DataSink& sink_;
   const std::function<void(std::string_view)>& skipped_;
-  std::vector<char> buffer_;
+  std::vector<std::byte> buffer_;
   std::optional<Error> error_;
   std::unique_ptr<archive, Free> archive_;
   std::unique_ptr<archive_entry, Free> entry_;

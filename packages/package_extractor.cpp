@@ -73,14 +73,8 @@ std::optional<Error> readInfo(const PackageReader& reader, UnpackTarget& target,
   const auto size = static_cast<std::size_t>(status.st_size);
   if (size > InfoLimits.bytes) return badInfo("Info.plist is larger than 1 MiB");
   Bytes bytes(size);
-  std::size_t filled = 0;
-  while (filled < size) {
-    const ssize_t count =
-        ::pread(file.get(), bytes.data() + filled, size - filled, static_cast<off_t>(filled));
-    if (count < 0 && errno == EINTR) continue;
-    if (count <= 0) return systemError(count < 0 ? errno : EIO, path);
-    filled += static_cast<std::size_t>(count);
-  }
+  const std::int64_t count = readAt(file.get(), bytes, 0);
+  if (count != status.st_size) return systemError(count < 0 ? errno : EIO, path);
   std::optional<Error> cause;
   std::optional<PropertyList> parsed = parsePropertyList(bytes, &cause, InfoLimits);
   if (!parsed)

@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <vector>
 
+#include "base/file_descriptor.h"
 #include "packages/package_entry_rules.h"
 
 namespace appsync {
@@ -55,9 +56,7 @@ class GzipStream final : public PackageStream {
  private:
   std::optional<Error> fill() {
     if (state_.avail_in != 0) return std::nullopt;
-    ssize_t count = -1;
-    do count = ::read(fd_, input_.data(), input_.size());
-    while (count < 0 && errno == EINTR);
+    const std::int64_t count = readSome(fd_, std::as_writable_bytes(std::span(input_)));
     if (count < 0) return Error::posix(errno);
     state_.next_in = input_.data();
     state_.avail_in = static_cast<uInt>(count);

@@ -1,13 +1,13 @@
 #include "packages/zip_directory.h"
 
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <string>
 #include <string_view>
 
+#include "base/file_descriptor.h"
 #include "base/text.h"
 #include "packages/package_entry_rules.h"
 
@@ -75,15 +75,8 @@ class ZipFile {
   std::string read(std::uint64_t at, std::size_t count) const {
     if (at > size_ || count > size_ - at) return {};
     std::string bytes(count, '\0');
-    std::size_t done = 0;
-    while (done < count) {
-      const ssize_t part =
-          ::pread(fd_, bytes.data() + done, count - done, static_cast<off_t>(at + done));
-      if (part < 0 && errno == EINTR) continue;
-      if (part <= 0) return {};
-      done += static_cast<std::size_t>(part);
-    }
-    return bytes;
+    const std::int64_t found = readAt(fd_, std::as_writable_bytes(std::span(bytes)), at);
+    return found == static_cast<std::int64_t>(count) ? bytes : std::string();
   }
 
   std::optional<Error> findDirectory(Directory& directory) const {

@@ -65,8 +65,7 @@ int readAll(int fd, std::size_t expected, Bytes& bytes) {
   bytes.resize(expected + 1);  // one more shows the end without another round
   std::size_t filled = 0;
   while (true) {
-    const ssize_t count = ::read(fd, bytes.data() + filled, bytes.size() - filled);
-    if (count < 0 && errno == EINTR) continue;
+    const std::int64_t count = readSome(fd, std::span(bytes).subspan(filled));
     if (count < 0) return errno;
     if (count == 0) break;
     filled += static_cast<std::size_t>(count);

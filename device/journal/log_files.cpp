@@ -5,7 +5,6 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <vector>
 
 #include "device/journal/log_format.h"
@@ -21,15 +20,8 @@ std::string wholeFile(int fd) {
   struct stat status {};
   if (::fstat(fd, &status) != 0) return {};
   std::string bytes(static_cast<std::size_t>(status.st_size), '\0');
-  std::size_t filled = 0;
-  while (filled < bytes.size()) {
-    const ssize_t count =
-        ::pread(fd, bytes.data() + filled, bytes.size() - filled, static_cast<off_t>(filled));
-    if (count < 0 && errno == EINTR) continue;
-    if (count <= 0) break;
-    filled += static_cast<std::size_t>(count);
-  }
-  bytes.resize(filled);
+  const std::int64_t count = readAt(fd, std::as_writable_bytes(std::span(bytes)), 0);
+  bytes.resize(count < 0 ? 0 : static_cast<std::size_t>(count));
   return bytes;
 }
 

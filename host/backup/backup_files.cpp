@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -21,19 +20,6 @@ BackupProblem problemOf(const std::string& name, int errnoValue) {
   if (errnoValue == ELOOP) return {name + " is a link", true};
   const std::string reason = std::generic_category().message(errnoValue);
   return {fmt::format("{} cannot be read: {}", name, reason), false};
-}
-
-bool readWhole(int fd, Bytes& bytes) {
-  std::size_t filled = 0;
-  while (filled < bytes.size()) {
-    const std::int64_t count =
-        readSome(fd, reinterpret_cast<std::uint8_t*>(bytes.data()) + filled, bytes.size() - filled);
-    if (count < 0) return false;
-    if (count == 0) break;
-    filled += static_cast<std::size_t>(count);
-  }
-  bytes.resize(filled);
-  return true;
 }
 
 }  // namespace
@@ -61,13 +47,6 @@ FileDescriptor openBackupFile(const std::filesystem::path& path, std::uint64_t& 
   return file;
 }
 
-std::int64_t readSome(int fd, std::uint8_t* bytes, std::size_t size) {
-  while (true) {
-    const ssize_t count = ::read(fd, bytes, size);
-    if (count >= 0 || errno != EINTR) return count;
-  }
-}
-
 std::optional<BackupManifest> readBackupManifest(const std::filesystem::path& folder,
                                                  BackupProblem& problem) {
   const std::filesystem::path path = folder / BackupManifestFile;
@@ -81,10 +60,12 @@ std::optional<BackupManifest> readBackupManifest(const std::filesystem::path& fo
   if (!file) return std::nullopt;
   // What is cut off here is refused as damaged.
   Bytes bytes(std::min<std::uint64_t>(size, PropertyListLimits{}.bytes));
-  if (!readWhole(file.get(), bytes)) {
+  const std::int64_t count = readAt(file.get(), bytes, 0);
+  if (count < 0) {
     problem = problemOf(std::string(BackupManifestFile), errno);
     return std::nullopt;
   }
+  bytes.resize(static_cast<std::size_t>(count));
   problem.isWrongFolder = true;
   return parseManifest(bytes, problem.text);
 }

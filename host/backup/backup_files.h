@@ -16,8 +16,6 @@ namespace appsync::host {
 /// A regular file reached through no link. Not valid, with a problem, for anything else.
 FileDescriptor openBackupFile(const std::filesystem::path& path, std::uint64_t& size,
                               BackupProblem& problem);
-/// The number of bytes read, 0 at the end, -1 with errno set.
-std::int64_t readSome(int fd, std::uint8_t* bytes, std::size_t size);
 std::optional<BackupManifest> readBackupManifest(const std::filesystem::path& folder,
                                                  BackupProblem& problem);
 

@@ -121,7 +121,8 @@ std::int64_t BackupFileReader::read(std::uint8_t* bytes, std::size_t size) {
   State& state = *state_;
   if (!state.problem.empty()) return -1;
   if (size == 0 || state.ended) return 0;
-  const std::int64_t count = readSome(state.descriptor.get(), bytes, size);
+  const std::int64_t count =
+      readSome(state.descriptor.get(), std::as_writable_bytes(std::span(bytes, size)));
   if (count < 0) {
     return state.fail("cannot be read: " + std::generic_category().message(errno));
   }

@@ -2,15 +2,10 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <cerrno>
 
 namespace appsync::host {
-
-PackageTransfer::~PackageTransfer() {
-  if (fd_ >= 0) ::close(fd_);
-}
 
 bool PackageTransfer::fail(int errnoValue, std::optional<Error>* error) const {
   setError(error, Error::posix(errnoValue, source_.string()));
@@ -19,9 +14,9 @@ bool PackageTransfer::fail(int errnoValue, std::optional<Error>* error) const {
 
 bool PackageTransfer::open(const Phone& phone, std::optional<Error>* error) {
   // Without O_NONBLOCK a pipe put in the package's place would hold the sync up.
-  fd_ = ::open(source_.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
+  file_.reset(::open(source_.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
   struct stat status {};
-  if (fd_ < 0 || ::fstat(fd_, &status) != 0) return fail(errno, error);
+  if (!file_ || ::fstat(file_.get(), &status) != 0) return fail(errno, error);
   if (!S_ISREG(status.st_mode)) return fail(ENOEXEC, error);
   total_ = static_cast<std::uint64_t>(status.st_size);
   receiver_ = phone.receiveFile(target_, error);
@@ -31,8 +26,7 @@ bool PackageTransfer::open(const Phone& phone, std::optional<Error>* error) {
 PackageTransfer::Step PackageTransfer::sendChunk(const Phone& phone, std::optional<Error>* error) {
   if (!receiver_ && !open(phone, error)) return Step::Failed;
   chunk_.resize(ChunkSize);
-  const ssize_t count = ::read(fd_, chunk_.data(), chunk_.size());
-  if (count < 0 && errno == EINTR) return Step::More;
+  const std::int64_t count = readSome(file_.get(), chunk_);
   bool ok = count >= 0 || fail(errno, error);
   if (ok && count > 0) {
     const auto size = static_cast<std::size_t>(count);

@@ -6,6 +6,7 @@
 #include <optional>
 #include <string>
 
+#include "base/file_descriptor.h"
 #include "host/phone/phone.h"
 
 namespace appsync::host {
@@ -21,9 +22,6 @@ class PackageTransfer {
   /// Touches nothing before the first step.
   PackageTransfer(std::filesystem::path source, std::string target)
       : source_(std::move(source)), target_(std::move(target)) {}
-  ~PackageTransfer();
-  PackageTransfer(const PackageTransfer&) = delete;
-  PackageTransfer& operator=(const PackageTransfer&) = delete;
 
   /// Sends the next chunk. After Failed (with an error) nothing of the package stays on the phone.
   Step sendChunk(const Phone& phone, std::optional<Error>* error);
@@ -39,7 +37,7 @@ class PackageTransfer {
 
   const std::filesystem::path source_;
   const std::string target_;
-  int fd_ = -1;
+  FileDescriptor file_;
   std::unique_ptr<device::FileReceiver> receiver_;
   Bytes chunk_;
   std::uint64_t sent_ = 0;
