@@ -8,6 +8,7 @@
 #include <ctime>
 #include <iterator>
 #include <optional>
+#include <system_error>
 
 #include "platform/utf8.h"
 
@@ -63,6 +64,8 @@ std::string shown(std::string_view text) {
   }
   return text.empty() ? result : result + "...";
 }
+
+std::string systemText(int errnoValue) { return std::generic_category().message(errnoValue); }
 
 std::string oneLine(std::string_view text) {
   constexpr std::string_view Blanks = " \t\r\n";

@@ -23,6 +23,9 @@ std::string printable(std::string_view text);
 /// 120 bytes.
 std::string shown(std::string_view text);
 
+/// What the system says of an errno value.
+std::string systemText(int errnoValue);
+
 /// A message without blank space at its end and with its line breaks as blanks.
 std::string oneLine(std::string_view text);
 

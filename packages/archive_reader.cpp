@@ -7,7 +7,6 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <system_error>
 
 #include "base/text.h"
 #include "base/utf8_locale.h"
@@ -65,7 +64,7 @@ std::string ArchiveReader::openingReason() const {
   const int code = ::archive_errno(archive_.get());
   // The library takes this value for "not a format that I know".
   if (code == EILSEQ) return "it is neither a zip nor a tar archive";
-  if (code > 0) return std::generic_category().message(code);
+  if (code > 0) return systemText(code);
   return "damaged: " + libraryReason();
 }
 

@@ -9,9 +9,9 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <system_error>
 
 #include "base/file_descriptor.h"
+#include "base/text.h"
 #include "base/utf8_locale.h"
 
 namespace appsync {
@@ -96,7 +96,7 @@ void ArchiveWriter::addFile(const std::string& name, const std::filesystem::path
   const FileDescriptor file(::open(source.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW));
   struct stat status {};
   if (!file || ::fstat(file.get(), &status) != 0) {
-    problem_ = fmt::format("{}: {}", source.string(), std::generic_category().message(errno));
+    problem_ = fmt::format("{}: {}", source.string(), systemText(errno));
     return;
   }
   archive_entry* entry = beginEntry(name, AE_IFREG, executable ? 0755 : 0644);
@@ -112,7 +112,7 @@ void ArchiveWriter::copyFrom(int fd, std::uint64_t size, const std::filesystem::
     const auto most = static_cast<std::size_t>(std::min<std::uint64_t>(size, block.size()));
     const std::int64_t count = readSome(fd, std::span(block).first(most));
     if (count < 0) {
-      problem_ = fmt::format("{}: {}", source.string(), std::generic_category().message(errno));
+      problem_ = fmt::format("{}: {}", source.string(), systemText(errno));
       return;
     }
     if (count == 0) {

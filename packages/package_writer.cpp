@@ -33,8 +33,7 @@ struct Member {
 };
 
 std::string systemReason(const fs::path& path, int errnoValue) {
-  return fmt::format("{}: {}", printable(path.string()),
-                     std::generic_category().message(errnoValue));
+  return fmt::format("{}: {}", printable(path.string()), systemText(errnoValue));
 }
 
 /// A folder that is removed with all in it.

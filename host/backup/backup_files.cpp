@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <system_error>
 
 #include "base/confined_directory.h"
 #include "base/text.h"
@@ -18,7 +17,7 @@ namespace {
 BackupProblem problemOf(const std::string& name, int errnoValue) {
   if (errnoValue == ENOENT) return {name + " is missing", true};
   if (errnoValue == ELOOP) return {name + " is a link", true};
-  const std::string reason = std::generic_category().message(errnoValue);
+  const std::string reason = systemText(errnoValue);
   return {fmt::format("{} cannot be read: {}", name, reason), false};
 }
 

@@ -124,7 +124,7 @@ std::int64_t BackupFileReader::read(std::uint8_t* bytes, std::size_t size) {
   const std::int64_t count =
       readSome(state.descriptor.get(), std::as_writable_bytes(std::span(bytes, size)));
   if (count < 0) {
-    return state.fail("cannot be read: " + std::generic_category().message(errno));
+    return state.fail("cannot be read: " + systemText(errno));
   }
   if (count == 0) return state.checkEnd();
   state.position += static_cast<std::uint64_t>(count);

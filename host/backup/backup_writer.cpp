@@ -30,8 +30,6 @@ namespace fs = std::filesystem;
 constexpr std::string_view UnfinishedMark = ".partial-";
 constexpr std::size_t UnfinishedDigits = 6;
 
-std::string systemText(int errnoValue) { return std::generic_category().message(errnoValue); }
-
 FileDescriptor openFolder(int directory, const std::string& name) {
   return FileDescriptor(
       ::openat(directory, name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));

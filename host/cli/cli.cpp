@@ -9,7 +9,6 @@
 #include <cerrno>
 #include <sstream>
 #include <string_view>
-#include <system_error>
 
 #include "base/text.h"
 #include "host/report/columns.h"
@@ -75,8 +74,7 @@ ExitCode run(const Command& command, CommandContext& context) {
 ExitCode withOutputChecked(ExitCode code, CommandContext& context) {
   const int error = context.out.error();
   if (error == 0 || error == EPIPE) return code;
-  context.err.line("appsync: cannot write to standard output: " +
-                   std::generic_category().message(error));
+  context.err.line("appsync: cannot write to standard output: " + systemText(error));
   return code == ExitCode::Done ? ExitCode::SomeFailed : code;
 }
 

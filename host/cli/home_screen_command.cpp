@@ -59,7 +59,7 @@ void writeFile(const fs::path& path, const Bytes& bytes) {
     std::optional<Error> error;
     device::ConfinedFileManager folder(path.parent_path());
     if (folder.writeAtomically("/" + path.filename().string(), bytes, &error)) return;
-    reason = std::generic_category().message(error ? static_cast<int>(error->code) : EIO);
+    reason = systemText(error ? static_cast<int>(error->code) : EIO);
   }
   throw CommandError(ExitCode::SomeFailed,
                      fmt::format("cannot write {}: {}", printable(path.string()), reason));

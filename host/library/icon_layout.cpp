@@ -6,7 +6,6 @@
 #include <fstream>
 #include <nlohmann/json.hpp>
 #include <sstream>
-#include <system_error>
 
 #include "base/text.h"
 #include "platform/property_list_codec.h"
@@ -53,7 +52,7 @@ std::optional<Bytes> readIconLayout(const std::filesystem::path& file, std::stri
   const std::string shown = printable(file.string());
   if (!stream.eof() && text.empty()) {
     problem = fmt::format("cannot read the icon layout {}: {}", shown,
-                          std::generic_category().message(errno == 0 ? EIO : errno));
+                          systemText(errno == 0 ? EIO : errno));
     return std::nullopt;
   }
   if (text.size() > MaximumBytes) {
