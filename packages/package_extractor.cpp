@@ -115,11 +115,6 @@ std::optional<Error> prepareExecutable(const PackageReader& reader, UnpackTarget
   return std::nullopt;
 }
 
-std::optional<std::string> stringIn(const PropertyList::Dictionary& info, std::string_view key) {
-  const std::string* text = findString(info, key);
-  return text ? std::optional(*text) : std::nullopt;
-}
-
 std::optional<Error> extract(int packageFd, int targetDirectoryFd,
                              std::optional<std::string_view> expectedIdentifier,
                              const PackageLimits& limits, ExtractedPackage& package) {
@@ -133,8 +128,8 @@ std::optional<Error> extract(int packageFd, int targetDirectoryFd,
   if (auto error = checkIdentifier(package.info, expectedIdentifier, package.identifier))
     return error;
   if (auto error = prepareExecutable(reader, target, package)) return error;
-  package.version = stringIn(package.info, KBBundleVersion);
-  package.displayName = stringIn(package.info, KBBundleDisplayName);
+  if (const auto* version = findString(package.info, KBBundleVersion)) package.version = *version;
+  if (const auto* name = findString(package.info, KBBundleDisplayName)) package.displayName = *name;
   package.hasMetadata = rules.holdsFile(exchange::MetadataName);
   package.hasArtwork = rules.holdsFile(exchange::ArtworkName);
   package.bytes = rules.fileBytes();
