@@ -1,12 +1,14 @@
+#include <fcntl.h>
 #include <fmt/format.h>
 
 #include <CLI/CLI.hpp>
+#include <cerrno>
 #include <filesystem>
 #include <memory>
 #include <system_error>
 
+#include "base/temporary_file.h"
 #include "base/text.h"
-#include "device/files/file_manager.h"
 #include "host/cli/cli.h"
 #include "host/home_screen/home_screen_icons.h"
 #include "host/home_screen/home_screen_picture.h"
@@ -48,6 +50,11 @@ Bytes encode(const Image& image) {
   return file;
 }
 
+bool replaceFile(int directory, const std::string& name, ByteView bytes) {
+  TemporaryFile file(directory);
+  return file.isOpen() && writeAll(file.fd(), bytes) && file.takePlaceOf(name, Durability::Durable);
+}
+
 /// The file appears whole or not at all; a device or a link to one is left as it is.
 void writeFile(const fs::path& path, const Bytes& bytes) {
   std::string reason = "it is no regular file";
@@ -56,10 +63,10 @@ void writeFile(const fs::path& path, const Bytes& bytes) {
   if (!fs::status_known(status)) {
     reason = failure.message();
   } else if (!fs::exists(status) || fs::is_regular_file(status)) {
-    std::optional<Error> error;
-    device::ConfinedFileManager folder(path.parent_path());
-    if (folder.writeAtomically("/" + path.filename().string(), bytes, &error)) return;
-    reason = systemText(error ? static_cast<int>(error->code) : EIO);
+    const FileDescriptor folder(
+        ::open(path.parent_path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (folder && replaceFile(folder.get(), path.filename().string(), bytes)) return;
+    reason = systemText(errno);
   }
   throw CommandError(ExitCode::SomeFailed,
                      fmt::format("cannot write {}: {}", printable(path.string()), reason));
