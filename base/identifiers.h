@@ -9,4 +9,8 @@ namespace appsync {
 /// temporary name, which is swept.
 bool isUsableIdentifier(std::string_view identifier);
 
+/// Whether an application of this identifier can be sent: the phone takes it, and it is no hidden
+/// name nor one that the exchange with the phone keeps for itself.
+bool isSendableIdentifier(std::string_view identifier);
+
 }  // namespace appsync

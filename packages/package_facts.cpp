@@ -21,10 +21,6 @@ constexpr std::size_t MaximumInfo = std::size_t{1} << 20;
 constexpr std::size_t MaximumPart = std::size_t{16} << 20;
 constexpr PropertyListLimits InfoLimits{MaximumInfo, 50'000, 64};
 
-/// Names that stand beside the applications' own folders in the staging area.
-constexpr std::array<std::string_view, 2> ReservedNames = {"ApplicationsSync.plist",
-                                                           "DashelIconState.plist"};
-
 constexpr std::array<std::string_view, 13> Endings = {
     ".zip",     ".tar",   ".tar.gz", ".tar.xz", ".tar.zst", ".tar.bz2", ".tar.lzma",
     ".tar.lz4", ".tar.z", ".tgz",    ".txz",    ".tzst",    ".tbz2"};
@@ -128,11 +124,6 @@ bool isPicture(std::string_view name) {
 }
 
 }  // namespace
-
-bool isSendableIdentifier(std::string_view identifier) {
-  return isUsableIdentifier(identifier) && identifier.front() != '.' &&
-         std::find(ReservedNames.begin(), ReservedNames.end(), identifier) == ReservedNames.end();
-}
 
 std::span<const std::string_view> packageEndings() { return Endings; }
 

@@ -11,10 +11,6 @@
 
 namespace appsync {
 
-/// Whether an application of this identifier can be sent: the phone takes it, and it is no hidden
-/// name nor one that the exchange with the phone keeps for itself.
-bool isSendableIdentifier(std::string_view identifier);
-
 /// The endings by which a file counts as a package, in lower case: ".zip", ".tar.gz", ...
 std::span<const std::string_view> packageEndings();
 /// The one of them that a file's name has; empty when it has none.

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "base/file_descriptor.h"
+#include "base/identifiers.h"
 #include "base/text.h"
 #include "packages/archive_writer.h"
 #include "packages/package_extractor.h"

@@ -2,9 +2,9 @@
 
 #include <cerrno>
 
+#include "base/identifiers.h"
 #include "base/text.h"
 #include "host/restore/restore_data.h"
-#include "packages/package_facts.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
 

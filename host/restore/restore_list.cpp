@@ -1,7 +1,7 @@
 #include "host/restore/restore_list.h"
 
+#include "base/identifiers.h"
 #include "base/text.h"
-#include "packages/package_facts.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
 

@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <set>
 
+#include "base/identifiers.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"

@@ -98,17 +98,6 @@ TEST_F(PackageReading, TakesControlCharactersOutOfTheName) {
   EXPECT_EQ(readInfo(appInfo("com.a", "1", "Evil\tname")), "com.a 1 Evil\uFFFDname");
 }
 
-TEST(Identifiers, AreUsableWhenThePhoneCanKeepThemApart) {
-  EXPECT_TRUE(isSendableIdentifier("com.example.app-2_b"));
-  EXPECT_FALSE(isSendableIdentifier(""));
-  EXPECT_FALSE(isSendableIdentifier(".."));
-  EXPECT_FALSE(isSendableIdentifier(".hidden"));
-  EXPECT_FALSE(isSendableIdentifier("a/b"));
-  EXPECT_FALSE(isSendableIdentifier("a b"));
-  EXPECT_FALSE(isSendableIdentifier("ApplicationsSync.plist"));
-  EXPECT_FALSE(isSendableIdentifier(std::string(300, 'a')));
-}
-
 TEST_F(PackageReading, CollectsWhatThePhoneShowsBeforeThePackageArrives) {
   pack(folder / "a.tar.gz", sampleEntries("com.a"));
   const PackageParts parts = readPackageParts(folder / "a.tar.gz");
