@@ -4,6 +4,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/binary_property_list.h"
 #include "platform/bytes.h"
 #include "platform/property_list_codec.h"
 
@@ -15,10 +16,12 @@ namespace appsync {
 /// Deeper trees are refused whatever the limits say: parser and tree recurse.
 inline constexpr std::size_t MaximumPropertyListDepth = 512;
 
-/// Why a binary property list is refused, or nullopt. Beyond its structure this bounds what it
-/// expands to, since objects may be shared: `limits.objects` objects and `limits.bytes` bytes.
-std::optional<std::string> binaryPropertyListProblem(ByteView bytes,
-                                                     const PropertyListLimits& limits);
+/// Why a binary property list is refused, or nullptr. Beyond its structure this bounds what it
+/// expands to, since objects may be shared: `limits.objects` objects and `limits.bytes` bytes. Of
+/// one that is not refused, `sharesContainers` tells whether an array or a dictionary stands in
+/// more than one place.
+const char* problemOf(const BinaryPropertyList& list, const PropertyListLimits& limits,
+                      bool* sharesContainers = nullptr);
 
 /// The same XML property list without anything that parsers read differently: no comments,
 /// attributes, CDATA, blanks between elements or character references; integers in plain decimal.

@@ -306,17 +306,18 @@ class TreeWriter {
   const char* problem_ = nullptr;
 };
 
-bool isBinary(ByteView bytes) { return asText(bytes).starts_with("bplist00"); }
-
 constexpr std::string_view ByteOrderMark = "\xef\xbb\xbf";
 
 /// The library's tree of bytes that have passed every check; null with `problem` otherwise.
 Node parsedNode(ByteView bytes, const PropertyListLimits& limits, std::string& problem) {
   std::string_view text = asText(bytes);
   plist_t node = nullptr;
-  if (isBinary(bytes)) {
-    if (const auto found = binaryPropertyListProblem(bytes, limits)) {
-      problem = *found;
+  if (BinaryPropertyList::isMeant(bytes)) {
+    BinaryPropertyList list;
+    const char* found = list.open(bytes);
+    if (!found) found = problemOf(list, limits);
+    if (found) {
+      problem = found;
       return nullptr;
     }
     plist_from_bin(text.data(), static_cast<std::uint32_t>(text.size()), &node);
@@ -347,7 +348,7 @@ std::optional<PropertyList> parsePropertyList(ByteView bytes, std::optional<Erro
       bytes.size() <= limits.bytes && bytes.size() <= std::numeric_limits<std::uint32_t>::max();
   const PlainLocale locale;
   if (const Node node = fits ? parsedNode(bytes, limits, problem) : nullptr) {
-    if (auto value = TreeReader(!isBinary(bytes)).read(node.get())) return value;
+    if (auto value = TreeReader(!BinaryPropertyList::isMeant(bytes)).read(node.get())) return value;
   }
   setError(error, failure("not a usable property list: " + problem));
   return std::nullopt;

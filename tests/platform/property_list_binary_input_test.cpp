@@ -146,11 +146,12 @@ TEST(BinaryInput, RefusesTextThatNoStringHolds) {
   expectRefused(single("\x61\xd8\x00"s), "a string is not valid text");
   expectRefused(single("\x61\xdc\x00"s), "a string is not valid text");
   expectRefused(single("\x62\xd8\x00\xd8\x00"s), "a string is not valid text");
+  expectRefused(single("\x60"), "a string is not valid text");  // UTF-16, and empty
 }
 
 TEST(BinaryInput, RefusesDatesThatAreNoNumber) {
-  const auto nan = single("\x33\x7f\xf8\0\0\0\0\0\x01"s);
-  EXPECT_EQ(parsePropertyList(nan), std::nullopt);
+  expectRefused(single("\x33\x7f\xf8\0\0\0\0\0\x01"s), "a date is no finite number");
+  expectRefused(single("\x33\xff\xf0\0\0\0\0\0\0"s), "a date is no finite number");
 }
 
 TEST(BinaryInput, RefusesReferencesThatLeadNowhere) {
