@@ -4,27 +4,11 @@
 #include <dlfcn.h>
 #include <gtest/gtest.h>
 
-#include <limits>
 #include <new>
 #include <typeinfo>
 
+#include "tests/client/allocations.h"
 #include "tests/client/client_test.h"
-
-namespace {
-
-constexpr unsigned Endless = std::numeric_limits<unsigned>::max();
-/// After so many more allocations the memory of this thread is used up.
-thread_local unsigned allocationsLeft = Endless;
-
-}  // namespace
-
-// Stands in front of the one that everything here uses, the plug-in's object too.
-void* operator new(std::size_t size) {
-  static auto* const next = reinterpret_cast<void* (*)(std::size_t)>(dlsym(RTLD_NEXT, "_Znwm"));
-  if (allocationsLeft == 0) throw std::bad_alloc();
-  if (allocationsLeft != Endless) --allocationsLeft;
-  return next(size);
-}
 
 namespace appsync {
 namespace {
@@ -84,7 +68,7 @@ TEST_F(PluginObject, MakesNoClientWithoutServices) { EXPECT_EQ(create()(nullptr)
 /// Services have memory of their own.
 class OwnMemory {
  public:
-  OwnMemory() { allocationsLeft = Endless; }
+  OwnMemory() { allocationsLeft = EndlessAllocations; }
   ~OwnMemory() { allocationsLeft = kept_; }
 
  private:
@@ -108,7 +92,7 @@ class RegistryWithMemory : public fakes::FaultyAppRegistry {
  public:
   using FaultyAppRegistry::FaultyAppRegistry;
   void addObserver(AppRegistryObserver* observer) noexcept override {
-    allocationsLeft = Endless;  // from here on others borrow the client
+    allocationsLeft = EndlessAllocations;  // from here on others borrow the client
     FaultyAppRegistry::addObserver(observer);
   }
 };
@@ -123,7 +107,7 @@ TEST_F(PluginObject, MakesNoClientWhenMakingItFailsAtAnyPoint) {
   while (failures < 1000) {
     allocationsLeft = failures;
     client = make(&platform);
-    allocationsLeft = Endless;
+    allocationsLeft = EndlessAllocations;
     if (client) break;
     ++failures;
     ASSERT_EQ(phone.appRegistry.observerCount(), 0u);
