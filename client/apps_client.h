@@ -13,6 +13,7 @@
 
 #include "client/log_message.h"
 #include "client/queues.h"
+#include "client/todo_file.h"
 #include "platform/platform.h"
 #include "platform/sync_client.h"
 
@@ -187,8 +188,14 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
 
  private:
   bool _runsInSyncHost() const;
+  /// The file of a list; one that is there but cannot be read is said in the log.
+  std::optional<Bytes> _bytesOrSay(std::string_view path) const;
+  /// The list in a file's bytes; none for an empty or damaged one.
+  std::optional<PropertyList::Array> _listIn(const Bytes& bytes) const;
   /// The list, as _loadPlist gives it; a file that is there but cannot be read is said in the log.
   std::optional<PropertyList::Array> _loadListOrSay(std::string_view path) const;
+  /// changeAssetID for a list of any form.
+  void _changeParsed(const Bytes& list, std::string_view identifier, std::string_view toDo);
   void _performDeletions(const PropertyList::Array& todoList);
   void _sendIconLayout();
   SyncAssetPtr _prepareAsset(const TransferCandidate& candidate);
@@ -246,6 +253,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   DelayedTasks _retries;
   /// Held while a state file is read, changed and written back: ten installs may end at once.
   mutable std::mutex _stateFileMutex;
+  /// The todo list as last read or changed here. Touched only with _stateFileMutex held.
+  mutable TodoFile _todoFile;
 };
 
 }  // namespace appsync

@@ -11,15 +11,17 @@
 namespace appsync {
 namespace {
 
-/// The property list in a file. none without `damaged` for a missing or empty file; `error` tells
-/// why it could not be read.
-std::optional<PropertyList> readPlist(FileManager& files, std::string_view path,
-                                      std::optional<Error>* error, bool& damaged) {
-  const std::optional<Bytes> bytes = files.contentsAtPath(path, error);
-  if (!bytes || bytes->empty()) return std::nullopt;
-  std::optional<PropertyList> parsed = parsePropertyList(*bytes);
+/// The property list in a file's bytes. none without `damaged` for an empty one.
+std::optional<PropertyList> plistIn(const Bytes& bytes, bool& damaged) {
+  if (bytes.empty()) return std::nullopt;
+  std::optional<PropertyList> parsed = parsePropertyList(bytes);
   damaged = !parsed;
   return parsed;
+}
+
+void sayChange(const ClientLog& log, std::string_view identifier, const PropertyList& from,
+               std::string_view to) {
+  log.normal("Changing %{public}@ from %{public}@ to %{public}@", identifier, from, to);
 }
 
 /// The first entry of the identifier, which is the one that counts.
@@ -33,8 +35,13 @@ auto entryOf(List& list, std::string_view identifier) {
 
 std::optional<PropertyList::Array> AppsClient::_loadPlist(std::string_view path,
                                                           std::optional<Error>* error) const {
+  const std::optional<Bytes> bytes = _platform.files.contentsAtPath(path, error);
+  return bytes ? _listIn(*bytes) : std::nullopt;
+}
+
+std::optional<PropertyList::Array> AppsClient::_listIn(const Bytes& bytes) const {
   bool damaged = false;
-  std::optional<PropertyList> list = readPlist(_platform.files, path, error, damaged);
+  std::optional<PropertyList> list = plistIn(bytes, damaged);
   if (damaged) _log.error("couldn't parse todo list");
   if (!list) return std::nullopt;
   PropertyList::Array* array = list->asArray();
@@ -47,8 +54,10 @@ std::optional<PropertyList::Array> AppsClient::_loadPlist(std::string_view path,
 
 std::optional<PropertyList::Dictionary> AppsClient::_loadDemotedAppsPlist(
     std::string_view path, std::optional<Error>* error) const {
+  const std::optional<Bytes> bytes = _platform.files.contentsAtPath(path, error);
+  if (!bytes) return std::nullopt;
   bool damaged = false;
-  std::optional<PropertyList> list = readPlist(_platform.files, path, error, damaged);
+  std::optional<PropertyList> list = plistIn(*bytes, damaged);
   if (damaged) _log.error("couldn't parse demoted apps list");
   if (!list) return std::nullopt;
   PropertyList::Dictionary* dictionary = list->asDictionary();
@@ -59,31 +68,58 @@ std::optional<PropertyList::Dictionary> AppsClient::_loadDemotedAppsPlist(
   return std::move(*dictionary);
 }
 
-std::optional<PropertyList::Array> AppsClient::_loadListOrSay(std::string_view path) const {
+std::optional<Bytes> AppsClient::_bytesOrSay(std::string_view path) const {
   std::optional<Error> error;
-  std::optional<PropertyList::Array> list = _loadPlist(path, &error);
+  std::optional<Bytes> bytes = _platform.files.contentsAtPath(path, &error);
   sayUnreadable(_log, path, error);
-  return list;
+  return bytes;
+}
+
+std::optional<PropertyList::Array> AppsClient::_loadListOrSay(std::string_view path) const {
+  const std::optional<Bytes> bytes = _bytesOrSay(path);
+  return bytes ? _listIn(*bytes) : std::nullopt;
 }
 
 void AppsClient::changeAssetID(std::string_view identifier, std::string_view toDo) {
   const std::lock_guard lock(_stateFileMutex);
-  std::optional<PropertyList::Array> list = _loadListOrSay(paths::TodoList);
-  if (!list) return;
-  const auto entry = entryOf(*list, identifier);
-  if (entry == list->end()) return;
+  std::optional<Bytes> bytes = _bytesOrSay(paths::TodoList);
+  if (!bytes) return;
+  if (!_todoFile.take(*bytes)) return _changeParsed(*bytes, identifier, toDo);
+
+  const std::optional<std::string_view> operation = _todoFile.operationOf(identifier);
+  if (!operation) return;
+  const PropertyList from(*operation);
+  if (!_todoFile.setOperation(identifier, toDo))
+    return _changeParsed(_todoFile.bytes(), identifier, toDo);
+  sayChange(_log, identifier, from, toDo);
+  _platform.files.writeAtomically(paths::TodoList, _todoFile.bytes());
+}
+
+void AppsClient::_changeParsed(const Bytes& list, std::string_view identifier,
+                               std::string_view toDo) {
+  std::optional<PropertyList::Array> entries = _listIn(list);
+  if (!entries) return;
+  const auto entry = entryOf(*entries, identifier);
+  if (entry == entries->end()) return;
 
   PropertyList& operation = (*entry->asDictionary())[std::string(exchange::TodoOperationKey)];
-  _log.normal("Changing %{public}@ from %{public}@ to %{public}@", identifier, operation, toDo);
+  sayChange(_log, identifier, operation, toDo);
   operation = toDo;
   const std::optional<Bytes> bytes =
-      serializePropertyList(std::move(*list), PropertyListFormat::Binary);
+      serializePropertyList(std::move(*entries), PropertyListFormat::Binary);
   if (bytes) _platform.files.writeAtomically(paths::TodoList, *bytes);
 }
 
 std::optional<std::string> AppsClient::_operationStateForIdentifier(
     std::string_view identifier) const {
-  const std::optional<PropertyList::Array> list = _loadListOrSay(paths::TodoList);
+  const std::lock_guard lock(_stateFileMutex);
+  std::optional<Bytes> bytes = _bytesOrSay(paths::TodoList);
+  if (!bytes) return std::nullopt;
+  if (_todoFile.take(*bytes)) {
+    const std::optional<std::string_view> operation = _todoFile.operationOf(identifier);
+    return operation ? std::optional<std::string>(*operation) : std::nullopt;
+  }
+  const std::optional<PropertyList::Array> list = _listIn(*bytes);
   if (!list) return std::nullopt;
   const auto entry = entryOf(*list, identifier);
   if (entry == list->end()) return std::nullopt;
