@@ -3,6 +3,7 @@
 #include <benchmark/benchmark.h>
 
 #include "bench/bench_phone.h"
+#include "bench/memory.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::bench {
@@ -13,11 +14,46 @@ void changeAssetID(benchmark::State& state) {
   const auto entries = static_cast<std::size_t>(state.range(0));
   phone.putTodoList(entries, false);
   const std::string identifier = identifierOf(entries - 1);
+  const MemoryMeter memory;
   bool sent = false;
   for (auto _ : state) {
     sent = !sent;
     phone.client().changeAssetID(identifier, sent ? "DOWNLOADED" : "INSTALLED");
   }
+  state.counters["bytes_per_entry"] = static_cast<double>(memory.most() / entries);
+}
+
+/// The same of a list that the client has not seen before, which it checks once.
+void changeAssetID_ofANewList(benchmark::State& state) {
+  BenchPhone phone;
+  const auto entries = static_cast<std::size_t>(state.range(0));
+  const std::string identifier = identifierOf(entries - 1);
+  for (auto _ : state) {
+    state.PauseTiming();
+    phone.putTodoList(entries, false);
+    state.ResumeTiming();
+    phone.client().changeAssetID(identifier, "DOWNLOADED");
+  }
+}
+
+void readOperation(benchmark::State& state) {
+  BenchPhone phone;
+  const auto entries = static_cast<std::size_t>(state.range(0));
+  phone.putTodoList(entries, false);
+  const std::string identifier = identifierOf(entries / 2);
+  const MemoryMeter memory;
+  for (auto _ : state) {
+    if (phone.client()._operationStateForIdentifier(identifier) != "install")
+      return state.SkipWithError("no operation");
+  }
+  state.counters["bytes_per_entry"] = static_cast<double>(memory.most() / entries);
+}
+
+/// Reading the file.
+void readOperation_floor(benchmark::State& state) {
+  BenchPhone phone;
+  phone.putTodoList(static_cast<std::size_t>(state.range(0)), false);
+  for (auto _ : state) benchmark::DoNotOptimize(phone.files().contentsAtPath(TodoList));
 }
 
 /// Reading the file and replacing it atomically with the same bytes.
@@ -87,18 +123,15 @@ void outstandingAssetTransfers_floor(benchmark::State& state) {
   }
 }
 
-BENCHMARK(changeAssetID)
-    ->Arg(100)
-    ->Arg(1000)
-    ->Arg(10000)
-    ->Unit(benchmark::kMicrosecond)
-    ->UseRealTime();
-BENCHMARK(changeAssetID_floor)
-    ->Arg(100)
-    ->Arg(1000)
-    ->Arg(10000)
-    ->Unit(benchmark::kMicrosecond)
-    ->UseRealTime();
+void ofTodoLists(benchmark::internal::Benchmark* benchmark) {
+  benchmark->RangeMultiplier(10)->Range(100, 100'000)->Unit(benchmark::kMicrosecond)->UseRealTime();
+}
+
+BENCHMARK(changeAssetID)->Apply(ofTodoLists);
+BENCHMARK(changeAssetID_floor)->Apply(ofTodoLists);
+BENCHMARK(changeAssetID_ofANewList)->Apply(ofTodoLists);
+BENCHMARK(readOperation)->Apply(ofTodoLists);
+BENCHMARK(readOperation_floor)->Apply(ofTodoLists);
 BENCHMARK(outstandingAssetTransfers)
     ->Arg(100)
     ->Arg(1000)

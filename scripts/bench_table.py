@@ -3,7 +3,8 @@
 
 A benchmark "name/size" is shown beside its floor "name_floor/size" of the same program: the least
 work that any solution has to do. Where a benchmark has no floor of its own, its counter
-"floor_ratio", if any, is shown. With --benchmark_repetitions the medians are taken.
+"floor_ratio", if any, is shown. The counter "bytes_per_entry" is the memory that it took. With
+--benchmark_repetitions the medians are taken.
 
 usage: bench_table.py REPORT.json...
 """
@@ -55,13 +56,10 @@ def rows(results):
         if name.split("/")[0].endswith("_floor"):
             continue
         floor = floor_of(name, results)
-        if floor:
-            yield name, duration(time), duration(floor[0]), f"{time / floor[0]:.2f}"
-        elif "floor_ratio" in run:
-            ratio = run["floor_ratio"]
-            yield name, duration(time), duration(time / ratio), f"{ratio:.2f}"
-        else:
-            yield name, duration(time), "", ""
+        ratio = time / floor[0] if floor else run.get("floor_ratio")
+        beside = (duration(time / ratio), f"{ratio:.2f}") if ratio else ("", "")
+        memory = f"{run['bytes_per_entry']:.0f}" if "bytes_per_entry" in run else ""
+        yield (name, duration(time), *beside, memory)
 
 
 def table(lines):
@@ -74,7 +72,7 @@ def table(lines):
 def main():
     if len(sys.argv) < 2:
         sys.exit("no benchmark reports")
-    lines = [("benchmark", "time", "floor", "ratio")]
+    lines = [("benchmark", "time", "floor", "ratio", "bytes/entry")]
     for path in sys.argv[1:]:
         lines.extend(rows(read(path)))
     table(lines)

@@ -80,11 +80,11 @@ class BenchTable(unittest.TestCase):
     def test_shows_each_benchmark_beside_its_floor(self):
         table = run("bench_table", self.report(
             ("change/100/real_time", 15, "us", {}), ("change_floor/100/real_time", 10000, "ns", {}),
-            ("change/1000", 99, "us", {}), ("alone", 4, "ms", {"floor_ratio": 2.0})))
+            ("change/1000", 99, "us", {"bytes_per_entry": 180.4}), ("alone", 4, "ms", {"floor_ratio": 2.0})))
         rows = [line.split() for line in table.splitlines()]
-        self.assertEqual(rows, [["benchmark", "time", "floor", "ratio"],
+        self.assertEqual(rows, [["benchmark", "time", "floor", "ratio", "bytes/entry"],
                                 ["change/100", "15", "us", "10", "us", "1.50"],
-                                ["change/1000", "99", "us"],
+                                ["change/1000", "99", "us", "180"],
                                 ["alone", "4", "ms", "2", "ms", "2.00"]])
 
     def test_takes_the_median_of_repetitions(self):
