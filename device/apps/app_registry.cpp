@@ -186,6 +186,15 @@ bool DeviceAppRegistry::installPackageWith(const FileLocation& package,
   return installed;
 }
 
+bool DeviceAppRegistry::buildPlaceholder(const std::string& identifier, const PlaceholderFace& face,
+                                         const InstallDetails& details,
+                                         std::optional<Error>* error) noexcept {
+  const auto build = [&](const std::string& id, std::optional<Error>* reason) {
+    return device::buildPlaceholder(core_, id, face, details, reason);
+  };
+  return changeApplication(identifier, build, error);
+}
+
 bool DeviceAppRegistry::uninstallApplication(std::string_view bundleId,
                                              const PropertyList::Dictionary& options) noexcept {
   const PropertyList* only = find(options, UninstallPlaceholdersOnlyKey);

@@ -32,6 +32,10 @@ class DeviceAppRegistry final : public AppRegistry {
   bool installPackageWith(const FileLocation& package, const std::string& identifier,
                           const InstallDetails& details, std::optional<Error>* error) noexcept;
 
+  /// Installs a placeholder and makes its bundle.
+  bool buildPlaceholder(const std::string& identifier, const PlaceholderFace& face,
+                        const InstallDetails& details, std::optional<Error>* error) noexcept;
+
   /// What a person does: the application goes with its placeholder and data.
   bool removeApplication(std::string_view bundleId, std::optional<Error>* error) noexcept;
   /// What a person does: only the application's placeholder and data stay.

@@ -9,53 +9,34 @@
 #include "device/journal/history.h"
 #include "platform/bundle.h"
 #include "platform/existence.h"
-#include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
 
 namespace appsync::device {
 namespace {
 
-constexpr std::string_view IconFile = "Icon.png";
-constexpr std::string_view BundleParts = "/tmp/com.corvane.demotion";
+bool isFile(FileManager& files, const std::string& path) {
+  const auto attributes = files.attributesOfItem(path);
+  return attributes && !attributes->isDirectory;
+}
 
+/// Empty when there is none.
 std::string iconOf(FileManager& files, const ApplicationRow& installed) {
   const auto info = loadDictionary(files, joinPath(installed.bundlePath(), "Info.plist"));
   const std::string* name = info ? findString(*info, KBBundleIconFile) : nullptr;
   const std::string icon = name ? joinPath(installed.bundlePath(), *name) : std::string();
-  const auto attributes = icon.empty() ? std::nullopt : files.attributesOfItem(icon);
-  return attributes && !attributes->isDirectory
-             ? icon
-             : joinPath(installed.container, exchange::ArtworkName);
-}
-
-/// A placeholder without an icon is better than none.
-bool buildBundle(FileManager& files, const ApplicationRow& installed, const std::string& bundle,
-                 std::optional<Error>* error) {
-  PropertyList::Dictionary info{{std::string(KBBundleIdentifier), installed.identifier},
-                                {std::string(KBBundleDisplayName), installed.displayName},
-                                {std::string(KBBundleExecutable), installed.displayName},
-                                {std::string(KBBundleIconFile), IconFile}};
-  if (installed.version) info.emplace(KBBundleVersion, *installed.version);
-  const auto bytes = serializePropertyList(info, PropertyListFormat::Xml, error);
-  files.removeItem(bundle);
-  if (!bytes || !files.createDirectory(bundle, true, {}, error) ||
-      !files.writeAtomically(joinPath(bundle, "Info.plist"), *bytes, error)) {
-    return false;
-  }
-  files.copyItem(iconOf(files, installed), joinPath(bundle, IconFile));
-  return true;
+  if (name && isFile(files, icon)) return icon;
+  const std::string artwork = joinPath(installed.container, exchange::ArtworkName);
+  return isFile(files, artwork) ? artwork : std::string();
 }
 
 bool layPlaceholder(DeviceCore& core, const ApplicationRow& installed,
                     std::optional<Error>* error) {
-  const std::string bundle = joinPath(BundleParts, installed.identifier + ".app");
   InstallDetails details{InstallType::IntentionalDowngrade, std::nullopt, installed.sinf};
   const std::string metadata = joinPath(installed.container, exchange::MetadataName);
   if (!readIfThere(core.files, metadata, details.metadata, error)) return false;
-  const bool laid = buildBundle(core.files, installed, bundle, error) &&
-                    installPlaceholder(core, bundle, installed.identifier, details, error);
-  core.files.removeItem(bundle);
-  return laid;
+  const PlaceholderFace face{installed.displayName, installed.version,
+                             iconOf(core.files, installed)};
+  return buildPlaceholder(core, installed.identifier, face, details, error);
 }
 
 bool takePackage(DeviceCore& core, const ApplicationRow& installed, std::optional<Error>* error) {

@@ -32,6 +32,18 @@ bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
                         const std::string& identifier, const InstallDetails& details,
                         std::optional<Error>* error);
 
+/// What a placeholder shows that has no bundle yet.
+struct PlaceholderFace {
+  std::string name;
+  std::optional<std::string> version;
+  std::string icon;                 ///< a file, which is copied; may be empty
+  PropertyList::Dictionary info{};  ///< what else its Info.plist says
+};
+
+/// Installs a placeholder and makes its bundle.
+bool buildPlaceholder(DeviceCore& core, const std::string& identifier, const PlaceholderFace& face,
+                      const InstallDetails& details, std::optional<Error>* error);
+
 /// Registers an application that comes with the system.
 bool installSystemApplication(DeviceCore& core, const std::string& identifier,
                               const std::string& displayName, const std::string& version,

@@ -1,5 +1,6 @@
 #include <fmt/format.h>
 
+#include <cerrno>
 #include <filesystem>
 
 #include "device/apps/installers.h"
@@ -15,6 +16,8 @@
 
 namespace appsync::device {
 namespace {
+
+constexpr std::string_view IconFile = "Icon.png";
 
 /// The bundle's information dictionary, if it is one of a placeholder of this application.
 std::optional<PropertyList::Dictionary> readInfo(DeviceCore& core, const std::string& bundle,
@@ -49,11 +52,43 @@ std::uint64_t sizeOf(DeviceCore& core, const std::string& file) {
   return attributes ? attributes->size : 0;
 }
 
-bool fill(DeviceCore& core, const std::string& source, const InstallDetails& details,
-          ApplicationRow& row, std::optional<Error>* error) {
-  if (!core.files.copyItem(source, row.bundlePath(), error)) return false;
+PropertyList::Dictionary infoOf(const std::string& identifier, const PlaceholderFace& face) {
+  PropertyList::Dictionary info = face.info;
+  const auto set = [&info](std::string_view key, std::string_view value) {
+    info.insert_or_assign(std::string(key), value);
+  };
+  set(KBBundleIdentifier, identifier);
+  set(KBBundleDisplayName, face.name);
+  set(KBBundleExecutable, face.name);
+  set(KBBundleIconFile, IconFile);
+  if (face.version) set(KBBundleVersion, *face.version);
+  return info;
+}
+
+/// A placeholder without an icon is better than none.
+void copyIcon(DeviceCore& core, const std::string& icon, const ApplicationRow& row) {
+  if (icon.empty()) return;
+  std::optional<Error> error = Error::posix(ENOENT, icon);
+  const auto attributes = core.files.attributesOfItem(icon);
+  const bool isFile = attributes && !attributes->isDirectory;
+  if (isFile && core.files.copyItem(icon, joinPath(row.bundlePath(), IconFile), &error)) return;
+  core.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default,
+                 fmt::format("The placeholder of {} goes without its icon: {}", row.identifier,
+                             error->localizedDescription()));
+}
+
+bool writeInfo(DeviceCore& core, const ApplicationRow& row, const PropertyList::Dictionary& info,
+               std::optional<Error>* error) {
+  const auto bytes = serializePropertyList(info, PropertyListFormat::Xml, error);
+  return bytes && core.files.createDirectory(row.bundlePath(), false, {}, error) &&
+         core.files.writeAtomically(joinPath(row.bundlePath(), "Info.plist"), *bytes, error);
+}
+
+/// What the container holds beside its bundle, and how much it is.
+bool complete(DeviceCore& core, const InstallDetails& details, ApplicationRow& row,
+              std::optional<Error>* error) {
   row.diskUsage = sizeOf(core, joinPath(row.bundlePath(), "Info.plist")) +
-                  sizeOf(core, joinPath(row.bundlePath(), "Icon.png"));
+                  sizeOf(core, joinPath(row.bundlePath(), IconFile));
   if (!details.metadata) return true;
   const std::string metadata = joinPath(row.container, exchange::MetadataName);
   row.diskUsage += details.metadata->size();
@@ -96,25 +131,24 @@ bool enter(DeviceCore& core, ApplicationRow& row, std::optional<ApplicationRow>&
       error);
 }
 
-}  // namespace
+using MakeBundle = std::function<bool(const ApplicationRow& row, std::optional<Error>* error)>;
 
-bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
-                        const std::string& identifier, const InstallDetails& details,
-                        std::optional<Error>* error) {
-  const auto info = readInfo(core, bundleDirectory, identifier, error);
-  if (!info) return false;
+/// Installs the placeholder whose bundle is of this name and says this of itself.
+bool install(DeviceCore& core, const std::string& identifier, const std::string& bundle,
+             const PropertyList::Dictionary& info, const InstallDetails& details,
+             const MakeBundle& makeBundle, std::optional<Error>* error) {
   StagedContainer staged(core, error);
   if (!staged.isMade()) return false;
   ApplicationRow row;
   row.identifier = identifier;
   row.placeholder = true;
   row.container = staged.path();
-  row.bundle = bundleName(bundleDirectory, identifier);
+  row.bundle = bundle;
   row.installType = details.installType;
   row.sinf = details.sinf;
-  describe(row, *info);
+  describe(row, info);
   std::optional<ApplicationRow> replaced;
-  if (!fill(core, bundleDirectory, details, row, error) ||
+  if (!makeBundle(row, error) || !complete(core, details, row, error) ||
       (mustLast(row) && !core.containers.flush(error)) || !enter(core, row, replaced, error)) {
     return false;
   }
@@ -122,6 +156,31 @@ bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
   if (replaced) core.containers.remove(replaced->container);
   core.observers.installsChanged();
   return true;
+}
+
+}  // namespace
+
+bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
+                        const std::string& identifier, const InstallDetails& details,
+                        std::optional<Error>* error) {
+  const auto info = readInfo(core, bundleDirectory, identifier, error);
+  if (!info) return false;
+  const auto copy = [&](const ApplicationRow& row, std::optional<Error>* reason) {
+    return core.files.copyItem(bundleDirectory, row.bundlePath(), reason);
+  };
+  const std::string bundle = bundleName(bundleDirectory, identifier);
+  return install(core, identifier, bundle, *info, details, copy, error);
+}
+
+bool buildPlaceholder(DeviceCore& core, const std::string& identifier, const PlaceholderFace& face,
+                      const InstallDetails& details, std::optional<Error>* error) {
+  const PropertyList::Dictionary info = infoOf(identifier, face);
+  const auto build = [&](const ApplicationRow& row, std::optional<Error>* reason) {
+    if (!writeInfo(core, row, info, reason)) return false;
+    copyIcon(core, face.icon, row);
+    return true;
+  };
+  return install(core, identifier, identifier + ".app", info, details, build, error);
 }
 
 bool installSystemApplication(DeviceCore& core, const std::string& identifier,
@@ -138,11 +197,7 @@ bool installSystemApplication(DeviceCore& core, const std::string& identifier,
                                       {std::string(KBBundleDisplayName), displayName},
                                       {std::string(KBBundleVersion), version}};
   describe(row, info);
-  const auto bytes = serializePropertyList(info, PropertyListFormat::Xml, error);
-  if (!bytes || !core.files.createDirectory(row.bundlePath(), false, {}, error) ||
-      !core.files.writeAtomically(joinPath(row.bundlePath(), "Info.plist"), *bytes, error)) {
-    return false;
-  }
+  if (!writeInfo(core, row, info, error)) return false;
   ApplicationRows before;
   const bool entered = core.database.change(
       fmt::format("{} could not be entered in the registry", identifier), Database::Commit::OnDisk,

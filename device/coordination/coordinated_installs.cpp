@@ -16,27 +16,20 @@
 namespace appsync::device {
 namespace {
 
-constexpr std::string_view IconFile = "Icon.png";
 constexpr std::string_view LaunchProhibitedKey = "SWApplicationLaunchProhibited";
 /// Between two looks whether an application has left the foreground: a file's worth of work.
 constexpr std::chrono::milliseconds ForegroundPoll{200};
 /// Until a coordinator that could not be read is looked at again.
 constexpr std::chrono::milliseconds RetryDelay{200};
 
-PropertyList::Dictionary infoOf(const PlaceholderRow& row) {
+PlaceholderFace faceOf(const CoordinatorState& state) {
+  const PlaceholderRow& row = *state.placeholder;
   const auto attributes =
       attributesFrom(row.attributes.value_or(Bytes{})).value_or(PlaceholderAttributes{});
-  PropertyList::Dictionary info = attributes.infoDictionary;
-  const auto set = [&info](std::string_view key, PropertyList value) {
-    info.insert_or_assign(std::string(key), std::move(value));
-  };
-  set(KBBundleIdentifier, row.identifier);
-  set(KBBundleDisplayName, row.name);
-  set(KBBundleExecutable, row.name);
-  set(KBBundleIconFile, IconFile);
-  set(LaunchProhibitedKey, attributes.launchProhibited);
-  if (attributes.bundleVersion) set(KBBundleVersion, *attributes.bundleVersion);
-  return info;
+  PlaceholderFace face{row.name, attributes.bundleVersion, {}, attributes.infoDictionary};
+  face.info.insert_or_assign(std::string(LaunchProhibitedKey), attributes.launchProhibited);
+  if (state.icon && !state.icon->over) face.icon = state.icon->path.value_or("");
+  return face;
 }
 
 /// The serialised dictionary; none when there is nothing in it.
@@ -45,16 +38,9 @@ std::optional<Bytes> metadataFile(const std::optional<StoreMetadata>& metadata) 
   return serializePropertyList(metadata->values, PropertyListFormat::Binary);
 }
 
-PropertyList::Dictionary optionsOf(const PlaceholderRow& row) {
-  PropertyList::Dictionary options{
-      {std::string(SWPackageTypeKey), SWPackageTypePlaceholder},
-      {std::string(KBBundleIdentifier), row.identifier},
-      {std::string(SWInstallTypeKey), static_cast<std::uint64_t>(row.installType)}};
-  if (auto metadata = metadataFile(metadataFrom(row.metadata.value_or(Bytes{})))) {
-    options.emplace(SWHalvoMetadataKey, std::move(*metadata));
-  }
-  if (row.sinf) options.emplace(SWApplicationSINFKey, *row.sinf);
-  return options;
+InstallDetails detailsOf(const PlaceholderRow& row) {
+  return {row.installType, metadataFile(metadataFrom(row.metadata.value_or(Bytes{}))), row.sinf,
+          HistoryOrigin::Sync};
 }
 
 /// Who brings the package.
@@ -230,46 +216,12 @@ bool CoordinatedInstalls::installPlaceholder(const CoordinatorState& state) {
   if (noted == Presence::Adopted) core_.device().observers.installsChanged();
   if (noted != Presence::Begun) return noted == Presence::Adopted;
   std::optional<Error> error;
-  if (layPlaceholder(state, &error)) return note(state, Presence::Installed) != Presence::None;
+  const PlaceholderRow& row = *state.placeholder;
+  if (core_.registry().buildPlaceholder(row.identifier, faceOf(state), detailsOf(row), &error)) {
+    return note(state, Presence::Installed) != Presence::None;
+  }
   finish(state, error);
   return false;
-}
-
-bool CoordinatedInstalls::layPlaceholder(const CoordinatorState& state,
-                                         std::optional<Error>* error) {
-  const PlaceholderRow& placeholder = *state.placeholder;
-  const std::string directory = joinPath(PlaceholderBundles, std::to_string(placeholder.number));
-  const std::string bundle = joinPath(directory, placeholder.identifier + ".app");
-  const bool laid = buildBundle(state, bundle, error) &&
-                    core_.registry().installApplication(FileLocation::directory(bundle),
-                                                        optionsOf(placeholder), error);
-  core_.device().files.removeItem(directory);
-  return laid;
-}
-
-bool CoordinatedInstalls::buildBundle(const CoordinatorState& state, const std::string& bundle,
-                                      std::optional<Error>* error) {
-  FileManager& files = core_.device().files;
-  const auto info =
-      serializePropertyList(infoOf(*state.placeholder), PropertyListFormat::Binary, error);
-  if (!info || !files.createDirectory(bundle, true, {}, error) ||
-      !files.writeAtomically(joinPath(bundle, "Info.plist"), *info, error)) {
-    return false;
-  }
-  copyIcon(state, bundle);
-  return true;
-}
-
-/// A placeholder without an icon is better than none.
-void CoordinatedInstalls::copyIcon(const CoordinatorState& state, const std::string& bundle) {
-  if (!state.icon || state.icon->over || !state.icon->path) return;
-  FileManager& files = core_.device().files;
-  std::optional<Error> error = Error::posix(ENOENT, *state.icon->path);
-  const bool copied = isFile(files, *state.icon->path) &&
-                      files.copyItem(*state.icon->path, joinPath(bundle, IconFile), &error);
-  if (copied) return;
-  core_.log(fmt::format("The placeholder of {} goes without its icon: {}",
-                        state.coordinator.identifier, error->localizedDescription()));
 }
 
 bool CoordinatedInstalls::installPackage(const CoordinatorState& state) {

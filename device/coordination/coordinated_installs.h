@@ -45,11 +45,6 @@ class CoordinatedInstalls {
   /// Notes the placeholder's presence, Adopted in the place of Begun where one stands already that
   /// is to stay. None when it is not wanted any more, or that failed.
   Presence note(const CoordinatorState& state, Presence presence);
-  bool layPlaceholder(const CoordinatorState& state, std::optional<Error>* error);
-  /// Builds the bundle of a placeholder in a directory of its own.
-  bool buildBundle(const CoordinatorState& state, const std::string& bundle,
-                   std::optional<Error>* error);
-  void copyIcon(const CoordinatorState& state, const std::string& bundle);
   enum class Beginning { Made, NotReady, Failed };
   /// Marks the package as being installed, unless the coordinator is not ready any more.
   Beginning begin(const CoordinatorState& state);
@@ -76,8 +71,5 @@ class CoordinatedInstalls {
   bool hurried_ = false;
   bool leaving_ = false;
 };
-
-/// Where placeholder bundles are built.
-inline constexpr std::string_view PlaceholderBundles = "/var/mobile/Library/InstallCoordination";
 
 }  // namespace appsync::device

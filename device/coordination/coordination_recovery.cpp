@@ -5,7 +5,6 @@
 #include <cerrno>
 
 #include "base/identifiers.h"
-#include "device/coordination/coordinated_installs.h"
 #include "device/coordination/coordination_values.h"
 #include "device/state/application_rows.h"
 #include "platform/existence.h"
@@ -140,8 +139,6 @@ class Repair {
 }  // namespace
 
 std::optional<Consequences> repairCoordination(DeviceCore& device) {
-  // Bundles that were being built.
-  if (device.files.fileExists(PlaceholderBundles)) device.files.removeItem(PlaceholderBundles);
   Consequences consequences;
   std::vector<std::string> notes;
   const bool repaired =
