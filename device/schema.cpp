@@ -5,7 +5,7 @@
 
 #include <cctype>
 
-#include "device/coordination/coordination_schema.h"
+#include "device/coordination/coordination_rows.h"
 #include "device/device_folder.h"
 #include "device/journal/history.h"
 

@@ -7,7 +7,6 @@
 
 #include "device/apps/installs.h"
 #include "device/coordination/coordination_core.h"
-#include "device/coordination/coordination_values.h"
 #include "device/journal/history.h"
 #include "device/state/application_rows.h"
 #include "platform/bundle.h"

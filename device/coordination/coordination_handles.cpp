@@ -5,8 +5,6 @@
 #include <algorithm>
 #include <cerrno>
 
-#include "device/coordination/coordination_values.h"
-
 namespace appsync::device {
 namespace {
 

@@ -5,7 +5,6 @@
 #include <cerrno>
 
 #include "base/identifiers.h"
-#include "device/coordination/coordination_values.h"
 #include "device/state/application_rows.h"
 #include "platform/existence.h"
 

@@ -1,7 +1,69 @@
 #include "device/coordination/coordination_rows.h"
 
+#include "platform/property_list_codec.h"
+
 namespace appsync::device {
 namespace {
+
+// Rows of what is over stay until the device is next opened for writing, so that whoever still
+// holds it reads the last values; those of coordinators with events to deliver stay longer.
+constexpr const char* Schema = R"(
+CREATE TABLE IF NOT EXISTS install_coordinators (
+  number INTEGER PRIMARY KEY AUTOINCREMENT,
+  identifier TEXT NOT NULL,
+  kind INTEGER NOT NULL,
+  creator INTEGER NOT NULL,
+  stage INTEGER NOT NULL,
+  options BLOB,                  -- property list
+  initial_promises BLOB,         -- property list: their numbers
+  package_promise INTEGER,
+  responsible_client INTEGER NOT NULL,
+  user_data_promise INTEGER,
+  placeholder INTEGER,
+  error BLOB                     -- property list
+);
+CREATE UNIQUE INDEX IF NOT EXISTS install_coordinators_live
+  ON install_coordinators (identifier) WHERE stage IN (0, 1);
+
+CREATE TABLE IF NOT EXISTS data_promises (
+  number INTEGER PRIMARY KEY AUTOINCREMENT,
+  sort INTEGER NOT NULL,
+  name TEXT NOT NULL,
+  client INTEGER NOT NULL,
+  disk_space INTEGER NOT NULL,   -- bytes
+  path TEXT,
+  path_is_directory INTEGER NOT NULL,
+  percent REAL NOT NULL,         -- 1.0 is all
+  complete INTEGER NOT NULL,
+  began INTEGER NOT NULL,        -- its coordinator's client was told so
+  over INTEGER NOT NULL
+);
+
+CREATE TABLE IF NOT EXISTS install_placeholders (
+  number INTEGER PRIMARY KEY AUTOINCREMENT,
+  identifier TEXT NOT NULL,
+  name TEXT NOT NULL,
+  install_type INTEGER NOT NULL,
+  client INTEGER NOT NULL,
+  icon_promise INTEGER,
+  attributes BLOB,               -- property list
+  metadata BLOB,                 -- property list
+  sinf BLOB,
+  configured INTEGER NOT NULL,
+  presence INTEGER NOT NULL,
+  over INTEGER NOT NULL
+);
+
+-- What is still to be told to somebody.
+CREATE TABLE IF NOT EXISTS coordinator_events (
+  number INTEGER PRIMARY KEY AUTOINCREMENT,
+  coordinator INTEGER NOT NULL,
+  kind INTEGER NOT NULL,
+  promise INTEGER NOT NULL,
+  reason BLOB,                   -- property list
+  client INTEGER NOT NULL
+);
+)";
 
 #define COORDINATOR_COLUMNS                                                             \
   "c.number, c.identifier, c.kind, c.creator, c.stage, c.options, c.initial_promises, " \
@@ -48,7 +110,39 @@ void take(std::int64_t& number, const SQLite::Database& database) {
   if (number == 0) number = database.getLastInsertRowid();
 }
 
+constexpr PropertyListFormat Format = PropertyListFormat::Binary;
+
+PropertyList::Dictionary treeOf(const Error& error) {
+  PropertyList::Dictionary tree{
+      {"Domain", error.domain}, {"Code", error.code}, {"UserInfo", error.userInfo}};
+  if (error.underlying) tree.emplace("Underlying", treeOf(*error.underlying));
+  return tree;
+}
+
+std::optional<Error> errorIn(const PropertyList::Dictionary& tree) {
+  const std::string* domain = findString(tree, "Domain");
+  const PropertyList* code = find(tree, "Code");
+  const PropertyList* info = find(tree, "UserInfo");
+  if (!domain || !code || !code->asInteger() || !info || !info->asDictionary()) return std::nullopt;
+  Error error{*domain, *code->asInteger(), *info->asDictionary(), nullptr};
+  const PropertyList* underlying = find(tree, "Underlying");
+  if (underlying && underlying->asDictionary()) {
+    if (const auto cause = errorIn(*underlying->asDictionary())) {
+      error.underlying = std::make_shared<const Error>(*cause);
+    }
+  }
+  return error;
+}
+
+std::optional<PropertyList::Dictionary> dictionaryFrom(const Bytes& bytes) {
+  const std::optional<PropertyList> value = parsePropertyList(bytes);
+  const PropertyList::Dictionary* dictionary = value ? value->asDictionary() : nullptr;
+  return dictionary ? std::optional(*dictionary) : std::nullopt;
+}
+
 }  // namespace
+
+void makeCoordinationTables(SQLite::Database& database) { database.exec(Schema); }
 
 std::optional<CoordinatorRow> findCoordinator(SQLite::Database& database, std::int64_t number) {
   return firstOf(Query(database,
@@ -190,6 +284,93 @@ std::vector<EventRow> pendingEvents(SQLite::Database& database) {
 
 void removeEvent(SQLite::Database& database, std::int64_t number) {
   Query(database, "DELETE FROM coordinator_events WHERE number = ?", number).run();
+}
+
+Bytes bytesOf(const Error& error) {
+  if (const auto bytes = serializePropertyList(treeOf(error), Format)) return *bytes;
+  const Error plain =
+      Error::withDescription(error.domain, error.code, error.localizedDescription());
+  if (const auto bytes = serializePropertyList(treeOf(plain), Format)) return *bytes;
+  const Error bare{std::string(POSIXErrorDomain), error.code, {}, nullptr};
+  return serializePropertyList(treeOf(bare), Format).value_or(Bytes{});
+}
+
+std::optional<Error> errorFrom(const Bytes& bytes) {
+  const auto tree = dictionaryFrom(bytes);
+  return tree ? errorIn(*tree) : std::nullopt;
+}
+
+std::optional<Bytes> bytesOf(const InstallOptions& options, std::optional<Error>* error) {
+  PropertyList::Dictionary tree{{"InstallType", static_cast<std::uint64_t>(options.installType)},
+                                {"TargetType", options.installTargetType}};
+  if (options.storeMetadata) tree.emplace("StoreMetadata", options.storeMetadata->values);
+  if (options.sinfData) tree.emplace("Sinf", *options.sinfData);
+  return serializePropertyList(std::move(tree), Format, error);
+}
+
+std::optional<InstallOptions> optionsFrom(const Bytes& bytes) {
+  const auto tree = dictionaryFrom(bytes);
+  if (!tree) return std::nullopt;
+  const PropertyList* type = find(*tree, "InstallType");
+  const PropertyList* target = find(*tree, "TargetType");
+  if (!type || !type->asUnsigned() || !target || !target->asUnsigned()) return std::nullopt;
+  InstallOptions options;
+  options.installType = static_cast<InstallType>(*type->asUnsigned());
+  options.installTargetType = *target->asUnsigned();
+  const PropertyList* metadata = find(*tree, "StoreMetadata");
+  if (metadata && metadata->asDictionary()) {
+    options.storeMetadata = StoreMetadata::fromDictionary(*metadata->asDictionary());
+  }
+  const PropertyList* sinf = find(*tree, "Sinf");
+  if (sinf && sinf->asData()) options.sinfData = *sinf->asData();
+  return options;
+}
+
+std::optional<Bytes> bytesOf(const PlaceholderAttributes& attributes, std::optional<Error>* error) {
+  PropertyList::Dictionary tree{{"Info", attributes.infoDictionary},
+                                {"LaunchProhibited", attributes.launchProhibited}};
+  if (attributes.bundleVersion) tree.emplace("Version", *attributes.bundleVersion);
+  return serializePropertyList(std::move(tree), Format, error);
+}
+
+std::optional<PlaceholderAttributes> attributesFrom(const Bytes& bytes) {
+  const auto tree = dictionaryFrom(bytes);
+  const PropertyList* info = tree ? find(*tree, "Info") : nullptr;
+  const PropertyList* prohibited = tree ? find(*tree, "LaunchProhibited") : nullptr;
+  if (!info || !info->asDictionary() || !prohibited) return std::nullopt;
+  PlaceholderAttributes attributes =
+      PlaceholderAttributes::fromInfoDictionary(*info->asDictionary());
+  attributes.setLaunchProhibited(prohibited->booleanValue());
+  if (const std::string* version = findString(*tree, "Version")) {
+    attributes.setBundleVersion(*version);
+  }
+  return attributes;
+}
+
+std::optional<Bytes> bytesOf(const StoreMetadata& metadata, std::optional<Error>* error) {
+  return serializePropertyList(metadata.values, Format, error);
+}
+
+std::optional<StoreMetadata> metadataFrom(const Bytes& bytes) {
+  auto tree = dictionaryFrom(bytes);
+  if (!tree) return std::nullopt;
+  return StoreMetadata::fromDictionary(std::move(*tree));
+}
+
+std::optional<Bytes> bytesOf(const std::vector<std::int64_t>& numbers) {
+  return serializePropertyList(PropertyList::Array(numbers.begin(), numbers.end()), Format);
+}
+
+std::optional<std::vector<std::int64_t>> numbersFrom(const Bytes& bytes) {
+  const std::optional<PropertyList> value = parsePropertyList(bytes);
+  if (!value || !value->asArray()) return std::nullopt;
+  std::vector<std::int64_t> numbers;
+  for (const PropertyList& item : *value->asArray()) {
+    const std::optional<std::int64_t> number = item.asInteger();
+    if (!number) return std::nullopt;
+    numbers.push_back(*number);
+  }
+  return numbers;
 }
 
 }  // namespace appsync::device

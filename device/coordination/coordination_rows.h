@@ -96,6 +96,9 @@ struct EventRow {
   CoordinationClientId client = 0;
 };
 
+/// Makes those of the coordination service's tables that are missing. Throws SQLite::Exception.
+void makeCoordinationTables(SQLite::Database& database);
+
 // These throw SQLite::Exception and are used within Database's work. "put" enters a row that has no
 // number yet and gives it one.
 
@@ -125,5 +128,25 @@ void addEvent(SQLite::Database& database, const CoordinatorRow& coordinator, Eve
 /// In the order in which they came about.
 std::vector<EventRow> pendingEvents(SQLite::Database& database);
 void removeEvent(SQLite::Database& database, std::int64_t number);
+
+// Values of the coordination service as binary property lists. Those that come from clients may
+// hold what no property list can (then nullopt and an error); bytes that are not what was written
+// give nullopt.
+
+/// An error whose user info cannot be written keeps its text.
+Bytes bytesOf(const Error& error);
+std::optional<Error> errorFrom(const Bytes& bytes);
+
+std::optional<Bytes> bytesOf(const InstallOptions& options, std::optional<Error>* error);
+std::optional<InstallOptions> optionsFrom(const Bytes& bytes);
+
+std::optional<Bytes> bytesOf(const PlaceholderAttributes& attributes, std::optional<Error>* error);
+std::optional<PlaceholderAttributes> attributesFrom(const Bytes& bytes);
+
+std::optional<Bytes> bytesOf(const StoreMetadata& metadata, std::optional<Error>* error);
+std::optional<StoreMetadata> metadataFrom(const Bytes& bytes);
+
+std::optional<Bytes> bytesOf(const std::vector<std::int64_t>& numbers);
+std::optional<std::vector<std::int64_t>> numbersFrom(const Bytes& bytes);
 
 }  // namespace appsync::device

@@ -1,6 +1,5 @@
 #include "device/coordination/coordination_state.h"
 
-#include "device/coordination/coordination_values.h"
 #include "device/state/application_rows.h"
 
 namespace appsync::device {
