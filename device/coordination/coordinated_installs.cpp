@@ -6,7 +6,6 @@
 #include <utility>
 
 #include "device/apps/installs.h"
-#include "device/coordination/coordination_core.h"
 #include "device/journal/history.h"
 #include "device/state/application_rows.h"
 #include "platform/bundle.h"
@@ -107,15 +106,15 @@ void CoordinatedInstalls::advance(const std::string& identifier, std::int64_t co
   // Once more, when whatever it was may have passed.
   const auto again = [this, coordinator] {
     std::optional<Error> error;
-    if (!carryOn(coordinator, &error)) core_.noteTrouble(coordinator, *error);
+    if (!carryOn(coordinator, &error)) store_.noteTrouble(coordinator, *error);
   };
-  core_.workers().add(identifier, again, RetryDelay);
+  workers_.add(identifier, again, RetryDelay);
 }
 
 bool CoordinatedInstalls::carryOn(std::int64_t coordinator, std::optional<Error>* error) {
   while (!isLeaving()) {
     std::optional<CoordinatorState> state;
-    const bool read = core_.read(
+    const bool read = store_.read(
         [&](SQLite::Database& database) {
           const auto row = findCoordinator(database, coordinator);
           if (row) state = loadState(database, *row);
@@ -145,28 +144,28 @@ bool CoordinatedInstalls::take(Step step, const CoordinatorState& state) {
 void CoordinatedInstalls::removePlaceholder(const std::string& identifier,
                                             const PlaceholderRow& placeholder) {
   if (placeholder.presence == Presence::Forsaken) {
-    core_.registry().cancelRestore(identifier, nullptr);
+    registry_.cancelRestore(identifier, nullptr);
     return;
   }
   if (placeholder.presence != Presence::Adopted) {
     const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
-    core_.registry().uninstallApplication(identifier, options);
+    registry_.uninstallApplication(identifier, options);
     return;
   }
-  core_.device().database.change("an install could not be ended", Database::Commit::Ordinary,
-                                 [&](SQLite::Database& database) {
-                                   endInstall(database, identifier, InstallState::Canceled);
-                                 });
-  core_.device().observers.installsChanged();
+  device_.database.change("an install could not be ended", Database::Commit::Ordinary,
+                          [&](SQLite::Database& database) {
+                            endInstall(database, identifier, InstallState::Canceled);
+                          });
+  device_.observers.installsChanged();
 }
 
 void CoordinatedInstalls::tidyUp(const std::string& identifier) {
   Leftovers left;
-  core_.read([&](SQLite::Database& database) { left = findLeftovers(database, identifier); });
+  store_.read([&](SQLite::Database& database) { left = findLeftovers(database, identifier); });
   for (const PlaceholderRow& placeholder : left.placeholders) {
     removePlaceholder(identifier, placeholder);
     // What cannot be written is found, and tidied up, again.
-    core_.change(
+    store_.change(
         [&](SQLite::Database& database, Consequences&) {
           const bool isAdopted = placeholder.presence == Presence::Adopted;
           if (!isAdopted && findApplication(database, identifier).placeholder) return;
@@ -174,12 +173,12 @@ void CoordinatedInstalls::tidyUp(const std::string& identifier) {
         },
         nullptr);
   }
-  FileManager& files = core_.device().files;
+  FileManager& files = device_.files;
   for (PromiseRow& package : left.packages) {
     if (isFile(files, *package.path)) files.removeItem(*package.path);
     package.path.reset();
-    core_.change([&](SQLite::Database& database, Consequences&) { put(database, package); },
-                 nullptr);
+    store_.change([&](SQLite::Database& database, Consequences&) { put(database, package); },
+                  nullptr);
   }
 }
 
@@ -187,8 +186,8 @@ bool CoordinatedInstalls::change(const CoordinatorState& state,
                                  const std::function<void(SQLite::Database&, Consequences&)>& work,
                                  Database::Commit commit) {
   std::optional<Error> error;
-  if (core_.change(work, &error, commit)) return true;
-  core_.noteTrouble(state.coordinator.number, *error);
+  if (store_.change(work, &error, commit)) return true;
+  store_.noteTrouble(state.coordinator.number, *error);
   return false;
 }
 
@@ -212,11 +211,11 @@ Presence CoordinatedInstalls::note(const CoordinatorState& state, Presence prese
 bool CoordinatedInstalls::installPlaceholder(const CoordinatorState& state) {
   // Noted first, so that whoever cancels meanwhile, or a crash, leaves no placeholder behind.
   const Presence noted = note(state, Presence::Begun);
-  if (noted == Presence::Adopted) core_.device().observers.installsChanged();
+  if (noted == Presence::Adopted) device_.observers.installsChanged();
   if (noted != Presence::Begun) return noted == Presence::Adopted;
   std::optional<Error> error;
   const PlaceholderRow& row = *state.placeholder;
-  if (core_.registry().buildPlaceholder(row.identifier, faceOf(state), detailsOf(row), &error)) {
+  if (registry_.buildPlaceholder(row.identifier, faceOf(state), detailsOf(row), &error)) {
     return note(state, Presence::Installed) != Presence::None;
   }
   finish(state, error);
@@ -225,7 +224,7 @@ bool CoordinatedInstalls::installPlaceholder(const CoordinatorState& state) {
 
 bool CoordinatedInstalls::installPackage(const CoordinatorState& state) {
   const std::string& identifier = state.coordinator.identifier;
-  const Foreground::HoldResult held = core_.device().foreground.hold(identifier);
+  const Foreground::HoldResult held = device_.foreground.hold(identifier);
   if (!held.hold) {
     const std::optional<Error> error =
         held.isRunning ? waitForForeground(state.coordinator) : Error::posix(EIO, identifier);
@@ -237,7 +236,7 @@ bool CoordinatedInstalls::installPackage(const CoordinatorState& state) {
   std::optional<Error> error;
   const FileLocation package{*state.package->path, state.package->pathIsDirectory};
   const bool installed =
-      core_.registry().installPackageWith(package, identifier, detailsOf(state), &error);
+      registry_.installPackageWith(package, identifier, detailsOf(state), &error);
   finish(state, installed ? std::nullopt : error);
   return false;
 }
@@ -276,8 +275,9 @@ void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optio
         commit);
   };
   if (error) {
-    core_.log(fmt::format("The coordinated install of {} failed: {}", state.coordinator.identifier,
-                          error->localizedDescription()));
+    device_.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default,
+                      fmt::format("The coordinated install of {} failed: {}",
+                                  state.coordinator.identifier, error->localizedDescription()));
     // On record before anything is taken away: what is not, is tried again when the device is next
     // opened.
     if (!end(false, Database::Commit::Ordinary)) return;
@@ -310,9 +310,9 @@ std::optional<Error> CoordinatedInstalls::waitForForeground(const CoordinatorRow
     isNew = std::exchange(waiting.coordinator, coordinator.number) != coordinator.number;
     isDue = std::exchange(waiting.lookIsDue, true);
   }
-  if (isNew) core_.device().watcher.assertionDenied(identifier);
+  if (isNew) device_.watcher.assertionDenied(identifier);
   if (!isDue) {
-    core_.workers().add(
+    workers_.add(
         identifier,
         [this, identifier, number = coordinator.number] { lookAgain(identifier, number); },
         ForegroundPoll);

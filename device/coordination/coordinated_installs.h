@@ -5,18 +5,20 @@
 #include <mutex>
 #include <string>
 
-#include "device/coordination/coordination_state.h"
-#include "device/state/database.h"
+#include "device/apps/app_registry.h"
+#include "device/coordination/coordination_store.h"
+#include "device/coordination/keyed_workers.h"
+#include "device/state/device_core.h"
 
 namespace appsync::device {
-
-class CoordinationCore;
 
 /// Does what the service does by itself: installs placeholders and packages, and takes away what
 /// was given up. Each operation is called by one worker of the application at a time.
 class CoordinatedInstalls {
  public:
-  explicit CoordinatedInstalls(CoordinationCore& core) : core_(core) {}
+  CoordinatedInstalls(DeviceCore& device, DeviceAppRegistry& registry, CoordinationStore& store,
+                      KeyedWorkers& workers)
+      : device_(device), registry_(registry), store_(store), workers_(workers) {}
 
   /// Goes on with the application's coordinator as far as it can.
   void advance(const std::string& identifier, std::int64_t coordinator);
@@ -64,7 +66,10 @@ class CoordinatedInstalls {
     bool lookIsDue = false;
   };
 
-  CoordinationCore& core_;
+  DeviceCore& device_;
+  DeviceAppRegistry& registry_;
+  CoordinationStore& store_;
+  KeyedWorkers& workers_;
   std::mutex mutex_;
   // Guarded by mutex_.
   std::map<std::string, Waiting> waiting_;

@@ -39,12 +39,40 @@ void checkPromise(SQLite::Database& database, std::int64_t number, std::int64_t 
   }
 }
 
+/// The row's object, made if nobody holds one.
+template <typename Handle, typename Make>
+std::shared_ptr<Handle> shared(std::map<std::int64_t, std::weak_ptr<Handle>>& handles,
+                               std::int64_t number, const Make& make) {
+  if (const auto found = handles.find(number); found != handles.end()) {
+    if (std::shared_ptr<Handle> held = found->second.lock()) return held;
+  }
+  std::erase_if(handles, [](const auto& item) { return item.second.expired(); });
+  std::shared_ptr<Handle> made = make();
+  handles[number] = made;
+  return made;
+}
+
 }  // namespace
 
-bool ServiceObject::attempt(const std::function<bool(CoordinationCore&)>& use,
+std::shared_ptr<CoordinatorHandle> CoordinationObjects::of(const CoordinatorRow& row) {
+  const std::lock_guard lock(mutex_);
+  auto handle = shared(coordinators_, row.number,
+                       [&] { return std::make_shared<CoordinatorHandle>(gate_, row); });
+  if (!row.isLive()) handle->settle(row);
+  return handle;
+}
+
+std::shared_ptr<PathPromiseHandle> CoordinationObjects::of(const PromiseRow& row) {
+  const std::lock_guard lock(mutex_);
+  return shared(promises_, row.number,
+                [&] { return std::make_shared<PathPromiseHandle>(gate_, row); });
+}
+
+bool ServiceObject::attempt(const std::function<bool(CoordinationStore&)>& use,
                             std::optional<Error>* error) const {
-  const auto done =
-      with(std::optional<bool>(), [&](CoordinationCore& core) { return std::optional(use(core)); });
+  const auto done = with(std::optional<bool>(), [&](CoordinationObjects& service) {
+    return std::optional(use(service.store));
+  });
   if (!done) setError(error, refusedWith(ESHUTDOWN, "the coordination service has ended"));
   return done.value_or(false);
 }
@@ -53,8 +81,8 @@ bool ServiceObject::attempt(const std::function<bool(CoordinationCore&)>& use,
 template <typename Promise>
 void PromiseHandle<Promise>::setPercentComplete(double fraction) noexcept {
   const double percent = fraction > 0 ? std::min(fraction, 1.0) : 0;  // also for what is no number
-  with(false, [&](CoordinationCore& core) {
-    return core.changePromise(
+  with(false, [&](CoordinationObjects& service) {
+    return service.store.changePromise(
         number(), [&](PromiseRow& row) { row.percent = percent; }, nullptr);
   });
 }
@@ -74,10 +102,10 @@ void PathPromiseHandle::setTransferPath(const FileLocation& location) noexcept {
   });
 }
 
-bool PlaceholderHandle::change(const CoordinationCore::PlaceholderChange& change,
+bool PlaceholderHandle::change(const CoordinationStore::PlaceholderChange& change,
                                std::optional<Error>* error) {
   return attempt(
-      [&](CoordinationCore& core) { return core.changePlaceholder(number(), change, error); },
+      [&](CoordinationStore& store) { return store.changePlaceholder(number(), change, error); },
       error);
 }
 
@@ -116,8 +144,8 @@ bool PlaceholderHandle::setConfigurationComplete(std::optional<Error>* error) no
 }
 
 bool PlaceholderHandle::cancel(const Error& reason, CoordinationClientId client) noexcept {
-  return with(false, [&](CoordinationCore& core) {
-    return core.cancelPlaceholder(number(), reason, client);
+  return with(false, [&](CoordinationObjects& service) {
+    return service.store.cancelPlaceholder(number(), reason, client);
   });
 }
 
@@ -132,17 +160,17 @@ std::optional<CoordinatorRow> CoordinatorHandle::find(std::optional<Error>* erro
     if (settled_) return settled_;
   }
   std::optional<CoordinatorRow> row;
-  with(false, [&](CoordinationCore& core) {
-    return core.read([&](SQLite::Database& database) { row = findCoordinator(database, number()); },
-                     error);
+  with(false, [&](CoordinationObjects& service) {
+    return service.store.read(
+        [&](SQLite::Database& database) { row = findCoordinator(database, number()); }, error);
   });
   return row;
 }
 
-bool CoordinatorHandle::change(const CoordinationCore::CoordinatorChange& change,
+bool CoordinatorHandle::change(const CoordinationStore::CoordinatorChange& change,
                                std::optional<Error>* error) {
   return attempt(
-      [&](CoordinationCore& core) { return core.changeCoordinator(number(), change, error); },
+      [&](CoordinationStore& store) { return store.changeCoordinator(number(), change, error); },
       error);
 }
 
@@ -152,7 +180,7 @@ std::optional<Error> CoordinatorHandle::error() const {
   if (!found) return failure;
   if (!found->error && found->isLive()) {
     return with(std::optional<Error>(),
-                [&](CoordinationCore& core) { return core.trouble(number()); });
+                [&](CoordinationObjects& service) { return service.store.trouble(number()); });
   }
   if (!found->error) return std::nullopt;
   // One that cannot be read is an error all the same.
@@ -160,8 +188,8 @@ std::optional<Error> CoordinatorHandle::error() const {
 }
 
 void CoordinatorHandle::setObserver(CoordinatorObserver* observer) noexcept {
-  with(false, [&](CoordinationCore& core) {
-    core.events().setObserver(number(), observer);
+  with(false, [&](CoordinationObjects& service) {
+    service.events.setObserver(number(), observer);
     return true;
   });
 }
@@ -191,15 +219,15 @@ bool CoordinatorHandle::setInitialQPKAssetPromises(
 std::shared_ptr<PathTransferPromise> CoordinatorHandle::appAssetPromise(
     std::optional<Error>* error) noexcept {
   using Promise = std::shared_ptr<PathTransferPromise>;
-  return with(Promise(), [&](CoordinationCore& core) -> Promise {
+  return with(Promise(), [&](CoordinationObjects& service) -> Promise {
     std::optional<PromiseRow> promise;
-    core.read(
+    service.store.read(
         [&](SQLite::Database& database) {
           const auto row = findCoordinator(database, number());
           if (row) promise = findPromise(database, row->package);
         },
         error);
-    return promise ? core.handleOf(*promise) : nullptr;
+    return promise ? service.of(*promise) : nullptr;
   });
 }
 
@@ -259,8 +287,8 @@ bool CoordinatorHandle::setPlaceholderPromise(
 }
 
 bool CoordinatorHandle::cancel(const Error& reason, CoordinationClientId client) noexcept {
-  return with(false, [&](CoordinationCore& core) {
-    return core.cancelCoordinator(number(), reason, client);
+  return with(false, [&](CoordinationObjects& service) {
+    return service.store.cancelCoordinator(number(), reason, client);
   });
 }
 

@@ -1,8 +1,59 @@
 #pragma once
 
-#include "device/coordination/coordination_core.h"
+#include <shared_mutex>
+
+#include "device/coordination/coordination_store.h"
+#include "device/coordination/event_delivery.h"
 
 namespace appsync::device {
+
+class CoordinationObjects;
+class CoordinatorHandle;
+class PathPromiseHandle;
+
+/// The way to a service that may be gone. Whoever holds it may outlive the service.
+class CoordinationGate {
+ public:
+  explicit CoordinationGate(CoordinationObjects& objects) : objects_(&objects) {}
+
+  /// Gives `otherwise` when the service is gone; else it stays until `use` has returned.
+  template <typename Result, typename Use>
+  Result with(Result otherwise, const Use& use) {
+    const std::shared_lock lock(mutex_);
+    return objects_ ? Result(use(*objects_)) : otherwise;
+  }
+  /// Waits for those who use the service.
+  void close() {
+    const std::unique_lock lock(mutex_);
+    objects_ = nullptr;
+  }
+
+ private:
+  std::shared_mutex mutex_;
+  CoordinationObjects* objects_;
+};
+
+/// Gives out the objects of the service, which are thin: they hold a row's number. Thread-safe.
+class CoordinationObjects {
+ public:
+  CoordinationObjects(CoordinationStore& ofRows, EventDelivery& ofEvents)
+      : store(ofRows), events(ofEvents) {}
+
+  // The one object for a row as long as somebody holds it.
+  std::shared_ptr<CoordinatorHandle> of(const CoordinatorRow& row);
+  std::shared_ptr<PathPromiseHandle> of(const PromiseRow& row);
+  const std::shared_ptr<CoordinationGate>& gate() const { return gate_; }
+
+  CoordinationStore& store;
+  EventDelivery& events;
+
+ private:
+  const std::shared_ptr<CoordinationGate> gate_ = std::make_shared<CoordinationGate>(*this);
+  std::mutex mutex_;
+  // Guarded by mutex_.
+  std::map<std::int64_t, std::weak_ptr<CoordinatorHandle>> coordinators_;
+  std::map<std::int64_t, std::weak_ptr<PathPromiseHandle>> promises_;
+};
 
 /// What every object of the service has. It stays usable when the service is gone.
 class ServiceObject {
@@ -23,7 +74,7 @@ class ServiceObject {
     return gate_->with(std::move(otherwise), use);
   }
   /// False with an error when the service is gone, else what `use` gives.
-  bool attempt(const std::function<bool(CoordinationCore&)>& use,
+  bool attempt(const std::function<bool(CoordinationStore&)>& use,
                std::optional<Error>* error) const;
 
  private:
@@ -48,8 +99,9 @@ class PromiseHandle : public Promise, public ServiceObject {
     fulfil([&](PromiseRow& row) { row.complete = complete; });
   }
   void cancel(const Error& reason, CoordinationClientId client) noexcept override {
-    with(false,
-         [&](CoordinationCore& core) { return core.cancelPromise(number(), reason, client); });
+    with(false, [&](CoordinationObjects& service) {
+      return service.store.cancelPromise(number(), reason, client);
+    });
   }
   std::string description() const override { return "<Promise " + name_ + ">"; }
 
@@ -60,16 +112,19 @@ class PromiseHandle : public Promise, public ServiceObject {
 
  protected:
   PromiseRow row() const {
-    return with(PromiseRow(), [&](CoordinationCore& core) {
-      return core.promise(number()).value_or(PromiseRow());
+    std::optional<PromiseRow> row;
+    with(false, [&](CoordinationObjects& service) {
+      return service.store.read(
+          [&](SQLite::Database& database) { row = findPromise(database, number()); });
     });
+    return row.value_or(PromiseRow());
   }
   /// For what its coordinator cannot do without.
-  void fulfil(const CoordinationCore::PromiseChange& change) {
-    with(false, [&](CoordinationCore& core) {
+  void fulfil(const CoordinationStore::PromiseChange& change) {
+    with(false, [&](CoordinationObjects& service) {
       std::optional<Error> error;
-      const bool done = core.changePromise(number(), change, &error);
-      if (!done) core.noteTroubleWithPromise(number(), *error);
+      const bool done = service.store.changePromise(number(), change, &error);
+      if (!done) service.store.noteTroubleWithPromise(number(), *error);
       const std::lock_guard lock(mutex_);
       if (!done) trouble_ = error;
       return done;
@@ -108,7 +163,7 @@ class PlaceholderHandle final : public InstallPlaceholder, public ServiceObject 
   std::string description() const override { return "<Placeholder " + identifier_ + ">"; }
 
  private:
-  bool change(const CoordinationCore::PlaceholderChange& change, std::optional<Error>* error);
+  bool change(const CoordinationStore::PlaceholderChange& change, std::optional<Error>* error);
 
   const std::string identifier_;
 };
@@ -158,7 +213,7 @@ class CoordinatorHandle final : public InstallCoordinator, public ServiceObject 
   /// nullopt when there is none any more, or when it cannot be read (then with an error).
   std::optional<CoordinatorRow> find(std::optional<Error>* error) const;
   CoordinatorRow row() const { return find(nullptr).value_or(CoordinatorRow()); }
-  bool change(const CoordinationCore::CoordinatorChange& change, std::optional<Error>* error);
+  bool change(const CoordinationStore::CoordinatorChange& change, std::optional<Error>* error);
 
   const std::string identifier_;
   const CoordinationClientId creator_;

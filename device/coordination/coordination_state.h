@@ -32,6 +32,7 @@ Step nextStep(const CoordinatorState& state);
 struct Consequences {
   std::map<std::string, std::int64_t> ready;  ///< applications with a next step; coordinators
   std::set<std::string> over;                 ///< applications with something to tidy up
+  std::map<std::string, double> progress;  ///< how far applications' packages have come: 1.0 is all
   bool events = false;
 };
 

@@ -5,22 +5,26 @@
 #include <algorithm>
 #include <cerrno>
 
-#include "base/identifiers.h"
+#include "device/apps/installs.h"
 #include "device/apps/removal.h"
-#include "device/coordination/coordination_handles.h"
+#include "base/identifiers.h"
+#include "device/coordination/coordination_recovery.h"
 #include "device/state/application_rows.h"
 #include "platform/existence.h"
 
 namespace appsync::device {
 namespace {
 
+constexpr std::size_t InstallsAtOnce = 4;
+constexpr std::int64_t ProgressUnits = 1000;
+
 class Listener final : public CoordinatorEventListener {
  public:
   Listener(std::shared_ptr<CoordinationGate> gate, std::uint64_t number)
       : gate_(std::move(gate)), number_(number) {}
   ~Listener() override {
-    gate_->with(false, [&](CoordinationCore& core) {
-      core.events().removeListener(number_);
+    gate_->with(false, [&](CoordinationObjects& service) {
+      service.events.removeListener(number_);
       return true;
     });
   }
@@ -52,8 +56,49 @@ std::optional<std::string> objectionTo(SQLite::Database& database, const Coordin
 
 DeviceInstallCoordination::DeviceInstallCoordination(DeviceCore& device,
                                                      DeviceAppRegistry& registry)
-    : core_(device, registry) {
-  core_.start();
+    : device_(device), workers_(InstallsAtOnce), installs_(device, registry, store_, workers_) {
+  const std::optional<Consequences> left = repairCoordination(device);
+  if (left) {
+    for (const std::string& identifier : left->over) installs_.tidyUp(identifier);
+    sweepCoordination(device);
+  }
+  events_.start();
+  if (left) follow({left->ready, {}, {}, true});
+}
+
+DeviceInstallCoordination::~DeviceInstallCoordination() {
+  installs_.leaveWaiting();
+  workers_.stop();
+  events_.stop();
+  objects_.gate()->close();
+}
+
+void DeviceInstallCoordination::hurry() noexcept {
+  installs_.hurry();
+  workers_.expedite();
+}
+
+void DeviceInstallCoordination::follow(const Consequences& consequences) {
+  for (const std::string& identifier : consequences.over) {
+    workers_.exclusively(identifier, [&] { installs_.tidyUp(identifier); });
+  }
+  for (const auto& [identifier, coordinator] : consequences.ready) {
+    workers_.add(identifier,
+                 [this, id = identifier, number = coordinator] { installs_.advance(id, number); });
+  }
+  if (consequences.events) events_.check();
+  for (const auto& [identifier, fraction] : consequences.progress) {
+    showProgress(identifier, fraction);
+  }
+}
+
+/// People who look at the device see how far the package has come.
+void DeviceInstallCoordination::showProgress(std::string_view identifier, double fraction) {
+  const auto progress = currentProgress(device_.database, device_.observers, identifier);
+  if (!progress) return;
+  progress->setInstallState(InstallState::Active);
+  progress->setTotalUnitCount(ProgressUnits);
+  progress->setCompletedUnitCount(static_cast<std::int64_t>(fraction * ProgressUnits));
 }
 
 std::shared_ptr<InstallCoordinator> DeviceInstallCoordination::coordinatorFor(
@@ -67,12 +112,13 @@ std::shared_ptr<InstallCoordinator> DeviceInstallCoordination::coordinatorFor(
   }
   std::optional<CoordinatorRow> found;
   if (!create) {
-    core_.read([&](SQLite::Database& database) { found = findLiveCoordinator(database, bundleId); },
-               error);
-    return found ? core_.handleOf(*found) : nullptr;
+    store_.read(
+        [&](SQLite::Database& database) { found = findLiveCoordinator(database, bundleId); },
+        error);
+    return found ? objects_.of(*found) : nullptr;
   }
   bool made = false;
-  const bool changed = core_.change(
+  const bool changed = store_.change(
       [&](SQLite::Database& database, Consequences& consequences) {
         found = findLiveCoordinator(database, bundleId);
         if (found && endedFor(database, *found, kind, client, consequences)) found.reset();
@@ -87,14 +133,14 @@ std::shared_ptr<InstallCoordinator> DeviceInstallCoordination::coordinatorFor(
       error);
   if (!changed) return nullptr;
   if (created) *created = made;
-  return core_.handleOf(*found);
+  return objects_.of(*found);
 }
 
 bool DeviceInstallCoordination::endedFor(SQLite::Database& database, const CoordinatorRow& live,
                                          CoordinatorKind kind, CoordinationClientId client,
                                          Consequences& consequences) {
   std::optional<std::string> why = objectionTo(database, live, kind);
-  if (const auto trouble = core_.trouble(live.number); !why && trouble) {
+  if (const auto trouble = store_.trouble(live.number); !why && trouble) {
     why = trouble->localizedDescription();
   }
   if (!why) return false;
@@ -109,12 +155,12 @@ bool DeviceInstallCoordination::endedFor(SQLite::Database& database, const Coord
 }
 
 void DeviceInstallCoordination::removeObserver(CoordinatorObserver* observer) noexcept {
-  core_.events().removeObserver(observer);
+  events_.removeObserver(observer);
 }
 
 std::int64_t DeviceInstallCoordination::enterPromise(PromiseRow& row) {
-  const bool entered =
-      core_.change([&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
+  const bool entered = store_.change(
+      [&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
   return entered ? row.number : 0;
 }
 
@@ -129,7 +175,7 @@ std::shared_ptr<PathTransferPromise> DeviceInstallCoordination::createPathTransf
     row.path = transferPath->path;
     row.pathIsDirectory = transferPath->isDirectory;
   }
-  return enterPromise(row) ? core_.handleOf(row) : nullptr;
+  return enterPromise(row) ? objects_.of(row) : nullptr;
 }
 
 std::shared_ptr<OutOfBandTransferPromise> DeviceInstallCoordination::createOutOfBandTransferPromise(
@@ -139,7 +185,8 @@ std::shared_ptr<OutOfBandTransferPromise> DeviceInstallCoordination::createOutOf
   row.name = name;
   row.client = client;
   row.diskSpace = diskSpaceNeeded;
-  return enterPromise(row) ? std::make_shared<OutOfBandPromiseHandle>(core_.gate(), row) : nullptr;
+  return enterPromise(row) ? std::make_shared<OutOfBandPromiseHandle>(objects_.gate(), row)
+                           : nullptr;
 }
 
 std::shared_ptr<InstallPlaceholder> DeviceInstallCoordination::createAppPlaceholder(
@@ -151,16 +198,16 @@ std::shared_ptr<InstallPlaceholder> DeviceInstallCoordination::createAppPlacehol
   row.name = appName;
   row.installType = installType;
   row.client = client;
-  const bool entered =
-      core_.change([&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
-  return entered ? std::make_shared<PlaceholderHandle>(core_.gate(), row) : nullptr;
+  const bool entered = store_.change(
+      [&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
+  return entered ? std::make_shared<PlaceholderHandle>(objects_.gate(), row) : nullptr;
 }
 
 void DeviceInstallCoordination::uninstallApp(
     std::string_view bundleId, bool,
     std::function<void(const std::optional<Error>&)> completion) noexcept {
   if (!isUsableIdentifier(bundleId)) {
-    core_.events().post([completion = std::move(completion)] { completion(unusable()); });
+    events_.post([completion = std::move(completion)] { completion(unusable()); });
     return;
   }
   const auto work = [this, identifier = std::string(bundleId), completion = std::move(completion)] {
@@ -168,20 +215,20 @@ void DeviceInstallCoordination::uninstallApp(
                                                 fmt::format("{} was uninstalled", identifier));
     std::optional<Error> error;
     ApplicationRows present;
-    bool going = core_.read(
+    bool going = store_.read(
         [&](SQLite::Database& database) { present = findApplication(database, identifier); },
         &error);
     const auto remove = [&] {
-      const KeyedMutex::Guard guard(core_.device().applicationLocks, identifier);
+      const KeyedMutex::Guard guard(device_.applicationLocks, identifier);
       // What a coordinator brought goes with it; an installed version below it stays.
       const bool placeholderOnly = present.installed && present.placeholder;
-      return removeForClient(core_.device(), identifier, placeholderOnly, &error);
+      return removeForClient(device_, identifier, placeholderOnly, &error);
     };
     // A placeholder that is all that is left takes its data along, if its install is not over yet.
     const bool isAlone = present.placeholder && !present.installed;
     if (going && isAlone) going = remove();
     bool ended = false;
-    going = going && core_.change(
+    going = going && store_.change(
                          [&](SQLite::Database& database, Consequences& consequences) {
                            const auto live = findLiveCoordinator(database, identifier);
                            ended = live &&
@@ -190,9 +237,9 @@ void DeviceInstallCoordination::uninstallApp(
                          &error);
     if (going && !isAlone) remove();
     if (ended && isMissing(error)) error.reset();
-    core_.events().post([completion, error] { completion(error); });
+    events_.post([completion, error] { completion(error); });
   };
-  core_.workers().add(bundleId, work);
+  workers_.add(bundleId, work);
 }
 
 Error DeviceInstallCoordination::createUserPresentableError(
@@ -208,12 +255,12 @@ Error DeviceInstallCoordination::createUserPresentableError(
 std::unique_ptr<CoordinatorEventListener> DeviceInstallCoordination::createEventListener(
     std::string_view, const std::set<CoordinationClientId>& clients,
     CoordinatorObserver& delegate) noexcept {
-  return std::make_unique<Listener>(core_.gate(), core_.events().addListener(clients, delegate));
+  return std::make_unique<Listener>(objects_.gate(), events_.addListener(clients, delegate));
 }
 
 bool DeviceInstallCoordination::tap(std::string_view bundleId) noexcept {
   bool live = false;
-  const bool noted = core_.change(
+  const bool noted = store_.change(
       [&](SQLite::Database& database, Consequences& consequences) {
         const auto row = findLiveCoordinator(database, bundleId);
         live = row.has_value();
@@ -227,22 +274,22 @@ bool DeviceInstallCoordination::tap(std::string_view bundleId) noexcept {
 
 bool DeviceInstallCoordination::cancelInstall(std::string_view bundleId) noexcept {
   std::optional<CoordinatorRow> live;
-  core_.read([&](SQLite::Database& database) { live = findLiveCoordinator(database, bundleId); });
+  store_.read([&](SQLite::Database& database) { live = findLiveCoordinator(database, bundleId); });
   if (!live) return false;
   const Error reason =
       Error::withDescription(POSIXErrorDomain, ECANCELED,
                              fmt::format("the install of {} was cancelled on the phone", bundleId));
-  return core_.cancelCoordinator(live->number, reason, PersonClientID);
+  return store_.cancelCoordinator(live->number, reason, PersonClientID);
 }
 
 bool DeviceInstallCoordination::isBusy(std::string_view bundleId) noexcept {
-  return core_.workers().isBusy(bundleId) || core_.events().isBusy(bundleId);
+  return workers_.isBusy(bundleId) || events_.isBusy(bundleId);
 }
 
 std::vector<std::string> DeviceInstallCoordination::packagesOwedBy(
     CoordinationClientId client) noexcept {
   std::vector<std::string> identifiers;
-  core_.read([&](SQLite::Database& database) {
+  store_.read([&](SQLite::Database& database) {
     for (const CoordinatorRow& row : allCoordinators(database)) {
       if (!row.isLive() || row.responsible != client) continue;
       const auto package = findPromise(database, row.package);

@@ -3,7 +3,8 @@
 #include <string>
 #include <vector>
 
-#include "device/coordination/coordination_core.h"
+#include "device/coordination/coordinated_installs.h"
+#include "device/coordination/coordination_handles.h"
 #include "platform/install_coordination.h"
 
 namespace appsync::device {
@@ -29,6 +30,8 @@ class DeviceInstallCoordination final : public InstallCoordination {
  public:
   /// Carries on what was left from before.
   DeviceInstallCoordination(DeviceCore& device, DeviceAppRegistry& registry);
+  /// Lets a running install end; what waits is carried on when the device is next opened.
+  ~DeviceInstallCoordination() override;
 
   bool coordinationIsEnabled() noexcept override { return true; }
   /// With `createIfNotExisting`, this client's live coordinator that cannot go on makes room.
@@ -70,9 +73,12 @@ class DeviceInstallCoordination final : public InstallCoordination {
   /// The applications whose package this client was named to bring and has not brought, sorted.
   std::vector<std::string> packagesOwedBy(CoordinationClientId client) noexcept;
   /// Installs that wait for an application to be closed fail, now and from now on.
-  void hurry() noexcept { core_.hurry(); }
+  void hurry() noexcept;
 
  private:
+  /// Does what follows from a change.
+  void follow(const Consequences& consequences);
+  void showProgress(std::string_view identifier, double fraction);
   /// Ends a live coordinator that nobody is served by going on with, if it is this client's. Throws
   /// Refused when one that does not serve cannot be ended.
   bool endedFor(SQLite::Database& database, const CoordinatorRow& live, CoordinatorKind kind,
@@ -80,7 +86,14 @@ class DeviceInstallCoordination final : public InstallCoordination {
   /// The row's number; 0 when it could not be entered.
   std::int64_t enterPromise(PromiseRow& row);
 
-  CoordinationCore core_;
+  // In the order in which they need one another.
+  DeviceCore& device_;
+  CoordinationStore store_{device_.database,
+                           [this](const auto& consequences) { follow(consequences); }};
+  EventDelivery events_{device_.database, [this](const auto& row) { return objects_.of(row); }};
+  CoordinationObjects objects_{store_, events_};
+  KeyedWorkers workers_;
+  CoordinatedInstalls installs_;
 };
 
 }  // namespace appsync::device
