@@ -256,68 +256,63 @@ CoordinatedInstalls::Beginning CoordinatedInstalls::begin(const CoordinatorState
 }
 
 void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optional<Error>& error) {
-  PlaceholderRow left = *state.placeholder;
-  const auto end = [&](bool isOver, Database::Commit commit) {
-    return change(
-        state,
-        [&](SQLite::Database& database, Consequences& consequences) {
-          auto row = findCoordinator(database, state.coordinator.number);
-          if (!row || !row->isLive()) return;
-          if (isOver) return complete(database, *row, error, consequences);
-          row->error = bytesOf(*error);
-          put(database, *row);
-          // The installer tells of its own failures.
-          if (row->stage == Stage::Waiting) enterInHistory(database, failureOf(state, *error));
-          if (waitsOn(database, state.coordinator, *state.placeholder))
-            left.presence = Presence::Adopted;
-          setPresence(database, left, left.presence);
-        },
-        commit);
-  };
-  if (error) {
-    device_.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default,
-                      fmt::format("The coordinated install of {} failed: {}",
-                                  state.coordinator.identifier, error->localizedDescription()));
-    // On record before anything is taken away: what is not, is tried again when the device is next
-    // opened.
-    if (!end(false, Database::Commit::Ordinary)) return;
-    // Before anybody hears of it, so that whoever does finds the phone as it is to stay.
-    if (left.presence != Presence::None) removePlaceholder(state.coordinator.identifier, left);
+  if (error && !fail(state, *error)) return;
+  change(
+      state,
+      [&](SQLite::Database& database, Consequences& consequences) {
+        const auto row = findCoordinator(database, state.coordinator.number);
+        if (row) complete(database, *row, error, consequences);
+      },
+      Database::Commit::OnDisk);
+}
+
+bool CoordinatedInstalls::fail(const CoordinatorState& state, const Error& error) {
+  const std::string& identifier = state.coordinator.identifier;
+  device_.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default,
+                    fmt::format("The coordinated install of {} failed: {}", identifier,
+                                error.localizedDescription()));
+  PlaceholderRow left;
+  // On record before anything is taken away: what is not, is tried again when the device is next
+  // opened.
+  const bool noted = change(state, [&](SQLite::Database& database, Consequences&) {
+    auto row = findCoordinator(database, state.coordinator.number);
+    if (!row || !row->isLive()) return;
+    row->error = bytesOf(error);
+    put(database, *row);
+    // The installer tells of its own failures.
+    if (row->stage == Stage::Waiting) enterInHistory(database, failureOf(state, error));
+    left = *state.placeholder;
+    if (waitsOn(database, *row, left)) left.presence = Presence::Adopted;
+    put(database, left);
+  });
+  if (noted && left.presence != Presence::None) removePlaceholder(identifier, left);
+  return noted;
+}
+
+std::optional<Error> CoordinatedInstalls::waitForForeground(const CoordinatorRow& coordinator) {
+  const std::string& identifier = coordinator.identifier;
+  const std::int64_t number = coordinator.number;
+  std::unique_lock lock(mutex_);
+  if (hurried_) return inForeground(identifier);
+  const bool isTold = std::exchange(told_[identifier], number) == number;
+  const bool isLookDue = !looks_.insert(identifier).second;
+  lock.unlock();
+  if (!isTold) device_.watcher.assertionDenied(identifier);
+  if (!isLookDue) {
+    workers_.add(
+        identifier, [this, identifier, number] { lookAgain(identifier, number); }, ForegroundPoll);
   }
-  end(true, Database::Commit::OnDisk);
+  return std::nullopt;
 }
 
 void CoordinatedInstalls::lookAgain(const std::string& identifier, std::int64_t coordinator) {
   {
     const std::lock_guard lock(mutex_);
-    waiting_[identifier].lookIsDue = false;
+    looks_.erase(identifier);
   }
   advance(identifier, coordinator);
   const std::lock_guard lock(mutex_);
-  if (const auto place = waiting_.find(identifier); place != waiting_.end()) {
-    if (!place->second.lookIsDue) waiting_.erase(place);
-  }
-}
-
-std::optional<Error> CoordinatedInstalls::waitForForeground(const CoordinatorRow& coordinator) {
-  const std::string& identifier = coordinator.identifier;
-  bool isNew = false;
-  bool isDue = false;
-  {
-    const std::lock_guard lock(mutex_);
-    if (hurried_) return inForeground(identifier);
-    Waiting& waiting = waiting_[identifier];
-    isNew = std::exchange(waiting.coordinator, coordinator.number) != coordinator.number;
-    isDue = std::exchange(waiting.lookIsDue, true);
-  }
-  if (isNew) device_.watcher.assertionDenied(identifier);
-  if (!isDue) {
-    workers_.add(
-        identifier,
-        [this, identifier, number = coordinator.number] { lookAgain(identifier, number); },
-        ForegroundPoll);
-  }
-  return std::nullopt;
+  if (!looks_.contains(identifier)) told_.erase(identifier);
 }
 
 }  // namespace appsync::device

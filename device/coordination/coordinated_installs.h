@@ -3,6 +3,7 @@
 #include <functional>
 #include <map>
 #include <mutex>
+#include <set>
 #include <string>
 
 #include "device/apps/app_registry.h"
@@ -51,6 +52,9 @@ class CoordinatedInstalls {
   /// Marks the package as being installed, unless the coordinator is not ready any more.
   Beginning begin(const CoordinatorState& state);
   void finish(const CoordinatorState& state, const std::optional<Error>& error);
+  /// Puts the failure on record and takes the placeholder away, before anybody hears of it, so that
+  /// whoever does finds the phone as it is to stay. False when it cannot be recorded.
+  bool fail(const CoordinatorState& state, const Error& error);
   /// Takes away what the placeholder has in the registry, as a person does if it was forsaken; the
   /// registry stays as it was where it was only adopted.
   void removePlaceholder(const std::string& identifier, const PlaceholderRow& placeholder);
@@ -60,19 +64,14 @@ class CoordinatedInstalls {
   void lookAgain(const std::string& identifier, std::int64_t coordinator);
   bool isLeaving();
 
-  /// An application in the foreground.
-  struct Waiting {
-    std::int64_t coordinator = 0;
-    bool lookIsDue = false;
-  };
-
   DeviceCore& device_;
   DeviceAppRegistry& registry_;
   CoordinationStore& store_;
   KeyedWorkers& workers_;
   std::mutex mutex_;
   // Guarded by mutex_.
-  std::map<std::string, Waiting> waiting_;
+  std::map<std::string, std::int64_t> told_;  ///< coordinators of which people know that they wait
+  std::set<std::string> looks_;               ///< applications that are to be looked at again
   bool hurried_ = false;
   bool leaving_ = false;
 };

@@ -135,6 +135,47 @@ class Repair {
   std::vector<std::string>& notes_;
 };
 
+// Of those that are over, the ones with nothing to be told and nothing to tidy up.
+constexpr const char* CoordinatorsOver = R"(
+DELETE FROM install_coordinators WHERE stage NOT IN (0, 1)
+  AND number NOT IN (SELECT coordinator FROM coordinator_events)
+  AND number NOT IN (SELECT c.number FROM install_coordinators c
+    JOIN install_placeholders p ON p.number = c.placeholder
+    WHERE c.error IS NOT NULL AND p.presence <> 0)
+  AND number NOT IN (SELECT c.number FROM install_coordinators c
+    JOIN data_promises p ON p.number = c.package_promise
+    WHERE p.complete AND p.path IS NOT NULL)
+)";
+
+constexpr const char* PlaceholdersOfNobody = R"(
+DELETE FROM install_placeholders WHERE number NOT IN
+  (SELECT placeholder FROM install_coordinators WHERE placeholder IS NOT NULL)
+)";
+
+// The initial promises' numbers are in a property list; those that are over are not needed.
+constexpr const char* PromisesOfNobody = R"(
+DELETE FROM data_promises WHERE number NOT IN
+  (SELECT package_promise FROM install_coordinators WHERE package_promise IS NOT NULL)
+  AND (over OR number NOT IN
+    (SELECT user_data_promise FROM install_coordinators WHERE user_data_promise IS NOT NULL
+    UNION SELECT icon_promise FROM install_placeholders WHERE icon_promise IS NOT NULL))
+)";
+
+/// How many were too old to be kept.
+int sweepEvents(SQLite::Database& database) {
+  // A cancellation is for the process that was sending the package, which is gone.
+  Query(database,
+        "DELETE FROM coordinator_events WHERE kind NOT BETWEEN ?1 AND ?2 OR "
+        "coordinator NOT IN (SELECT number FROM install_coordinators)",
+        EventKind::PromiseBegan, EventKind::Prioritize)
+      .run();
+  return Query(database,
+               "DELETE FROM coordinator_events WHERE number <= "
+               "(SELECT max(number) FROM coordinator_events) - ?1",
+               EventsKept)
+      .run();
+}
+
 }  // namespace
 
 std::optional<Consequences> repairCoordination(DeviceCore& device) {
@@ -156,45 +197,13 @@ std::optional<Consequences> repairCoordination(DeviceCore& device) {
 
 void sweepCoordination(DeviceCore& device) {
   int forgotten = 0;
-  device.database.change(
-      "what install coordinators left could not be swept", Database::Commit::Ordinary,
-      [&](SQLite::Database& database) {
-        // A cancellation is for the process that was sending the package, which is gone.
-        Query(database,
-              "DELETE FROM coordinator_events WHERE kind NOT BETWEEN ?1 AND ?2 OR "
-              "coordinator NOT IN (SELECT number FROM install_coordinators)",
-              EventKind::PromiseBegan, EventKind::Prioritize)
-            .run();
-        forgotten = Query(database,
-                          "DELETE FROM coordinator_events WHERE number <= "
-                          "(SELECT max(number) FROM coordinator_events) - ?1",
-                          EventsKept)
-                        .run();
-        Query(database,
-              "DELETE FROM install_coordinators WHERE stage NOT IN (0, 1) "
-              "AND number NOT IN (SELECT coordinator FROM coordinator_events) "
-              "AND number NOT IN (SELECT c.number FROM install_coordinators c "
-              "JOIN install_placeholders p ON p.number = c.placeholder "
-              "WHERE c.error IS NOT NULL AND p.presence <> 0) "
-              "AND number NOT IN (SELECT c.number FROM install_coordinators c "
-              "JOIN data_promises p ON p.number = c.package_promise "
-              "WHERE p.complete AND p.path IS NOT NULL)")
-            .run();
-        Query(database,
-              "DELETE FROM install_placeholders WHERE number NOT IN (SELECT placeholder "
-              "FROM install_coordinators WHERE placeholder IS NOT NULL)")
-            .run();
-        // The initial promises' numbers are in a property list; those that are over are not needed.
-        Query(database,
-              "DELETE FROM data_promises WHERE number NOT IN (SELECT package_promise "
-              "FROM install_coordinators WHERE package_promise IS NOT NULL) "
-              "AND (over OR number NOT IN ("
-              "SELECT user_data_promise FROM install_coordinators "
-              "WHERE user_data_promise IS NOT NULL "
-              "UNION SELECT icon_promise FROM install_placeholders "
-              "WHERE icon_promise IS NOT NULL))")
-            .run();
-      });
+  device.database.change("what install coordinators left could not be swept",
+                         Database::Commit::Ordinary, [&](SQLite::Database& database) {
+                           forgotten = sweepEvents(database);
+                           database.exec(CoordinatorsOver);
+                           database.exec(PlaceholdersOfNobody);
+                           database.exec(PromisesOfNobody);
+                         });
   if (forgotten == 0) return;
   device.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default,
                    fmt::format("{} events of install coordinators that nobody came to hear are "

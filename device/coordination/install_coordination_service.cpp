@@ -206,40 +206,39 @@ std::shared_ptr<InstallPlaceholder> DeviceInstallCoordination::createAppPlacehol
 void DeviceInstallCoordination::uninstallApp(
     std::string_view bundleId, bool,
     std::function<void(const std::optional<Error>&)> completion) noexcept {
-  if (!isUsableIdentifier(bundleId)) {
-    events_.post([completion = std::move(completion)] { completion(unusable()); });
-    return;
-  }
-  const auto work = [this, identifier = std::string(bundleId), completion = std::move(completion)] {
-    const Error reason = Error::withDescription(POSIXErrorDomain, ECANCELED,
-                                                fmt::format("{} was uninstalled", identifier));
-    std::optional<Error> error;
-    ApplicationRows present;
-    bool going = store_.read(
-        [&](SQLite::Database& database) { present = findApplication(database, identifier); },
-        &error);
-    const auto remove = [&] {
-      const KeyedMutex::Guard guard(device_.applicationLocks, identifier);
-      // What a coordinator brought goes with it; an installed version below it stays.
-      const bool placeholderOnly = present.installed && present.placeholder;
-      return removeForClient(device_, identifier, placeholderOnly, &error);
-    };
-    // A placeholder that is all that is left takes its data along, if its install is not over yet.
-    const bool isAlone = present.placeholder && !present.installed;
-    if (going && isAlone) going = remove();
-    bool ended = false;
-    going = going && store_.change(
-                         [&](SQLite::Database& database, Consequences& consequences) {
-                           const auto live = findLiveCoordinator(database, identifier);
-                           ended = live &&
-                                   cancel(database, *live, reason, DeviceClientID, consequences);
-                         },
-                         &error);
-    if (going && !isAlone) remove();
-    if (ended && isMissing(error)) error.reset();
+  const auto tell = [this, completion = std::move(completion)](const std::optional<Error>& error) {
     events_.post([completion, error] { completion(error); });
   };
-  workers_.add(bundleId, work);
+  if (!isUsableIdentifier(bundleId)) return tell(unusable());
+  workers_.add(bundleId, [this, id = std::string(bundleId), tell] { tell(uninstall(id)); });
+}
+
+std::optional<Error> DeviceInstallCoordination::uninstall(const std::string& identifier) {
+  std::optional<Error> error;
+  ApplicationRows present;
+  const auto look = [&](SQLite::Database& database) {
+    present = findApplication(database, identifier);
+  };
+  if (!store_.read(look, &error)) return error;
+  const auto remove = [&] {
+    const KeyedMutex::Guard guard(device_.applicationLocks, identifier);
+    // What a coordinator brought goes with it; an installed version below it stays.
+    const bool placeholderOnly = present.installed && present.placeholder;
+    return removeForClient(device_, identifier, placeholderOnly, &error);
+  };
+  // A placeholder that is all that is left takes its data along, if its install is not over yet.
+  const bool isAlone = present.placeholder && !present.installed;
+  if (isAlone && !remove()) return error;
+  const Error reason = Error::withDescription(POSIXErrorDomain, ECANCELED,
+                                              fmt::format("{} was uninstalled", identifier));
+  bool ended = false;
+  const auto end = [&](SQLite::Database& database, Consequences& consequences) {
+    const auto live = findLiveCoordinator(database, identifier);
+    ended = live && cancel(database, *live, reason, DeviceClientID, consequences);
+  };
+  if (!store_.change(end, &error)) return error;
+  if (!isAlone) remove();
+  return ended && isMissing(error) ? std::nullopt : error;
 }
 
 Error DeviceInstallCoordination::createUserPresentableError(

@@ -79,6 +79,8 @@ class DeviceInstallCoordination final : public InstallCoordination {
   /// Does what follows from a change.
   void follow(const Consequences& consequences);
   void showProgress(std::string_view identifier, double fraction);
+  /// Why it could not be uninstalled.
+  std::optional<Error> uninstall(const std::string& identifier);
   /// Ends a live coordinator that nobody is served by going on with, if it is this client's. Throws
   /// Refused when one that does not serve cannot be ended.
   bool endedFor(SQLite::Database& database, const CoordinatorRow& live, CoordinatorKind kind,
