@@ -8,8 +8,8 @@
 
 #include "device/apps/app_registry.h"
 #include "device/coordination/coordination_store.h"
-#include "device/coordination/keyed_workers.h"
 #include "device/state/device_core.h"
+#include "device/state/keyed_workers.h"
 
 namespace appsync::device {
 

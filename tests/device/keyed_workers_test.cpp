@@ -1,4 +1,4 @@
-#include "device/coordination/keyed_workers.h"
+#include "device/state/keyed_workers.h"
 
 #include <gtest/gtest.h>
 
