@@ -8,8 +8,12 @@
 namespace appsync::device {
 namespace {
 
-Error refusedWith(int code, std::string_view reason) {
+Error posixError(int code, std::string_view reason) {
   return Error::withDescription(POSIXErrorDomain, code, reason);
+}
+
+[[noreturn]] void refuse(int code, std::string_view reason) {
+  throw Refused{posixError(code, reason)};
 }
 
 /// What an object of a client stands for. Throws Refused for none and for one of another service.
@@ -17,26 +21,49 @@ template <typename Object>
 std::int64_t numberOf(const std::shared_ptr<Object>& object, const ServiceObject& owner,
                       std::string_view what) {
   const auto* const known = dynamic_cast<const ServiceObject*>(object.get());
-  if (known && known->belongsWith(owner)) {
-    if (const auto trouble = known->trouble()) throw Refused{*trouble};
-    return known->number();
+  if (!known || !known->belongsWith(owner)) {
+    refuse(EINVAL,
+           fmt::format("the {} is {}", what, object ? "none of this service's" : "missing"));
   }
-  throw Refused{refusedWith(
-      EINVAL, fmt::format("the {} is {}", what, object ? "none of this service's" : "missing"))};
+  if (const auto trouble = known->trouble()) throw Refused{*trouble};
+  return known->number();
 }
 
-/// Throws Refused for a promise that cannot be kept any more or is another coordinator's package.
-void checkPromise(SQLite::Database& database, std::int64_t number, std::int64_t coordinator = 0) {
+/// Throws Refused for a promise that cannot be kept any more or is another coordinator's.
+void checkPromise(SQLite::Database& database, std::int64_t number, std::int64_t coordinator) {
   const auto promise = findPromise(database, number);
-  if (!promise || promise->over) {
-    throw Refused{refusedWith(ECANCELED, "the promise has been cancelled or is settled")};
-  }
+  if (!promise || promise->over) refuse(ECANCELED, "the promise has been cancelled or is settled");
   for (const CoordinatorRow& user : coordinatorsUsingPromise(database, number)) {
-    if (user.number != coordinator) {
-      throw Refused{
-          refusedWith(EBUSY, fmt::format("the promise is made to {} already", user.identifier))};
-    }
+    if (user.number == coordinator) continue;
+    refuse(EBUSY, fmt::format("the promise is made to {} already", user.identifier));
   }
+}
+
+/// The number of a promise that can be made to the coordinator.
+template <typename Promise>
+std::int64_t promised(SQLite::Database& database, const std::shared_ptr<Promise>& promise,
+                      const ServiceObject& owner, std::string_view what, std::int64_t coordinator) {
+  const std::int64_t number = numberOf(promise, owner, what);
+  checkPromise(database, number, coordinator);
+  return number;
+}
+
+/// Throws Refused for a placeholder that the coordinator cannot have.
+void checkPlaceholder(SQLite::Database& database, std::int64_t number, const CoordinatorRow& row) {
+  const auto placeholder = findPlaceholder(database, number);
+  if (!placeholder || placeholder->over) refuse(ECANCELED, "the placeholder has been cancelled");
+  if (!placeholder->configured) {
+    refuse(EINVAL, "the placeholder's configuration is not complete");
+  }
+  if (placeholder->identifier != row.identifier) {
+    refuse(EINVAL, fmt::format("the placeholder is one of {}, not of {}", placeholder->identifier,
+                               row.identifier));
+  }
+  const auto present = findPlaceholder(database, row.placeholder);
+  if (present && present->number != number && present->presence != Presence::None) {
+    refuse(EEXIST, fmt::format("{} has its placeholder already", row.identifier));
+  }
+  if (placeholder->icon) checkPromise(database, *placeholder->icon, row.number);
 }
 
 /// The row's object, made if nobody holds one.
@@ -73,7 +100,7 @@ bool ServiceObject::attempt(const std::function<bool(CoordinationStore&)>& use,
   const auto done = with(std::optional<bool>(), [&](CoordinationObjects& service) {
     return std::optional(use(service.store));
   });
-  if (!done) setError(error, refusedWith(ESHUTDOWN, "the coordination service has ended"));
+  if (!done) setError(error, posixError(ESHUTDOWN, "the coordination service has ended"));
   return done.value_or(false);
 }
 
@@ -113,9 +140,9 @@ bool PlaceholderHandle::setIconPromise(const std::shared_ptr<PathTransferPromise
                                        std::optional<Error>* error) noexcept {
   return change(
       [&](SQLite::Database& database, PlaceholderRow& row) {
-        row.icon = numberOf(promise, *this, "icon promise");
         const auto coordinator = coordinatorWithPlaceholder(database, row.number);
-        checkPromise(database, *row.icon, coordinator ? coordinator->number : 0);
+        row.icon = promised(database, promise, *this, "icon promise",
+                            coordinator ? coordinator->number : 0);
       },
       error);
 }
@@ -208,8 +235,7 @@ bool CoordinatorHandle::setInitialQPKAssetPromises(
       [&](SQLite::Database& database, CoordinatorRow& row) {
         std::vector<std::int64_t> numbers;
         for (const auto& promise : promises) {
-          numbers.push_back(numberOf(promise, *this, "initial promise"));
-          checkPromise(database, numbers.back(), row.number);
+          numbers.push_back(promised(database, promise, *this, "initial promise", row.number));
         }
         row.initialPromises = bytesOf(numbers);
       },
@@ -235,8 +261,7 @@ bool CoordinatorHandle::setAppAssetPromise(const std::shared_ptr<PathTransferPro
                                            std::optional<Error>* error) noexcept {
   return change(
       [&](SQLite::Database& database, CoordinatorRow& row) {
-        row.package = numberOf(promise, *this, "package promise");
-        checkPromise(database, *row.package, row.number);
+        row.package = promised(database, promise, *this, "package promise", row.number);
       },
       error);
 }
@@ -250,8 +275,7 @@ bool CoordinatorHandle::setUserDataPromise(const std::shared_ptr<OutOfBandTransf
                                            std::optional<Error>* error) noexcept {
   return change(
       [&](SQLite::Database& database, CoordinatorRow& row) {
-        row.userData = numberOf(promise, *this, "user data promise");
-        checkPromise(database, *row.userData, row.number);
+        row.userData = promised(database, promise, *this, "user data promise", row.number);
       },
       error);
 }
@@ -259,29 +283,14 @@ bool CoordinatorHandle::setUserDataPromise(const std::shared_ptr<OutOfBandTransf
 bool CoordinatorHandle::setPlaceholderPromise(
     const std::shared_ptr<InstallPlaceholder>& placeholder, std::optional<Error>* error) noexcept {
   if (!placeholder) {
-    setError(error, refusedWith(EINVAL, "there is no placeholder"));
+    setError(error, posixError(EINVAL, "there is no placeholder"));
     return false;
   }
   return change(
       [&](SQLite::Database& database, CoordinatorRow& row) {
-        const auto present = findPlaceholder(database, row.placeholder);
-        row.placeholder = numberOf(placeholder, *this, "placeholder");
-        const auto promised = findPlaceholder(database, row.placeholder);
-        if (!promised || promised->over) {
-          throw Refused{refusedWith(ECANCELED, "the placeholder has been cancelled")};
-        }
-        if (!promised->configured) {
-          throw Refused{refusedWith(EINVAL, "the placeholder's configuration is not complete")};
-        }
-        if (promised->identifier != row.identifier) {
-          throw Refused{refusedWith(EINVAL, fmt::format("the placeholder is one of {}, not of {}",
-                                                        promised->identifier, row.identifier))};
-        }
-        if (present && present->number != promised->number && present->presence != Presence::None) {
-          throw Refused{
-              refusedWith(EEXIST, fmt::format("{} has its placeholder already", row.identifier))};
-        }
-        if (promised->icon) checkPromise(database, *promised->icon, row.number);
+        const std::int64_t number = numberOf(placeholder, *this, "placeholder");
+        checkPlaceholder(database, number, row);
+        row.placeholder = number;
       },
       error);
 }
