@@ -137,7 +137,6 @@ class CoordinationSweepTest : public CoordinationTest {
     return faults.struck();
   }
   static void comeToRest(DeviceInstallCoordination& service) {
-    const DatabaseFaults::Uncounted uncounted;
     while (service.isBusy(Id)) std::this_thread::yield();
   }
 
@@ -152,6 +151,7 @@ TEST_F(CoordinationSweepTest, WhateverFailsTheClientIsRefusedOrFindsAnError) {
       faults.strike(there.database());
       EventRecorder observer;
       const auto given = install(service, observer);
+      const DatabaseFaults::Uncounted uncounted;  // what the test asks
       comeToRest(service);
       const auto record = there.registry().recordForIdentifier(Id, false);
       const bool isInstalled = record && !record->isPlaceholder;
@@ -174,6 +174,7 @@ TEST_F(CoordinationSweepTest, AnInstallWhosePackageHasComeEndsThoughAReadFails) 
     comeToRest(service);
     faults.strike(there.database());
     begun.bringPackage();
+    const DatabaseFaults::Uncounted uncounted;  // what the test asks
     comeToRest(service);
     EXPECT_EQ(observer.count("complete") + observer.count("failed"), 1U);
     service.removeObserver(&observer);
