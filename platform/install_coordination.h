@@ -119,7 +119,8 @@ class InstallPlaceholder {
 class InstallCoordinator;
 
 /// Receives coordinator events, one after another, on a service thread. The coordinator is valid
-/// for the call. An event comes once; a process that dies while it receives one gets it anew.
+/// for the call. An event comes once; a process that dies while it receives one gets it anew,
+/// unless it is a cancellation.
 class CoordinatorObserver {
  public:
   virtual ~CoordinatorObserver() = default;
@@ -137,7 +138,8 @@ class CoordinatorObserver {
 
 /// One application's install, update or restore, owned by the coordination service; this is a
 /// shared handle to it. Setters give false and an error when the service refuses, or when the
-/// coordinator is over. It is also over, untold, when its placeholder is taken out of the registry.
+/// coordinator is over. One whose placeholder was taken out of the registry goes on until its
+/// client asks to make one anew, or the service is started anew: then it is over, untold.
 class InstallCoordinator {
  public:
   virtual ~InstallCoordinator() = default;
