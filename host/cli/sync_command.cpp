@@ -114,7 +114,6 @@ ExitCode runClear(bool withData, CommandContext& context) {
   const Phone phone = phoneOf(*device);
   const std::set<std::string> sent = everSent(phone);
   loaded.client().clearSyncData();
-  waitUntilIdle(phone, sent);
   removeLeftOverPackages(phone, sent);
   if (context.json || !context.quiet) {
     context.tell({{"event", "cleared"}}, "Cleared all sync data and took every placeholder away.");

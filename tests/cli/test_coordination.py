@@ -83,6 +83,20 @@ class TapAndCancel(support.Case):
         self.assertEqual(len(self.apps()), 4)
         self.assertEqual(self.apps()["com.b"], "1.0")
 
+    def test_a_clear_does_not_wait_for_an_application_to_be_closed(self):
+        self.offer("com.open")
+        self.sync("--install", "com.open")
+        self.run_appsync("launch", "com.open")
+        self.offer("com.open", "2.0")
+        process = self.start("--json", "sync", self.library, "--install", "com.open")
+        for line in process.stdout:
+            if json.loads(line)["event"] == "waiting":
+                break
+        process.kill()
+        process.communicate()
+        self.run_appsync("clear")
+        self.assertEqual(self.apps()["com.open"], "1.0")
+
     def test_what_a_killed_sync_left_can_be_cancelled(self):
         process = self.sync_until_sending()
         process.kill()
