@@ -72,6 +72,12 @@ class FolderDevice final : public EmbeddedDevice {
             transactions_,  notifier_, host,        queue_};
   }
 
+  Phone phone() noexcept override {
+    return {files_,        registry_,      homeScreen_,
+            iconRenderer_, imageEncoders_, *this,
+            *this,         *this,          coordination_ ? &*coordination_ : nullptr};
+  }
+
   /// Why a wish cannot be carried out.
   std::optional<Error> carryOut(PersonWish wish, std::string_view bundleId) {
     return wish == PersonWish::Tap ? tap(bundleId) : cancel(bundleId);
@@ -95,19 +101,12 @@ class FolderDevice final : public EmbeddedDevice {
 
   std::optional<std::vector<std::string>> namesIn(std::string_view directory,
                                                   std::optional<Error>* error) noexcept override {
-    std::optional<Error> cause;
-    const FileDescriptor opened = files_.openDirectory(directory, &cause);
-    std::vector<std::string> names;
-    if (!opened && cause && cause->code == ENOENT) return names;
-    if (!opened || !listNames(opened.get(), names)) {
-      setError(error, cause.value_or(Error::posix(errno, directory)));
-      return std::nullopt;
-    }
-    std::ranges::sort(names);
+    auto names = containers_.namesIn(directory, error);
+    if (names) std::ranges::sort(*names);
     return names;
   }
 
-  void setWatcher(DeviceWatcher* watcher) noexcept override { watcher_.set(watcher); }
+  void setWatcher(PhoneWatcher* watcher) noexcept override { watcher_.set(watcher); }
 
   void hurry() noexcept override {
     homeScreen_.refuseAssertions();
@@ -115,8 +114,13 @@ class FolderDevice final : public EmbeddedDevice {
     if (coordination_) coordination_->hurry();
   }
 
-  bool isBusyWith(std::string_view bundleId) noexcept override {
-    return coordination_ && coordination_->isBusy(bundleId);
+  std::set<std::string> busyAmong(const std::set<std::string>& bundleIds) noexcept override {
+    std::set<std::string> busy;
+    if (!coordination_) return busy;
+    std::ranges::copy_if(
+        bundleIds, std::inserter(busy, busy.end()),
+        [this](const std::string& bundleId) { return coordination_->isBusy(bundleId); });
+    return busy;
   }
 
   std::vector<std::string> packagesOwedBy(CoordinationClientId client) noexcept override {

@@ -150,10 +150,8 @@ class AppRegistry {
                                                        bool placeholder) noexcept = 0;
 
   /// Calls the visitor on the calling thread, before it returns, with a snapshot taken at the
-  /// start; the visitor may call the registry. False, with an error and without a visit, when the
-  /// registry cannot be read.
-  virtual bool enumerateBundles(BundleKind kind, const Visitor& visitor,
-                                std::optional<Error>* error = nullptr) noexcept = 0;
+  /// start; the visitor may call the registry.
+  virtual void enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept = 0;
 
   /// Installs the package file, or the placeholder bundle directory, at `package`.
   /// Options: SWPackageTypeKey (SWPackageTypeCustomer or SWPackageTypePlaceholder) and

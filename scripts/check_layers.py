@@ -2,8 +2,8 @@
 """Checks that every #include follows the layers: arrows only ever point down to platform/.
 
     host/                                              may include all below but the plug-in
-    device/                                            may include packages/, icons/, base/, platform/
-    packages/ icons/                                   may include base/, platform/
+    device/                                            may include all below but the plug-in
+    phone/ packages/ icons/                            may include base/, platform/
     base/                                              may include platform/
     client/ sync/ transfer/ coordination/ restore/     the plug-in, may include platform/ and itself
     platform/                                          may include nothing of the others
@@ -23,14 +23,15 @@ import re
 import sys
 
 PLUGIN = {"client", "sync", "transfer", "coordination", "restore"}
-LAYERS = PLUGIN | {"platform", "base", "icons", "packages", "device", "host"}
+LAYERS = PLUGIN | {"platform", "base", "icons", "packages", "phone", "device", "host"}
 MAY_INCLUDE = {folder: PLUGIN | {"platform"} for folder in PLUGIN} | {
     "platform": {"platform"},
     "base": {"base", "platform"},
     "icons": {"icons", "base", "platform"},
     "packages": {"packages", "base", "platform"},
-    "device": {"device", "packages", "icons", "base", "platform"},
-    "host": {"host", "device", "packages", "icons", "base", "platform"},
+    "phone": {"phone", "base", "platform"},
+    "device": {"device", "phone", "packages", "icons", "base", "platform"},
+    "host": {"host", "device", "phone", "packages", "icons", "base", "platform"},
 }
 ORDER = {
     "device": "files state journal home services apps coordination".split(),

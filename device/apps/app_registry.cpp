@@ -108,17 +108,13 @@ std::optional<Bytes> DeviceAppRegistry::opaqueBlob(std::string_view bundleId,
   return blob;
 }
 
-bool DeviceAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor,
-                                         std::optional<Error>* error) noexcept {
-  std::optional<Error> reason;
-  const std::vector<AppRecord> all = records(&reason);
+void DeviceAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept {
+  const std::vector<AppRecord> all = records();
   bool stop = false;
   for (const AppRecord& record : kind == BundleKind::All ? all : onePerApplication(all, kind)) {
     visitor(record, stop);
-    if (stop) break;
+    if (stop) return;
   }
-  if (reason) setError(error, *reason);
-  return !reason;
 }
 
 bool DeviceAppRegistry::changeApplication(

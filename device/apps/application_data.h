@@ -2,6 +2,7 @@
 
 #include "base/data_stream.h"
 #include "device/state/device_core.h"
+#include "phone/phone.h"
 
 namespace appsync::device {
 

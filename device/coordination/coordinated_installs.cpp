@@ -144,7 +144,7 @@ bool CoordinatedInstalls::take(Step step, const CoordinatorState& state) {
 void CoordinatedInstalls::removePlaceholder(const std::string& identifier,
                                             const PlaceholderRow& placeholder) {
   if (placeholder.presence == Presence::Forsaken) {
-    registry_.cancelRestore(identifier, nullptr);
+    registry_.cancelWish(identifier, nullptr);
     return;
   }
   if (placeholder.presence != Presence::Adopted) {

@@ -5,9 +5,9 @@
 #include <algorithm>
 #include <cerrno>
 
+#include "base/identifiers.h"
 #include "device/apps/installs.h"
 #include "device/apps/removal.h"
-#include "base/identifiers.h"
 #include "device/coordination/coordination_recovery.h"
 #include "device/state/application_rows.h"
 #include "platform/existence.h"

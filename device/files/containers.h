@@ -55,9 +55,12 @@ class Containers {
   /// True when the application has no data any more.
   bool removeData(std::string_view identifier);
 
- private:
+  /// The names in any directory, none of one that is not there; nullopt (with an error) when they
+  /// cannot be read.
   std::optional<std::vector<std::string>> namesIn(std::string_view directory,
                                                   std::optional<Error>* error);
+
+ private:
   bool removeIfThere(const std::string& path);
 
   FileManager& files_;

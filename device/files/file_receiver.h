@@ -4,22 +4,11 @@
 #include <optional>
 #include <string_view>
 
-#include "platform/bytes.h"
-#include "platform/error.h"
+#include "phone/phone.h"
 
 namespace appsync::device {
 
 class ConfinedFileManager;
-
-/// A file that is being sent to the phone piece by piece. Destroying it before `finish` removes
-/// what has arrived. Used by one thread.
-class FileReceiver {
- public:
-  virtual ~FileReceiver() = default;
-  virtual bool append(ByteView bytes, std::optional<Error>* error) noexcept = 0;
-  /// The file is whole. False when it could not be completed.
-  virtual bool finish(std::optional<Error>* error) noexcept = 0;
-};
 
 /// Begins a file at a path of the phone; missing parents are made. The bytes arrive under a
 /// temporary name beside the target and take its place, on disk, in one step when it is finished.

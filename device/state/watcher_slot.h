@@ -5,14 +5,14 @@
 #include <shared_mutex>
 #include <string_view>
 
-#include "device/state/device_watcher.h"
+#include "phone/phone.h"
 
 namespace appsync::device {
 
 /// Holds the device's watcher. Calls to it run beside one another; replacing it waits for them.
 class WatcherSlot {
  public:
-  void set(DeviceWatcher* watcher) {
+  void set(PhoneWatcher* watcher) {
     const std::unique_lock lock(mutex_);
     watcher_ = watcher;
   }
@@ -29,7 +29,7 @@ class WatcherSlot {
 
  private:
   std::shared_mutex mutex_;
-  DeviceWatcher* watcher_ = nullptr;
+  PhoneWatcher* watcher_ = nullptr;
 };
 
 }  // namespace appsync::device

@@ -25,7 +25,7 @@ std::string reasonOf(const std::optional<Error>& error) {
 
 }  // namespace
 
-BackupRun::BackupRun(SyncClient& client, const BackupPhone& phone, BackupWriter& writer,
+BackupRun::BackupRun(SyncClient& client, const Phone& phone, BackupWriter& writer,
                      Reporter& reporter, Interruption& interruption)
     : client_(client),
       phone_(phone),
@@ -62,10 +62,10 @@ bool BackupRun::saveAll(const BackupOptions& options) {
 
 /// What an install under way replaces could not be read.
 void BackupRun::waitUntilIdle(const std::vector<AppRecord>& applications) {
-  for (const AppRecord& record : applications) {
-    while (!interruption_.requested() && phone_.isBusyWith(record.applicationIdentifier)) {
-      std::this_thread::sleep_for(IdlePoll);
-    }
+  std::set<std::string> identifiers;
+  for (const AppRecord& record : applications) identifiers.insert(record.applicationIdentifier);
+  while (!interruption_.requested() && !phone_.activity.busyAmong(identifiers).empty()) {
+    std::this_thread::sleep_for(IdlePoll);
   }
 }
 
@@ -102,7 +102,7 @@ std::optional<std::string> BackupRun::saveData(const AppRecord& record) {
   };
   std::optional<Error> error;
   if (!writer_.beginData(record.applicationIdentifier)) return writer_.problem();
-  const bool whole = phone_.saveData(record.applicationIdentifier, take, &error);
+  const bool whole = phone_.data.saveData(record.applicationIdentifier, take, &error);
   if (whole && bytes > 0) {
     writer_.endData();
   } else {
@@ -124,7 +124,7 @@ void BackupRun::noteUnlisted() {
       any = !bytes.empty();
       return !any;
     };
-    const bool read = phone_.saveData(identifier, look, nullptr);
+    const bool read = phone_.data.saveData(identifier, look, nullptr);
     if (read && !any) continue;
     summary_.failed.push_back({identifier, "the phone does not list it, but has data of it"});
   }
@@ -143,12 +143,11 @@ bool BackupRun::mayReplaceOlder() {
 }
 
 bool BackupRun::saveLists() {
-  const Platform& services = phone_.services;
-  const auto layout = services.homeScreen.getFlattenedIconState(services.homeScreen.serverPort(),
-                                                                FlattenedIconState);
+  const auto layout =
+      phone_.homeScreen.getFlattenedIconState(phone_.homeScreen.serverPort(), FlattenedIconState);
   if (!layout) return broken("the home screen does not tell its layout");
   std::optional<Error> error;
-  auto demotions = demotionsAmong(services.files, saved_, &error);
+  auto demotions = demotionsAmong(phone_.files, saved_, &error);
   if (!demotions)
     return broken("the list of demoted applications cannot be read: " + reasonOf(error));
   // Binary, since it is mostly icons.

@@ -23,7 +23,7 @@ struct BackupOptions {
 /// holds it stays. Borrows everything; used once, by one thread.
 class BackupRun {
  public:
-  BackupRun(SyncClient& client, const BackupPhone& phone, BackupWriter& writer, Reporter& reporter,
+  BackupRun(SyncClient& client, const Phone& phone, BackupWriter& writer, Reporter& reporter,
             Interruption& interruption);
   ~BackupRun();
   BackupRun(const BackupRun&) = delete;
@@ -50,7 +50,7 @@ class BackupRun {
   bool broken(const std::string& reason);
 
   SyncClient& client_;
-  const BackupPhone& phone_;
+  const Phone& phone_;
   BackupWriter& writer_;
   Reporter& reporter_;
   Interruption& interruption_;

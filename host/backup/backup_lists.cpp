@@ -6,7 +6,7 @@
 #include <map>
 #include <set>
 
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 #include "platform/bundle.h"
 #include "platform/property_list_codec.h"
 
@@ -43,12 +43,12 @@ std::optional<Bytes> metadataOf(FileManager& files, const AppRecord& record,
   return serializePropertyList(std::move(metadata), PropertyListFormat::Binary, error);
 }
 
-std::optional<Bytes> renderedIcon(const Platform& services, const std::string& bundlePath) {
-  const auto bundle = Bundle::open(services.files, FileLocation::directory(bundlePath));
-  const auto icon = bundle ? services.iconRenderer.renderHomeScreenIcon(*bundle) : std::nullopt;
+std::optional<Bytes> renderedIcon(const Phone& phone, const std::string& bundlePath) {
+  const auto bundle = Bundle::open(phone.files, FileLocation::directory(bundlePath));
+  const auto icon = bundle ? phone.iconRenderer.renderHomeScreenIcon(*bundle) : std::nullopt;
   if (!icon) return std::nullopt;
   Bytes png;
-  const auto encoder = services.imageEncoders.create(png, "public.png", 1);
+  const auto encoder = phone.imageEncoders.create(png, "public.png", 1);
   if (!encoder) return std::nullopt;
   encoder->addImage(*icon);
   return encoder->finalize() ? std::optional(std::move(png)) : std::nullopt;
@@ -69,15 +69,15 @@ bool canTellIcon(FileManager& files, const std::string& bundlePath, std::optiona
 }
 
 /// None for an application without an icon that can be drawn. False when that cannot be told.
-bool takeIcon(const Platform& services, const AppRecord& record, std::optional<Bytes>& icon,
+bool takeIcon(const Phone& phone, const AppRecord& record, std::optional<Bytes>& icon,
               std::optional<Error>* error) {
   if (!record.bundlePath) return true;
   // A placeholder's icon is a home-screen icon already.
   if (record.isPlaceholder) {
-    return readIfThere(services.files, joinPath(*record.bundlePath, "Icon.png"), icon, error);
+    return readIfThere(phone.files, joinPath(*record.bundlePath, "Icon.png"), icon, error);
   }
-  icon = renderedIcon(services, *record.bundlePath);
-  return icon || canTellIcon(services.files, *record.bundlePath, error);
+  icon = renderedIcon(phone, *record.bundlePath);
+  return icon || canTellIcon(phone.files, *record.bundlePath, error);
 }
 
 /// A placeholder that a person has asked for since is of another type.
@@ -93,22 +93,10 @@ PropertyList::Array arrayOf(const std::set<std::string>& identifiers) {
 
 }  // namespace
 
-BackupPhone backupPhoneOf(device::EmbeddedDevice& device, SyncHost& host) {
-  return {device.platform(host),
-          [&device](std::optional<Error>* error) { return device.applications(error); },
-          [&device](std::string_view bundleId, const DataSink& sink, std::optional<Error>* error) {
-            return device.saveData(bundleId, sink, error);
-          },
-          [&device](std::string_view bundleId, std::optional<Error>* error) {
-            return device.opaqueBlob(bundleId, error);
-          },
-          [&device](std::string_view bundleId) { return device.isBusyWith(bundleId); }};
-}
-
-std::vector<AppRecord> applicationsToSave(const BackupPhone& phone, std::optional<Error>* error) {
+std::vector<AppRecord> applicationsToSave(const Phone& phone, std::optional<Error>* error) {
   std::vector<AppRecord> applications;
   std::set<std::string_view> taken;
-  const std::vector<AppRecord> all = phone.applications(error);
+  const std::vector<AppRecord> all = phone.data.applications(error);
   // Of an update under way the installed version, whose record comes first.
   for (const AppRecord& record : all) {
     const bool leftOver = record.isPlaceholder && record.installType == InstallType::Sync;
@@ -120,8 +108,7 @@ std::vector<AppRecord> applicationsToSave(const BackupPhone& phone, std::optiona
   return applications;
 }
 
-std::optional<PropertyList::Dictionary> restoreEntry(const BackupPhone& phone,
-                                                     const AppRecord& record,
+std::optional<PropertyList::Dictionary> restoreEntry(const Phone& phone, const AppRecord& record,
                                                      std::string& problem) {
   std::optional<Error> error;
   const auto refuse = [&](std::string_view what) {
@@ -129,15 +116,15 @@ std::optional<PropertyList::Dictionary> restoreEntry(const BackupPhone& phone,
                           error ? error->localizedDescription() : "unknown reason");
     return std::nullopt;
   };
-  auto metadata = metadataOf(phone.services.files, record, &error);
+  auto metadata = metadataOf(phone.files, record, &error);
   if (!metadata) return refuse("metadata");
   PropertyList::Dictionary entry;
   entry.emplace(exchange::RestoreMetadataKey, std::move(*metadata));
-  auto blob = phone.opaqueBlob(record.applicationIdentifier, &error);
+  auto blob = phone.data.opaqueBlob(record.applicationIdentifier, &error);
   if (error) return refuse("opaque blob");
   if (blob) entry.emplace(exchange::RestoreSinfKey, std::move(*blob));
   std::optional<Bytes> icon;
-  if (!takeIcon(phone.services, record, icon, &error)) return refuse("icon");
+  if (!takeIcon(phone, record, icon, &error)) return refuse("icon");
   if (icon) entry.emplace(exchange::RestoreIconKey, std::move(*icon));
   return entry;
 }

@@ -33,7 +33,7 @@ ExitCode runBackup(const BackupArguments& arguments, CommandContext& context) {
     throw CommandError(problem.isWrongFolder ? ExitCode::WrongUsage : ExitCode::DeviceUnusable,
                        problem.text);
   }
-  const BackupPhone phone = backupPhoneOf(*device, loaded.host());
+  const Phone phone = device->phone();
   const BackupSummary summary =
       BackupRun(loaded.client(), phone, *writer, *reporter, interruption).run(arguments.options);
   writer.reset();  // takes away what is not whole

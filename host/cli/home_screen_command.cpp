@@ -76,7 +76,7 @@ ExitCode runHomeScreen(const HomeScreenOptions& options, CommandContext& context
   const auto device = context.openDevice(device::Access::ReadOnly);
   const auto order = device->homeScreenOrder();
   const ScreenView view = viewOf(pagesFor(order.size()), options.page);
-  const HomeScreenIcons source(*device, view.iconSide());
+  const HomeScreenIcons source(device->phone(), view.iconSide());
   std::vector<ScreenIcon> icons;
   const std::size_t first = view.firstPage * IconsPerPage;
   const std::size_t end = std::min(first + view.pagesShown * IconsPerPage, order.size());

@@ -56,8 +56,8 @@ ExitCode runRestore(const RestoreOptions& options, CommandContext& context) {
                   [&](PluginSession& loaded, Reporter& reporter, Interruption& interruption) {
                     reportUnreadable(input.packages, reporter);
                     reportUnreadable(input.catalogue, reporter);
-                    return Restore(loaded.client(), loaded.host(), restorePhoneOf(*device),
-                                   reporter, interruption)
+                    return Restore(loaded.client(), loaded.host(), device->phone(), reporter,
+                                   interruption)
                         .run(input);
                   });
 }

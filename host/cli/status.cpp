@@ -6,7 +6,7 @@
 
 #include "base/text.h"
 #include "host/cli/plugin_session.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::host {

@@ -46,7 +46,7 @@ void plan(SyncInput& input, PlanOptions options, device::EmbeddedDevice& device)
   options.installingAllowed = allowed(device, PolicySetting::AppInstallationAllowed);
   options.removingAllowed = allowed(device, PolicySetting::AppRemovalAllowed);
   std::string problem;
-  const auto installed = installedApplications(phoneOf(device), problem);
+  const auto installed = installedApplications(device.phone(), problem);
   if (!installed) throw CommandError(ExitCode::SomeFailed, problem);
   auto made = makePlan(input.library, *installed, options, problem);
   if (!made) throw CommandError(ExitCode::WrongUsage, problem);
@@ -77,7 +77,7 @@ ExitCode runSync(const SyncOptions& options, CommandContext& context) {
   return runVisit(context, *device, "sync",
                   [&](PluginSession& loaded, Reporter& reporter, Interruption& interruption) {
                     reportPlan(input, reporter);
-                    return Session(loaded.client(), loaded.host(), phoneOf(*device), reporter,
+                    return Session(loaded.client(), loaded.host(), device->phone(), reporter,
                                    interruption)
                         .run(input);
                   });
@@ -85,9 +85,9 @@ ExitCode runSync(const SyncOptions& options, CommandContext& context) {
 
 /// Clearing takes every placeholder away, and with it what is left of its application.
 void refuseToLoseData(device::EmbeddedDevice& device) {
-  const Phone phone = phoneOf(device);
+  const Phone phone = device.phone();
   std::optional<Error> error;
-  const auto present = applicationsPresent(phone.apps, &error);
+  const auto present = applicationsPresent(phone, &error);
   if (!present) {
     throw CommandError(ExitCode::SomeFailed, withReason(CannotTellApplications, error));
   }
@@ -111,7 +111,7 @@ ExitCode runClear(bool withData, CommandContext& context) {
   const auto plugin = loadPlugin(context);
   const Interruption interruption;
   PluginSession loaded(*plugin, QueryToolBundleIdentifier, *device, interruption, nullptr);
-  const Phone phone = phoneOf(*device);
+  const Phone phone = device->phone();
   const std::set<std::string> sent = everSent(phone);
   loaded.client().clearSyncData();
   removeLeftOverPackages(phone, sent);

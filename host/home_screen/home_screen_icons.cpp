@@ -51,8 +51,8 @@ struct HomeScreenIcons::Records {
   }
 };
 
-HomeScreenIcons::HomeScreenIcons(device::EmbeddedDevice& device, std::uint32_t side)
-    : files_(device.files()), registry_(device.appRegistry()), side_(side), demotions_(files_) {}
+HomeScreenIcons::HomeScreenIcons(const Phone& phone, std::uint32_t side)
+    : files_(phone.files), registry_(phone.apps), side_(side), demotions_(files_) {}
 
 HomeScreenIcons::Records HomeScreenIcons::recordsOf(std::string_view identifier) const {
   Records records{registry_.recordForIdentifier(identifier, false),

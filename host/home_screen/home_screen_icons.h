@@ -4,19 +4,19 @@
 #include <optional>
 #include <string_view>
 
-#include "device/embedded_device.h"
 #include "host/home_screen/home_screen_picture.h"
 #include "host/phone/demotions.h"
+#include "phone/phone.h"
 
 namespace appsync::host {
 
-/// What a device's home screen shows of its applications, also while another process installs some.
+/// What a phone's home screen shows of its applications, also while another process installs some.
 class HomeScreenIcons {
  public:
-  /// Borrows the device. Pictures of icons are `side` pixels wide.
-  HomeScreenIcons(device::EmbeddedDevice& device, std::uint32_t side);
+  /// Pictures of icons are `side` pixels wide.
+  HomeScreenIcons(const Phone& phone, std::uint32_t side);
 
-  /// As it is now; nullopt for what is not on the device. The picture is that of the application's
+  /// As it is now; nullopt for what is not on the phone. The picture is that of the application's
   /// bundle or the artwork beside the bundle; none when neither can be drawn.
   std::optional<ScreenIcon> iconOf(std::string_view identifier) const;
 

@@ -1,7 +1,7 @@
 #include "host/phone/demotions.h"
 
 #include "base/text.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 #include "platform/bundle.h"
 #include "platform/sync_files.h"
 

@@ -9,7 +9,7 @@ namespace {
 class ClientsWishes {
  public:
   explicit ClientsWishes(const Phone& phone) : coordinated_(phone.coordination != nullptr) {
-    const std::vector<std::string> owed = phone.packagesOwedBy(KQClientKiosk);
+    const std::vector<std::string> owed = phone.activity.packagesOwedBy(KQClientKiosk);
     owedByStore_.insert(owed.begin(), owed.end());
   }
 
@@ -60,8 +60,14 @@ std::optional<std::vector<InstalledApplication>> installedApplications(const Pho
   const ClientsWishes wishes(phone);
   const std::set<std::string> untold = withoutWord(phone.files);
   std::map<std::string, InstalledApplication> found;
-  const auto take = [&](const AppRecord& record, bool&) {
-    if (!record.isApplication || (record.isPlaceholder && isLeftOver(phone, record))) return;
+  std::optional<Error> error;
+  const auto records = applicationsOf(phone, &error);
+  if (!records) {
+    problem = withReason(CannotTellApplications, error);
+    return std::nullopt;
+  }
+  for (const AppRecord& record : *records) {
+    if (!record.isApplication || (record.isPlaceholder && isLeftOver(phone, record))) continue;
     const auto [place, isNew] = found.try_emplace(record.applicationIdentifier);
     InstalledApplication& application = place->second;
     if (isNew || !record.isPlaceholder) {
@@ -76,11 +82,6 @@ std::optional<std::vector<InstalledApplication>> installedApplications(const Pho
                      !record.isPlaceholder && untold.contains(record.applicationIdentifier)};
     }
     if (record.isPlaceholder) application.waits = wishes.leaveOut(record);
-  };
-  std::optional<Error> error;
-  if (!phone.apps.enumerateBundles(BundleKind::All, take, &error)) {
-    problem = withReason(CannotTellApplications, error);
-    return std::nullopt;
   }
   std::vector<InstalledApplication> result;
   result.reserve(found.size());

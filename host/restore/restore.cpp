@@ -25,16 +25,16 @@ void addUnreadable(const std::optional<Library>& library, Summary& summary) {
 
 }  // namespace
 
-Restore::Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Reporter& reporter,
+Restore::Restore(SyncClient& client, HostProcess& host, Phone phone, Reporter& reporter,
                  Interruption& interruption)
-    : Visit(client, host, phone, reporter, interruption), restorePhone_(std::move(phone)) {}
+    : Visit(client, host, phone, reporter, interruption) {}
 
 SyncResult Restore::run(const RestoreInput& input) {
   for (const auto* library : {&input.packages, &input.catalogue}) {
     if (*library) watch_.nameFilesOf(**library);
   }
-  handover_ = handOver(restorePhone_, input.backup, input.list, input.overwriteData, reporter_,
-                       interruption_);
+  handover_ =
+      handOver(phone_, input.backup, input.list, input.overwriteData, reporter_, interruption_);
   host_.transfers().forgetCancelled();
   removeLeftOverPackages(phone_, everSent(phone_));
   failures_ = handover_.failures;
@@ -55,12 +55,12 @@ void Restore::overwriteData(const RestoreInput& input) {
     const auto file = input.backup.data.find(app.identifier);
     if (file == input.backup.data.end()) {
       installedData_[app.identifier] = InstalledData::NoneInBackup;
-    } else if (hasData(restorePhone_, app.identifier, file->second)) {
+    } else if (hasData(phone_, app.identifier, file->second)) {
       installedData_[app.identifier] = InstalledData::SameAlready;
     } else if (interruption_.requested()) {
       failures_[app.identifier] = InterruptedReason;
-    } else if (const auto failure = host::overwriteData(restorePhone_, app, file->second, reporter_,
-                                                        interruption_)) {
+    } else if (const auto failure =
+                   host::overwriteData(phone_, app, file->second, reporter_, interruption_)) {
       failures_[app.identifier] = *failure;
     } else {
       installedData_[app.identifier] = InstalledData::Overwritten;
@@ -75,7 +75,7 @@ bool Restore::callClient(const RestoreInput& input) {
   std::optional<Error> error;
   client_.reconcileRestoreOfType(FromDesktopBackup, &error);
   waitUntilIdle(phone_, handover_.listed);
-  if (!claimDownloads(phone_.apps, {}, &error)) return breakOff(CannotTellApplications, error);
+  if (!claimDownloads(phone_, {}, &error)) return breakOff(CannotTellApplications, error);
   reportPlaceholders(input.list);
   transfer(input);
   return !interruption_.requested();
@@ -135,7 +135,7 @@ void Restore::explainPlaceholders(const RestoreInput& input, RestoreEnd& end) {
   const std::optional<Library>& library = forbidden         ? None
                                           : input.catalogue ? input.catalogue
                                                             : input.packages;
-  const std::vector<std::string> owed = phone_.packagesOwedBy(KQClientKiosk);
+  const std::vector<std::string> owed = phone_.activity.packagesOwedBy(KQClientKiosk);
   const Demotions demotions(phone_.files);
   if (demotions.problem()) breakOff(*demotions.problem());
   for (const auto& [identifier, record] : end.present.placeholders) {

@@ -29,7 +29,7 @@ struct RestoreInput {
 /// all is there. Borrows everything; used once, by one thread.
 class Restore : Visit {
  public:
-  Restore(SyncClient& client, HostProcess& host, RestorePhone phone, Reporter& reporter,
+  Restore(SyncClient& client, HostProcess& host, Phone phone, Reporter& reporter,
           Interruption& interruption);
 
   SyncResult run(const RestoreInput& input);
@@ -51,7 +51,6 @@ class Restore : Visit {
   void explainPlaceholders(const RestoreInput& input, RestoreEnd& end);
   Summary settle(const RestoreInput& input);
 
-  const RestorePhone restorePhone_;
   Handover handover_;
   std::map<std::string, InstalledData> installedData_;
 };

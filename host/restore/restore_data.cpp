@@ -7,7 +7,7 @@ namespace appsync::host {
 namespace {
 
 /// The archive of an application without data has no bytes.
-bool isSame(const RestorePhone& phone, const std::string& identifier, const BackupFile* file) {
+bool isSame(const Phone& phone, const std::string& identifier, const BackupFile* file) {
   Sha256 digest;
   std::uint64_t size = 0;
   const std::uint64_t expected = file ? file->size : 0;
@@ -16,7 +16,7 @@ bool isSame(const RestorePhone& phone, const std::string& identifier, const Back
     size += bytes.size();
     return size <= expected;
   };
-  return phone.saveData(identifier, compare, nullptr) && size == expected &&
+  return phone.data.saveData(identifier, compare, nullptr) && size == expected &&
          (!file || digest.finish() == file->digest);
 }
 
@@ -49,10 +49,9 @@ std::string cause(const std::optional<Error>& error) {
   return error ? oneLine(error->localizedDescription()) : "no reason is known";
 }
 
-using Taker = std::function<bool(std::string_view bundleId, const DataSource& source,
-                                 std::optional<Error>* error)>;
+using Taker = decltype(&ApplicationData::restoreData);
 
-std::optional<std::string> giveData(const Taker& taker, const BackedUpApplication& app,
+std::optional<std::string> giveData(const Phone& phone, Taker taker, const BackedUpApplication& app,
                                     const BackupFile& file, Reporter& reporter,
                                     const Interruption& interruption) {
   ReportedData data(app, file, reporter);
@@ -60,40 +59,41 @@ std::optional<std::string> giveData(const Taker& taker, const BackedUpApplicatio
     return interruption.requested() ? -1 : data.read(bytes, size);
   };
   std::optional<Error> error;
-  if (taker(app.identifier, source, &error)) return std::nullopt;
+  if ((phone.data.*taker)(app.identifier, source, &error)) return std::nullopt;
   if (!data.problem().empty()) return "its data in the backup is damaged: " + data.problem();
   if (interruption.requested()) return InterruptedReason;
   return "its data could not be given back: " + cause(error);
 }
 
 /// What an earlier restore left waiting belongs to another backup.
-std::optional<std::string> clear(const RestorePhone& phone, const std::string& identifier) {
+std::optional<std::string> clear(const Phone& phone, const std::string& identifier) {
   const auto nothing = [](std::uint8_t*, std::size_t) { return std::int64_t{0}; };
   std::optional<Error> error;
-  if (phone.restoreData(identifier, nothing, &error)) return std::nullopt;
+  if (phone.data.restoreData(identifier, nothing, &error)) return std::nullopt;
   return "older data that waits for it could not be removed: " + cause(error);
 }
 
 }  // namespace
 
-bool hasData(const RestorePhone& phone, const std::string& identifier, const BackupFile& file) {
+bool hasData(const Phone& phone, const std::string& identifier, const BackupFile& file) {
   return isSame(phone, identifier, &file);
 }
 
-std::optional<std::string> overwriteData(const RestorePhone& phone, const BackedUpApplication& app,
+std::optional<std::string> overwriteData(const Phone& phone, const BackedUpApplication& app,
                                          const BackupFile& file, Reporter& reporter,
                                          const Interruption& interruption) {
-  auto failure = giveData(phone.overwriteData, app, file, reporter, interruption);
+  auto failure =
+      giveData(phone, &ApplicationData::overwriteData, app, file, reporter, interruption);
   reporter.report(DataEnded{app.identifier, failure});
   return failure;
 }
 
-std::optional<std::string> giveBackData(const RestorePhone& phone, const BackedUpApplication& app,
+std::optional<std::string> giveBackData(const Phone& phone, const BackedUpApplication& app,
                                         const BackupFile* file, Reporter& reporter,
                                         const Interruption& interruption) {
   if (isSame(phone, app.identifier, file)) return std::nullopt;
   if (!file) return clear(phone, app.identifier);
-  auto failure = giveData(phone.restoreData, app, *file, reporter, interruption);
+  auto failure = giveData(phone, &ApplicationData::restoreData, app, *file, reporter, interruption);
   reporter.report(DataEnded{app.identifier, failure});
   return failure;
 }

@@ -40,7 +40,7 @@ std::optional<Bytes> demotionsOf(const Backup& backup, const RestoreList& list, 
 
 class HandoverInProgress {
  public:
-  HandoverInProgress(const RestorePhone& phone, const Backup& backup, const RestoreList& list,
+  HandoverInProgress(const Phone& phone, const Backup& backup, const RestoreList& list,
                      bool overwriteData, Reporter& reporter, const Interruption& interruption)
       : phone_(phone),
         backup_(backup),
@@ -65,7 +65,7 @@ class HandoverInProgress {
     for (const BackedUpApplication& app : list_.applications()) all.insert(app.identifier);
     waitUntilIdle(phone_, all);
     std::optional<Error> error;
-    auto present = applicationsPresent(phone_.apps, &error);
+    auto present = applicationsPresent(phone_, &error);
     if (!present) {
       breakOff(CannotTellApplications, error);
       return false;
@@ -89,7 +89,7 @@ class HandoverInProgress {
   }
 
   void chooseForClient() {
-    for (const std::string& identifier : phone_.packagesOwedBy(KQClientKiosk)) {
+    for (const std::string& identifier : phone_.activity.packagesOwedBy(KQClientKiosk)) {
       owed_.insert(identifier);
     }
     for (const BackedUpApplication& app : list_.applications()) {
@@ -182,7 +182,7 @@ class HandoverInProgress {
            phone_.files.writeAtomically(path, bytes, error);
   }
 
-  const RestorePhone& phone_;
+  const Phone& phone_;
   const Backup& backup_;
   const RestoreList& list_;
   const bool overwriteData_;
@@ -195,7 +195,7 @@ class HandoverInProgress {
 
 }  // namespace
 
-Handover handOver(const RestorePhone& phone, const Backup& backup, const RestoreList& list,
+Handover handOver(const Phone& phone, const Backup& backup, const RestoreList& list,
                   bool overwriteData, Reporter& reporter, const Interruption& interruption) {
   return HandoverInProgress(phone, backup, list, overwriteData, reporter, interruption).run();
 }

@@ -7,7 +7,7 @@
 
 #include "base/interruption.h"
 #include "host/library/events.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 #include "host/restore/restore_list.h"
 
 namespace appsync::host {
@@ -28,7 +28,7 @@ struct Handover {
 /// carries on. What is installed is left alone, with its data. So is the data that any other
 /// application has of its own, unless `overwriteData`: then the backup's waits for it, and takes
 /// the place of its own when its package comes.
-Handover handOver(const RestorePhone& phone, const Backup& backup, const RestoreList& list,
+Handover handOver(const Phone& phone, const Backup& backup, const RestoreList& list,
                   bool overwriteData, Reporter& reporter, const Interruption& interruption);
 
 }  // namespace appsync::host

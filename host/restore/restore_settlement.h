@@ -6,7 +6,7 @@
 #include <string>
 
 #include "host/library/events.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 #include "host/restore/restore_list.h"
 
 namespace appsync::host {

@@ -107,7 +107,7 @@ bool Session::reconcile(const SyncInput& input) {
 
 bool Session::transfer(const SyncInput& input) {
   std::optional<Error> error;
-  const bool claimed = claimDownloads(phone_.apps, identifiersOf(input.plan, false), &error) ||
+  const bool claimed = claimDownloads(phone_, identifiersOf(input.plan, false), &error) ||
                        breakOff(CannotTellApplications, error);
   if (claimed && !interruption_.requested()) {
     const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
@@ -134,7 +134,8 @@ void Session::findCoordinators(const std::vector<SyncAssetPtr>& assets) {
 /// A completed install shows in the todo list; a cancelled one leaves no trace there, and one that
 /// the phone gave up stays as it is.
 bool Session::isSettled(const std::string& identifier,
-                        const std::optional<std::vector<TodoState>>& todo) {
+                        const std::optional<std::vector<TodoState>>& todo,
+                        const std::set<std::string>& busy) {
   const auto& coordinator = coordinators_.at(identifier);
   const std::optional<Error> error = coordinator ? coordinator->error() : std::nullopt;
   if (!coordinator || error) {
@@ -142,7 +143,7 @@ bool Session::isSettled(const std::string& identifier,
     return true;
   }
   if (!isDownloaded(identifier, todo)) return true;
-  if (phone_.isBusyWith(identifier)) return false;
+  if (busy.contains(identifier)) return false;
   // Nobody will do more for it, unless it was done since the list was read.
   return isDownloaded(identifier, readTodoList(phone_.files, exchange::WorkArea));
 }
@@ -154,8 +155,9 @@ void Session::waitForCoordination(const SyncPlan& plan) {
   const auto installsSettled = [&] {
     if (interruption_.requested()) return true;
     const auto todo = readTodoList(phone_.files, exchange::WorkArea);
-    return std::all_of(sent.begin(), sent.end(),
-                       [&](const std::string& identifier) { return isSettled(identifier, todo); });
+    const std::set<std::string> busy = phone_.activity.busyAmong(sent);
+    return std::ranges::all_of(
+        sent, [&](const std::string& identifier) { return isSettled(identifier, todo, busy); });
   };
   while (!installsSettled()) std::this_thread::sleep_for(InstallPoll);
   waitUntilIdle(phone_, identifiersOf(plan));
@@ -163,17 +165,16 @@ void Session::waitForCoordination(const SyncPlan& plan) {
 
 /// The client never asks for a package whose placeholder stands already.
 bool Session::sweepPlaceholders() {
+  std::optional<Error> error;
+  const auto records = applicationsOf(phone_, &error);
+  if (!records) return breakOff(CannotTellApplications, error);
   std::vector<std::string> leftOver;
-  const auto look = [&](const AppRecord& record, bool&) {
-    if (!record.isPlaceholder || !isLeftOver(phone_, record)) return;
+  for (const AppRecord& record : *records) {
+    if (!record.isPlaceholder || !isLeftOver(phone_, record)) continue;
     const auto progress = phone_.apps.installProgressSync(record);
     const bool onItsWay = progress && progress->installState() == InstallState::Active &&
                           progress->installPhase() == InstallPhase::Installing;
     if (!onItsWay) leftOver.push_back(record.applicationIdentifier);
-  };
-  std::optional<Error> error;
-  if (!phone_.apps.enumerateBundles(BundleKind::All, look, &error)) {
-    return breakOff(CannotTellApplications, error);
   }
   for (const std::string& identifier : leftOver) {
     const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
@@ -197,18 +198,18 @@ void Session::reportDeletions(const PropertyList::Dictionary& inventory) {
 /// The next sync's inventory compares what is there with this list. The client deletes the old one
 /// when a sync ends.
 void Session::writeApplicationsPresent() {
+  std::optional<Error> error;
+  const auto records = applicationsOf(phone_, &error);
   PropertyList::Array present;
-  const auto take = [&](const AppRecord& record, bool&) {
+  for (const AppRecord& record : records.value_or(std::vector<AppRecord>{})) {
     if (record.isApplication && !record.isPlaceholder &&
         record.applicationType == ApplicationTypeUser) {
       present.emplace_back(record.applicationIdentifier);
     }
-  };
-  std::optional<Error> error;
-  const bool read = phone_.apps.enumerateBundles(BundleKind::All, take, &error);
+  }
   const auto bytes =
-      read ? serializePropertyList(std::move(present), PropertyListFormat::Binary, &error)
-           : std::nullopt;
+      records ? serializePropertyList(std::move(present), PropertyListFormat::Binary, &error)
+              : std::nullopt;
   if (!bytes || !phone_.files.writeAtomically(exchange::LastSyncState, *bytes, &error)) {
     breakOff("the list of applications present could not be written", error);
   }

@@ -35,7 +35,8 @@ class Session : Visit {
   bool reconcile(const SyncInput& input);
   bool transfer(const SyncInput& input);
   void findCoordinators(const std::vector<SyncAssetPtr>& assets);
-  bool isSettled(const std::string& identifier, const std::optional<std::vector<TodoState>>& todo);
+  bool isSettled(const std::string& identifier, const std::optional<std::vector<TodoState>>& todo,
+                 const std::set<std::string>& busy);
   void waitForCoordination(const SyncPlan& plan);
 
   bool sweepPlaceholders();

@@ -6,16 +6,16 @@ namespace appsync::host {
 
 InstallWatch::InstallWatch(const Phone& phone, Reporter& reporter, Interruption& interruption)
     : phone_(phone), reporter_(reporter), interruption_(interruption) {
-  phone_.setWatcher(this);
+  phone_.activity.setWatcher(this);
   interruption_.setListener([this] {
     reporter_.report(Interrupted{});
-    phone_.hurry();
+    phone_.activity.hurry();
   });
 }
 
 InstallWatch::~InstallWatch() {
   interruption_.setListener({});
-  phone_.setWatcher(nullptr);
+  phone_.activity.setWatcher(nullptr);
 }
 
 void InstallWatch::assertionDenied(std::string_view bundleId) noexcept {

@@ -9,13 +9,13 @@
 
 #include "base/interruption.h"
 #include "host/library/events.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 
 namespace appsync::host {
 
 /// Watches a phone for as long as it lives: tells of its installs, remembers why some failed, and
 /// hurries the phone when the person interrupts. Borrows everything. Called from any thread.
-class InstallWatch : public device::DeviceWatcher {
+class InstallWatch : public PhoneWatcher {
  public:
   InstallWatch(const Phone& phone, Reporter& reporter, Interruption& interruption);
   ~InstallWatch() override;

@@ -10,7 +10,7 @@
 
 #include "base/interruption.h"
 #include "host/library/events.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 #include "host/phone/transfer_queue.h"
 #include "host/transfer/package_delivery.h"
 #include "host/transfer/package_transfer.h"
@@ -22,9 +22,9 @@ inline constexpr const char* InterruptedTransfer = "interrupted before it was se
 
 /// A package that is to be sent, and what for.
 struct Shipment {
-  SyncAssetPtr asset;                       ///< stands for it in the queue
+  SyncAssetPtr asset;                     ///< stands for it in the queue
   const PackageFacts* package = nullptr;  ///< without one it fails when its turn comes
-  std::string target;                       ///< file of the phone
+  std::string target;                     ///< file of the phone
   std::unique_ptr<PackageDelivery> delivery;
 };
 

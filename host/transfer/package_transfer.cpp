@@ -19,7 +19,7 @@ bool PackageTransfer::open(const Phone& phone, std::optional<Error>* error) {
   if (!file_ || ::fstat(file_.get(), &status) != 0) return fail(errno, error);
   if (!S_ISREG(status.st_mode)) return fail(ENOEXEC, error);
   total_ = static_cast<std::uint64_t>(status.st_size);
-  receiver_ = phone.receiveFile(target_, error);
+  receiver_ = phone.incoming.receiveFile(target_, error);
   return receiver_ != nullptr;
 }
 

@@ -7,7 +7,7 @@
 #include <string>
 
 #include "base/file_descriptor.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 
 namespace appsync::host {
 
@@ -38,7 +38,7 @@ class PackageTransfer {
   const std::filesystem::path source_;
   const std::string target_;
   FileDescriptor file_;
-  std::unique_ptr<device::FileReceiver> receiver_;
+  std::unique_ptr<FileReceiver> receiver_;
   Bytes chunk_;
   std::uint64_t sent_ = 0;
   std::uint64_t total_ = 0;

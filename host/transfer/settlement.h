@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "host/library/events.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 #include "host/transfer/package_sender.h"
 
 namespace appsync::host {

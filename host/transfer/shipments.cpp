@@ -35,7 +35,7 @@ std::vector<Shipment> shipmentsTo(SyncClient& client, const std::vector<SyncAsse
 }
 
 std::set<std::string> waitingForStore(const Phone& phone, const ApplicationsPresent& present) {
-  const std::vector<std::string> owed = phone.packagesOwedBy(KQClientKiosk);
+  const std::vector<std::string> owed = phone.activity.packagesOwedBy(KQClientKiosk);
   std::set<std::string> waiting(owed.begin(), owed.end());
   const Demotions demotions(phone.files);
   for (const auto& [identifier, record] : present.placeholders) {
@@ -51,7 +51,7 @@ std::vector<Shipment> shipmentsFromStore(HostProcess& host, const Phone& phone,
                                          const Library& catalogue,
                                          std::optional<InstallType> origin,
                                          const std::set<std::string>& identifiers) {
-  const std::vector<std::string> owed = phone.packagesOwedBy(KQClientKiosk);
+  const std::vector<std::string> owed = phone.activity.packagesOwedBy(KQClientKiosk);
   std::vector<Shipment> shipments;
   for (const std::string& identifier : identifiers) {
     const auto found = present.placeholders.find(identifier);

@@ -6,7 +6,7 @@
 #include <vector>
 
 #include "host/library/library.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 #include "host/phone/sync_host.h"
 #include "host/transfer/package_sender.h"
 #include "platform/sync_client.h"

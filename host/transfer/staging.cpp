@@ -142,7 +142,7 @@ std::set<std::string> everSent(const Phone& phone) {
     if (!todo) continue;
     for (const TodoState& entry : *todo) identifiers.insert(entry.identifier);
   }
-  const auto present = applicationsPresent(phone.apps, nullptr);
+  const auto present = applicationsPresent(phone, nullptr);
   if (!present) return identifiers;  // what is left over waits for the next sync
   identifiers.insert(present->installed.begin(), present->installed.end());
   for (const auto& placeholder : present->placeholders) identifiers.insert(placeholder.first);
@@ -154,7 +154,7 @@ void removeLeftOverPackages(const Phone& phone, const std::set<std::string>& sen
   if (!restoreState) return;
   const std::set<std::string> remembered = rememberedPackages(*restoreState);
   for (const std::string_view directory : {exchange::StagingRoot, exchange::Downloads}) {
-    const auto names = phone.namesIn(directory, nullptr);
+    const auto names = phone.incoming.namesIn(directory, nullptr);
     if (!names) continue;
     for (const std::string& name : *names) {
       const std::string path = joinPath(directory, name);

@@ -6,7 +6,7 @@
 
 #include "host/library/library.h"
 #include "host/library/sync_plan.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 
 namespace appsync::host {
 

@@ -33,18 +33,20 @@ void Visit::sendToClient(const std::vector<SyncAssetPtr>& assets, const Library&
   sender_.send(shipmentsTo(client_, assets, library), InterruptedTransfer);
 }
 
-void Visit::bringFromStore(const ApplicationsPresent& present, const Library& catalogue, std::optional<InstallType> origin,
+void Visit::bringFromStore(const ApplicationsPresent& present, const Library& catalogue,
+                           std::optional<InstallType> origin,
                            const std::set<std::string>& identifiers,
                            std::string_view ifInterrupted) {
   PackageSender sender = makeSender();
-  sender.send(shipmentsFromStore(host_, phone_, present, catalogue, origin, identifiers), ifInterrupted);
+  sender.send(shipmentsFromStore(host_, phone_, present, catalogue, origin, identifiers),
+              ifInterrupted);
   sender.settle();
   note(sender.outcome().failures);
 }
 
 std::optional<ApplicationsPresent> Visit::applicationsNow() {
   std::optional<Error> error;
-  auto present = applicationsPresent(phone_.apps, &error);
+  auto present = applicationsPresent(phone_, &error);
   if (!present) breakOff(CannotTellApplications, error);
   return present;
 }

@@ -9,7 +9,7 @@
 
 #include "base/interruption.h"
 #include "host/library/events.h"
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 #include "host/phone/sync_host.h"
 #include "host/transfer/install_watch.h"
 #include "host/transfer/package_sender.h"
@@ -39,8 +39,9 @@ class Visit {
   /// Sends what the client asks for.
   void sendToClient(const std::vector<SyncAssetPtr>& assets, const Library& library);
   /// Brings what waits for the store, and notes what failed. See shipmentsFromStore.
-  void bringFromStore(const ApplicationsPresent& present, const Library& catalogue, std::optional<InstallType> origin,
-                      const std::set<std::string>& identifiers, std::string_view ifInterrupted);
+  void bringFromStore(const ApplicationsPresent& present, const Library& catalogue,
+                      std::optional<InstallType> origin, const std::set<std::string>& identifiers,
+                      std::string_view ifInterrupted);
 
   /// nullopt when they cannot be told, which breaks the visit off.
   std::optional<ApplicationsPresent> applicationsNow();

@@ -250,9 +250,8 @@ TEST_F(Metrics, SumUpTheUsersApplicationsAndNothingIsPurgeable) {
 class GenerousRegistry : public fakes::FaultyAppRegistry {
  public:
   using FaultyAppRegistry::FaultyAppRegistry;
-  bool enumerateBundles(BundleKind, const Visitor& visitor,
-                        std::optional<Error>* error) noexcept override {
-    return FaultyAppRegistry::enumerateBundles(BundleKind::All, visitor, error);
+  void enumerateBundles(BundleKind, const Visitor& visitor) noexcept override {
+    FaultyAppRegistry::enumerateBundles(BundleKind::All, visitor);
   }
 };
 

@@ -130,7 +130,7 @@ class EmbeddedPhone : public Phone {
     return device::EmbeddedDevice::cancel(folder_, identifier, problem, nullptr);
   }
   void settle(std::string_view identifier) override {
-    while (device_->isBusyWith(identifier)) std::this_thread::yield();
+    while (!device_->busyAmong({std::string(identifier)}).empty()) std::this_thread::yield();
   }
 
  private:

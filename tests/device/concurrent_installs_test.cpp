@@ -36,7 +36,7 @@ class ConcurrentInstallsTest : public DeviceTest {
 };
 
 /// Counts how many installs have finished while others had not begun to return.
-class CountingWatcher final : public DeviceWatcher {
+class CountingWatcher final : public PhoneWatcher {
  public:
   void installFinished(std::string_view, const std::optional<Error>& error) noexcept override {
     error ? ++refused : ++installed;

@@ -233,7 +233,7 @@ TEST_F(CoordinationObjectsTest, TheDeviceIsBusyUntilACompletionHasReturned) {
     released.wait();
   });
   called.wait();
-  EXPECT_TRUE(device->isBusyWith(Id));
+  EXPECT_EQ(device->busyAmong({std::string(Id)}), std::set<std::string>{std::string(Id)});
   released.count_down();
   waitUntilIdle(Id);
 }

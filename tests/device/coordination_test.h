@@ -13,7 +13,7 @@ namespace appsync::device {
 using fakes::EventRecorder;
 
 /// Waits for the device's watcher to be told of a denied assertion or a finished install.
-class WaitingWatcher : public DeviceWatcher {
+class WaitingWatcher : public PhoneWatcher {
  public:
   void assertionDenied(std::string_view bundleId) noexcept override;
   void installFinished(std::string_view bundleId,

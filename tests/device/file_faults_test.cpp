@@ -113,20 +113,14 @@ TEST_F(FileFaultsTest, WaitingDataAndWhatItReplacesAreNeverLostBetween) {
   putFile(Notes, "older");
   putFile(WaitingNotes, "from the backup");
   const FileLocation package = stage(archive("1.0"));
-  bool done = false;
-  sweep(
-      [&] {
-        done = install(package);
-        openAnew();
-      },
-      [&] {
-        EXPECT_EQ(textAt(Notes), done ? "from the backup" : "older");
-        EXPECT_EQ(done, !device->files().fileExists(WaitingNotes));
-        EXPECT_TRUE(done || install(package));
-        EXPECT_EQ(textAt(Notes), "from the backup");
-        EXPECT_EQ(device->namesIn(Containers::DataDirectory, nullptr), Lines{std::string(Id)});
-      });
-  EXPECT_TRUE(done);
+  sweep([&] { return install(package); },
+        [&](bool done) {
+          EXPECT_EQ(textAt(Notes), done ? "from the backup" : "older");
+          EXPECT_EQ(done, !device->files().fileExists(WaitingNotes));
+          EXPECT_TRUE(done || install(package));
+          EXPECT_EQ(textAt(Notes), "from the backup");
+          EXPECT_EQ(device->namesIn(Containers::DataDirectory, nullptr), Lines{std::string(Id)});
+        });
 }
 
 TEST_F(FileFaultsTest, AnInstallThatIsTriedAgainFindsBothDataAsTheyWere) {
@@ -134,9 +128,8 @@ TEST_F(FileFaultsTest, AnInstallThatIsTriedAgainFindsBothDataAsTheyWere) {
   putFile(Notes, "older");
   putFile(WaitingNotes, "from the backup");
   const FileLocation package = stage(archive("1.0"));
-  bool done = false;
-  sweep([&] { done = install(package) || install(package); },
-        [&] {
+  sweep([&] { return install(package) || install(package); },
+        [&](bool done) {
           EXPECT_TRUE(done);
           EXPECT_EQ(textAt(Notes), "from the backup");
           EXPECT_EQ(device->namesIn(Containers::DataDirectory, nullptr), Lines{std::string(Id)});

@@ -114,7 +114,7 @@ TEST_F(HomeScreenTest, AnAssertionIsDeniedWhileTheApplicationIsInTheForeground) 
 }
 
 TEST_F(HomeScreenTest, TheWatcherHearsOfADenial) {
-  struct Watcher final : DeviceWatcher {
+  struct Watcher final : PhoneWatcher {
     void assertionDenied(std::string_view id) noexcept override { denied.emplace_back(id); }
     Lines denied;
   } watcher;

@@ -18,7 +18,7 @@ class PackageInstallTest : public DeviceTest {
   }
 };
 
-class RecordingWatcher final : public DeviceWatcher {
+class RecordingWatcher final : public PhoneWatcher {
  public:
   void installFinished(std::string_view bundleId,
                        const std::optional<Error>& error) noexcept override {

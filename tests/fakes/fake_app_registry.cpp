@@ -40,8 +40,7 @@ std::optional<AppRecord> FakeAppRegistry::recordForIdentifier(std::string_view b
   return record ? record : placeholder(bundleId);
 }
 
-bool FakeAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor,
-                                       std::optional<Error>*) noexcept {
+void FakeAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept {
   trace_.add(TraceQuery,
              callText("AppRegistry.enumerateBundles", static_cast<std::uint32_t>(kind)));
   std::vector<AppRecord> records;
@@ -58,9 +57,8 @@ bool FakeAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor,
   bool stop = false;
   for (const AppRecord& record : records) {
     visitor(record, stop);
-    if (stop) break;
+    if (stop) return;
   }
-  return true;
 }
 
 bool FakeAppRegistry::installApplication(const FileLocation& package,

@@ -32,8 +32,7 @@ class FakeAppRegistry : public AppRegistry {
   bool isApplicationInstalled(std::string_view bundleId) noexcept override;
   std::optional<AppRecord> recordForIdentifier(std::string_view bundleId,
                                                bool placeholder) noexcept override;
-  bool enumerateBundles(BundleKind kind, const Visitor& visitor,
-                        std::optional<Error>* error = nullptr) noexcept override;
+  void enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept override;
   bool installApplication(const FileLocation& package, const PropertyList::Dictionary& options,
                           std::optional<Error>* error) noexcept override;
   bool uninstallApplication(std::string_view bundleId,

@@ -25,10 +25,8 @@ class FaultyAppRegistry : public AppRegistry {
     if (plan_.next("AppRegistry.recordForIdentifier", bundleId)) return std::nullopt;
     return registry_.recordForIdentifier(bundleId, placeholder);
   }
-  bool enumerateBundles(BundleKind kind, const Visitor& visitor,
-                        std::optional<Error>* error) noexcept override {
-    return !plan_.strikes("AppRegistry.enumerateBundles", "", error) &&
-           registry_.enumerateBundles(kind, visitor, error);
+  void enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept override {
+    registry_.enumerateBundles(kind, visitor);
   }
   bool installApplication(const FileLocation& package, const PropertyList::Dictionary& options,
                           std::optional<Error>* error) noexcept override {

@@ -3,7 +3,6 @@
 #include <cerrno>
 
 #include "host/backup/backup.h"
-#include "host/phone/phone.h"
 #include "tests/host/session_fixture.h"
 #include "tests/test_pch.h"
 
@@ -36,52 +35,11 @@ class BackupRunTest : public ::testing::Test {
  protected:
   BackupRunTest() { phone_.homeScreen.setOrder({"com.b", "com.a"}); }
 
-  BackupPhone backupPhone() {
-    return {phone_.platform(),
-            [this](std::optional<Error>* error) { return giveApplications(error); },
-            [this](std::string_view identifier, const DataSink& sink, std::optional<Error>* error) {
-              return giveData(identifier, sink, error);
-            },
-            [this](std::string_view identifier, std::optional<Error>* error) {
-              const auto blob = blobs_.find(identifier);
-              if (identifier == unreadableBlob_) setError(error, Error::posix(EIO));
-              return blob == blobs_.end() ? std::nullopt : std::optional(toBytes(blob->second));
-            },
-            [this](std::string_view identifier) { return isBusyWith_ && isBusyWith_(identifier); }};
-  }
-
-  /// As a device gives them: sorted, placeholders last.
-  std::vector<AppRecord> giveApplications(std::optional<Error>* error) {
-    std::vector<AppRecord> all;
-    if (registryFailure_) return setError(error, *registryFailure_), all;
-    phone_.appRegistry.enumerateBundles(
-        BundleKind::All, [&](const AppRecord& record, bool&) { all.push_back(record); });
-    std::ranges::sort(all, {}, [](const AppRecord& record) {
-      return std::pair(record.applicationIdentifier, record.isPlaceholder);
-    });
-    return all;
-  }
-
-  bool giveData(std::string_view identifier, const DataSink& sink, std::optional<Error>* error) {
-    const auto found = data_.find(identifier);
-    const std::string_view data = found == data_.end() ? "" : std::string_view(found->second);
-    for (std::size_t begin = 0; begin < data.size(); begin += 1000) {
-      if (onPiece_) onPiece_(begin);
-      if (sink(asBytes(data.substr(begin, 1000)))) continue;
-      setError(error, Error::posix(ECANCELED));
-      return false;
-    }
-    const auto failure = dataFailures_.find(identifier);
-    if (failure == dataFailures_.end()) return true;
-    setError(error, failure->second);
-    return false;
-  }
-
   BackupSummary backUp(const BackupOptions& options = {}) {
     BackupProblem problem;
     const auto writer = BackupWriter::open(target_, problem);
     EXPECT_TRUE(writer) << problem.text;
-    const BackupPhone phone = backupPhone();
+    const Phone phone = hostsView_.phone();
     return BackupRun(client_, phone, *writer, reporter_, interruption_).run(options);
   }
 
@@ -137,13 +95,8 @@ class BackupRunTest : public ::testing::Test {
   RecordingReporter reporter_;
   Folder folder_;
   const fs::path target_ = folder_ / "backup";
-  std::map<std::string, std::string, std::less<>> data_;
-  std::map<std::string, std::string, std::less<>> blobs_;
-  std::map<std::string, Error, std::less<>> dataFailures_;
-  std::string unreadableBlob_;
-  std::optional<Error> registryFailure_;
-  std::function<bool(std::string_view)> isBusyWith_;
-  std::function<void(std::size_t)> onPiece_;
+  testing::FakePhone hostsView_{phone_};
+  testing::FakePhone::Texts& data_ = hostsView_.owned;
 };
 
 TEST_F(BackupRunTest, SavesEveryApplicationOfTheUserAndTheHomeScreen) {
@@ -246,7 +199,7 @@ TEST_F(BackupRunTest, AnApplicationThatTellsNothingOfItselfStillComesBack) {
 TEST_F(BackupRunTest, SavesTheOpaqueBlobWhereThereIsOne) {
   phone_.appRegistry.seedInstalled("com.a");
   phone_.appRegistry.seedInstalled("com.b");
-  blobs_["com.a"] = "blob";
+  hostsView_.blobs["com.a"] = "blob";
   expectMade(backUp());
   EXPECT_EQ(valueOf("com.a", "ApplicationSINF"), "blob");
   EXPECT_EQ(valueOf("com.b", "ApplicationSINF"), "none");
@@ -341,7 +294,7 @@ TEST_F(BackupRunTest, AnApplicationWhoseDataCannotBeReadFailsAlone) {
     phone_.appRegistry.seedInstalled(identifier);
     data_[identifier] = std::string(5000, 'd');
   }
-  dataFailures_["com.b"] = Error::posix(EACCES, "notes.txt");
+  hostsView_.dataFailures["com.b"] = Error::posix(EACCES, "notes.txt");
   const BackupSummary summary = backUp();
   EXPECT_TRUE(summary.made);
   EXPECT_EQ(summary.saved, (Lines{"com.a", "com.c"}));
@@ -386,10 +339,10 @@ TEST_F(BackupRunTest, NothingThatCannotBeReadIsTakenForMissing) {
   EXPECT_EQ(reasonFor("FileManager.contentsAtPath", "Icon.png"), "com.placeholder" + icon);
   EXPECT_EQ(reasonFor("FileManager.contentsAtPath", "Info.plist"), "com.installed" + icon);
   EXPECT_EQ(reasonFor("FileManager.attributesOfItem", "drawn.png"), "com.installed" + icon);
-  unreadableBlob_ = "com.installed";
+  hostsView_.unreadableBlob = "com.installed";
   EXPECT_EQ(reasonFor(nullptr, "blob"),
             "com.installed: its opaque blob cannot be read: Input/output error");
-  unreadableBlob_.clear();
+  hostsView_.unreadableBlob.clear();
   expectMade(backUp());
 }
 
@@ -399,7 +352,7 @@ TEST_F(BackupRunTest, AListThatCannotBeReadEndsTheBackup) {
   phone_.faults.failWhere("FileManager.contentsAtPath", "DemotedApps.plist", Error::posix(EIO));
   EXPECT_FALSE(backUp().made);
   phone_.faults.clear();
-  registryFailure_ = Error::posix(EMFILE);
+  phone_.faults.failEvery("phone.applications", Error::posix(EMFILE));
   EXPECT_FALSE(backUp({.allowMissing = true}).made);
   EXPECT_EQ(reporter_.lines("broken"),
             (Lines{"broken the list of demoted applications cannot be read: Input/output error",
@@ -414,7 +367,7 @@ TEST_F(BackupRunTest, AnOlderBackupStaysWhenTheNewOneWouldLackAnApplicationOfIt)
   expectMade(backUp());
   phone_.appRegistry.seedInstalled("com.new");
   for (const char* identifier : {"com.a", "com.c", "com.new"}) {
-    dataFailures_.emplace(identifier, Error::posix(EACCES));
+    hostsView_.dataFailures.emplace(identifier, Error::posix(EACCES));
   }
   const BackupSummary summary = backUp();
   EXPECT_FALSE(summary.made);
@@ -445,7 +398,7 @@ TEST_F(BackupRunTest, AnUnwritableTargetEndsTheBackupAndLeavesTheOlderOne) {
   expectMade(backUp());
   phone_.appRegistry.seedInstalled("com.b");
   data_["com.a"] = std::string(5000, 'd');
-  onPiece_ = [&](std::size_t) {  // somebody takes the folder away
+  hostsView_.onPiece = [&](std::size_t) {  // somebody takes the folder away
     for (const auto& item : fs::directory_iterator(folder_.path())) {
       if (item.path().filename() != "backup") fs::remove_all(item);
     }
@@ -462,7 +415,7 @@ TEST_F(BackupRunTest, AnInterruptionLeavesTheOlderBackup) {
   expectMade(backUp());
   phone_.appRegistry.seedInstalled("com.b");
   data_["com.a"] = std::string(5000, 'd');
-  onPiece_ = [&](std::size_t offset) {
+  hostsView_.onPiece = [&](std::size_t offset) {
     if (offset == 2000) interruption_.request();
   };
   const BackupSummary summary = backUp();
@@ -477,7 +430,7 @@ TEST_F(BackupRunTest, WaitsForWhatThePhoneIsBusyWith) {
   phone_.appRegistry.seedPlaceholder("com.a", InstallType::Sync);
   phone_.appRegistry.seedInstalled("com.b");
   int asked = 0;
-  isBusyWith_ = [&](std::string_view identifier) {
+  hostsView_.isBusyWith = [&](std::string_view identifier) {
     if (identifier != "com.b" || ++asked < 3) return identifier == "com.b";
     phone_.appRegistry.seedInstalled("com.a");
     return false;
@@ -488,7 +441,7 @@ TEST_F(BackupRunTest, WaitsForWhatThePhoneIsBusyWith) {
 
 TEST_F(BackupRunTest, AnInterruptionEndsTheWaiting) {
   phone_.appRegistry.seedInstalled("com.a");
-  isBusyWith_ = [&](std::string_view) {
+  hostsView_.isBusyWith = [&](std::string_view) {
     interruption_.request();
     return true;
   };

@@ -2,9 +2,10 @@
 
 #include <gtest/gtest.h>
 
-#include "host/phone/phone.h"
+#include "device/embedded_device.h"
 #include "icons/image_encoder.h"
 #include "platform/property_list_codec.h"
+#include "platform/sync_files.h"
 #include "tests/host/host_files.h"
 
 namespace appsync::host {
@@ -89,7 +90,7 @@ class HomeScreenIconsTest : public ::testing::Test {
   }
 
   std::optional<ScreenIcon> shown(const std::string& identifier) {
-    return HomeScreenIcons(*phone, Side).iconOf(identifier);
+    return HomeScreenIcons(phone->phone(), Side).iconOf(identifier);
   }
 
   testing::Folder folder;
@@ -185,7 +186,7 @@ TEST_F(HomeScreenIconsTest, ProgressIsSeenByAnotherProcessThatOnlyReads) {
   const auto reader =
       device::EmbeddedDevice::open(folder / "phone", device::Access::ReadOnly, problem);
   ASSERT_TRUE(reader) << problem.message;
-  EXPECT_EQ(HomeScreenIcons(*reader, Side).iconOf("com.new")->state, State::Loading);
+  EXPECT_EQ(HomeScreenIcons(reader->phone(), Side).iconOf("com.new")->state, State::Loading);
 }
 
 TEST_F(HomeScreenIconsTest, AnInstallThatWasBrokenOffIsPaused) {

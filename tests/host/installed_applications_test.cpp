@@ -16,7 +16,7 @@ class InstalledApplicationsTest : public RestoreTest {
  protected:
   std::vector<std::string> found() {
     std::vector<std::string> lines;
-    const auto all = installedApplications(phoneForHost(), problem);
+    const auto all = installedApplications(hostsView.phone(), problem);
     if (!all) return {problem};
     for (const auto& application : *all) {
       lines.push_back(
@@ -104,7 +104,7 @@ TEST_F(InstalledApplicationsTest, AreNotToldWhenItCannotBeSeenWhatIsDemoted) {
 
 TEST_F(InstalledApplicationsTest, AreNotToldWhenTheRegistryCannotBeRead) {
   phone.appRegistry.seedInstalled("com.a", "1.0");
-  phone.faults.failEvery("AppRegistry.enumerateBundles", Error::posix(EMFILE));
+  phone.faults.failEvery("phone.applications", Error::posix(EMFILE));
   EXPECT_THAT(found(), ElementsAre("the phone's applications cannot be told: Too many open files"));
 }
 

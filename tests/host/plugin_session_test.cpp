@@ -30,7 +30,7 @@ class PluginSessionTest : public ::testing::Test {
                                                     SyncHostClientID, true, nullptr, nullptr);
     ASSERT_TRUE(coordinator);
     ASSERT_TRUE(coordinator->cancel(Error::posix(ECANCELED), KQClientKiosk));
-    ASSERT_FALSE(device->isBusyWith(identifier));
+    ASSERT_TRUE(device->busyAmong({std::string(identifier)}).empty());
   }
 
   bool logMentions(std::string_view text) {
@@ -49,14 +49,14 @@ class PluginSessionTest : public ::testing::Test {
 TEST_F(PluginSessionTest, TheClientGetsWhatAKilledSyncLeftAndCanBeWaitedFor) {
   leaveAnEvent("com.a");
   PluginSession session(*plugin, SyncHostBundleIdentifier, *device, interruption, nullptr);
-  while (device->isBusyWith("com.a")) std::this_thread::yield();
+  while (!device->busyAmong({"com.a"}).empty()) std::this_thread::yield();
   EXPECT_TRUE(logMentions("com.a"));
 }
 
 TEST_F(PluginSessionTest, AToolThatOnlyAsksGetsNoEvents) {
   leaveAnEvent("com.a");
   PluginSession session(*plugin, QueryToolBundleIdentifier, *device, interruption, nullptr);
-  EXPECT_FALSE(device->isBusyWith("com.a"));
+  EXPECT_TRUE(device->busyAmong({"com.a"}).empty());
   EXPECT_FALSE(logMentions("com.a"));
 }
 

@@ -79,6 +79,7 @@ void RestoringClient::assetTransferSucceeded(const SyncAssetPtr& asset, bool suc
 }
 
 RestoreTest::RestoreTest() {
+  hostsView.onWatcher = [this](PhoneWatcher* watcher) { client.watcher = watcher; };
   isBusyWith = [this](std::string_view identifier) {
     settleCoordinated(std::string(identifier));
     return false;
@@ -107,44 +108,6 @@ Backup RestoreTest::backup() {
   EXPECT_TRUE(written && writer->finish()) << writer->problem();
   std::string problem;
   return readBackup(backups / "backup", problem).value();
-}
-
-RestorePhone RestoreTest::restorePhone() {
-  Phone base = phoneForHost();
-  base.setWatcher = [this](device::DeviceWatcher* watcher) { client.watcher = watcher; };
-  return {
-      std::move(base), phone.homeScreen,
-      [this](std::string_view identifier, const DataSource& source, std::optional<Error>* error) {
-        if (phone.faults.strikes("phone.restoreData", identifier, error)) return false;
-        std::string bytes;
-        std::array<std::uint8_t, 1000> piece{};
-        std::int64_t count = 0;
-        while ((count = source(piece.data(), piece.size())) > 0) {
-          bytes.append(piece.begin(), piece.begin() + count);
-        }
-        if (count < 0) {
-          setError(error, Error::posix(ECANCELED));
-          return false;
-        }
-        phone.trace.add(fakes::TraceCall,
-                        fmt::format("phone.restoreData({}, {})", identifier, bytes));
-        waiting.erase(std::string(identifier));
-        if (!bytes.empty()) waiting.emplace(identifier, bytes);
-        return true;
-      },
-      [this](std::string_view identifier, const DataSource& source, std::optional<Error>* error) {
-        if (phone.faults.strikes("phone.overwriteData", identifier, error)) return false;
-        std::string bytes(1000, 0);
-        const std::int64_t count =
-            source(reinterpret_cast<std::uint8_t*>(bytes.data()), bytes.size());
-        if (count < 0) return false;
-        bytes.resize(static_cast<std::size_t>(count));
-        EXPECT_EQ(source(nullptr, 0), 0);
-        phone.trace.add(fakes::TraceCall,
-                        fmt::format("phone.overwriteData({}, {})", identifier, bytes));
-        owned[std::string(identifier)] = bytes;
-        return true;
-      }};
 }
 
 /// A device installs a package that is complete by itself.
@@ -177,7 +140,7 @@ std::string RestoreTest::restore() {
   }
   if (packages) input.packages = readLibrary(folder.path(), problem).value();
   if (store) input.catalogue = readLibrary(folder.path(), problem).value();
-  Restore session(client, host, restorePhone(), reporter, interruption);
+  Restore session(client, host, hostsView.phone(), reporter, interruption);
   return text(session.run(input).summary);
 }
 

@@ -11,9 +11,7 @@ namespace appsync::host::testing {
 /// a package in mind whose data waits until that data is delivered.
 class RestoringClient : public RecordingClient {
  public:
-  using Waiting = std::map<std::string, std::string>;
-
-  RestoringClient(fakes::FakePlatform& phone, SyncHost& syncHost, const Waiting& waiting,
+  RestoringClient(fakes::FakePlatform& phone, SyncHost& syncHost, const FakePhone::Texts& waiting,
                   const bool& coordination)
       : RecordingClient(phone, syncHost),
         fake_(phone),
@@ -31,7 +29,7 @@ class RestoringClient : public RecordingClient {
   void makePlaceholder(const std::string& identifier, const PropertyList& entry);
 
   fakes::FakePlatform& fake_;
-  const Waiting& waiting_;
+  const FakePhone::Texts& waiting_;
   const bool& coordination_;
 };
 
@@ -44,7 +42,6 @@ class RestoreTest : public SessionTest {
   void backUp(const std::string& identifier, const std::string& data = {}, bool demoted = false);
   /// The backup so far, read from its folder.
   Backup backup();
-  RestorePhone restorePhone();
   /// A whole restore; the summary as text.
   std::string restore();
 

@@ -19,7 +19,7 @@ class HandoverTest : public RestoreTest {
     std::string problem;
     const Backup read = backup();
     phone.trace.clear();
-    return host::handOver(restorePhone(), read, RestoreList::of(read, problem).value(),
+    return host::handOver(hostsView.phone(), read, RestoreList::of(read, problem).value(),
                           overwriteData, reporter, interruption);
   }
   std::string demotionsOnPhone() {
@@ -127,10 +127,10 @@ TEST_F(HandoverTest, OverwritesTheDataOfADemotedApplicationWhenAsked) {
 
 TEST_F(HandoverTest, GivesNothingWhenTheApplicationsCannotBeTold) {
   backUp("com.a", "data of a");
-  phone.faults.failEvery("AppRegistry.enumerateBundles", Error::posix(EMFILE));
+  phone.faults.failEvery("phone.applications", Error::posix(EMFILE));
   const Handover given = handOver();
   EXPECT_EQ(given.broken, "the phone's applications cannot be told: Too many open files");
-  EXPECT_THAT(trace(), ElementsAre("fault AppRegistry.enumerateBundles()"));
+  EXPECT_THAT(trace(), ElementsAre("fault phone.applications()"));
 }
 
 TEST_F(HandoverTest, LeavesOutAnApplicationWhoseDataCannotBeLookedAt) {
@@ -161,7 +161,7 @@ TEST_F(HandoverTest, LeavesOutAnApplicationWhoseDataIsDamaged) {
   std::string problem;
   const Backup read = readBackup(backups / "backup", problem).value();
   const Handover given =
-      host::handOver(restorePhone(), read, RestoreList::of(read, problem).value(), overwriteData,
+      host::handOver(hostsView.phone(), read, RestoreList::of(read, problem).value(), overwriteData,
                      reporter, interruption);
   EXPECT_THAT(given.failures,
               ElementsAre(Pair("com.b",
@@ -250,7 +250,7 @@ TEST_F(HandoverTest, GoesOnWithoutALayoutThatTheHomeScreenRefuses) {
   std::string problem;
   const RestoreList list = RestoreList::of(damaged, problem).value();
   const Handover given =
-      host::handOver(restorePhone(), damaged, list, overwriteData, reporter, interruption);
+      host::handOver(hostsView.phone(), damaged, list, overwriteData, reporter, interruption);
   EXPECT_FALSE(given.broken);
   EXPECT_THAT(namesOnList(), ElementsAre("com.a"));
   EXPECT_THAT(given.layoutRefused.value_or(""),

@@ -166,19 +166,6 @@ void RecordingClient::syncEndedWithSuccess(bool success) noexcept {
   note(fmt::format("syncEndedWithSuccess({})", success));
 }
 
-bool FakeReceiver::append(ByteView bytes, std::optional<Error>* error) noexcept {
-  if (phone_.faults.strikes("phone.append", path_, error)) return false;
-  received_.insert(received_.end(), bytes.begin(), bytes.end());
-  return true;
-}
-
-bool FakeReceiver::finish(std::optional<Error>* error) noexcept {
-  if (phone_.faults.strikes("phone.finish", path_, error)) return false;
-  phone_.trace.add(fakes::TraceFile, fmt::format("phone.received({})", path_));
-  phone_.files.putFile(path_, received_);
-  return true;
-}
-
 void RecordingReporter::report(const Event& event) {
   const std::lock_guard lock(mutex_);
   lines_.push_back(lineOf(event));
@@ -214,57 +201,17 @@ std::string text(const Summary& summary) {
   return result;
 }
 
-Phone SessionTest::phoneForHost() {
-  return {phone.faultyFiles,
-          phone.faultyRegistry,
-          [this](std::string_view path,
-                 std::optional<Error>* error) -> std::unique_ptr<device::FileReceiver> {
-            if (phone.faults.strikes("phone.receive", path, error)) return nullptr;
-            phone.trace.add(fakes::TraceFile, fmt::format("phone.receive({})", path));
-            return std::make_unique<FakeReceiver>(phone, std::string(path));
-          },
-          [this](std::string_view directory, std::optional<Error>*) {
-            std::vector<std::string> names;
-            const std::string parent = std::string(directory) + "/";
-            for (const auto& file : phone.files.files()) {
-              const bool below = file.first.starts_with(parent);
-              const std::string name = below ? file.first.substr(parent.size()) : "";
-              if (below && name.find('/') == std::string::npos) names.push_back(name);
-            }
-            return std::optional(names);
-          },
-          [this](device::DeviceWatcher* watcher) { client.watcher = watcher; },
-          [this] { phone.trace.add(fakes::TraceCall, "phone.hurry"); },
-          [this](std::string_view bundleId) { return isBusyWith && isBusyWith(bundleId); },
-          [this](std::string_view identifier, const DataSink& sink, std::optional<Error>* error) {
-            if (phone.faults.strikes("phone.saveData", identifier, error)) return false;
-            const auto& all = waiting.contains(std::string(identifier)) ? waiting : owned;
-            const auto found = all.find(std::string(identifier));
-            return found == all.end() || sink(toBytes(found->second));
-          },
-          [this](CoordinationClientId responsible) { return owedBy(responsible); },
-          coordination ? &phone.installCoordination : nullptr};
-}
-
-std::vector<std::string> SessionTest::owedBy(CoordinationClientId responsible) {
-  std::vector<std::string> owed;
-  for (const std::string& identifier : phone.appRegistry.placeholderIdentifiers()) {
-    const auto coordinator = phone.installCoordination.coordinator(identifier);
-    if (!coordinator || coordinator->error()) continue;
-    const auto state = coordinator->state();
-    const bool came = state.appAssetPromise && state.appAssetPromise->isComplete();
-    if (state.responsibleClient == responsible && !came) owed.push_back(identifier);
-  }
-  return owed;
+SessionTest::SessionTest() {
+  hostsView.onWatcher = [this](PhoneWatcher* watcher) { client.watcher = watcher; };
 }
 
 SyncResult SessionTest::sync() {
   std::string problem;
   SyncInput input{readLibrary(folder.path(), problem).value(), {}, iconLayout, "NEW"};
-  input.plan = makePlan(input.library, installedApplications(phoneForHost(), problem).value(),
+  input.plan = makePlan(input.library, installedApplications(hostsView.phone(), problem).value(),
                         options, problem)
                    .value();
-  Session session(client, host, phoneForHost(), reporter, interruption);
+  Session session(client, host, hostsView.phone(), reporter, interruption);
   return session.run(input);
 }
 

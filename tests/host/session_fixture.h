@@ -10,6 +10,7 @@
 #include "host/phone/sync_host.h"
 #include "host/sync/session.h"
 #include "tests/fakes/fake_platform.h"
+#include "tests/host/fake_phone.h"
 #include "tests/host/host_files.h"
 #include "tests/test_pch.h"
 
@@ -63,7 +64,7 @@ class RecordingClient : public SyncClient {
   std::function<void()> onTransfersEnd;
   bool installsAtOnce = true;
   bool removes = true;
-  device::DeviceWatcher* watcher = nullptr;
+  PhoneWatcher* watcher = nullptr;
 
  private:
   void note(const std::string& line) { phone_.trace.add(fakes::TraceCall, "client." + line); }
@@ -72,20 +73,6 @@ class RecordingClient : public SyncClient {
 
   fakes::FakePlatform& phone_;
   SyncHost& host_;
-};
-
-/// A package arriving at the fake phone, in the trace from its begin to its end.
-class FakeReceiver : public device::FileReceiver {
- public:
-  FakeReceiver(fakes::FakePlatform& phone, std::string path)
-      : phone_(phone), path_(std::move(path)) {}
-  bool append(ByteView bytes, std::optional<Error>* error) noexcept override;
-  bool finish(std::optional<Error>* error) noexcept override;
-
- private:
-  fakes::FakePlatform& phone_;
-  const std::string path_;
-  Bytes received_;
 };
 
 /// Events as short lines, in the order in which they came.
@@ -107,6 +94,8 @@ std::string text(const Summary& summary);
 /// A sync of a real library folder with a fake phone.
 class SessionTest : public ::testing::Test {
  protected:
+  SessionTest();
+
   static constexpr std::string_view Root = "/var/mobile/Media/PublicStaging/";
 
   /// Plans and runs a whole sync of what lies in `folder`.
@@ -117,7 +106,6 @@ class SessionTest : public ::testing::Test {
   void putTodo(const std::vector<TodoState>& entries);
   std::shared_ptr<InstallCoordinator> makeCoordinator(std::string_view identifier);
 
-  Phone phoneForHost();
   /// Calls of all services, "STAGING" for the staging root.
   std::vector<std::string> trace() const;
   std::vector<std::string> trace(std::string_view beginning) const;
@@ -130,14 +118,11 @@ class SessionTest : public ::testing::Test {
   RecordingReporter reporter;
   PlanOptions options;
   std::optional<Bytes> iconLayout;
-  bool coordination = false;
-  std::map<std::string, std::string> waiting;  ///< restored data, by identifier
-  std::map<std::string, std::string> owned;    ///< data of applications without a package
-  /// none: the phone never is.
-  std::function<bool(std::string_view)> isBusyWith;
-
- private:
-  std::vector<std::string> owedBy(CoordinationClientId responsible);
+  FakePhone hostsView{phone};
+  bool& coordination = hostsView.coordination;
+  FakePhone::Texts& waiting = hostsView.waiting;
+  FakePhone::Texts& owned = hostsView.owned;
+  std::function<bool(std::string_view)>& isBusyWith = hostsView.isBusyWith;
 };
 
 }  // namespace appsync::host::testing

@@ -121,7 +121,7 @@ TEST_F(SessionTest, IsBrokenWhereverTheApplicationsCannotBeTold) {
     SCOPED_TRACE(call);
     phone.appRegistry.removeAll("com.a");
     phone.appRegistry.seedInstalled("com.old");
-    phone.faults.failCall("AppRegistry.enumerateBundles", call, Error::posix(EMFILE));
+    phone.faults.failCall("phone.applications", call, Error::posix(EMFILE));
     const SyncResult result = sync();
     EXPECT_FALSE(result.completed);
     EXPECT_EQ(result.summary.deleted.empty(), call == 2 || call == 6);

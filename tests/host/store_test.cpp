@@ -1,8 +1,7 @@
 // What the store brings to a fake phone, through coordinators and without them.
-#include "host/transfer/shipments.h"
-
 #include <cerrno>
 
+#include "host/transfer/shipments.h"
 #include "tests/host/restore_fixture.h"
 
 namespace appsync::host {
@@ -38,10 +37,10 @@ class StoreTest : public RestoreTest {
   std::map<std::string, std::string> deliver(const std::set<std::string>& except = {}) {
     std::string problem;
     const Library catalogue = readLibrary(folder.path(), problem).value();
-    const RestorePhone all = restorePhone();
+    const Phone all = hostsView.phone();
     phone.trace.clear();
     PackageSender sender(host.transfers(), all, watching, interruption);
-    const ApplicationsPresent present = applicationsPresent(all.apps, nullptr).value();
+    const ApplicationsPresent present = applicationsPresent(all, nullptr).value();
     std::set<std::string> wanted = waitingForStore(all, present);
     for (const std::string& identifier : except) wanted.erase(identifier);
     sender.send(shipmentsFromStore(host, all, present, catalogue, origin, wanted), "interrupted");
@@ -257,7 +256,7 @@ TEST_F(StoreTest, ClaimsOnlyWhatWasAskedForOfIt) {
   seedRestoring("com.b");
   seedRestoring("com.without-progress", InstallType::StoreDownload);
   phone.appRegistry.dropProgress("com.without-progress");
-  EXPECT_TRUE(claimDownloads(phone.appRegistry, {}, nullptr));
+  EXPECT_TRUE(claimDownloads(hostsView.phone(), {}, nullptr));
   EXPECT_EQ(phone.appRegistry.progress("com.asked")->installState(), InstallState::Active);
   EXPECT_EQ(phone.appRegistry.progress("com.b")->installState(), InstallState::Waiting);
 }

@@ -161,7 +161,7 @@ class BrokenRestoreTest : public ::testing::TestWithParam<bool> {
     std::optional<Error> error;
     const bool done = client.reconcileRestoreOfType(2, &error);
     for (const Restored& each : list) {
-      while (device_->isBusyWith(each.identifier)) std::this_thread::yield();
+      while (!device_->busyAmong({each.identifier}).empty()) std::this_thread::yield();
     }
     client.outstandingAssetTransfers();
     client.assetTransferEndedWithSuccess(true);

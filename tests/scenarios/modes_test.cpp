@@ -147,7 +147,7 @@ class ModePhone {
     PartReporter reporter([&](const std::string& identifier) {
       if (cancelled_.erase(identifier) > 0) cancel(identifier, host);
     });
-    Session session(client, host, phoneOf(*device_), reporter, interruption);
+    Session session(client, host, device_->phone(), reporter, interruption);
     const SyncResult result = session.run(input);
     EXPECT_TRUE(result.completed);
     return text(result.summary);
@@ -162,7 +162,7 @@ class ModePhone {
     }
     device::DeviceError problem;
     EXPECT_TRUE(device::EmbeddedDevice::cancel(folder_ / "phone", identifier, problem, nullptr));
-    while (device_->isBusyWith(identifier)) std::this_thread::yield();
+    while (!device_->busyAmong({identifier}).empty()) std::this_thread::yield();
   }
 
   /// The restrictions change after the plan is made, so that the phone must keep to them itself.
@@ -180,7 +180,7 @@ class ModePhone {
       input.library.packages.emplace(task.identifier, shelf.package(task));
     }
     std::string problem;
-    input.plan = makePlan(input.library, installedApplications(phoneOf(*device_), problem).value(),
+    input.plan = makePlan(input.library, installedApplications(device_->phone(), problem).value(),
                           options, problem)
                      .value();
     return input;

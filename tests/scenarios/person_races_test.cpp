@@ -45,7 +45,7 @@ class PersonRacesTest : public ::testing::Test {
     AppsClient client(device_->platform(host));
     announceStartUp(device_->systemNotifier());
     Quiet reporter;
-    Session session(client, host, phoneOf(*device_), reporter, interruption);
+    Session session(client, host, device_->phone(), reporter, interruption);
     std::atomic<bool> over = false;
     std::set<std::string> cancelled;
     std::thread person([&] {
@@ -96,7 +96,7 @@ class PersonRacesTest : public ::testing::Test {
                                      PackageFacts{file, idOf(number), version, "Sample"});
     }
     std::string problem;
-    input.plan = makePlan(input.library, installedApplications(phoneOf(*device_), problem).value(),
+    input.plan = makePlan(input.library, installedApplications(device_->phone(), problem).value(),
                           options, problem)
                      .value();
     return input;

@@ -96,27 +96,54 @@ Platform withFilesAndLog(const Platform& all, FileManager& files, Log& log) {
           all.backgroundQueue};
 }
 
-/// A phone for the host, with a step before each piece of data and each package.
-RestorePhone stepping(const RestorePhone& phone, FileManager& files,
-                      const RestoringPhone::Step& step) {
-  const auto receive = [=](std::string_view path, std::optional<Error>* error) {
-    step();
-    return phone.receiveFile(path, error);
-  };
-  const auto restoreData = [=](std::string_view identifier, const DataSource& source,
-                               std::optional<Error>* error) {
+/// A step before each piece of data and each package that the host gives to a phone.
+class SteppingPhone final : public IncomingFiles, public ApplicationData {
+ public:
+  SteppingPhone(const Phone& phone, const RestoringPhone::Step& step)
+      : phone_(phone), step_(step) {}
+
+  Phone phone(FileManager& files) {
+    return {files, phone_.apps, phone_.homeScreen, phone_.iconRenderer, phone_.imageEncoders,
+            *this, *this,       phone_.activity,   phone_.coordination};
+  }
+
+  std::unique_ptr<FileReceiver> receiveFile(std::string_view path,
+                                            std::optional<Error>* error) noexcept override {
+    step_();
+    return phone_.incoming.receiveFile(path, error);
+  }
+  std::optional<std::vector<std::string>> namesIn(std::string_view directory,
+                                                  std::optional<Error>* error) noexcept override {
+    return phone_.incoming.namesIn(directory, error);
+  }
+  std::vector<AppRecord> applications(std::optional<Error>* error) noexcept override {
+    return phone_.data.applications(error);
+  }
+  std::optional<Bytes> opaqueBlob(std::string_view identifier,
+                                  std::optional<Error>* error) noexcept override {
+    return phone_.data.opaqueBlob(identifier, error);
+  }
+  bool saveData(std::string_view identifier, const DataSink& sink,
+                std::optional<Error>* error) noexcept override {
+    return phone_.data.saveData(identifier, sink, error);
+  }
+  bool restoreData(std::string_view identifier, const DataSource& source,
+                   std::optional<Error>* error) noexcept override {
     const auto stepped = [&](std::uint8_t* bytes, std::size_t size) {
-      step();
+      step_();
       return source(bytes, size);
     };
-    return phone.restoreData(identifier, stepped, error);
-  };
-  return {{files, phone.apps, receive, phone.namesIn, phone.setWatcher, phone.hurry,
-           phone.isBusyWith, phone.saveData, phone.packagesOwedBy, phone.coordination},
-          phone.homeScreen,
-          restoreData,
-          phone.overwriteData};
-}
+    return phone_.data.restoreData(identifier, stepped, error);
+  }
+  bool overwriteData(std::string_view identifier, const DataSource& source,
+                     std::optional<Error>* error) noexcept override {
+    return phone_.data.overwriteData(identifier, source, error);
+  }
+
+ private:
+  const Phone phone_;
+  const RestoringPhone::Step& step_;
+};
 
 }  // namespace
 
@@ -208,8 +235,8 @@ std::string RestoringPhone::restore(const RestoreInput& input, const Step& step)
   fakes::SteppingFileManager files(device_->files(), every);
   AppsClient client(withFilesAndLog(device_->platform(host), files, log));
   announceStartUp(device_->systemNotifier());
-  const RestorePhone phone = stepping(restorePhoneOf(*device_), files, every);
-  Restore restore(client, host, phone, reporter, interruption);
+  SteppingPhone phone(device_->phone(), every);
+  Restore restore(client, host, phone.phone(files), reporter, interruption);
   return text(restore.run(input).summary);
 }
 
@@ -221,12 +248,12 @@ std::string RestoringPhone::sync(const Library& library, const PlanOptions& opti
   std::string problem;
   SyncInput input{library, {}, {}, "NEW"};
   input.plan =
-      makePlan(library, installedApplications(phoneOf(*device_), problem).value(), options, problem)
+      makePlan(library, installedApplications(device_->phone(), problem).value(), options, problem)
           .value();
   HostProcess host(SyncHostBundleIdentifier, "com.corvane.twc.AppsClient", interruption);
   AppsClient client(device_->platform(host));
   announceStartUp(device_->systemNotifier());
-  Session session(client, host, phoneOf(*device_), reporter, interruption);
+  Session session(client, host, device_->phone(), reporter, interruption);
   return text(session.run(input).summary);
 }
 

@@ -1,4 +1,4 @@
-#include "host/phone/phone.h"
+#include "host/phone/phone_state.h"
 
 #include <chrono>
 #include <thread>
@@ -13,36 +13,6 @@ namespace {
 constexpr std::chrono::milliseconds IdlePoll{10};
 
 }  // namespace
-
-Phone phoneOf(device::EmbeddedDevice& device) {
-  return {device.files(),
-          device.appRegistry(),
-          [&device](std::string_view path, std::optional<Error>* error) {
-            return device.receiveFile(path, error);
-          },
-          [&device](std::string_view directory, std::optional<Error>* error) {
-            return device.namesIn(directory, error);
-          },
-          [&device](device::DeviceWatcher* watcher) { device.setWatcher(watcher); },
-          [&device] { device.hurry(); },
-          [&device](std::string_view bundleId) { return device.isBusyWith(bundleId); },
-          [&device](std::string_view bundleId, const DataSink& sink, std::optional<Error>* error) {
-            return device.saveData(bundleId, sink, error);
-          },
-          [&device](CoordinationClientId client) { return device.packagesOwedBy(client); },
-          device.options().coordination ? &device.installCoordination() : nullptr};
-}
-
-RestorePhone restorePhoneOf(device::EmbeddedDevice& device) {
-  return {
-      phoneOf(device), device.homeScreen(),
-      [&device](std::string_view bundleId, const DataSource& source, std::optional<Error>* error) {
-        return device.restoreData(bundleId, source, error);
-      },
-      [&device](std::string_view bundleId, const DataSource& source, std::optional<Error>* error) {
-        return device.overwriteData(bundleId, source, error);
-      }};
-}
 
 std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,
                                                        std::optional<Error>* error) {
@@ -62,28 +32,38 @@ std::optional<bool> ownsData(const Phone& phone, const std::string& identifier,
     any = !bytes.empty();
     return !any;
   };
-  const bool read = phone.saveData(identifier, look, error);
+  const bool read = phone.data.saveData(identifier, look, error);
   return any || read ? std::optional(any) : std::nullopt;
 }
 
 void waitUntilIdle(const Phone& phone, const std::set<std::string>& identifiers) {
-  for (const std::string& identifier : identifiers) {
-    while (phone.isBusyWith(identifier)) std::this_thread::sleep_for(IdlePoll);
-  }
+  while (!phone.activity.busyAmong(identifiers).empty()) std::this_thread::sleep_for(IdlePoll);
 }
 
-std::optional<ApplicationsPresent> applicationsPresent(AppRegistry& registry,
+std::optional<std::vector<AppRecord>> applicationsOf(const Phone& phone,
+                                                     std::optional<Error>* error) {
+  std::optional<Error> reason;
+  std::vector<AppRecord> records = phone.data.applications(&reason);
+  if (reason) {
+    setError(error, *reason);
+    return std::nullopt;
+  }
+  return records;
+}
+
+std::optional<ApplicationsPresent> applicationsPresent(const Phone& phone,
                                                        std::optional<Error>* error) {
+  const auto records = applicationsOf(phone, error);
+  if (!records) return std::nullopt;
   ApplicationsPresent present;
-  const auto sort = [&](const AppRecord& record, bool&) {
-    if (!record.isApplication) return;
+  for (const AppRecord& record : *records) {
+    if (!record.isApplication) continue;
     if (record.isPlaceholder) {
       present.placeholders.insert_or_assign(record.applicationIdentifier, record);
     } else {
       present.installed.insert(record.applicationIdentifier);
     }
-  };
-  if (!registry.enumerateBundles(BundleKind::All, sort, error)) return std::nullopt;
+  }
   return present;
 }
 
@@ -93,14 +73,14 @@ std::string withReason(std::string_view what, const std::optional<Error>& error)
   return text;
 }
 
-bool claimDownloads(AppRegistry& apps, const std::set<std::string>& except,
+bool claimDownloads(const Phone& phone, const std::set<std::string>& except,
                     std::optional<Error>* error) {
-  const auto present = applicationsPresent(apps, error);
+  const auto present = applicationsPresent(phone, error);
   if (!present) return false;
   for (const auto& item : present->placeholders) {
     const AppRecord& record = item.second;
     if (record.installType != InstallType::StoreDownload || except.contains(item.first)) continue;
-    if (const auto progress = apps.installProgressSync(record)) {
+    if (const auto progress = phone.apps.installProgressSync(record)) {
       progress->setInstallState(InstallState::Active);
     }
   }
