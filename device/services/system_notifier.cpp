@@ -4,15 +4,9 @@
 
 namespace appsync::device {
 
-LocalNotifier::LocalNotifier() : thread_([this] { run(); }) {}
-
 LocalNotifier::~LocalNotifier() {
-  {
-    const std::lock_guard lock(mutex_);
-    stopping_ = true;
-  }
-  posted_.notify_all();
-  thread_.join();
+  const std::lock_guard lock(mutex_);
+  subscriptions_.clear();
 }
 
 SystemNotifier::Registration LocalNotifier::registerCheck(std::string_view name) noexcept {
@@ -36,8 +30,8 @@ std::uint64_t LocalNotifier::state(std::string_view name) noexcept {
 
 void LocalNotifier::post(std::string_view name) noexcept {
   const std::lock_guard lock(mutex_);
-  postings_.push_back({std::string(name), ++postingCount_});
-  posted_.notify_all();
+  const Posting posting{std::string(name), ++postingCount_};
+  queue_.after({}, [this, posting] { deliver(posting); });
 }
 
 void LocalNotifier::addObserver(void* observer, std::string_view name, Callback callback) noexcept {
@@ -55,26 +49,15 @@ void LocalNotifier::removeObserver(void* observer, std::string_view name) noexce
     if (gone && number == running_) called = number;
     return gone;
   });
-  if (called != 0 && std::this_thread::get_id() != thread_.get_id())
+  if (called != 0 && std::this_thread::get_id() != deliverer_)
     returned_.wait(lock, [&] { return running_ != called; });
 }
 
-void LocalNotifier::run() {
+void LocalNotifier::deliver(const Posting& posting) {
   std::unique_lock lock(mutex_);
-  while (!stopping_) {
-    if (postings_.empty()) {
-      posted_.wait(lock);
-      continue;
-    }
-    const Posting posting = std::move(postings_.front());
-    postings_.pop_front();
-    deliver(posting, lock);
-  }
-}
-
-void LocalNotifier::deliver(const Posting& posting, std::unique_lock<std::mutex>& lock) {
+  deliverer_ = std::this_thread::get_id();
   // Subscriptions come and go during a callback: the next one is looked up by its number.
-  for (auto next = subscriptions_.begin(); next != subscriptions_.end() && !stopping_;
+  for (auto next = subscriptions_.begin(); next != subscriptions_.end();
        next = subscriptions_.upper_bound(running_)) {
     running_ = next->first;
     const Subscription subscription = next->second;

@@ -1,13 +1,12 @@
 #pragma once
 
 #include <condition_variable>
-#include <deque>
 #include <map>
 #include <mutex>
 #include <string>
-#include <thread>
 #include <vector>
 
+#include "device/state/background_queue.h"
 #include "platform/system_notifier.h"
 
 namespace appsync::device {
@@ -18,7 +17,6 @@ namespace appsync::device {
 /// name sets the same one.
 class LocalNotifier final : public SystemNotifier {
  public:
-  LocalNotifier();
   /// Drops what is posted but not yet delivered and lets a running callback end. Not to be called
   /// from a callback.
   ~LocalNotifier() override;
@@ -46,11 +44,9 @@ class LocalNotifier final : public SystemNotifier {
     std::uint64_t number;
   };
 
-  void run();
-  void deliver(const Posting& posting, std::unique_lock<std::mutex>& lock);
+  void deliver(const Posting& posting);
 
   std::mutex mutex_;
-  std::condition_variable posted_;
   std::condition_variable returned_;  ///< a callback has returned
   // Guarded by mutex_.
   std::vector<std::string> tokenNames_;  ///< of token n + 1
@@ -58,11 +54,10 @@ class LocalNotifier final : public SystemNotifier {
   std::map<std::uint64_t, Subscription> subscriptions_;  ///< in the order they were added
   std::uint64_t lastSubscription_ = 0;
   std::uint64_t running_ = 0;  ///< subscription being called, 0 for none
-  std::deque<Posting> postings_;
   std::uint64_t postingCount_ = 0;
-  bool stopping_ = false;
+  std::thread::id deliverer_;
 
-  std::thread thread_;
+  ThreadBackgroundQueue queue_;  ///< one task for each posting
 };
 
 }  // namespace appsync::device

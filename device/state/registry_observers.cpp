@@ -1,10 +1,10 @@
 #include "device/state/registry_observers.h"
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
-#include <condition_variable>
-#include <deque>
-#include <thread>
+
+#include "device/state/background_queue.h"
 
 namespace appsync::device {
 namespace {
@@ -16,88 +16,51 @@ constexpr std::chrono::seconds LongestPause{1};
 
 class RegistryObservers::Service {
  public:
+  /// The observer gets a report without any change.
   Service(AppRegistryObserver& observer, const std::function<Report()>& report)
-      : observer_(observer), report_(report), thread_([this] { run(); }) {}
-  ~Service() {
-    stop();
-    thread_.join();
+      : observer_(observer), report_(report) {
+    installsChanged();
   }
 
   void installsChanged() {
-    const std::lock_guard lock(mutex_);
-    reportDue_ = true;
-    changed_.notify_all();
+    if (!reportDue_.exchange(true)) deliverReport(Clock::duration::zero());
   }
 
   void installsCancelled(const std::vector<AppRecord>& records) {
-    const std::lock_guard lock(mutex_);
-    cancelled_.push_back(records);
-    changed_.notify_all();
+    queue_.after({}, [this, records] { observer_.applicationInstallsDidCancel(records); });
   }
 
-  bool isStopping() {
-    const std::lock_guard lock(mutex_);
-    return stopping_;
-  }
+  bool isStopping() { return queue_.isStopped(); }
 
   /// Returns when no event is running and none will come; may be called by several threads.
-  void stop() {
-    std::unique_lock lock(mutex_);
-    stopping_ = true;
-    changed_.notify_all();
-    changed_.wait(lock, [this] { return ended_; });
-  }
+  void stop() { queue_.stop(); }
 
  private:
   using Clock = std::chrono::steady_clock;
 
-  void run() {
-    std::unique_lock lock(mutex_);
-    while (!stopping_) {
-      if (!cancelled_.empty()) {
-        const std::vector<AppRecord> records = std::move(cancelled_.front());
-        cancelled_.pop_front();
-        lock.unlock();
-        observer_.applicationInstallsDidCancel(records);
-        lock.lock();
-      } else if (reportDue_ && Clock::now() < nextReport_) {
-        changed_.wait_until(lock, nextReport_);
-      } else if (reportDue_) {
-        reportDue_ = false;
-        lock.unlock();
-        const Report report = timedReport();
-        observer_.applicationInstallsArePrioritized(report.prioritized, report.paused);
-        lock.lock();
-      } else {
-        changed_.wait(lock);
-      }
-    }
-    ended_ = true;
-    changed_.notify_all();
-  }
-
   /// Those who change installs wait for the registry that a report reads: it may take a tenth of
   /// the time and no more.
-  Report timedReport() {
-    const Clock::time_point begin = Clock::now();
-    Report report = report_();
-    const Clock::time_point end = Clock::now();
-    nextReport_ = end + std::min<Clock::duration>(9 * (end - begin), LongestPause);
-    return report;
+  void deliverReport(Clock::duration delay) {
+    queue_.after(std::chrono::ceil<std::chrono::milliseconds>(delay), [this] {
+      if (const auto early = nextReport_ - Clock::now(); early > Clock::duration::zero()) {
+        deliverReport(early);
+        return;
+      }
+      reportDue_ = false;
+      const Clock::time_point begin = Clock::now();
+      const Report report = report_();
+      const Clock::time_point end = Clock::now();
+      nextReport_ = end + std::min<Clock::duration>(9 * (end - begin), LongestPause);
+      observer_.applicationInstallsArePrioritized(report.prioritized, report.paused);
+    });
   }
 
   AppRegistryObserver& observer_;
   const std::function<Report()>& report_;
-  Clock::time_point nextReport_;  ///< only used by the thread
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  // Guarded by mutex_.
-  bool reportDue_ = true;  // a new observer gets one without being asked for
-  std::deque<std::vector<AppRecord>> cancelled_;
-  bool stopping_ = false;
-  bool ended_ = false;
+  Clock::time_point nextReport_;  ///< only used by the queue's thread
+  std::atomic<bool> reportDue_ = false;
 
-  std::thread thread_;
+  ThreadBackgroundQueue queue_;
 };
 
 RegistryObservers::RegistryObservers(std::function<Report()> report) : report_(std::move(report)) {}

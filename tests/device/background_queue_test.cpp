@@ -1,4 +1,4 @@
-#include "device/services/background_queue.h"
+#include "device/state/background_queue.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

@@ -1,4 +1,4 @@
-#include "device/services/background_queue.h"
+#include "device/state/background_queue.h"
 
 #include <algorithm>
 
@@ -14,11 +14,7 @@ constexpr std::chrono::milliseconds LongestDelay = std::chrono::hours(24 * 365 *
 ThreadBackgroundQueue::ThreadBackgroundQueue() : thread_([this] { run(); }) {}
 
 ThreadBackgroundQueue::~ThreadBackgroundQueue() {
-  {
-    const std::lock_guard lock(mutex_);
-    stopping_ = true;
-  }
-  changed_.notify_all();
+  stop();
   thread_.join();
 }
 
@@ -61,6 +57,19 @@ void ThreadBackgroundQueue::expedite() noexcept {
   }
   pending_ = std::move(hurried);
   changed_.notify_all();
+}
+
+void ThreadBackgroundQueue::stop() noexcept {
+  std::unique_lock lock(mutex_);
+  stopping_ = true;
+  changed_.notify_all();
+  if (std::this_thread::get_id() == thread_.get_id()) return;
+  finished_.wait(lock, [this] { return !running_; });
+}
+
+bool ThreadBackgroundQueue::isStopped() noexcept {
+  const std::lock_guard lock(mutex_);
+  return stopping_;
 }
 
 void ThreadBackgroundQueue::run() {

@@ -15,7 +15,7 @@ namespace appsync::device {
 class ThreadBackgroundQueue final : public BackgroundQueue {
  public:
   ThreadBackgroundQueue();
-  /// Drops what is pending and lets a running task end. Not to be called from a task.
+  /// Not to be called from a task.
   ~ThreadBackgroundQueue() override;
 
   Token after(std::chrono::milliseconds delay, std::function<void()> task) noexcept override;
@@ -24,6 +24,11 @@ class ThreadBackgroundQueue final : public BackgroundQueue {
 
   /// Runs all pending tasks at once, in their order, and later ones without delay.
   void expedite() noexcept;
+
+  /// Drops what is pending and lets a running task end; no other will run. May be called by several
+  /// threads; from a task it does not wait.
+  void stop() noexcept;
+  bool isStopped() noexcept;
 
  private:
   using Clock = std::chrono::steady_clock;
