@@ -1,7 +1,8 @@
 #!/usr/bin/env python3
 """Checks that every #include follows the layers: arrows only ever point down to platform/.
 
-    host/                                              may include all below but the plug-in
+    host/                                              may include all below but the plug-in; of
+                                                       device/ only its door, and only in cli/
     device/                                            may include all below but the plug-in
     phone/ packages/ icons/                            may include base/, platform/
     base/                                              may include platform/
@@ -37,6 +38,8 @@ ORDER = {
     "device": "files state journal home services apps coordination".split(),
     "host": "library report phone home_screen transfer sync backup restore cli".split(),
 }
+# A phone is a folder only to the commands; all else sees it through phone/.
+DOOR = "device/embedded_device.h"
 STANDARD_ONLY = PLUGIN | {"platform"}
 PLIST_FILE = "platform/property_list_codec.cpp"
 PLIST_HEADERS = {"plist/plist.h", "locale.h"}
@@ -88,6 +91,9 @@ def problem(path, header, quoted):
     if top in LAYERS and "/" in header:
         if top not in MAY_INCLUDE[folder]:
             return f"{folder}/ must not know {top}/"
+        at_the_door = header == DOOR and path.startswith("host/cli/")
+        if folder == "host" and top == "device" and not at_the_door:
+            return f"only host/cli/ may include {DOOR}, and nothing else of device/"
         return out_of_order(path, header) if top == folder and top in ORDER else None
     if quoted:
         return "own headers are included as \"folder/name.h\""

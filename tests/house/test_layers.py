@@ -69,6 +69,13 @@ class Layers(unittest.TestCase):
         self.assertRefused("packages/a.h", '#include "icons/b.h"\n', "must not know icons/")
         self.assertRefused("base/a.h", '#include "icons/b.h"\n', "must not know icons/")
 
+    def test_host_knows_of_the_device_only_its_door(self):
+        self.assertAllowed("host/cli/a.h", '#include "device/embedded_device.h"\n')
+        self.assertAllowed("host/sync/a.h", '#include "phone/phone.h"\n')
+        self.assertRefused("host/sync/a.h", '#include "device/embedded_device.h"\n', "only host/cli/")
+        self.assertRefused("host/cli/a.h", '#include "device/state/b.h"\n', "only host/cli/")
+        self.assertRefused("phone/a.h", '#include "device/embedded_device.h"\n', "must not know device/")
+
     def test_host_meets_the_plugin_only_through_the_platform(self):
         for folder in ("client", "sync", "transfer", "coordination", "restore"):
             self.assertRefused("host/a.cpp", f'#include "{folder}/x.h"\n', "must not know")
@@ -101,7 +108,7 @@ class Layers(unittest.TestCase):
         self.assertAllowed("device/a.cpp", '#include "base/b.h"\n')
         self.assertAllowed("host/a.cpp", '#include "base/b.h"\n')
         self.assertAllowed("sync/a.cpp", '#include "transfer/b.h"\n#include "platform/log.h"\n')
-        self.assertAllowed("host/a.cpp", '#include "device/b.h"\n#include <unistd.h>\n')
+        self.assertAllowed("host/a.cpp", '#include "phone/b.h"\n#include <unistd.h>\n')
         self.assertAllowed("device/a.cpp", '#include "platform/log.h"\n#include <sqlite3.h>\n')
         self.assertAllowed("client/a.cpp", "#include <vector>\n#include <cstdint>\n")
 
