@@ -267,6 +267,7 @@ TEST_F(CoordinationObjectsTest, ARegistryThatCannotBeReadCostsNoWaitingDataAndTh
   ASSERT_TRUE(
       coordinator->setPlaceholderPromise(completePlaceholder(Id, InstallType::Restore), nullptr));
   ASSERT_TRUE(recorder.waitFor("placeholder"));
+  waitUntilIdle(Id);  // the event that was delivered is still being taken out
   SQLite::Database database((folder / "device.db").string(), SQLite::OPEN_READWRITE);
   database.exec("ALTER TABLE applications RENAME TO hidden");
   DeviceError problem;
