@@ -32,8 +32,10 @@ inline constexpr std::string_view StagingArea = "/var/mobile/Media/PublicStaging
 /// All state of the sync. The client makes it, and removes it in SyncClient::clearSyncData.
 inline constexpr std::string_view SyncRoot = "/var/mobile/Library/ApplicationSync";
 
-/// Where the client moves the staging area; the one of the sync before is removed first.
-inline constexpr std::string_view WorkArea = "/var/mobile/Library/ApplicationSync/HalvoStuff";
+/// Where the client moves the staging area; the one of the sync before is removed first. Paths in
+/// it begin with the first of the two.
+inline constexpr std::string_view InWorkArea = "/var/mobile/Library/ApplicationSync/HalvoStuff/";
+inline constexpr std::string_view WorkArea = InWorkArea.substr(0, InWorkArea.size() - 1);
 
 /// In the staging area, later in the work area: an array with a dictionary for each application, in
 /// the order of the desktop's wishes. The host writes it; the client then records in it how far
@@ -55,7 +57,9 @@ inline constexpr std::string_view TodoFailed = "FAILED";
 
 /// In the staging area: the home screen's layout that the desktop wants, handed to the home screen
 /// as it stands. Missing or empty: the home screen keeps its own.
-inline constexpr std::string_view IconLayoutName = "DashelIconState.plist";
+inline constexpr std::string_view IconLayoutFormat = "%@/DashelIconState.plist";  ///< of the area
+inline constexpr std::string_view IconLayoutName =
+    IconLayoutFormat.substr(IconLayoutFormat.find('/') + 1);
 
 /// An array of identifiers: the applications that were on the phone when the last sync ended. The
 /// host writes it after a successful end; the client reads it in SyncClient::installedAssets and

@@ -33,7 +33,7 @@ PropertyList::Dictionary todoEntry(const PropertyList& item, const std::string& 
   sayUnexpectedTypes(log, identifier, *item.asDictionary(),
                      {exchange::TodoVersionKey, exchange::TodoNameKey});
   const TodoEntry todo(item);
-  const std::string path = joinPath(paths::WorkArea, identifier);
+  const std::string path = std::string(paths::InWorkArea) + identifier;
   PropertyList::Dictionary entry;
   entry.emplace(PathKey, path);
   entry.emplace(ContainerKey, path);
