@@ -36,4 +36,9 @@ std::optional<bool> isExecutableThere(FileManager& files, std::string_view bundl
   return name ? isThere(files, joinPath(bundlePath, *name), error) : true;
 }
 
+bool isFile(FileManager& files, std::string_view path) {
+  const auto attributes = files.attributesOfItem(path);
+  return attributes && !attributes->isDirectory;
+}
+
 }  // namespace appsync

@@ -26,4 +26,7 @@ bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>
 std::optional<bool> isExecutableThere(FileManager& files, std::string_view bundlePath,
                                       std::optional<Error>* error);
 
+/// Whether anything but a directory is there; false also when that cannot be told.
+bool isFile(FileManager& files, std::string_view path);
+
 }  // namespace appsync

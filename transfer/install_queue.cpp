@@ -5,6 +5,7 @@
 
 #include "client/apps_client.h"
 #include "platform/bundle.h"
+#include "platform/existence.h"
 #include "platform/sync_files.h"
 #include "transfer/install_plan.h"
 
@@ -20,8 +21,7 @@ constexpr std::string_view StartwellErrorDomain = "StartwellError";
 /// Removes a package whose install is over. What is not seen to be a file stays: an empty path
 /// leads to the directory in which all packages arrive.
 void removePackage(FileManager& files, const std::string& path) {
-  const std::optional<ItemAttributes> item = files.attributesOfItem(path);
-  if (item && !item->isDirectory) files.removeItem(path);
+  if (isFile(files, path)) files.removeItem(path);
 }
 
 /// Without a placeholder over it, the registry would take the working version that was to be

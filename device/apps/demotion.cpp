@@ -14,11 +14,6 @@
 namespace appsync::device {
 namespace {
 
-bool isFile(FileManager& files, const std::string& path) {
-  const auto attributes = files.attributesOfItem(path);
-  return attributes && !attributes->isDirectory;
-}
-
 /// Empty when there is none.
 std::string iconOf(FileManager& files, const ApplicationRow& installed) {
   const auto info = loadDictionary(files, joinPath(installed.bundlePath(), "Info.plist"));

@@ -69,9 +69,10 @@ PropertyList::Dictionary infoOf(const std::string& identifier, const Placeholder
 void copyIcon(DeviceCore& core, const std::string& icon, const ApplicationRow& row) {
   if (icon.empty()) return;
   std::optional<Error> error = Error::posix(ENOENT, icon);
-  const auto attributes = core.files.attributesOfItem(icon);
-  const bool isFile = attributes && !attributes->isDirectory;
-  if (isFile && core.files.copyItem(icon, joinPath(row.bundlePath(), IconFile), &error)) return;
+  if (isFile(core.files, icon) &&
+      core.files.copyItem(icon, joinPath(row.bundlePath(), IconFile), &error)) {
+    return;
+  }
   core.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default,
                  fmt::format("The placeholder of {} goes without its icon: {}", row.identifier,
                              error->localizedDescription()));

@@ -9,6 +9,7 @@
 #include "device/journal/history.h"
 #include "device/state/application_rows.h"
 #include "platform/bundle.h"
+#include "platform/existence.h"
 #include "platform/property_list_codec.h"
 
 namespace appsync::device {
@@ -70,11 +71,6 @@ bool isToStay(SQLite::Database& database, const PlaceholderRow& placeholder) {
   const ApplicationRows present = findApplication(database, placeholder.identifier);
   return placeholder.installType == InstallType::Sync && !present.installed &&
          present.placeholder && present.placeholder->installType != InstallType::Sync;
-}
-
-bool isFile(FileManager& files, const std::string& path) {
-  const auto attributes = files.attributesOfItem(path);
-  return attributes && !attributes->isDirectory;
 }
 
 Error inForeground(std::string_view identifier) {
