@@ -7,6 +7,7 @@
 #include <thread>
 
 #include "base/text.h"
+#include "host/phone/phone_state.h"
 
 namespace appsync::host {
 namespace {
@@ -119,13 +120,7 @@ void BackupRun::noteUnlisted() {
         std::ranges::any_of(summary_.failed, isIt, &FailedEntry::identifier)) {
       continue;
     }
-    bool any = false;
-    const auto look = [&](ByteView bytes) {
-      any = !bytes.empty();
-      return !any;
-    };
-    const bool read = phone_.data.saveData(identifier, look, nullptr);
-    if (read && !any) continue;
+    if (hasAnyData(phone_, identifier, nullptr) == false) continue;
     summary_.failed.push_back({identifier, "the phone does not list it, but has data of it"});
   }
 }

@@ -27,6 +27,11 @@ std::optional<bool> ownsData(const Phone& phone, const std::string& identifier,
                              std::optional<Error>* error) {
   const auto waits = isThere(phone.files, joinPath(exchange::WaitingData, identifier), error);
   if (!waits || *waits) return waits ? std::optional(false) : std::nullopt;
+  return hasAnyData(phone, identifier, error);
+}
+
+std::optional<bool> hasAnyData(const Phone& phone, const std::string& identifier,
+                               std::optional<Error>* error) {
   bool any = false;
   const auto look = [&](ByteView bytes) {
     any = !bytes.empty();

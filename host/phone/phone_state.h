@@ -23,6 +23,11 @@ std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::
 std::optional<bool> ownsData(const Phone& phone, const std::string& identifier,
                              std::optional<Error>* error);
 
+/// Whether there is data of the application, its own or waiting; nullopt (with an error) when that
+/// cannot be told.
+std::optional<bool> hasAnyData(const Phone& phone, const std::string& identifier,
+                               std::optional<Error>* error);
+
 /// Waits until the phone has nothing left to do for these applications by itself.
 void waitUntilIdle(const Phone& phone, const std::set<std::string>& identifiers);
 
