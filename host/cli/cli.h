@@ -75,6 +75,7 @@ std::string checkPositive(const std::string& text);
 /// Check of an identifier's text: empty when it may be one, else what is wrong with it.
 std::string checkIdentifier(const std::string& text);
 
+bool isAllowed(device::EmbeddedDevice& device, PolicySetting setting);
 /// "allow" or "forbid".
 std::string policyText(device::EmbeddedDevice& device, PolicySetting setting);
 

@@ -139,8 +139,12 @@ void addIdentifierCommand(CLI::App& app, Command& chosen, const char* name, cons
 
 }  // namespace
 
+bool isAllowed(device::EmbeddedDevice& device, PolicySetting setting) {
+  return device.policy(setting) != PolicyValue::ExplicitlyNo;
+}
+
 std::string policyText(device::EmbeddedDevice& device, PolicySetting setting) {
-  return device.policy(setting) == PolicyValue::ExplicitlyNo ? "forbid" : "allow";
+  return isAllowed(device, setting) ? "allow" : "forbid";
 }
 
 void addPhoneCommands(CLI::App& app, Command& chosen) {

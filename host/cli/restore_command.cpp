@@ -50,8 +50,7 @@ ExitCode runRestore(const RestoreOptions& options, CommandContext& context) {
         "this phone takes the packages of restored applications only from the store: "
         "use --store instead of --packages");
   }
-  input.installingAllowed =
-      device->policy(PolicySetting::AppInstallationAllowed) != PolicyValue::ExplicitlyNo;
+  input.installingAllowed = isAllowed(*device, PolicySetting::AppInstallationAllowed);
   return runVisit(context, *device, "restore",
                   [&](PluginSession& loaded, Reporter& reporter, Interruption& interruption) {
                     reportUnreadable(input.packages, reporter);

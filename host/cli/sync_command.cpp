@@ -23,10 +23,6 @@ struct SyncOptions {
   bool dryRun = false;
 };
 
-bool allowed(device::EmbeddedDevice& device, PolicySetting setting) {
-  return device.policy(setting) != PolicyValue::ExplicitlyNo;
-}
-
 SyncInput prepareInput(const SyncOptions& options) {
   std::string problem;
   SyncInput input;
@@ -43,8 +39,8 @@ SyncInput prepareInput(const SyncOptions& options) {
 }
 
 void plan(SyncInput& input, PlanOptions options, device::EmbeddedDevice& device) {
-  options.installingAllowed = allowed(device, PolicySetting::AppInstallationAllowed);
-  options.removingAllowed = allowed(device, PolicySetting::AppRemovalAllowed);
+  options.installingAllowed = isAllowed(device, PolicySetting::AppInstallationAllowed);
+  options.removingAllowed = isAllowed(device, PolicySetting::AppRemovalAllowed);
   std::string problem;
   const auto installed = installedApplications(device.phone(), problem);
   if (!installed) throw CommandError(ExitCode::SomeFailed, problem);

@@ -131,10 +131,7 @@ void Restore::explainPlaceholders(const RestoreInput& input, RestoreEnd& end) {
                 : input.catalogue ? "the store does not have it"
                 : input.packages  ? "the library does not have it"
                                   : "waits for its package";
-  static const std::optional<Library> None;
-  const std::optional<Library>& library = forbidden         ? None
-                                          : input.catalogue ? input.catalogue
-                                                            : input.packages;
+  const std::optional<Library>& library = input.catalogue ? input.catalogue : input.packages;
   const std::vector<std::string> owed = phone_.activity.packagesOwedBy(KQClientKiosk);
   const Demotions demotions(phone_.files);
   if (demotions.problem()) breakOff(*demotions.problem());
@@ -144,7 +141,7 @@ void Restore::explainPlaceholders(const RestoreInput& input, RestoreEnd& end) {
     } else if (record.installType == InstallType::Sync ||
                (input.list.isPart() && !input.list.names(identifier))) {
       continue;
-    } else if (library && library->find(identifier)) {
+    } else if (!forbidden && library && library->find(identifier)) {
       failures_.emplace(identifier, broken_                     ? *broken_
                                     : interruption_.requested() ? InterruptedReason
                                                                 : NotInstalled);
