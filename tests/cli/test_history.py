@@ -54,7 +54,8 @@ class History(support.Case):
             "installed com.a 1.0 by sync",
             "failed com.a 2.0 by sync: " + summary["failed"][0]["reason"]])
 
-    def test_a_restore(self):
+    def restore_on_another_phone(self):
+        """Of com.a and com.b; gives the backup."""
         self.offer("com.a")
         self.offer("com.b")
         self.sync()
@@ -63,6 +64,10 @@ class History(support.Case):
         self.environment["APPSYNC_DEVICE"] = str(self.folder / "other")
         self.init(*self.options())
         self.run_appsync("restore", backup)
+        return backup
+
+    def test_a_restore(self):
+        backup = self.restore_on_another_phone()
         restored = ["restored com.a 1.0 by sync", "restored com.b 1.0 by sync"]
         self.assertEqual(sorted(self.history()), restored)
         self.run_appsync("restore", backup, "--store", self.library, "--quiet")
@@ -72,14 +77,7 @@ class History(support.Case):
             "removed com.b 1.0 by person"])
 
     def test_a_restored_application_that_a_sync_brings_or_a_person_cancels(self):
-        self.offer("com.a")
-        self.offer("com.b")
-        self.sync()
-        backup = self.folder / "backup"
-        self.run_appsync("backup", backup)
-        self.environment["APPSYNC_DEVICE"] = str(self.folder / "other")
-        self.init(*self.options())
-        self.run_appsync("restore", backup)
+        self.restore_on_another_phone()
         self.run_appsync("cancel", "com.b")
         self.sync("--install", "com.a")
         self.assertEqual(self.history()[2:], [
