@@ -106,21 +106,25 @@ bool Session::reconcile(const SyncInput& input) {
 }
 
 bool Session::transfer(const SyncInput& input) {
-  std::optional<Error> error;
-  const bool claimed = claimDownloads(phone_, identifiersOf(input.plan, false), &error) ||
-                       breakOff(CannotTellApplications, error);
-  if (claimed && !interruption_.requested()) {
-    const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
-    if (phone_.coordination) findCoordinators(assets);
-    sendToClient(assets, input.library);
-  }
+  if (!interruption_.requested()) sendWhatIsAskedFor(input);
   // Restored, demoted and asked-for applications whose packages the client leaves to the store.
   const std::set<std::string> waiting = identifiersOf(input.plan, true);
-  const auto present = claimed && !waiting.empty() ? applicationsNow() : std::nullopt;
+  const auto present = !broken_ && !waiting.empty() ? applicationsNow() : std::nullopt;
   if (present) bringFromStore(*present, input.library, std::nullopt, waiting, InterruptedSync);
   if (phone_.coordination) waitForCoordination(input.plan);
   endTransfers();
   return !broken_ && !interruption_.requested();
+}
+
+void Session::sendWhatIsAskedFor(const SyncInput& input) {
+  std::optional<Error> error;
+  if (!claimDownloads(phone_, identifiersOf(input.plan, false), &error)) {
+    breakOff(CannotTellApplications, error);
+    return;
+  }
+  const std::vector<SyncAssetPtr> assets = client_.outstandingAssetTransfers();
+  if (phone_.coordination) findCoordinators(assets);
+  sendToClient(assets, input.library);
 }
 
 /// Before anything is sent, so that an install that is over by then can only have been cancelled.

@@ -34,6 +34,7 @@ class Session : Visit {
   bool prepare();
   bool reconcile(const SyncInput& input);
   bool transfer(const SyncInput& input);
+  void sendWhatIsAskedFor(const SyncInput& input);
   void findCoordinators(const std::vector<SyncAssetPtr>& assets);
   bool isSettled(const std::string& identifier, const std::optional<std::vector<TodoState>>& todo,
                  const std::set<std::string>& busy);

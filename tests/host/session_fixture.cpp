@@ -91,6 +91,7 @@ PropertyList::Dictionary RecordingClient::installedAssets() noexcept {
 bool RecordingClient::reconcileSync(const PropertyList&, std::string_view newAnchor,
                                     const ProgressCallback&, std::optional<Error>* error) noexcept {
   note(fmt::format("reconcileSync({})", newAnchor));
+  if (onTakingOver) onTakingOver();
   if (reconcileError) {
     setError(error, *reconcileError);
     return false;

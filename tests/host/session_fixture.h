@@ -58,6 +58,7 @@ class RecordingClient : public SyncClient {
   std::map<std::string, Error> refusedPackages;
   /// Where a call is given, it runs inside that call.
   std::function<void()> onInventory;
+  std::function<void()> onTakingOver;  ///< in reconcileSync
   std::function<void()> onOutstanding;
   std::function<void(const SyncAssetPtr&, double)> onProgress;
   std::function<void(const SyncAssetPtr&)> onSent;

@@ -219,6 +219,14 @@ TEST_F(SessionTest, EndsCleanlyWhenInterruptedWhileSending) {
   EXPECT_FALSE(phone.files.exists(exchange::LastSyncState));
 }
 
+TEST_F(SessionTest, ClaimsNothingForTheStoreOnceItIsInterrupted) {
+  phone.appRegistry.seedPlaceholder("com.asked", InstallType::StoreDownload);
+  offer("com.a");
+  client.onTakingOver = [&] { interruption.request(); };
+  EXPECT_FALSE(sync().completed);
+  EXPECT_EQ(phone.appRegistry.progress("com.asked")->installState(), InstallState::Waiting);
+}
+
 TEST_F(SessionTest, DoesNotTouchThePhoneWhenInterruptedBeforeStaging) {
   offer("com.a");
   client.onInventory = [&] { interruption.request(); };
