@@ -55,7 +55,7 @@ bool packageIsHere(FileManager& files, const std::string& identifier,
     log.normal("Recovered download path for %{public}@ at %{public}@", identifier, *path);
     return true;
   }
-  const bool isNoPath = error && error->code == EINVAL;
+  const bool isNoPath = error && error->domain == POSIXErrorDomain && error->code == EINVAL;
   if (isMissing(error) || isNoPath) {
     log.normal("Download path recovered for %{public}@ but the file is missing: %{public}@",
                identifier, *path);

@@ -239,14 +239,14 @@ TEST_F(OutstandingTransfers, RestoreWhoseRememberedPackageCannotBeLookedAtAsksFo
   seedRestore("com.r");
   phone.files.putFile(path, "package");
   rememberPath("com.r", path);
-  for (const char* look : {"FileManager.fileExists", "FileManager.attributesOfItem"}) {
-    phone.faults.failWhere(look, path, Error::posix(24));
-  }
+  // Of another domain, a code says nothing of the path.
+  const Error reason = Error::withDescription("OtherErrorDomain", EINVAL, "busy");
+  phone.faults.failWhere("FileManager.attributesOfItem", path, reason);
   requested();
   EXPECT_TRUE(
       logged("log error SyncBundle|com.corvane.twc.AppsClient|Download path recovered for com.r "
              "but can't look at " +
-             path + ": " + description(Error::posix(24))));
+             path + ": " + description(reason)));
   EXPECT_FALSE(loggedMessage("Download path recovered for com.r but the file is missing: " + path));
   EXPECT_EQ(phone.host.made().front()->variantOptions,
             (Dictionary{{"AssetParts", 3}, {"Version", "1.0"}}));
