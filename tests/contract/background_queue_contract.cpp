@@ -57,6 +57,8 @@ TEST_P(BackgroundQueueContract, RunsTasksInTheOrderOfTheirTimes) {
   queue.after(1ms, [&] { note(1); });
   queue.after(75ms, [&] { note(2); });
   EXPECT_TRUE(comesTrue(done, 150ms));
+  // Under the lock: only then has the last task let go of it, which is on this stack.
+  const std::scoped_lock lock(mutex);
   EXPECT_EQ(order, (std::vector<int>{1, 2, 3}));
 }
 
