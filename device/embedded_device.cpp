@@ -108,10 +108,10 @@ class FolderDevice final : public EmbeddedDevice {
 
   void setWatcher(PhoneWatcher* watcher) noexcept override { watcher_.set(watcher); }
 
-  void hurry() noexcept override {
+  void expedite() noexcept override {
     homeScreen_.refuseAssertions();
     queue_.expedite();
-    if (coordination_) coordination_->hurry();
+    if (coordination_) coordination_->expedite();
   }
 
   std::set<std::string> busyAmong(const std::set<std::string>& bundleIds) noexcept override {

@@ -103,7 +103,7 @@ class PhoneActivity {
   /// The host wants to end: termination assertions are refused from now on with an unknown error
   /// (3) and pending delays of the background queue run at once, so that waiting installs come to
   /// an end.
-  virtual void hurry() noexcept = 0;
+  virtual void expedite() noexcept = 0;
 
   /// Those of the applications for which the phone has something left to do: an install or a
   /// removal through coordination, or telling a client that is there. Not an install that waits for

@@ -81,9 +81,9 @@ Error inForeground(std::string_view identifier) {
 
 }  // namespace
 
-void CoordinatedInstalls::hurry() {
+void CoordinatedInstalls::expedite() {
   const std::lock_guard lock(mutex_);
-  hurried_ = true;
+  expedited_ = true;
 }
 
 void CoordinatedInstalls::leaveWaiting() {
@@ -289,7 +289,7 @@ std::optional<Error> CoordinatedInstalls::waitForForeground(const CoordinatorRow
   const std::string& identifier = coordinator.identifier;
   const std::int64_t number = coordinator.number;
   std::unique_lock lock(mutex_);
-  if (hurried_) return inForeground(identifier);
+  if (expedited_) return inForeground(identifier);
   const bool isTold = std::exchange(told_[identifier], number) == number;
   const bool isLookDue = !looks_.insert(identifier).second;
   lock.unlock();

@@ -28,7 +28,7 @@ class CoordinatedInstalls {
   void tidyUp(const std::string& identifier);
 
   /// Installs that wait for an application to leave the foreground fail from now on.
-  void hurry();
+  void expedite();
   /// Nothing more is begun.
   void leaveWaiting();
 
@@ -72,7 +72,7 @@ class CoordinatedInstalls {
   // Guarded by mutex_.
   std::map<std::string, std::int64_t> told_;  ///< coordinators of which people know that they wait
   std::set<std::string> looks_;               ///< applications that are to be looked at again
-  bool hurried_ = false;
+  bool expedited_ = false;
   bool leaving_ = false;
 };
 

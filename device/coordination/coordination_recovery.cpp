@@ -41,7 +41,7 @@ class Repair {
     if (const auto reason = hopelessness(row)) {
       giveUp(std::move(row), *reason);
     } else {
-      follow(database_, row, consequences_);
+      noteConsequences(database_, row, consequences_);
     }
   }
 

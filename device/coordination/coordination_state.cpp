@@ -74,8 +74,8 @@ CoordinatorState loadState(SQLite::Database& database, const CoordinatorRow& coo
   return state;
 }
 
-void follow(SQLite::Database& database, const CoordinatorRow& coordinator,
-            Consequences& consequences) {
+void noteConsequences(SQLite::Database& database, const CoordinatorRow& coordinator,
+                      Consequences& consequences) {
   if (!coordinator.isLive()) return;
   const CoordinatorState state = loadState(database, coordinator);
   noteBeginning(database, coordinator, state.icon, consequences);

@@ -42,8 +42,8 @@ CoordinatorState loadState(SQLite::Database& database, const CoordinatorRow& coo
 
 /// To be called when anything has changed that a live coordinator depends on: enters the events
 /// that this brings about.
-void follow(SQLite::Database& database, const CoordinatorRow& coordinator,
-            Consequences& consequences);
+void noteConsequences(SQLite::Database& database, const CoordinatorRow& coordinator,
+                      Consequences& consequences);
 
 /// False when the coordinator is past cancelling.
 bool cancel(SQLite::Database& database, CoordinatorRow coordinator, const Error& reason,

@@ -20,7 +20,7 @@ bool CoordinationStore::change(const std::function<void(SQLite::Database&, Conse
   const bool changed = database_.change(
       ChangeFailed, commit, [&](SQLite::Database& database) { work(database, consequences); },
       error);
-  if (changed) follow_(consequences);
+  if (changed) carryOut_(consequences);
   return changed;
 }
 
@@ -37,7 +37,7 @@ bool CoordinationStore::changeCoordinator(std::int64_t number, const Coordinator
         if (row->stage != Stage::Waiting) throw isOver("the package is being installed already");
         work(database, *row);
         put(database, *row);
-        follow(database, *row, consequences);
+        noteConsequences(database, *row, consequences);
       },
       error);
 }
@@ -51,7 +51,7 @@ bool CoordinationStore::changePromise(std::int64_t number, const PromiseChange& 
         work(*row);
         put(database, *row);
         for (const CoordinatorRow& coordinator : coordinatorsUsingPromise(database, number)) {
-          follow(database, coordinator, consequences);
+          noteConsequences(database, coordinator, consequences);
           if (coordinator.package != number) continue;
           consequences.progress.insert_or_assign(coordinator.identifier, row->percent);
         }
@@ -68,7 +68,7 @@ bool CoordinationStore::changePlaceholder(std::int64_t number, const Placeholder
         work(database, *row);
         put(database, *row);
         if (const auto coordinator = coordinatorWithPlaceholder(database, number)) {
-          follow(database, *coordinator, consequences);
+          noteConsequences(database, *coordinator, consequences);
         }
       },
       error);
@@ -104,7 +104,7 @@ bool CoordinationStore::cancelPromise(std::int64_t number, const Error& reason,
           if (user.package == number) {
             device::cancel(database, user, reason, client, consequences);
           } else {
-            follow(database, user, consequences);  // a placeholder does without its icon
+            noteConsequences(database, user, consequences);  // a placeholder does without its icon
           }
         }
       },

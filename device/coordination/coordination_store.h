@@ -12,9 +12,9 @@ namespace appsync::device {
 /// asked for: each is one transaction. Thread-safe; no lock is held while it calls out.
 class CoordinationStore {
  public:
-  /// `follow` does what follows from a change, after it.
-  CoordinationStore(Database& database, std::function<void(const Consequences&)> follow)
-      : database_(database), follow_(std::move(follow)) {}
+  /// `carryOut` does what follows from a change, after it.
+  CoordinationStore(Database& database, std::function<void(const Consequences&)> carryOut)
+      : database_(database), carryOut_(std::move(carryOut)) {}
 
   /// Runs work in one transaction and then does what follows from it.
   bool change(const std::function<void(SQLite::Database&, Consequences&)>& work,
@@ -46,7 +46,7 @@ class CoordinationStore {
 
  private:
   Database& database_;
-  const std::function<void(const Consequences&)> follow_;
+  const std::function<void(const Consequences&)> carryOut_;
   std::mutex mutex_;
   std::map<std::int64_t, Error> troubles_;  ///< by coordinator; guarded by mutex_
 };

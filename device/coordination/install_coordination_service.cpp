@@ -63,7 +63,7 @@ DeviceInstallCoordination::DeviceInstallCoordination(DeviceCore& device,
     sweepCoordination(device);
   }
   events_.start();
-  if (left) follow({left->ready, {}, {}, true});
+  if (left) carryOut({left->ready, {}, {}, true});
 }
 
 DeviceInstallCoordination::~DeviceInstallCoordination() {
@@ -73,12 +73,12 @@ DeviceInstallCoordination::~DeviceInstallCoordination() {
   objects_.gate()->close();
 }
 
-void DeviceInstallCoordination::hurry() noexcept {
-  installs_.hurry();
+void DeviceInstallCoordination::expedite() noexcept {
+  installs_.expedite();
   workers_.expedite();
 }
 
-void DeviceInstallCoordination::follow(const Consequences& consequences) {
+void DeviceInstallCoordination::carryOut(const Consequences& consequences) {
   for (const std::string& identifier : consequences.over) {
     workers_.exclusively(identifier, [&] { installs_.tidyUp(identifier); });
   }

@@ -73,11 +73,11 @@ class DeviceInstallCoordination final : public InstallCoordination {
   /// The applications whose package this client was named to bring and has not brought, sorted.
   std::vector<std::string> packagesOwedBy(CoordinationClientId client) noexcept;
   /// Installs that wait for an application to be closed fail, now and from now on.
-  void hurry() noexcept;
+  void expedite() noexcept;
 
  private:
   /// Does what follows from a change.
-  void follow(const Consequences& consequences);
+  void carryOut(const Consequences& consequences);
   void showProgress(std::string_view identifier, double fraction);
   /// Why it could not be uninstalled.
   std::optional<Error> uninstall(const std::string& identifier);
@@ -91,7 +91,7 @@ class DeviceInstallCoordination final : public InstallCoordination {
   // In the order in which they need one another.
   DeviceCore& device_;
   CoordinationStore store_{device_.database,
-                           [this](const auto& consequences) { follow(consequences); }};
+                           [this](const auto& consequences) { carryOut(consequences); }};
   EventDelivery events_{device_.database, [this](const auto& row) { return objects_.of(row); }};
   CoordinationObjects objects_{store_, events_};
   KeyedWorkers workers_;

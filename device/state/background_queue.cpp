@@ -48,14 +48,14 @@ void ThreadBackgroundQueue::expedite() noexcept {
   expedited_ = true;
   const Clock::time_point now = Clock::now();
   std::size_t ahead = pending_.size();
-  Tasks hurried;
+  Tasks expedited;
   for (auto& [key, task] : pending_) {
     // Distinct times in the past keep the order, also before tasks that come later.
     const Clock::time_point due = std::min(key.first, now) - std::chrono::nanoseconds(ahead--);
     due_[key.second] = due;
-    hurried.emplace(Key{due, key.second}, std::move(task));
+    expedited.emplace(Key{due, key.second}, std::move(task));
   }
-  pending_ = std::move(hurried);
+  pending_ = std::move(expedited);
   changed_.notify_all();
 }
 

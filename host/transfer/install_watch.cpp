@@ -9,7 +9,7 @@ InstallWatch::InstallWatch(const Phone& phone, Reporter& reporter, Interruption&
   phone_.activity.setWatcher(this);
   interruption_.setListener([this] {
     reporter_.report(Interrupted{});
-    phone_.activity.hurry();
+    phone_.activity.expedite();
   });
 }
 

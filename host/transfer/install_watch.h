@@ -14,7 +14,7 @@
 namespace appsync::host {
 
 /// Watches a phone for as long as it lives: tells of its installs, remembers why some failed, and
-/// hurries the phone when the person interrupts. Borrows everything. Called from any thread.
+/// expedites the phone when the person interrupts. Borrows everything. Called from any thread.
 class InstallWatch : public PhoneWatcher {
  public:
   InstallWatch(const Phone& phone, Reporter& reporter, Interruption& interruption);

@@ -64,7 +64,7 @@ TEST_F(CoordinationHistoryTest, TellsOfAnInstallThatWaitedForItsApplicationInVai
   device->setWatcher(&watcher);
   deliver(*prepare(Id, CoordinatorKind::Updating), Id);
   ASSERT_TRUE(watcher.waitFor("denied com.example.a"));
-  device->hurry();
+  device->expedite();
   ASSERT_TRUE(recorder.waitFor("failed"));
   device->setWatcher(nullptr);
   EXPECT_EQ(history(), (Lines{"installed sync com.example.a 1.0",

@@ -262,9 +262,9 @@ TEST_F(CoordinationInstallTest, TheBlobOfAPlaceholderStaysWithTheApplication) {
   EXPECT_EQ(device->opaqueBlob(Id), toBytes("sinf"));
 }
 
-TEST_F(CoordinationInstallTest, WhenTheHostHurriesAWaitingInstallFails) {
+TEST_F(CoordinationInstallTest, WhenExpeditedAWaitingInstallFails) {
   updateWhileOpen();
-  device->hurry();
+  device->expedite();
   ASSERT_TRUE(recorder.waitFor("failed com.example.a: "));
   EXPECT_EQ(version(Id), "1.0");
   deliver(*prepare("com.example.b"), "com.example.b");

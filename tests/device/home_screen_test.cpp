@@ -216,13 +216,13 @@ TEST_F(HomeScreenTest, AnUninstalledApplicationIsNotInTheForegroundAnyMore) {
   EXPECT_TRUE(device->foregroundApplications().empty());
 }
 
-TEST_F(HomeScreenTest, InAHurryAssertionsAreRefusedAndDelaysRunAtOnce) {
+TEST_F(HomeScreenTest, WhenExpeditedAssertionsAreRefusedAndDelaysRunAtOnce) {
   ASSERT_TRUE(installPackage("com.example.a"));
   const Platform services = platform();
   std::thread::id ranOn;
   const auto token = services.backgroundQueue.after(std::chrono::hours(1),
                                                     [&] { ranOn = std::this_thread::get_id(); });
-  device->hurry();
+  device->expedite();
   services.backgroundQueue.cancel(token);
   EXPECT_EQ(static_cast<int>(outcomeFor("com.example.a")), 3);
 }

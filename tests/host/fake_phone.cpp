@@ -141,7 +141,7 @@ std::optional<std::string> FakePhone::take(const DataSource& source, std::option
   return std::nullopt;
 }
 
-void FakePhone::hurry() noexcept { services_.trace.add(fakes::TraceCall, "phone.hurry"); }
+void FakePhone::expedite() noexcept { services_.trace.add(fakes::TraceCall, "phone.expedite"); }
 
 std::set<std::string> FakePhone::busyAmong(const std::set<std::string>& identifiers) noexcept {
   std::set<std::string> busy;

@@ -32,7 +32,7 @@ class FakePhone final : public IncomingFiles, public ApplicationData, public Pho
   bool overwriteData(std::string_view identifier, const DataSource& source,
                      std::optional<Error>* error) noexcept override;
   void setWatcher(PhoneWatcher* watcher) noexcept override { onWatcher(watcher); }
-  void hurry() noexcept override;
+  void expedite() noexcept override;
   std::set<std::string> busyAmong(const std::set<std::string>& identifiers) noexcept override;
   std::vector<std::string> packagesOwedBy(CoordinationClientId responsible) noexcept override;
 

@@ -113,7 +113,7 @@ TEST_F(RestoreTest, EndsTheTransfersWhenInterruptedAfterThePlaceholders) {
   EXPECT_THAT(trace("client.outstanding"), IsEmpty());
   EXPECT_THAT(trace("client.assetTransferEnded"),
               ElementsAre("client.assetTransferEndedWithSuccess(false)"));
-  EXPECT_THAT(trace("phone"), ElementsAre("phone.hurry"));
+  EXPECT_THAT(trace("phone"), ElementsAre("phone.expedite"));
   EXPECT_THAT(reporter.lines("interrupted"), ElementsAre("interrupted"));
 }
 

@@ -212,7 +212,7 @@ TEST_F(SessionTest, EndsCleanlyWhenInterruptedWhileSending) {
                           "client.assetTransferSucceeded(com.c, failed, POSIX 125)",
                           "client.assetTransferEndedWithSuccess(false)",
                           "client.syncEndedWithSuccess(false)"));
-  EXPECT_THAT(trace("phone.hurry"), SizeIs(1));
+  EXPECT_THAT(trace("phone.expedite"), SizeIs(1));
   EXPECT_EQ(text(result.summary),
             "installed: com.a; failed: com.b (interrupted before it was sent) "
             "com.c (interrupted before it was sent)");
@@ -246,7 +246,7 @@ TEST_F(SessionTest, EndsInstallsThatWaitWhenInterruptedAtTheEnd) {
   };
   const SyncResult result = sync();
   EXPECT_THAT(reporter.lines(), Contains("waiting com.a"));
-  EXPECT_THAT(trace("phone.hurry"), SizeIs(1));
+  EXPECT_THAT(trace("phone.expedite"), SizeIs(1));
   EXPECT_EQ(trace("client.").back(), "client.syncEndedWithSuccess(false)");
   EXPECT_EQ(text(result.summary), "failed: com.a (interrupted; the next sync does it)");
   EXPECT_FALSE(phone.files.exists(joinPath(exchange::StagingRoot, "com.a.tar")));
