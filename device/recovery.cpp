@@ -25,21 +25,12 @@ void note(DeviceCore& core, std::string_view text) {
   core.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default, text);
 }
 
-std::vector<ApplicationRow> readRows(DeviceCore& core, bool& read) {
-  std::vector<ApplicationRow> rows;
-  read = core.database.read("the registry could not be read",
-                            [&](SQLite::Database& database) { rows = allApplications(database); });
-  return rows;
-}
-
 /// Only what is known to be missing counts: a bundle that cannot be looked at is left alone.
 bool isGone(DeviceCore& core, const ApplicationRow& row) {
   return isThere(core.files, joinPath(row.bundlePath(), "Info.plist"), nullptr) == false;
 }
 
-/// The rows that remain.
-std::vector<ApplicationRow> dropRowsWithoutBundle(DeviceCore& core,
-                                                  std::vector<ApplicationRow> rows) {
+void dropRowsWithoutBundle(DeviceCore& core, std::vector<ApplicationRow>& rows) {
   std::erase_if(rows, [&](const ApplicationRow& row) {
     if (!isGone(core, row)) return false;
     note(core, fmt::format("{} is dropped from the registry: {} is gone", row.identifier,
@@ -48,7 +39,6 @@ std::vector<ApplicationRow> dropRowsWithoutBundle(DeviceCore& core,
         "a row without a bundle could not be dropped", Database::Commit::Ordinary,
         [&](SQLite::Database& database) { eraseApplication(database, row); });
   });
-  return rows;
 }
 
 void removeUnnamedContainers(DeviceCore& core, const std::vector<ApplicationRow>& rows) {
@@ -65,13 +55,12 @@ void removeUnnamedContainers(DeviceCore& core, const std::vector<ApplicationRow>
 }
 
 void removeAllAbandonedData(DeviceCore& core) {
-  std::vector<std::string> identifiers;
-  core.database.read("the list of abandoned data could not be read",
-                     [&](SQLite::Database& database) {
-                       Query query(database, "SELECT identifier FROM abandoned_data");
-                       while (query.next()) identifiers.push_back(query.text(0));
-                     });
-  for (const std::string& identifier : identifiers) removeAbandonedData(core, identifier, nullptr);
+  const auto identifiers = core.database.lookUp(
+      "the list of abandoned data could not be read", [](SQLite::Database& database) {
+        return Query(database, "SELECT identifier FROM abandoned_data").texts();
+      });
+  if (!identifiers) return;
+  for (const std::string& identifier : *identifiers) removeAbandonedData(core, identifier, nullptr);
 }
 
 /// The installs that set data aside never came to their end, or the data would be abandoned.
@@ -132,13 +121,12 @@ void removeTemporaries(DeviceCore& core, const std::vector<ApplicationRow>& rows
 
 void finishInterruptedWork(DeviceCore& core) {
   // Nothing is removed on the word of a registry that cannot be read, or may take it back.
-  bool read = core.database.settle();
-  std::vector<ApplicationRow> rows;
-  if (read) rows = readRows(core, read);
-  if (!read) return;
-  rows = dropRowsWithoutBundle(core, std::move(rows));
-  removeUnnamedContainers(core, rows);
-  const std::set<std::string> installed = installedAmong(rows);
+  if (!core.database.settle()) return;
+  auto rows = readApplications(core.database);
+  if (!rows) return;
+  dropRowsWithoutBundle(core, *rows);
+  removeUnnamedContainers(core, *rows);
+  const std::set<std::string> installed = installedAmong(*rows);
   removeAllAbandonedData(core);
   undoAdoptions(core);
   // What a first install left that did not come to its end. Data with something in it is never
@@ -146,7 +134,7 @@ void finishInterruptedWork(DeviceCore& core) {
   core.containers.removeEmptyData(installed);
   pauseInstalls(core);
   clearForeground(core.foreground, installed);
-  removeTemporaries(core, rows);
+  removeTemporaries(core, *rows);
 }
 
 }  // namespace appsync::device

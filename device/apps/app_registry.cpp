@@ -15,8 +15,6 @@
 namespace appsync::device {
 namespace {
 
-constexpr std::string_view ReadFailed = "the registry could not be read";
-
 bool isOfKind(const AppRecord& record, BundleKind kind) {
   return record.applicationType ==
          (kind == BundleKind::System ? ApplicationTypeSystem : ApplicationTypeUser);
@@ -75,37 +73,25 @@ bool DeviceAppRegistry::isApplicationInstalled(std::string_view bundleId) noexce
 
 std::optional<AppRecord> DeviceAppRegistry::recordForIdentifier(std::string_view bundleId,
                                                                 bool placeholder) noexcept {
-  ApplicationRows rows;
-  core_.database.read(
-      ReadFailed, [&](SQLite::Database& database) { rows = findApplication(database, bundleId); });
-  if (rows.installed && !placeholder) return rows.installed->record();
-  if (rows.placeholder) return rows.placeholder->record();
+  const auto rows = readApplication(core_.database, bundleId);
+  if (rows && rows->installed && !placeholder) return rows->installed->record();
+  if (rows && rows->placeholder) return rows->placeholder->record();
   return std::nullopt;
 }
 
 std::vector<AppRecord> DeviceAppRegistry::records(std::optional<Error>* error) noexcept {
   std::vector<AppRecord> records;
-  const bool read = core_.database.read(
-      ReadFailed,
-      [&](SQLite::Database& database) {
-        for (const ApplicationRow& row : allApplications(database)) records.push_back(row.record());
-      },
-      error);
-  if (!read) records.clear();
+  const auto rows = readApplications(core_.database, error);
+  if (!rows) return records;
+  for (const ApplicationRow& row : *rows) records.push_back(row.record());
   return records;
 }
 
 std::optional<Bytes> DeviceAppRegistry::opaqueBlob(std::string_view bundleId,
                                                    std::optional<Error>* error) noexcept {
-  std::optional<Bytes> blob;
-  core_.database.read(
-      ReadFailed,
-      [&](SQLite::Database& database) {
-        const ApplicationRows rows = findApplication(database, bundleId);
-        if (rows.any()) blob = (rows.installed ? rows.installed : rows.placeholder)->sinf;
-      },
-      error);
-  return blob;
+  const auto rows = readApplication(core_.database, bundleId, error);
+  if (!rows || !rows->any()) return std::nullopt;
+  return (rows->installed ? rows->installed : rows->placeholder)->sinf;
 }
 
 void DeviceAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor) noexcept {
@@ -217,10 +203,7 @@ bool DeviceAppRegistry::demote(std::string_view bundleId, std::optional<Error>* 
 }
 
 bool DeviceAppRegistry::askFor(std::string_view bundleId, std::optional<Error>* error) noexcept {
-  const auto ask = [&](const std::string& identifier, std::optional<Error>* why) {
-    return device::askFor(core_, identifier, why);
-  };
-  return changeApplication(bundleId, ask, error);
+  return changeApplication(bundleId, std::bind_front(device::askFor, std::ref(core_)), error);
 }
 
 bool DeviceAppRegistry::mayCancel(std::string_view bundleId, std::optional<Error>* error) noexcept {
@@ -249,20 +232,13 @@ bool DeviceAppRegistry::cancelWish(std::string_view bundleId,
 }
 
 void DeviceAppRegistry::undoAsking(std::string_view bundleId) noexcept {
-  const auto undo = [&](const std::string& identifier, std::optional<Error>* why) {
-    return device::undoAsking(core_, identifier, why);
-  };
-  changeApplication(bundleId, undo, nullptr);
+  changeApplication(bundleId, std::bind_front(device::undoAsking, std::ref(core_)), nullptr);
 }
 
 void DeviceAppRegistry::forgetWaitingData(std::string_view bundleId) noexcept {
   const auto forget = [&](const std::string& identifier, std::optional<Error>* error) {
-    bool isKnown = true;
-    const bool read = core_.database.read(
-        ReadFailed,
-        [&](SQLite::Database& database) { isKnown = findApplication(database, identifier).any(); },
-        error);
-    return read && !isKnown && core_.containers.removeWaitingData(identifier);
+    const auto rows = readApplication(core_.database, identifier, error);
+    return rows && !rows->any() && core_.containers.removeWaitingData(identifier);
   };
   changeApplication(bundleId, forget, nullptr);
 }

@@ -27,15 +27,9 @@ std::string nameOf(const std::string& path) { return path.substr(path.rfind('/')
 /// Whether what a restore has still to give back is the application's data; nullopt with an error.
 std::optional<bool> ownsWaitingData(DeviceCore& core, std::string_view identifier,
                                     std::optional<Error>* error) {
-  bool installed = false;
-  const bool read = core.database.read(
-      "the registry could not be read",
-      [&](SQLite::Database& database) {
-        installed = findApplication(database, identifier).installed.has_value();
-      },
-      error);
-  if (!read) return std::nullopt;
-  return installed ? false : core.containers.dataWaits(identifier, error);
+  const auto rows = readApplication(core.database, identifier, error);
+  if (!rows) return std::nullopt;
+  return rows->installed ? false : core.containers.dataWaits(identifier, error);
 }
 
 std::optional<Error> save(DeviceCore& core, const std::string& identifier, const DataSink& sink) {
@@ -130,10 +124,9 @@ std::optional<Error> restore(DeviceCore& core, const std::string& identifier,
 
 /// The data is in its place whether or not this can be written.
 void enterOverwriting(DeviceCore& core, const ApplicationRow& application) {
-  HistoryEntry entry;
-  entry.event = HistoryEvent::DataOverwritten;
-  entry.bundleId = application.identifier;
-  entry.version = application.version;
+  const HistoryEntry entry{.event = HistoryEvent::DataOverwritten,
+                           .bundleId = application.identifier,
+                           .version = application.version};
   core.database.change("the history lacks an overwriting of data", Database::Commit::Ordinary,
                        [&](SQLite::Database& database) { enterInHistory(database, entry); });
 }

@@ -39,12 +39,10 @@ bool takePackage(DeviceCore& core, const ApplicationRow& installed, std::optiona
       fmt::format("{} could not be demoted", installed.identifier), Database::Commit::OnDisk,
       [&](SQLite::Database& database) {
         eraseApplication(database, installed);
-        HistoryEntry entry;
-        entry.event = HistoryEvent::Demoted;
-        entry.origin = HistoryOrigin::Person;
-        entry.bundleId = installed.identifier;
-        entry.version = installed.version;
-        enterInHistory(database, entry);
+        enterInHistory(database, {.event = HistoryEvent::Demoted,
+                                  .origin = HistoryOrigin::Person,
+                                  .bundleId = installed.identifier,
+                                  .version = installed.version});
       },
       error);
   if (erased) core.containers.remove(installed.container);

@@ -20,17 +20,14 @@ std::optional<IdleApplication> holdIdle(DeviceCore& core, const std::string& ide
     setError(error, std::move(reason));
     return std::nullopt;
   };
-  ApplicationRows rows;
-  const bool read = core.database.read(
-      "the registry could not be read",
-      [&](SQLite::Database& database) { rows = findApplication(database, identifier); }, error);
-  if (!read) return std::nullopt;
-  if (!rows.installed) return refuse(objection(ENOENT, identifier, "is not installed"));
-  if (isUpdating(rows)) return refuse(objection(EBUSY, identifier, "is just being updated"));
+  auto rows = readApplication(core.database, identifier, error);
+  if (!rows) return std::nullopt;
+  if (!rows->installed) return refuse(objection(ENOENT, identifier, "is not installed"));
+  if (isUpdating(*rows)) return refuse(objection(EBUSY, identifier, "is just being updated"));
   Foreground::HoldResult held = core.foreground.hold(identifier);
   if (held.isRunning) return refuse(objection(EBUSY, identifier, "is open; close it first"));
   if (!held.hold) return refuse(Error::posix(EIO, identifier));
-  return IdleApplication{std::move(*rows.installed), std::move(held.hold)};
+  return IdleApplication{std::move(*rows->installed), std::move(held.hold)};
 }
 
 Error objection(int code, std::string_view identifier, std::string_view reason) {

@@ -5,17 +5,16 @@
 namespace appsync::device {
 
 std::optional<PropertyList::Dictionary> DeviceInstallerService::lookupUninstalled() noexcept {
-  PropertyList::Dictionary found;
-  const bool read = database_.read(
-      "the uninstalled applications could not be read", [&](SQLite::Database& database) {
+  return database_.lookUp(
+      "the uninstalled applications could not be read", [](SQLite::Database& database) {
+        PropertyList::Dictionary found;
         Query query(database, "SELECT identifier, time FROM uninstalled");
         while (query.next()) {
           const PropertyList::Date date{query.real(1) - PropertyListEpoch};
           found.emplace(query.text(0), PropertyList::Dictionary{{"Date", date}});
         }
+        return found;
       });
-  if (!read) return std::nullopt;
-  return found;
 }
 
 int DeviceInstallerService::clearUninstalled(const std::vector<std::string>& bundleIds) noexcept {

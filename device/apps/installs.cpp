@@ -27,10 +27,7 @@ class RowProgress final : public InstallProgress {
     return static_cast<InstallState>(read("SELECT state FROM installs WHERE number = ?"));
   }
   void setInstallState(InstallState state) noexcept override {
-    if (write("UPDATE installs SET state = ?1 WHERE number = ?2 AND NOT over AND state <> ?1",
-              static_cast<std::int64_t>(state))) {
-      observers_.installsChanged();
-    }
+    if (changeState(state)) observers_.installsChanged();
   }
   InstallPhase installPhase() const noexcept override {
     return static_cast<InstallPhase>(read("SELECT phase FROM installs WHERE number = ?"));
@@ -62,13 +59,17 @@ class RowProgress final : public InstallProgress {
   }
 
  private:
+  bool changeState(InstallState state) noexcept {
+    return write("UPDATE installs SET state = ?1 WHERE number = ?2 AND NOT over AND state <> ?1",
+                 static_cast<std::int64_t>(state));
+  }
+
   std::int64_t read(const char* sql) const noexcept {
-    std::int64_t value = 0;
-    database_.read(ReadFailed, [&](SQLite::Database& database) {
+    const auto value = database_.lookUp(ReadFailed, [&](SQLite::Database& database) {
       Query query(database, sql, number_);
-      if (query.next()) value = query.integer(0);
+      return query.next() ? query.integer(0) : 0;
     });
-    return value;
+    return value.value_or(0);
   }
 
   /// True when the row changed.
@@ -87,16 +88,12 @@ class RowProgress final : public InstallProgress {
 };
 
 void RowProgress::cancel() noexcept {
+  if (!changeState(InstallState::Canceled)) return;
   std::vector<AppRecord> records;
-  const bool changed =
-      write("UPDATE installs SET state = ?1 WHERE number = ?2 AND NOT over AND state <> ?1",
-            static_cast<std::int64_t>(InstallState::Canceled));
-  if (!changed) return;
-  database_.read(ReadFailed, [&](SQLite::Database& database) {
-    const ApplicationRows rows = findApplication(database, identifier_);
-    if (rows.any())
-      records.push_back((rows.placeholder ? rows.placeholder : rows.installed)->record());
-  });
+  const auto rows = readApplication(database_, identifier_);
+  if (rows && rows->any()) {
+    records.push_back((rows->placeholder ? rows->placeholder : rows->installed)->record());
+  }
   observers_.installsCancelled(records);
   observers_.installsChanged();
 }

@@ -22,17 +22,13 @@ std::optional<Error> objectionToExecutable(FileManager& files, const Application
 
 std::optional<Error> objectionToLaunch(Database& database, FileManager& files,
                                        std::string_view identifier) {
-  ApplicationRows rows;
   std::optional<Error> error;
-  const bool read = database.read(
-      "the registry could not be read",
-      [&](SQLite::Database& connection) { rows = findApplication(connection, identifier); },
-      &error);
-  if (!read) return error;
-  if (!rows.any()) return objection(ENOENT, identifier, "is not installed");
-  if (!rows.installed) return objection(ENOENT, identifier, "is not installed yet");
-  if (rows.installed->launchProhibited) return objection(EPERM, identifier, "may not be launched");
-  return objectionToExecutable(files, *rows.installed);
+  const auto rows = readApplication(database, identifier, &error);
+  if (!rows) return error;
+  if (!rows->any()) return objection(ENOENT, identifier, "is not installed");
+  if (!rows->installed) return objection(ENOENT, identifier, "is not installed yet");
+  if (rows->installed->launchProhibited) return objection(EPERM, identifier, "may not be launched");
+  return objectionToExecutable(files, *rows->installed);
 }
 
 }  // namespace appsync::device

@@ -107,10 +107,7 @@ void inherit(ApplicationRow& row, const ApplicationRows& before, const InstallDe
 
 HistoryEntry installOf(const ApplicationRow& row, const ApplicationRows& before,
                        HistoryOrigin origin) {
-  HistoryEntry entry;
-  entry.origin = origin;
-  entry.bundleId = row.identifier;
-  entry.version = row.version;
+  HistoryEntry entry{.origin = origin, .bundleId = row.identifier, .version = row.version};
   if (before.installed) entry.replaced = before.installed->version.value_or("");
   return entry;
 }
@@ -169,13 +166,11 @@ void markInstalling(DeviceCore& core, const std::string& identifier) {
 
 HistoryEntry failureOf(const std::string& identifier, const ApplicationRows& before,
                        HistoryOrigin origin, const std::optional<Error>& reason) {
-  HistoryEntry entry;
-  entry.event = HistoryEvent::Failed;
-  entry.origin = origin;
-  entry.bundleId = identifier;
-  if (before.placeholder) entry.version = before.placeholder->version;
-  entry.reason = reason ? reason->localizedDescription() : "no reason given";
-  return entry;
+  return {.event = HistoryEvent::Failed,
+          .origin = origin,
+          .bundleId = identifier,
+          .version = before.placeholder ? before.placeholder->version : std::nullopt,
+          .reason = reason ? reason->localizedDescription() : "no reason given"};
 }
 
 void markFailed(DeviceCore& core, const HistoryEntry& failure) {
@@ -190,16 +185,13 @@ void markFailed(DeviceCore& core, const HistoryEntry& failure) {
 
 bool installPackage(DeviceCore& core, const std::string& package, const std::string& identifier,
                     const InstallDetails& details, std::optional<Error>* error) {
-  ApplicationRows before;
-  const bool read = core.database.read(
-      "the registry could not be read",
-      [&](SQLite::Database& database) { before = findApplication(database, identifier); }, error);
-  if (!read) return false;
+  const auto before = readApplication(core.database, identifier, error);
+  if (!before) return false;
   markInstalling(core, identifier);
   std::optional<Error> reason;
-  const bool installed = replaceApplication(core, package, identifier, before, details, &reason);
+  const bool installed = replaceApplication(core, package, identifier, *before, details, &reason);
   if (!installed) {
-    markFailed(core, failureOf(identifier, before, details.origin, reason));
+    markFailed(core, failureOf(identifier, *before, details.origin, reason));
     if (reason) setError(error, *std::move(reason));
   }
   core.observers.installsChanged();

@@ -79,20 +79,19 @@ bool askFor(DeviceCore& core, const std::string& identifier, std::optional<Error
 
 std::optional<Cancelling> effectOfCancelling(DeviceCore& core, const std::string& identifier,
                                              std::optional<Error>* error) {
-  Asked asked;
-  const bool read = core.database.read(
+  const auto asked = core.database.lookUp(
       "the registry could not be read",
-      [&](SQLite::Database& database) { asked = findAsked(database, identifier); }, error);
-  if (!read) return std::nullopt;
-  if (!asked.placeholder) return Cancelling::Nothing;
-  if (asked.before && isComing(core, identifier)) return Cancelling::Nothing;
-  if (asked.before && *asked.before != InstallType::Restore) return Cancelling::Undoing;
-  if (asked.before.value_or(asked.placeholder->installType) != InstallType::Restore) {
+      [&](SQLite::Database& database) { return findAsked(database, identifier); }, error);
+  if (!asked) return std::nullopt;
+  if (!asked->placeholder) return Cancelling::Nothing;
+  if (asked->before && isComing(core, identifier)) return Cancelling::Nothing;
+  if (asked->before && *asked->before != InstallType::Restore) return Cancelling::Undoing;
+  if (asked->before.value_or(asked->placeholder->installType) != InstallType::Restore) {
     return Cancelling::Nothing;
   }
   const std::optional<bool> demoted = isListedAsDemoted(core.files, identifier, error);
   if (!demoted) return std::nullopt;
-  if (*demoted) return asked.before ? Cancelling::Undoing : Cancelling::Nothing;
+  if (*demoted) return asked->before ? Cancelling::Undoing : Cancelling::Nothing;
   return mayRemove(core, nullptr) ? Cancelling::Forgetting : Cancelling::Forbidden;
 }
 

@@ -106,14 +106,6 @@ bool isRestored(const ApplicationRow& placeholder) {
          placeholder.installType == InstallType::IntentionalDowngrade;
 }
 
-HistoryEntry restorationOf(const ApplicationRow& placeholder) {
-  HistoryEntry entry;
-  entry.event = HistoryEvent::Restored;
-  entry.bundleId = placeholder.identifier;
-  entry.version = placeholder.version;
-  return entry;
-}
-
 /// Enters the placeholder; `replaced` is the one it takes the place of.
 bool enter(DeviceCore& core, ApplicationRow& row, std::optional<ApplicationRow>& replaced,
            std::optional<Error>* error) {
@@ -126,7 +118,11 @@ bool enter(DeviceCore& core, ApplicationRow& row, std::optional<ApplicationRow>&
         putApplication(database, row);
         beginInstall(database, row.identifier);
         appendToIconOrder(database, row.identifier);
-        if (!before.any() && isRestored(row)) enterInHistory(database, restorationOf(row));
+        if (!before.any() && isRestored(row)) {
+          enterInHistory(database, {.event = HistoryEvent::Restored,
+                                    .bundleId = row.identifier,
+                                    .version = row.version});
+        }
         replaced = std::move(before.placeholder);
       },
       error);

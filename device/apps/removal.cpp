@@ -43,12 +43,10 @@ void erasePlaceholder(SQLite::Database& database, const ApplicationRow& placehol
 }
 
 void enterRemoval(SQLite::Database& database, const ApplicationRow& removed, HistoryOrigin origin) {
-  HistoryEntry entry;
-  entry.event = HistoryEvent::Removed;
-  entry.origin = origin;
-  entry.bundleId = removed.identifier;
-  entry.version = removed.version;
-  enterInHistory(database, entry);
+  enterInHistory(database, {.event = HistoryEvent::Removed,
+                            .origin = origin,
+                            .bundleId = removed.identifier,
+                            .version = removed.version});
 }
 
 /// Without it the application is as it was before an install that did not come to its end.
@@ -131,15 +129,10 @@ void abandonData(SQLite::Database& database, std::string_view name) {
 
 std::optional<bool> isAbandoned(DeviceCore& core, std::string_view name,
                                 std::optional<Error>* error) {
-  bool abandoned = false;
-  const bool read = core.database.read(
-      "the list of abandoned data could not be read",
-      [&](SQLite::Database& database) {
-        abandoned =
-            Query(database, "SELECT 1 FROM abandoned_data WHERE identifier = ?", name).next();
-      },
-      error);
-  return read ? std::optional(abandoned) : std::nullopt;
+  const auto isNamed = [&](SQLite::Database& database) {
+    return Query(database, "SELECT 1 FROM abandoned_data WHERE identifier = ?", name).next();
+  };
+  return core.database.lookUp("the list of abandoned data could not be read", isNamed, error);
 }
 
 bool removeAbandonedData(DeviceCore& core, const std::string& name, std::optional<Error>* error) {

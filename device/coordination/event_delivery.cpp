@@ -152,13 +152,11 @@ bool EventDelivery::deliverAll() {
 }
 
 std::optional<std::vector<EventRow>> EventDelivery::pending() {
-  std::vector<EventRow> events;
-  const bool read =
-      database_.read("the events of install coordinators could not be read",
-                     [&](SQLite::Database& database) { events = pendingEvents(database); });
-  if (!read) return std::nullopt;
+  auto events =
+      database_.lookUp("the events of install coordinators could not be read", pendingEvents);
+  if (!events) return events;
   const std::lock_guard lock(mutex_);
-  std::erase_if(events, [&](const EventRow& event) { return delivered_.contains(event.number); });
+  std::erase_if(*events, [&](const EventRow& event) { return delivered_.contains(event.number); });
   return events;
 }
 

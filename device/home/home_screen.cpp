@@ -70,13 +70,9 @@ std::optional<Bytes> DeviceHomeScreen::getFlattenedIconState(Port port, int form
 HomeScreenService::AssertionResult DeviceHomeScreen::createTerminationAssertion(
     std::string_view bundleId, std::uint32_t) noexcept {
   if (refusing_ || !core_.database.writable()) return {nullptr, UnknownError};
-  bool installed = false;
-  const bool read =
-      core_.database.read("the registry could not be read", [&](SQLite::Database& database) {
-        installed = findApplication(database, bundleId).installed.has_value();
-      });
-  if (!read) return {nullptr, UnknownError};
-  if (!installed) return {nullptr, AssertionOutcome::NotFound};
+  const auto rows = readApplication(core_.database, bundleId);
+  if (!rows) return {nullptr, UnknownError};
+  if (!rows->installed) return {nullptr, AssertionOutcome::NotFound};
   Foreground::HoldResult result = core_.foreground.hold(std::string(bundleId));
   if (result.isRunning) {
     core_.watcher.assertionDenied(bundleId);
@@ -91,11 +87,7 @@ std::vector<std::string> DeviceHomeScreen::order() noexcept {
 }
 
 std::optional<std::vector<std::string>> DeviceHomeScreen::readOrder() noexcept {
-  std::vector<std::string> identifiers;
-  const bool read = core_.database.read(
-      "the icon order could not be read",
-      [&](SQLite::Database& database) { identifiers = shownIconOrder(database); });
-  return read ? std::optional(std::move(identifiers)) : std::nullopt;
+  return core_.database.lookUp("the icon order could not be read", shownIconOrder);
 }
 
 }  // namespace appsync::device

@@ -1,16 +1,6 @@
 #include "device/home/icon_order.h"
 
 namespace appsync::device {
-namespace {
-
-std::vector<std::string> identifiersOf(Query query) {
-  std::vector<std::string> identifiers;
-  while (query.next()) identifiers.push_back(query.text(0));
-  return identifiers;
-}
-
-}  // namespace
-
 void appendToIconOrder(SQLite::Database& database, std::string_view identifier) {
   Query(database, "INSERT OR IGNORE INTO icon_order (identifier) VALUES (?)", identifier).run();
 }
@@ -21,16 +11,17 @@ void removeFromIconOrder(SQLite::Database& database, std::string_view identifier
 
 void adoptIconOrder(SQLite::Database& database, const std::vector<std::string>& identifiers) {
   const std::vector<std::string> before =
-      identifiersOf({database, "SELECT identifier FROM icon_order ORDER BY position"});
+      Query(database, "SELECT identifier FROM icon_order ORDER BY position").texts();
   Query(database, "DELETE FROM icon_order").run();
   for (const std::string& identifier : identifiers) appendToIconOrder(database, identifier);
   for (const std::string& identifier : before) appendToIconOrder(database, identifier);
 }
 
 std::vector<std::string> shownIconOrder(SQLite::Database& database) {
-  return identifiersOf({database,
-                        "SELECT identifier FROM icon_order WHERE identifier IN "
-                        "(SELECT identifier FROM applications) ORDER BY position"});
+  return Query(database,
+               "SELECT identifier FROM icon_order WHERE identifier IN "
+               "(SELECT identifier FROM applications) ORDER BY position")
+      .texts();
 }
 
 }  // namespace appsync::device

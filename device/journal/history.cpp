@@ -13,14 +13,8 @@ bool hasTable(SQLite::Database& database) {
 
 HistoryEntry entryOf(const Query& query) {
   HistoryEntry entry;
-  entry.number = query.integer(0);
-  entry.time = query.real(1);
-  entry.event = query.as<HistoryEvent>(2);
-  entry.origin = query.as<HistoryOrigin>(3);
-  entry.bundleId = query.text(4);
-  entry.version = query.optionalText(5);
-  entry.replaced = query.optionalText(6);
-  entry.reason = query.text(7);
+  query.take(0, entry.number, entry.time, entry.event, entry.origin, entry.bundleId, entry.version,
+             entry.replaced, entry.reason);
   return entry;
 }
 
@@ -52,19 +46,15 @@ void enterInHistory(SQLite::Database& database, const HistoryEntry& entry) {
 }
 
 std::vector<HistoryEntry> readHistory(Database& database, std::optional<Error>* error) {
-  std::vector<HistoryEntry> entries;
-  const bool read = database.read(
-      "the history could not be read",
-      [&](SQLite::Database& connection) {
-        if (!hasTable(connection)) return;
-        Query query(connection,
-                    "SELECT number, time, event, origin, identifier, version, replaced, reason "
-                    "FROM history ORDER BY number");
-        while (query.next()) entries.push_back(entryOf(query));
-      },
-      error);
-  if (!read) entries.clear();
-  return entries;
+  const auto allEntries = [](SQLite::Database& connection) {
+    if (!hasTable(connection)) return std::vector<HistoryEntry>();
+    return Query(connection,
+                 "SELECT number, time, event, origin, identifier, version, replaced, reason "
+                 "FROM history ORDER BY number")
+        .all(entryOf);
+  };
+  return database.lookUp("the history could not be read", allEntries, error)
+      .value_or(std::vector<HistoryEntry>());
 }
 
 }  // namespace appsync::device

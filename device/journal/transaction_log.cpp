@@ -7,15 +7,8 @@ namespace {
 
 TransactionRecord recordOf(const Query& query) {
   TransactionRecord record;
-  record.number = query.integer(0);
-  record.time = query.real(1);
-  record.scenario = query.text(2);
-  if (!query.isNull(3)) record.step = query.as<std::uint32_t>(3);
-  record.party = query.as<std::uint32_t>(4);
-  record.phase = query.as<std::uint32_t>(5);
-  record.success = query.boolean(6);
-  record.bundleId = query.text(7);
-  record.description = query.text(8);
+  query.take(0, record.number, record.time, record.scenario, record.step, record.party,
+             record.phase, record.success, record.bundleId, record.description);
   return record;
 }
 
@@ -30,26 +23,22 @@ void StoredTransactionLog::initializeWithLog(const LogHandle& handle) noexcept {
 void StoredTransactionLog::logScenario(std::string_view scenario, std::optional<std::uint32_t> step,
                                        bool success, std::string_view bundleId,
                                        std::string_view description) noexcept {
-  TransactionRecord record;
-  record.scenario = scenario;
-  record.step = step;
-  record.success = success;
-  record.bundleId = bundleId;
-  record.description = description;
-  keep(record);
+  keep({.scenario = std::string(scenario),
+        .step = step,
+        .success = success,
+        .bundleId = std::string(bundleId),
+        .description = std::string(description)});
 }
 
 void StoredTransactionLog::logStep(std::uint32_t step, std::uint32_t party, std::uint32_t phase,
                                    bool success, std::string_view bundleId,
                                    std::string_view description) noexcept {
-  TransactionRecord record;
-  record.step = step;
-  record.party = party;
-  record.phase = phase;
-  record.success = success;
-  record.bundleId = bundleId;
-  record.description = description;
-  keep(record);
+  keep({.step = step,
+        .party = party,
+        .phase = phase,
+        .success = success,
+        .bundleId = std::string(bundleId),
+        .description = std::string(description)});
 }
 
 void StoredTransactionLog::keep(const TransactionRecord& record) noexcept {
@@ -71,19 +60,15 @@ void StoredTransactionLog::keep(const TransactionRecord& record) noexcept {
 
 std::vector<TransactionRecord> StoredTransactionLog::recordsAfter(
     std::int64_t number, std::optional<Error>* error) noexcept {
-  std::vector<TransactionRecord> records;
-  const bool read = database_.read(
-      "the transaction records could not be read",
-      [&](SQLite::Database& database) {
-        Query query(database,
-                    "SELECT number, time, scenario, step, party, phase, success, identifier, "
-                    "description FROM transactions WHERE number > ? ORDER BY number",
-                    number);
-        while (query.next()) records.push_back(recordOf(query));
-      },
-      error);
-  if (!read) records.clear();
-  return records;
+  const auto laterRecords = [&](SQLite::Database& database) {
+    return Query(database,
+                 "SELECT number, time, scenario, step, party, phase, success, identifier, "
+                 "description FROM transactions WHERE number > ? ORDER BY number",
+                 number)
+        .all(recordOf);
+  };
+  return database_.lookUp("the transaction records could not be read", laterRecords, error)
+      .value_or(std::vector<TransactionRecord>());
 }
 
 }  // namespace appsync::device

@@ -9,20 +9,13 @@ namespace {
   "identifier, placeholder, type, container, bundle, version, display_name, disk_usage, " \
   "install_type, launch_prohibited, device_based, sinf"
 
+constexpr std::string_view ReadFailed = "the registry could not be read";
+
 ApplicationRow rowOf(const Query& query) {
   ApplicationRow row;
-  row.identifier = query.text(0);
-  row.placeholder = query.boolean(1);
-  row.type = query.text(2);
-  row.container = query.text(3);
-  row.bundle = query.text(4);
-  row.version = query.optionalText(5);
-  row.displayName = query.text(6);
-  row.diskUsage = query.as<std::uint64_t>(7);
-  row.installType = query.as<InstallType>(8);
-  row.launchProhibited = query.boolean(9);
-  row.deviceBased = query.boolean(10);
-  row.sinf = query.optionalBytes(11);
+  query.take(0, row.identifier, row.placeholder, row.type, row.container, row.bundle, row.version,
+             row.displayName, row.diskUsage, row.installType, row.launchProhibited, row.deviceBased,
+             row.sinf);
   return row;
 }
 
@@ -70,11 +63,9 @@ ApplicationRows findApplication(SQLite::Database& database, std::string_view ide
 }
 
 std::vector<ApplicationRow> allApplications(SQLite::Database& database) {
-  std::vector<ApplicationRow> rows;
-  Query query(database,
-              "SELECT " APPLICATION_COLUMNS " FROM applications ORDER BY identifier, placeholder");
-  while (query.next()) rows.push_back(rowOf(query));
-  return rows;
+  return Query(database,
+               "SELECT " APPLICATION_COLUMNS " FROM applications ORDER BY identifier, placeholder")
+      .all(rowOf);
 }
 
 void putApplication(SQLite::Database& database, const ApplicationRow& row) {
@@ -94,6 +85,18 @@ void eraseApplication(SQLite::Database& database, const ApplicationRow& row) {
   if (row.placeholder) {
     Query(database, "DELETE FROM asked_for WHERE identifier = ?", row.identifier).run();
   }
+}
+
+std::optional<ApplicationRows> readApplication(Database& database, std::string_view identifier,
+                                               std::optional<Error>* error) {
+  return database.lookUp(
+      ReadFailed,
+      [&](SQLite::Database& connection) { return findApplication(connection, identifier); }, error);
+}
+
+std::optional<std::vector<ApplicationRow>> readApplications(Database& database,
+                                                            std::optional<Error>* error) {
+  return database.lookUp(ReadFailed, allApplications, error);
 }
 
 }  // namespace appsync::device

@@ -56,16 +56,6 @@ class FullSynchronisation {
 
 }  // namespace
 
-std::optional<std::string> Query::optionalText(int column) const {
-  if (isNull(column)) return std::nullopt;
-  return text(column);
-}
-
-std::optional<Bytes> Query::optionalBytes(int column) const {
-  if (isNull(column)) return std::nullopt;
-  return toBytes(text(column));
-}
-
 Error errorOf(const SQLite::Exception& exception) {
   const Reason reason = reasonOf(exception.getErrorCode());
   return Error::withDescription(POSIXErrorDomain, reason.errnoValue,

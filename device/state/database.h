@@ -9,6 +9,7 @@
 #include <string>
 #include <string_view>
 #include <type_traits>
+#include <vector>
 
 #include "platform/bytes.h"
 #include "platform/error.h"
@@ -28,6 +29,17 @@ class Query {
 
   /// Steps to the next row; false when there is none.
   bool next() { return statement_.executeStep(); }
+  /// What `read` makes of each row that is left.
+  template <typename Read>
+  auto all(const Read& read) {
+    std::vector<std::invoke_result_t<Read, const Query&>> rows;
+    while (next()) rows.push_back(read(*this));
+    return rows;
+  }
+  /// The first column of each row that is left.
+  std::vector<std::string> texts() {
+    return all([](const Query& row) { return row.text(0); });
+  }
   /// Runs a statement that gives no rows; the number of rows it changed.
   int run() { return statement_.exec(); }
 
@@ -36,15 +48,30 @@ class Query {
   bool boolean(int column) const { return integer(column) != 0; }
   double real(int column) const { return statement_.getColumn(column).getDouble(); }
   std::string text(int column) const { return statement_.getColumn(column).getString(); }
-  std::optional<std::string> optionalText(int column) const;
-  std::optional<Bytes> optionalBytes(int column) const;
-  bool isNull(int column) const { return statement_.getColumn(column).isNull(); }
   template <typename Enumeration>
   Enumeration as(int column) const {
     return static_cast<Enumeration>(integer(column));
   }
+  /// The columns from `first` on, each into a value of its type.
+  template <typename... Values>
+  void take(int first, Values&... values) const {
+    (read(first++, values), ...);
+  }
 
  private:
+  void read(int column, bool& value) const { value = boolean(column); }
+  void read(int column, double& value) const { value = real(column); }
+  void read(int column, std::string& value) const { value = text(column); }
+  void read(int column, Bytes& value) const { value = toBytes(text(column)); }
+  template <typename Number>
+  requires std::integral<Number> || std::is_enum_v<Number>
+  void read(int column, Number& value) const { value = as<Number>(column); }
+  template <typename Value>
+  void read(int column, std::optional<Value>& value) const {
+    value.reset();
+    if (!statement_.isColumnNull(column)) read(column, value.emplace());
+  }
+
   void bind(int index, std::nullopt_t) { statement_.bind(index); }
   void bind(int index, std::string_view text) { statement_.bind(index, std::string(text)); }
   void bind(int index, const char* text) { bind(index, std::string_view(text)); }
@@ -88,6 +115,15 @@ class Database {
   /// `purpose` names the work in the log: "the policies could not be read".
   bool read(std::string_view purpose, const Work& work,
             std::optional<Error>* error = nullptr) noexcept;
+  /// What the work finds; nullopt, with an error, when it fails.
+  template <typename LookUp>
+  auto lookUp(std::string_view purpose, const LookUp& work,
+              std::optional<Error>* error = nullptr) noexcept {
+    std::optional<std::invoke_result_t<LookUp, SQLite::Database&>> found;
+    read(
+        purpose, [&](SQLite::Database& database) { found.emplace(work(database)); }, error);
+    return found;
+  }
   /// Runs the work in one transaction. False: the change does not hold, and never will once
   /// `settle` says so.
   bool change(std::string_view purpose, Commit commit, const Work& work,
