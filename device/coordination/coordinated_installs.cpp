@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <utility>
 
+#include "device/apps/idle_application.h"
 #include "device/apps/installs.h"
 #include "device/journal/history.h"
 #include "device/state/application_rows.h"
@@ -55,14 +56,12 @@ InstallDetails detailsOf(const CoordinatorState& state) {
 }
 
 HistoryEntry failureOf(const CoordinatorState& state, const Error& reason) {
-  HistoryEntry entry;
-  entry.event = HistoryEvent::Failed;
-  entry.origin = originOf(state);
-  entry.bundleId = state.coordinator.identifier;
   const auto attributes = attributesFrom(state.placeholder->attributes.value_or(Bytes{}));
-  if (attributes) entry.version = attributes->bundleVersion;
-  entry.reason = reason.localizedDescription();
-  return entry;
+  return {.event = HistoryEvent::Failed,
+          .origin = originOf(state),
+          .bundleId = state.coordinator.identifier,
+          .version = attributes ? attributes->bundleVersion : std::nullopt,
+          .reason = reason.localizedDescription()};
 }
 
 /// Whether a sync finds all that is left of an application: if the sync comes to nothing, that must
@@ -71,12 +70,6 @@ bool isToStay(SQLite::Database& database, const PlaceholderRow& placeholder) {
   const ApplicationRows present = findApplication(database, placeholder.identifier);
   return placeholder.installType == InstallType::Sync && !present.installed &&
          present.placeholder && present.placeholder->installType != InstallType::Sync;
-}
-
-Error inForeground(std::string_view identifier) {
-  return Error::withDescription(
-      POSIXErrorDomain, EBUSY,
-      fmt::format("{} is in the foreground and was not closed in time", identifier));
 }
 
 }  // namespace
@@ -109,15 +102,15 @@ void CoordinatedInstalls::advance(const std::string& identifier, std::int64_t co
 
 bool CoordinatedInstalls::carryOn(std::int64_t coordinator, std::optional<Error>* error) {
   while (!isLeaving()) {
-    std::optional<CoordinatorState> state;
-    const bool read = store_.read(
-        [&](SQLite::Database& database) {
+    const auto state = store_.lookUp(
+        [&](SQLite::Database& database) -> std::optional<CoordinatorState> {
           const auto row = findCoordinator(database, coordinator);
-          if (row) state = loadState(database, *row);
+          if (!row) return std::nullopt;
+          return loadState(database, *row);
         },
         error);
-    if (!read) return false;
-    if (!state || !take(nextStep(*state), *state)) break;
+    if (!state) return false;
+    if (!*state || !take(nextStep(**state), **state)) break;
   }
   return true;
 }
@@ -156,9 +149,10 @@ void CoordinatedInstalls::removePlaceholder(const std::string& identifier,
 }
 
 void CoordinatedInstalls::tidyUp(const std::string& identifier) {
-  Leftovers left;
-  store_.read([&](SQLite::Database& database) { left = findLeftovers(database, identifier); });
-  for (const PlaceholderRow& placeholder : left.placeholders) {
+  auto left = store_.lookUp(
+      [&](SQLite::Database& database) { return findLeftovers(database, identifier); });
+  if (!left) return;
+  for (const PlaceholderRow& placeholder : left->placeholders) {
     removePlaceholder(identifier, placeholder);
     // What cannot be written is found, and tidied up, again.
     store_.change(
@@ -170,7 +164,7 @@ void CoordinatedInstalls::tidyUp(const std::string& identifier) {
         nullptr);
   }
   FileManager& files = device_.files;
-  for (PromiseRow& package : left.packages) {
+  for (PromiseRow& package : left->packages) {
     if (isFile(files, *package.path)) files.removeItem(*package.path);
     package.path.reset();
     store_.change([&](SQLite::Database& database, Consequences&) { put(database, package); },
@@ -287,28 +281,30 @@ bool CoordinatedInstalls::fail(const CoordinatorState& state, const Error& error
 
 std::optional<Error> CoordinatedInstalls::waitForForeground(const CoordinatorRow& coordinator) {
   const std::string& identifier = coordinator.identifier;
-  const std::int64_t number = coordinator.number;
-  std::unique_lock lock(mutex_);
-  if (expedited_) return inForeground(identifier);
-  const bool isTold = std::exchange(told_[identifier], number) == number;
-  const bool isLookDue = !looks_.insert(identifier).second;
-  lock.unlock();
-  if (!isTold) device_.watcher.assertionDenied(identifier);
-  if (!isLookDue) {
-    workers_.add(
-        identifier, [this, identifier, number] { lookAgain(identifier, number); }, ForegroundPoll);
+  const Wait wait{coordinator.number, true};
+  Wait before;
+  {
+    const std::lock_guard lock(mutex_);
+    if (expedited_) {
+      return objection(EBUSY, identifier, "is in the foreground and was not closed in time");
+    }
+    before = std::exchange(waits_[identifier], wait);
   }
+  if (before.coordinator != wait.coordinator) device_.watcher.assertionDenied(identifier);
+  if (before.isLookDue) return std::nullopt;
+  const auto look = [this, identifier, wait] { lookAgain(identifier, wait.coordinator); };
+  workers_.add(identifier, look, ForegroundPoll);
   return std::nullopt;
 }
 
 void CoordinatedInstalls::lookAgain(const std::string& identifier, std::int64_t coordinator) {
   {
     const std::lock_guard lock(mutex_);
-    looks_.erase(identifier);
+    waits_[identifier].isLookDue = false;
   }
   advance(identifier, coordinator);
   const std::lock_guard lock(mutex_);
-  if (!looks_.contains(identifier)) told_.erase(identifier);
+  if (!waits_[identifier].isLookDue) waits_.erase(identifier);
 }
 
 }  // namespace appsync::device

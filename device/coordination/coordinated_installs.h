@@ -3,7 +3,6 @@
 #include <functional>
 #include <map>
 #include <mutex>
-#include <set>
 #include <string>
 
 #include "device/apps/app_registry.h"
@@ -59,6 +58,11 @@ class CoordinatedInstalls {
   /// registry stays as it was where it was only adopted.
   void removePlaceholder(const std::string& identifier, const PlaceholderRow& placeholder);
 
+  /// For an application to leave the foreground.
+  struct Wait {
+    std::int64_t coordinator = 0;  ///< of which people know that it waits
+    bool isLookDue = false;
+  };
   /// Comes back later; an error when that is not to be.
   std::optional<Error> waitForForeground(const CoordinatorRow& coordinator);
   void lookAgain(const std::string& identifier, std::int64_t coordinator);
@@ -70,8 +74,7 @@ class CoordinatedInstalls {
   KeyedWorkers& workers_;
   std::mutex mutex_;
   // Guarded by mutex_.
-  std::map<std::string, std::int64_t> told_;  ///< coordinators of which people know that they wait
-  std::set<std::string> looks_;               ///< applications that are to be looked at again
+  std::map<std::string, Wait> waits_;  ///< by application
   bool expedited_ = false;
   bool leaving_ = false;
 };

@@ -186,12 +186,8 @@ std::optional<CoordinatorRow> CoordinatorHandle::find(std::optional<Error>* erro
     const std::lock_guard lock(mutex_);
     if (settled_) return settled_;
   }
-  std::optional<CoordinatorRow> row;
-  with(false, [&](CoordinationObjects& service) {
-    return service.store.read(
-        [&](SQLite::Database& database) { row = findCoordinator(database, number()); }, error);
-  });
-  return row;
+  return lookUp([&](SQLite::Database& database) { return findCoordinator(database, number()); },
+                error);
 }
 
 bool CoordinatorHandle::change(const CoordinationStore::CoordinatorChange& change,
@@ -246,13 +242,11 @@ std::shared_ptr<PathTransferPromise> CoordinatorHandle::appAssetPromise(
     std::optional<Error>* error) noexcept {
   using Promise = std::shared_ptr<PathTransferPromise>;
   return with(Promise(), [&](CoordinationObjects& service) -> Promise {
-    std::optional<PromiseRow> promise;
-    service.store.read(
-        [&](SQLite::Database& database) {
-          const auto row = findCoordinator(database, number());
-          if (row) promise = findPromise(database, row->package);
-        },
-        error);
+    const auto package = [&](SQLite::Database& database) {
+      const auto row = findCoordinator(database, number());
+      return row ? findPromise(database, row->package) : std::nullopt;
+    };
+    const auto promise = service.store.lookUp(package, error).value_or(std::nullopt);
     return promise ? service.of(*promise) : nullptr;
   });
 }

@@ -73,6 +73,15 @@ class ServiceObject {
   Result with(Result otherwise, const Use& use) const {
     return gate_->with(std::move(otherwise), use);
   }
+  /// What the work finds, which is an optional row; nullopt also when it cannot be read (then with
+  /// an error) or the service is gone.
+  template <typename LookUp>
+  auto lookUp(const LookUp& work, std::optional<Error>* error) const {
+    using Found = std::invoke_result_t<LookUp, SQLite::Database&>;
+    return with(Found(), [&](CoordinationObjects& service) {
+      return service.store.lookUp(work, error).value_or(Found());
+    });
+  }
   /// False with an error when the service is gone, else what `use` gives.
   bool attempt(const std::function<bool(CoordinationStore&)>& use,
                std::optional<Error>* error) const;
@@ -112,12 +121,8 @@ class PromiseHandle : public Promise, public ServiceObject {
 
  protected:
   PromiseRow row() const {
-    std::optional<PromiseRow> row;
-    with(false, [&](CoordinationObjects& service) {
-      return service.store.read(
-          [&](SQLite::Database& database) { row = findPromise(database, number()); });
-    });
-    return row.value_or(PromiseRow());
+    const auto find = [&](SQLite::Database& database) { return findPromise(database, number()); };
+    return lookUp(find, nullptr).value_or(PromiseRow());
   }
   /// For what its coordinator cannot do without.
   void fulfil(const CoordinationStore::PromiseChange& change) {

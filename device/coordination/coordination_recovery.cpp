@@ -135,14 +135,15 @@ class Repair {
   std::vector<std::string>& notes_;
 };
 
-// Of those that are over, the ones with nothing to be told and nothing to tidy up.
+// Of those that are over, all but the ones with something to tell, with a placeholder to take away,
+// or with a package to take away.
 constexpr const char* CoordinatorsOver = R"(
-DELETE FROM install_coordinators WHERE stage NOT IN (0, 1)
-  AND number NOT IN (SELECT coordinator FROM coordinator_events)
-  AND number NOT IN (SELECT c.number FROM install_coordinators c
+DELETE FROM install_coordinators WHERE stage NOT IN (0, 1) AND number NOT IN
+  (SELECT coordinator FROM coordinator_events
+  UNION SELECT c.number FROM install_coordinators c
     JOIN install_placeholders p ON p.number = c.placeholder
-    WHERE c.error IS NOT NULL AND p.presence <> 0)
-  AND number NOT IN (SELECT c.number FROM install_coordinators c
+    WHERE c.error IS NOT NULL AND p.presence <> 0
+  UNION SELECT c.number FROM install_coordinators c
     JOIN data_promises p ON p.number = c.package_promise
     WHERE p.complete AND p.path IS NOT NULL)
 )";
@@ -161,14 +162,17 @@ DELETE FROM data_promises WHERE number NOT IN
     UNION SELECT icon_promise FROM install_placeholders WHERE icon_promise IS NOT NULL))
 )";
 
-/// How many were too old to be kept.
-int sweepEvents(SQLite::Database& database) {
-  // A cancellation is for the process that was sending the package, which is gone.
+/// Cancellations are for the process that was sending the package, which is gone.
+void forgetEventsForNobody(SQLite::Database& database) {
   Query(database,
         "DELETE FROM coordinator_events WHERE kind NOT BETWEEN ?1 AND ?2 OR "
         "coordinator NOT IN (SELECT number FROM install_coordinators)",
         EventKind::PromiseBegan, EventKind::Prioritize)
       .run();
+}
+
+/// How many were too old to be kept.
+int forgetOldEvents(SQLite::Database& database) {
   return Query(database,
                "DELETE FROM coordinator_events WHERE number <= "
                "(SELECT max(number) FROM coordinator_events) - ?1",
@@ -199,7 +203,8 @@ void sweepCoordination(DeviceCore& device) {
   int forgotten = 0;
   device.database.change("what install coordinators left could not be swept",
                          Database::Commit::Ordinary, [&](SQLite::Database& database) {
-                           forgotten = sweepEvents(database);
+                           forgetEventsForNobody(database);
+                           forgotten = forgetOldEvents(database);
                            database.exec(CoordinatorsOver);
                            database.exec(PlaceholdersOfNobody);
                            database.exec(PromisesOfNobody);

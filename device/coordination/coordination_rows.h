@@ -20,17 +20,17 @@ enum class Stage {
 
 struct CoordinatorRow {
   std::int64_t number = 0;  ///< 0: not entered yet
-  std::string identifier;
+  std::string identifier{};
   CoordinatorKind kind = CoordinatorKind::Initiating;
   CoordinationClientId creator = 0;
   Stage stage = Stage::Waiting;
-  std::optional<Bytes> options;
-  std::optional<Bytes> initialPromises;
-  std::optional<std::int64_t> package;
+  std::optional<Bytes> options{};
+  std::optional<Bytes> initialPromises{};
+  std::optional<std::int64_t> package{};
   CoordinationClientId responsible = 0;
-  std::optional<std::int64_t> userData;
-  std::optional<std::int64_t> placeholder;
-  std::optional<Bytes> error;
+  std::optional<std::int64_t> userData{};
+  std::optional<std::int64_t> placeholder{};
+  std::optional<Bytes> error{};
 
   bool isLive() const { return stage == Stage::Waiting || stage == Stage::Installing; }
 };
@@ -41,10 +41,10 @@ enum class PromiseSort { Path = 0, OutOfBand = 1 };
 struct PromiseRow {
   std::int64_t number = 0;  ///< 0: not entered yet
   PromiseSort sort = PromiseSort::Path;
-  std::string name;
+  std::string name{};
   CoordinationClientId client = 0;
   std::uint64_t diskSpace = 0;  ///< bytes
-  std::optional<std::string> path;
+  std::optional<std::string> path{};
   bool pathIsDirectory = false;
   double percent = 0;
   bool complete = false;
@@ -63,14 +63,14 @@ enum class Presence {
 
 struct PlaceholderRow {
   std::int64_t number = 0;  ///< 0: not entered yet
-  std::string identifier;
-  std::string name;
+  std::string identifier{};
+  std::string name{};
   InstallType installType = InstallType::None;
   CoordinationClientId client = 0;
-  std::optional<std::int64_t> icon;
-  std::optional<Bytes> attributes;
-  std::optional<Bytes> metadata;
-  std::optional<Bytes> sinf;
+  std::optional<std::int64_t> icon{};
+  std::optional<Bytes> attributes{};
+  std::optional<Bytes> metadata{};
+  std::optional<Bytes> sinf{};
   bool configured = false;
   Presence presence = Presence::None;
   bool over = false;

@@ -6,7 +6,6 @@ namespace appsync::device {
 namespace {
 
 constexpr std::string_view ChangeFailed = "an install's coordination could not be changed";
-constexpr std::string_view ReadFailed = "an install's coordination could not be read";
 
 Refused isOver(std::string_view what) {
   return {Error::withDescription(POSIXErrorDomain, ECANCELED, what)};
@@ -22,10 +21,6 @@ bool CoordinationStore::change(const std::function<void(SQLite::Database&, Conse
       error);
   if (changed) carryOut_(consequences);
   return changed;
-}
-
-bool CoordinationStore::read(const Database::Work& work, std::optional<Error>* error) {
-  return database_.read(ReadFailed, work, error);
 }
 
 bool CoordinationStore::changeCoordinator(std::int64_t number, const CoordinatorChange& work,
@@ -135,9 +130,10 @@ void CoordinationStore::noteTrouble(std::int64_t coordinator, const Error& error
 }
 
 void CoordinationStore::noteTroubleWithPromise(std::int64_t promise, const Error& error) {
-  std::vector<CoordinatorRow> users;
-  read([&](SQLite::Database& database) { users = coordinatorsUsingPromise(database, promise); });
-  for (const CoordinatorRow& user : users) noteTrouble(user.number, error);
+  const auto users = lookUp(
+      [&](SQLite::Database& database) { return coordinatorsUsingPromise(database, promise); });
+  if (!users) return;
+  for (const CoordinatorRow& user : *users) noteTrouble(user.number, error);
 }
 
 std::optional<Error> CoordinationStore::trouble(std::int64_t coordinator) {

@@ -19,7 +19,11 @@ class CoordinationStore {
   /// Runs work in one transaction and then does what follows from it.
   bool change(const std::function<void(SQLite::Database&, Consequences&)>& work,
               std::optional<Error>* error, Database::Commit commit = Database::Commit::Ordinary);
-  bool read(const Database::Work& work, std::optional<Error>* error = nullptr);
+  /// What the work finds; nullopt, with an error, when it fails.
+  template <typename LookUp>
+  auto lookUp(const LookUp& work, std::optional<Error>* error = nullptr) {
+    return database_.lookUp("an install's coordination could not be read", work, error);
+  }
 
   // Changes. False with an error when the object is over, or the change is refused (Refused thrown
   // by `change`) or fails. A promise that is over is left as it is, which is no failure.

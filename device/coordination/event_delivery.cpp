@@ -11,11 +11,9 @@ constexpr std::chrono::milliseconds RetryDelay{200};
 
 }  // namespace
 
-EventDelivery::EventDelivery(Database& database, Coordinators coordinators)
-    : database_(database), coordinators_(std::move(coordinators)) {}
-
-void EventDelivery::start() {
+void EventDelivery::start(Coordinators coordinators) {
   const std::lock_guard lock(mutex_);
+  coordinators_ = std::move(coordinators);
   thread_ = std::thread([this] { run(); });
   threadId_ = thread_.get_id();
 }

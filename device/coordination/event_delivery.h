@@ -25,10 +25,10 @@ class EventDelivery {
   /// Gives the coordinator that an event shows.
   using Coordinators = std::function<std::shared_ptr<InstallCoordinator>(const CoordinatorRow&)>;
 
-  EventDelivery(Database& database, Coordinators coordinators);
+  explicit EventDelivery(Database& database) : database_(database) {}
   ~EventDelivery() { stop(); }
 
-  void start();
+  void start(Coordinators coordinators);
   /// Runs what was posted, delivers nothing more and ends the thread. Not to be called from an
   /// event.
   void stop();
@@ -69,7 +69,7 @@ class EventDelivery {
   void waitUntilReturned(const CoordinatorObserver* observer, Lock& lock);
 
   Database& database_;
-  const Coordinators coordinators_;
+  Coordinators coordinators_;  ///< set before the thread begins
   std::mutex mutex_;
   std::condition_variable changed_;
   std::condition_variable returned_;

@@ -6,6 +6,7 @@
 #include <cerrno>
 
 #include "base/identifiers.h"
+#include "device/apps/idle_application.h"
 #include "device/apps/installs.h"
 #include "device/apps/removal.h"
 #include "device/coordination/coordination_recovery.h"
@@ -62,7 +63,7 @@ DeviceInstallCoordination::DeviceInstallCoordination(DeviceCore& device,
     for (const std::string& identifier : left->over) installs_.tidyUp(identifier);
     sweepCoordination(device);
   }
-  events_.start();
+  events_.start([this](const CoordinatorRow& row) { return objects_.of(row); });
   if (left) carryOut({left->ready, {}, {}, true});
 }
 
@@ -110,13 +111,11 @@ std::shared_ptr<InstallCoordinator> DeviceInstallCoordination::coordinatorFor(
     if (create) setError(error, unusable());
     return nullptr;
   }
-  std::optional<CoordinatorRow> found;
   if (!create) {
-    store_.read(
-        [&](SQLite::Database& database) { found = findLiveCoordinator(database, bundleId); },
-        error);
-    return found ? objects_.of(*found) : nullptr;
+    const auto live = liveCoordinator(bundleId, error);
+    return live ? objects_.of(*live) : nullptr;
   }
+  std::optional<CoordinatorRow> found;
   bool made = false;
   const bool changed = store_.change(
       [&](SQLite::Database& database, Consequences& consequences) {
@@ -124,16 +123,22 @@ std::shared_ptr<InstallCoordinator> DeviceInstallCoordination::coordinatorFor(
         if (found && endedFor(database, *found, kind, client, consequences)) found.reset();
         made = !found;
         if (!made) return;
-        found.emplace();
-        found->identifier = bundleId;
-        found->kind = kind;
-        found->creator = client;
+        found =
+            CoordinatorRow{.identifier = std::string(bundleId), .kind = kind, .creator = client};
         put(database, *found);
       },
       error);
   if (!changed) return nullptr;
   if (created) *created = made;
   return objects_.of(*found);
+}
+
+std::optional<CoordinatorRow> DeviceInstallCoordination::liveCoordinator(
+    std::string_view bundleId, std::optional<Error>* error) {
+  return store_
+      .lookUp([&](SQLite::Database& database) { return findLiveCoordinator(database, bundleId); },
+              error)
+      .value_or(std::nullopt);
 }
 
 bool DeviceInstallCoordination::endedFor(SQLite::Database& database, const CoordinatorRow& live,
@@ -149,9 +154,7 @@ bool DeviceInstallCoordination::endedFor(SQLite::Database& database, const Coord
       fmt::format("the install of {} was begun anew: {}", live.identifier, *why));
   if (live.creator == client && cancel(database, live, reason, client, consequences)) return true;
   if (endAlike(live.kind, kind)) return false;
-  throw Refused{
-      Error::withDescription(POSIXErrorDomain, EBUSY,
-                             fmt::format("{} is being installed in another way", live.identifier))};
+  throw Refused{objection(EBUSY, live.identifier, "is being installed in another way")};
 }
 
 void DeviceInstallCoordination::removeObserver(CoordinatorObserver* observer) noexcept {
@@ -167,10 +170,7 @@ std::int64_t DeviceInstallCoordination::enterPromise(PromiseRow& row) {
 std::shared_ptr<PathTransferPromise> DeviceInstallCoordination::createPathTransferPromise(
     std::string_view name, CoordinationClientId client,
     const std::optional<FileLocation>& transferPath, std::uint64_t diskSpaceNeeded) noexcept {
-  PromiseRow row;
-  row.name = name;
-  row.client = client;
-  row.diskSpace = diskSpaceNeeded;
+  PromiseRow row{.name = std::string(name), .client = client, .diskSpace = diskSpaceNeeded};
   if (transferPath) {
     row.path = transferPath->path;
     row.pathIsDirectory = transferPath->isDirectory;
@@ -180,11 +180,10 @@ std::shared_ptr<PathTransferPromise> DeviceInstallCoordination::createPathTransf
 
 std::shared_ptr<OutOfBandTransferPromise> DeviceInstallCoordination::createOutOfBandTransferPromise(
     std::string_view name, CoordinationClientId client, std::uint64_t diskSpaceNeeded) noexcept {
-  PromiseRow row;
-  row.sort = PromiseSort::OutOfBand;
-  row.name = name;
-  row.client = client;
-  row.diskSpace = diskSpaceNeeded;
+  PromiseRow row{.sort = PromiseSort::OutOfBand,
+                 .name = std::string(name),
+                 .client = client,
+                 .diskSpace = diskSpaceNeeded};
   return enterPromise(row) ? std::make_shared<OutOfBandPromiseHandle>(objects_.gate(), row)
                            : nullptr;
 }
@@ -193,11 +192,10 @@ std::shared_ptr<InstallPlaceholder> DeviceInstallCoordination::createAppPlacehol
     std::string_view appName, std::string_view bundleId, InstallType installType,
     CoordinationClientId client) noexcept {
   if (!isUsableIdentifier(bundleId)) return nullptr;
-  PlaceholderRow row;
-  row.identifier = bundleId;
-  row.name = appName;
-  row.installType = installType;
-  row.client = client;
+  PlaceholderRow row{.identifier = std::string(bundleId),
+                     .name = std::string(appName),
+                     .installType = installType,
+                     .client = client};
   const bool entered = store_.change(
       [&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
   return entered ? std::make_shared<PlaceholderHandle>(objects_.gate(), row) : nullptr;
@@ -215,40 +213,32 @@ void DeviceInstallCoordination::uninstallApp(
 
 std::optional<Error> DeviceInstallCoordination::uninstall(const std::string& identifier) {
   std::optional<Error> error;
-  ApplicationRows present;
-  const auto look = [&](SQLite::Database& database) {
-    present = findApplication(database, identifier);
-  };
-  if (!store_.read(look, &error)) return error;
-  const auto remove = [&] {
+  const auto present = readApplication(device_.database, identifier, &error);
+  if (!present) return error;
+  const auto remove = [&](bool placeholderOnly) {
     const KeyedMutex::Guard guard(device_.applicationLocks, identifier);
-    // What a coordinator brought goes with it; an installed version below it stays.
-    const bool placeholderOnly = present.installed && present.placeholder;
     return removeForClient(device_, identifier, placeholderOnly, &error);
   };
-  // A placeholder that is all that is left takes its data along, if its install is not over yet.
-  const bool isAlone = present.placeholder && !present.installed;
-  if (isAlone && !remove()) return error;
-  const Error reason = Error::withDescription(POSIXErrorDomain, ECANCELED,
-                                              fmt::format("{} was uninstalled", identifier));
+  if (present->placeholder && !present->installed) {
+    // All that is left takes its data along, if its install is not over yet.
+    if (remove(false)) endLive(identifier, &error);
+    return error;
+  }
+  const std::optional<bool> ended = endLive(identifier, &error);
+  // What a coordinator brought has gone with it; an installed version below it stays.
+  if (!ended || remove(present->placeholder.has_value())) return error;
+  return *ended && isMissing(error) ? std::nullopt : error;
+}
+
+std::optional<bool> DeviceInstallCoordination::endLive(const std::string& identifier,
+                                                       std::optional<Error>* error) {
+  const Error reason = objection(ECANCELED, identifier, "was uninstalled");
   bool ended = false;
   const auto end = [&](SQLite::Database& database, Consequences& consequences) {
     const auto live = findLiveCoordinator(database, identifier);
     ended = live && cancel(database, *live, reason, DeviceClientID, consequences);
   };
-  if (!store_.change(end, &error)) return error;
-  if (!isAlone) remove();
-  return ended && isMissing(error) ? std::nullopt : error;
-}
-
-Error DeviceInstallCoordination::createUserPresentableError(
-    std::int64_t code, std::uint64_t flag, const std::optional<Error>& underlying) noexcept {
-  Error error = Error::withDescription(
-      TWErrorDomain, code,
-      underlying ? underlying->localizedDescription() : "The application could not be installed.");
-  error.userInfo.emplace("Flag", flag);
-  if (underlying) error.underlying = std::make_shared<const Error>(*underlying);
-  return error;
+  return store_.change(end, error) ? std::optional(ended) : std::nullopt;
 }
 
 std::unique_ptr<CoordinatorEventListener> DeviceInstallCoordination::createEventListener(
@@ -272,8 +262,7 @@ bool DeviceInstallCoordination::tap(std::string_view bundleId) noexcept {
 }
 
 bool DeviceInstallCoordination::cancelInstall(std::string_view bundleId) noexcept {
-  std::optional<CoordinatorRow> live;
-  store_.read([&](SQLite::Database& database) { live = findLiveCoordinator(database, bundleId); });
+  const auto live = liveCoordinator(bundleId, nullptr);
   if (!live) return false;
   const Error reason =
       Error::withDescription(POSIXErrorDomain, ECANCELED,
@@ -287,16 +276,17 @@ bool DeviceInstallCoordination::isBusy(std::string_view bundleId) noexcept {
 
 std::vector<std::string> DeviceInstallCoordination::packagesOwedBy(
     CoordinationClientId client) noexcept {
-  std::vector<std::string> identifiers;
-  store_.read([&](SQLite::Database& database) {
+  const auto owed = [&](SQLite::Database& database) {
+    std::vector<std::string> identifiers;
     for (const CoordinatorRow& row : allCoordinators(database)) {
       if (!row.isLive() || row.responsible != client) continue;
       const auto package = findPromise(database, row.package);
       if (!package || !package->complete) identifiers.push_back(row.identifier);
     }
-  });
-  std::ranges::sort(identifiers);
-  return identifiers;
+    std::ranges::sort(identifiers);
+    return identifiers;
+  };
+  return store_.lookUp(owed).value_or(std::vector<std::string>());
 }
 
 }  // namespace appsync::device

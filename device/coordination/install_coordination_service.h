@@ -5,6 +5,7 @@
 
 #include "device/coordination/coordinated_installs.h"
 #include "device/coordination/coordination_handles.h"
+#include "device/coordination/presentable_error.h"
 #include "platform/install_coordination.h"
 
 namespace appsync::device {
@@ -55,9 +56,10 @@ class DeviceInstallCoordination final : public InstallCoordination {
   /// Takes what the registry's uninstallApplication would and ends a live coordinator.
   void uninstallApp(std::string_view bundleId, bool requestUserConfirmation,
                     std::function<void(const std::optional<Error>&)> completion) noexcept override;
-  /// Of TWErrorDomain, with the cause's text and a "Flag".
   Error createUserPresentableError(std::int64_t code, std::uint64_t flag,
-                                   const std::optional<Error>& underlying) noexcept override;
+                                   const std::optional<Error>& underlying) noexcept override {
+    return presentableError(code, flag, underlying);
+  }
   std::unique_ptr<CoordinatorEventListener> createEventListener(
       std::string_view serviceName, const std::set<CoordinationClientId>& clients,
       CoordinatorObserver& delegate) noexcept override;
@@ -79,8 +81,13 @@ class DeviceInstallCoordination final : public InstallCoordination {
   /// Does what follows from a change.
   void carryOut(const Consequences& consequences);
   void showProgress(std::string_view identifier, double fraction);
+  /// nullopt when there is none, and with an error when that cannot be read.
+  std::optional<CoordinatorRow> liveCoordinator(std::string_view bundleId,
+                                                std::optional<Error>* error);
   /// Why it could not be uninstalled.
   std::optional<Error> uninstall(const std::string& identifier);
+  /// Whether there was a live coordinator that could be ended; nullopt with an error.
+  std::optional<bool> endLive(const std::string& identifier, std::optional<Error>* error);
   /// Ends a live coordinator that nobody is served by going on with, if it is this client's. Throws
   /// Refused when one that does not serve cannot be ended.
   bool endedFor(SQLite::Database& database, const CoordinatorRow& live, CoordinatorKind kind,
@@ -92,7 +99,7 @@ class DeviceInstallCoordination final : public InstallCoordination {
   DeviceCore& device_;
   CoordinationStore store_{device_.database,
                            [this](const auto& consequences) { carryOut(consequences); }};
-  EventDelivery events_{device_.database, [this](const auto& row) { return objects_.of(row); }};
+  EventDelivery events_{device_.database};
   CoordinationObjects objects_{store_, events_};
   KeyedWorkers workers_;
   CoordinatedInstalls installs_;

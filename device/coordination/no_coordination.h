@@ -1,5 +1,8 @@
 #pragma once
 
+#include <cerrno>
+
+#include "device/coordination/presentable_error.h"
 #include "platform/background_queue.h"
 #include "platform/install_coordination.h"
 
@@ -12,32 +15,52 @@ class NoCoordination final : public InstallCoordination {
   explicit NoCoordination(BackgroundQueue& queue) : queue_(queue) {}
 
   bool coordinationIsEnabled() noexcept override { return false; }
-  std::shared_ptr<InstallCoordinator> coordinatorFor(CoordinatorKind kind,
-                                                     std::string_view bundleId,
-                                                     CoordinationClientId client,
-                                                     bool createIfNotExisting, bool* created,
-                                                     std::optional<Error>* error) noexcept override;
-  void removeObserver(CoordinatorObserver* observer) noexcept override { (void)observer; }
-  std::shared_ptr<PathTransferPromise> createPathTransferPromise(
-      std::string_view name, CoordinationClientId client,
-      const std::optional<FileLocation>& transferPath,
-      std::uint64_t diskSpaceNeeded) noexcept override;
+  std::shared_ptr<InstallCoordinator> coordinatorFor(
+      CoordinatorKind, std::string_view, CoordinationClientId, bool, bool* created,
+      std::optional<Error>* error) noexcept override {
+    if (created) *created = false;
+    setError(error, switchedOff());
+    return nullptr;
+  }
+  void removeObserver(CoordinatorObserver*) noexcept override {}
+  std::shared_ptr<PathTransferPromise> createPathTransferPromise(std::string_view,
+                                                                 CoordinationClientId,
+                                                                 const std::optional<FileLocation>&,
+                                                                 std::uint64_t) noexcept override {
+    return nullptr;
+  }
   std::shared_ptr<OutOfBandTransferPromise> createOutOfBandTransferPromise(
-      std::string_view name, CoordinationClientId client,
-      std::uint64_t diskSpaceNeeded) noexcept override;
-  std::shared_ptr<InstallPlaceholder> createAppPlaceholder(
-      std::string_view appName, std::string_view bundleId, InstallType installType,
-      CoordinationClientId client) noexcept override;
-  void uninstallApp(std::string_view bundleId, bool requestUserConfirmation,
-                    std::function<void(const std::optional<Error>&)> completion) noexcept override;
+      std::string_view, CoordinationClientId, std::uint64_t) noexcept override {
+    return nullptr;
+  }
+  std::shared_ptr<InstallPlaceholder> createAppPlaceholder(std::string_view, std::string_view,
+                                                           InstallType,
+                                                           CoordinationClientId) noexcept override {
+    return nullptr;
+  }
+  void uninstallApp(std::string_view, bool,
+                    std::function<void(const std::optional<Error>&)> completion) noexcept override {
+    queue_.after({}, [completion] { completion(switchedOff()); });
+  }
   Error createUserPresentableError(std::int64_t code, std::uint64_t flag,
-                                   const std::optional<Error>& underlying) noexcept override;
+                                   const std::optional<Error>& underlying) noexcept override {
+    return presentableError(code, flag, underlying);
+  }
   /// A listener that hears nothing.
   std::unique_ptr<CoordinatorEventListener> createEventListener(
-      std::string_view serviceName, const std::set<CoordinationClientId>& clients,
-      CoordinatorObserver& delegate) noexcept override;
+      std::string_view, const std::set<CoordinationClientId>&,
+      CoordinatorObserver&) noexcept override {
+    return std::make_unique<SilentListener>();
+  }
 
  private:
+  class SilentListener final : public CoordinatorEventListener {};
+
+  static Error switchedOff() {
+    return Error::withDescription(POSIXErrorDomain, ENOTSUP,
+                                  "install coordination is switched off on this device");
+  }
+
   BackgroundQueue& queue_;
 };
 
