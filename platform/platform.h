@@ -1,5 +1,7 @@
 #pragma once
 
+#include <concepts>
+
 #include "platform/app_registry.h"
 #include "platform/background_queue.h"
 #include "platform/backup_manager.h"
@@ -33,5 +35,31 @@ struct Platform {
   SyncHost& syncHost;
   BackgroundQueue& backgroundQueue;
 };
+
+/// The same services, but for this one.
+template <typename Service>
+Platform with(const Platform& all, Service& other) {
+  const auto pick = [&other]<typename Own>(Own& own) -> Own& {
+    if constexpr (std::derived_from<Service, Own>) {
+      return other;
+    } else {
+      return own;
+    }
+  };
+  return {.log = pick(all.log),
+          .files = pick(all.files),
+          .appRegistry = pick(all.appRegistry),
+          .installCoordination = pick(all.installCoordination),
+          .installerService = pick(all.installerService),
+          .backupManager = pick(all.backupManager),
+          .devicePolicy = pick(all.devicePolicy),
+          .homeScreen = pick(all.homeScreen),
+          .iconRenderer = pick(all.iconRenderer),
+          .imageEncoders = pick(all.imageEncoders),
+          .transactionLog = pick(all.transactionLog),
+          .systemNotifier = pick(all.systemNotifier),
+          .syncHost = pick(all.syncHost),
+          .backgroundQueue = pick(all.backgroundQueue)};
+}
 
 }  // namespace appsync

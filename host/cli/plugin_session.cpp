@@ -1,27 +1,6 @@
 #include "host/cli/plugin_session.h"
 
 namespace appsync::host {
-namespace {
-
-Platform withLog(const Platform& services, Log& log) {
-  return {log,
-          services.files,
-          services.appRegistry,
-          services.installCoordination,
-          services.installerService,
-          services.backupManager,
-          services.devicePolicy,
-          services.homeScreen,
-          services.iconRenderer,
-          services.imageEncoders,
-          services.transactionLog,
-          services.systemNotifier,
-          services.syncHost,
-          services.backgroundQueue};
-}
-
-}  // namespace
-
 void ReportingLog::write(LogChannel channel, LogLevel level, std::string_view text) noexcept {
   log_.write(channel, level, text);
   if (reporter_) reporter_->report(ClientLogLine{channel, level, std::string(text)});
@@ -40,7 +19,7 @@ PluginSession::PluginSession(Plugin& plugin, std::string_view mainBundleIdentifi
                              Reporter* logReporter)
     : host_(mainBundleIdentifier, plugin.identifier(), interruption),
       log_(device.log(), logReporter),
-      client_(plugin.createClient(withLog(device.platform(host_), log_))) {
+      client_(plugin.createClient(with(device.platform(host_), log_))) {
   if (!client_) throw CommandError(ExitCode::SomeFailed, "the plug-in could not make its client");
   if (mainBundleIdentifier == SyncHostBundleIdentifier) {
     announceStartUp(device.systemNotifier());

@@ -3,7 +3,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <concepts>
 #include <initializer_list>
 #include <optional>
 #include <ostream>
@@ -26,32 +25,6 @@ inline const std::string TodoListPath = WorkAreaPath + "/ApplicationsSync.plist"
 inline const std::string LastSyncStatePath = SyncRootPath + "/LastSyncAppState.plist";
 inline const std::string RestoreStatePath = SyncRootPath + "/RestoreState.plist";
 inline const std::string StagingRootPath = "/var/mobile/Media/PublicStaging";
-
-/// The same services, but for this one.
-template <typename Service>
-Platform with(const Platform& all, Service& other) {
-  const auto pick = [&other]<typename Own>(Own& own) -> Own& {
-    if constexpr (std::derived_from<Service, Own>) {
-      return other;
-    } else {
-      return own;
-    }
-  };
-  return {pick(all.log),
-          pick(all.files),
-          pick(all.appRegistry),
-          pick(all.installCoordination),
-          pick(all.installerService),
-          pick(all.backupManager),
-          pick(all.devicePolicy),
-          pick(all.homeScreen),
-          pick(all.iconRenderer),
-          pick(all.imageEncoders),
-          pick(all.transactionLog),
-          pick(all.systemNotifier),
-          pick(all.syncHost),
-          pick(all.backgroundQueue)};
-}
 
 /// A phone in memory with one client on it. A test prepares `phone`, acts through `client()` and
 /// compares the trace.

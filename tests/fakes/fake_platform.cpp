@@ -7,9 +7,20 @@ FakePlatform::FakePlatform() = default;
 FakePlatform::~FakePlatform() = default;
 
 Platform FakePlatform::platform() {
-  return {log,          faultyFiles, faultyRegistry, installCoordination, installerService,
-          backup,       policy,      homeScreen,     iconRenderer,        imageEncoders,
-          transactions, notifier,    host,           backgroundQueue};
+  return {.log = log,
+          .files = faultyFiles,
+          .appRegistry = faultyRegistry,
+          .installCoordination = installCoordination,
+          .installerService = installerService,
+          .backupManager = backup,
+          .devicePolicy = policy,
+          .homeScreen = homeScreen,
+          .iconRenderer = iconRenderer,
+          .imageEncoders = imageEncoders,
+          .transactionLog = transactions,
+          .systemNotifier = notifier,
+          .syncHost = host,
+          .backgroundQueue = backgroundQueue};
 }
 
 }  // namespace appsync::fakes

@@ -79,23 +79,6 @@ class StepReporter : public Reporter {
   const std::function<void(const Event&)> step_;
 };
 
-Platform withFilesAndLog(const Platform& all, FileManager& files, Log& log) {
-  return {log,
-          files,
-          all.appRegistry,
-          all.installCoordination,
-          all.installerService,
-          all.backupManager,
-          all.devicePolicy,
-          all.homeScreen,
-          all.iconRenderer,
-          all.imageEncoders,
-          all.transactionLog,
-          all.systemNotifier,
-          all.syncHost,
-          all.backgroundQueue};
-}
-
 /// A step before each piece of data and each package that the host gives to a phone.
 class SteppingPhone final : public IncomingFiles, public ApplicationData {
  public:
@@ -103,8 +86,15 @@ class SteppingPhone final : public IncomingFiles, public ApplicationData {
       : phone_(phone), step_(step) {}
 
   Phone phone(FileManager& files) {
-    return {files, phone_.apps, phone_.homeScreen, phone_.iconRenderer, phone_.imageEncoders,
-            *this, *this,       phone_.activity,   phone_.coordination};
+    return {.files = files,
+            .apps = phone_.apps,
+            .homeScreen = phone_.homeScreen,
+            .iconRenderer = phone_.iconRenderer,
+            .imageEncoders = phone_.imageEncoders,
+            .incoming = *this,
+            .data = *this,
+            .activity = phone_.activity,
+            .coordination = phone_.coordination};
   }
 
   std::unique_ptr<FileReceiver> receiveFile(std::string_view path,
@@ -233,7 +223,7 @@ std::string RestoringPhone::restore(const RestoreInput& input, const Step& step)
   HostProcess host(SyncHostBundleIdentifier, "com.corvane.twc.AppsClient", interruption);
   StepLog log(device_->log(), every);
   fakes::SteppingFileManager files(device_->files(), every);
-  AppsClient client(withFilesAndLog(device_->platform(host), files, log));
+  AppsClient client(with(with(device_->platform(host), files), log));
   announceStartUp(device_->systemNotifier());
   SteppingPhone phone(device_->phone(), every);
   Restore restore(client, host, phone.phone(files), reporter, interruption);
