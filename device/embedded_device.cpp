@@ -8,6 +8,7 @@
 #include "base/identifiers.h"
 #include "device/apps/app_registry.h"
 #include "device/apps/application_data.h"
+#include "device/apps/idle_application.h"
 #include "device/apps/installer_service.h"
 #include "device/apps/installs.h"
 #include "device/apps/launching.h"
@@ -32,13 +33,7 @@ namespace appsync::device {
 namespace {
 
 Error notInstalling(std::string_view bundleId) {
-  return Error::withDescription(POSIXErrorDomain, ENOENT,
-                                fmt::format("{} is not being installed", bundleId));
-}
-
-Error tooLate(std::string_view bundleId, std::string_view why) {
-  return Error::withDescription(POSIXErrorDomain, EBUSY,
-                                fmt::format("{} is just being installed, {}", bundleId, why));
+  return objection(ENOENT, bundleId, "is not being installed");
 }
 
 class FolderDevice final : public EmbeddedDevice {
@@ -66,16 +61,32 @@ class FolderDevice final : public EmbeddedDevice {
   bool isUsable() const { return files_.isOpen(); }
 
   Platform platform(SyncHost& host) noexcept override {
-    InstallCoordination& coordination = installCoordination();
-    return {*log_,          files_,    registry_,   coordination,  installerService_,
-            backupManager_, policy_,   homeScreen_, iconRenderer_, imageEncoders_,
-            transactions_,  notifier_, host,        queue_};
+    return {.log = *log_,
+            .files = files_,
+            .appRegistry = registry_,
+            .installCoordination = installCoordination(),
+            .installerService = installerService_,
+            .backupManager = backupManager_,
+            .devicePolicy = policy_,
+            .homeScreen = homeScreen_,
+            .iconRenderer = iconRenderer_,
+            .imageEncoders = imageEncoders_,
+            .transactionLog = transactions_,
+            .systemNotifier = notifier_,
+            .syncHost = host,
+            .backgroundQueue = queue_};
   }
 
   Phone phone() noexcept override {
-    return {files_,        registry_,      homeScreen_,
-            iconRenderer_, imageEncoders_, *this,
-            *this,         *this,          coordination_ ? &*coordination_ : nullptr};
+    return {.files = files_,
+            .apps = registry_,
+            .homeScreen = homeScreen_,
+            .iconRenderer = iconRenderer_,
+            .imageEncoders = imageEncoders_,
+            .incoming = *this,
+            .data = *this,
+            .activity = *this,
+            .coordination = coordination_ ? &*coordination_ : nullptr};
   }
 
   /// Why a wish cannot be carried out.
@@ -222,7 +233,8 @@ class FolderDevice final : public EmbeddedDevice {
     if (error) return error;
     if (isHeard || isAsked) return std::nullopt;
     return registry_.isBeingInstalled(bundleId)
-               ? tooLate(bundleId, "and this phone brings packages in their order")
+               ? objection(EBUSY, bundleId,
+                           "is just being installed, and this phone brings packages in their order")
                : notInstalling(bundleId);
   }
 
@@ -240,8 +252,9 @@ class FolderDevice final : public EmbeddedDevice {
     const bool isLive =
         coordination_ && coordination_->coordinatorFor(CoordinatorKind::Any, bundleId,
                                                        PersonClientID, false, nullptr, nullptr);
-    return isLive || registry_.isBeingInstalled(bundleId) ? tooLate(bundleId, "too late to cancel")
-                                                          : notInstalling(bundleId);
+    return isLive || registry_.isBeingInstalled(bundleId)
+               ? objection(EBUSY, bundleId, "is just being installed, too late to cancel")
+               : notInstalling(bundleId);
   }
 
   // In the order in which they need one another: what works on threads of its own goes first.
@@ -278,17 +291,25 @@ DeviceError unusable(const std::filesystem::path& folder, std::string_view reaso
                      "check the permissions of the folder and the free space");
 }
 
-std::unique_ptr<FolderDevice> openDevice(const std::filesystem::path& folder, Access access,
-                                         DeviceError& error) noexcept {
+/// Does work that may throw. What it throws is a problem of the folder.
+template <typename Work>
+std::invoke_result_t<Work> guarded(const std::filesystem::path& folder, DeviceError& error,
+                                   const Work& work) noexcept {
   try {
-    std::optional<OpenFolder> opened = openFolder(folder, access, error);
-    if (!opened) return nullptr;
-    auto device = std::make_unique<FolderDevice>(std::move(*opened));
-    if (device->isUsable()) return device;
-    error = unusable(folder, "its files cannot be opened");
+    return work();
   } catch (const std::exception& failure) {
     error = unusable(folder, failure.what());
+    return {};
   }
+}
+
+std::unique_ptr<FolderDevice> openDevice(const std::filesystem::path& folder, Access access,
+                                         DeviceError& error) {
+  std::optional<OpenFolder> opened = openFolder(folder, access, error);
+  if (!opened) return nullptr;
+  auto device = std::make_unique<FolderDevice>(std::move(*opened));
+  if (device->isUsable()) return device;
+  error = unusable(folder, "its files cannot be opened");
   return nullptr;
 }
 
@@ -328,68 +349,50 @@ bool fulfil(PersonWish wish, const std::filesystem::path& folder, std::string_vi
 
 bool EmbeddedDevice::initialize(const std::filesystem::path& folder, const DeviceOptions& options,
                                 DeviceError& error) noexcept {
-  try {
-    return makeDeviceFolder(DevicePaths(folder), options, error);
-  } catch (const std::exception& failure) {
-    error = unusable(folder, failure.what());
-    return false;
-  }
+  return guarded(folder, error,
+                 [&] { return makeDeviceFolder(DevicePaths(folder), options, error); });
 }
 
 std::unique_ptr<EmbeddedDevice> EmbeddedDevice::open(const std::filesystem::path& folder,
                                                      Access access, DeviceError& error) noexcept {
-  return openDevice(folder, access, error);
+  return guarded(folder, error, [&] { return openDevice(folder, access, error); });
 }
 
 bool EmbeddedDevice::launch(const std::filesystem::path& folder, std::string_view bundleId,
                             DeviceError& deviceError, std::optional<Error>* error) noexcept {
-  try {
+  return guarded(folder, deviceError, [&] {
     const std::optional<OpenFolder> opened = openFolder(folder, Access::ReadOnly, deviceError);
     if (!opened) return false;
     ConfinedFileManager files(opened->paths.root);
-    const auto objection = [&] { return objectionToLaunch(*opened->database, files, bundleId); };
+    const auto refusal = [&] { return objectionToLaunch(*opened->database, files, bundleId); };
     if (isUsableIdentifier(bundleId)) {
-      return Foreground(opened->paths.foreground).launch(std::string(bundleId), objection, error);
+      return Foreground(opened->paths.foreground).launch(std::string(bundleId), refusal, error);
     }
-    if (error) *error = objection();
-  } catch (const std::exception& failure) {
-    deviceError = unusable(folder, failure.what());
-  }
-  return false;
+    if (error) *error = refusal();
+    return false;
+  });
 }
 
 bool EmbeddedDevice::quit(const std::filesystem::path& folder, std::string_view bundleId,
                           DeviceError& deviceError, std::optional<Error>* error) noexcept {
-  try {
+  return guarded(folder, deviceError, [&] {
     const std::optional<OpenFolder> opened = openFolder(folder, Access::ReadOnly, deviceError);
-    if (!opened) return false;
     // What no application can be called does not run.
-    return !isUsableIdentifier(bundleId) ||
-           Foreground(opened->paths.foreground).quit(std::string(bundleId), error);
-  } catch (const std::exception& failure) {
-    deviceError = unusable(folder, failure.what());
-  }
-  return false;
+    return opened && (!isUsableIdentifier(bundleId) ||
+                      Foreground(opened->paths.foreground).quit(std::string(bundleId), error));
+  });
 }
 
 bool EmbeddedDevice::tap(const std::filesystem::path& folder, std::string_view bundleId,
                          DeviceError& deviceError, std::optional<Error>* error) noexcept {
-  try {
-    return fulfil(PersonWish::Tap, folder, bundleId, deviceError, error);
-  } catch (const std::exception& failure) {
-    deviceError = unusable(folder, failure.what());
-  }
-  return false;
+  return guarded(folder, deviceError,
+                 [&] { return fulfil(PersonWish::Tap, folder, bundleId, deviceError, error); });
 }
 
 bool EmbeddedDevice::cancel(const std::filesystem::path& folder, std::string_view bundleId,
                             DeviceError& deviceError, std::optional<Error>* error) noexcept {
-  try {
-    return fulfil(PersonWish::Cancel, folder, bundleId, deviceError, error);
-  } catch (const std::exception& failure) {
-    deviceError = unusable(folder, failure.what());
-  }
-  return false;
+  return guarded(folder, deviceError,
+                 [&] { return fulfil(PersonWish::Cancel, folder, bundleId, deviceError, error); });
 }
 
 }  // namespace appsync::device

@@ -4,6 +4,7 @@
 
 #include <cerrno>
 
+#include "device/apps/idle_application.h"
 #include "device/apps/installer_service.h"
 #include "device/apps/installs.h"
 #include "device/home/icon_order.h"
@@ -13,15 +14,8 @@
 namespace appsync::device {
 namespace {
 
-Error notInstalled(std::string_view identifier) {
-  return Error::withDescription(POSIXErrorDomain, ENOENT,
-                                fmt::format("{} is not installed", identifier));
-}
-
-Error belongsToSystem(std::string_view identifier) {
-  return Error::withDescription(
-      POSIXErrorDomain, EPERM,
-      fmt::format("{} belongs to the system and cannot be removed", identifier));
+Refused notInstalled(std::string_view identifier) {
+  return {objection(ENOENT, identifier, "is not installed")};
 }
 
 /// What the phone has of an application beside its rows.
@@ -31,7 +25,10 @@ void forgetApplication(SQLite::Database& database, std::string_view identifier) 
 }
 
 void eraseInstalled(SQLite::Database& database, const ApplicationRow& installed) {
-  if (installed.type == ApplicationTypeSystem) throw Refused{belongsToSystem(installed.identifier)};
+  if (installed.type == ApplicationTypeSystem) {
+    throw Refused{
+        objection(EPERM, installed.identifier, "belongs to the system and cannot be removed")};
+  }
   eraseApplication(database, installed);
   recordUninstalled(database, installed.identifier);
   forgetApplication(database, installed.identifier);
@@ -88,7 +85,7 @@ bool removeForClient(DeviceCore& core, const std::string& identifier, bool place
           enterRemoval(database, *present.installed, HistoryOrigin::Sync);
           removed.installed = std::move(present.installed);
         } else {
-          throw Refused{notInstalled(identifier)};
+          throw notInstalled(identifier);
         }
       },
       error);
@@ -105,7 +102,7 @@ bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optio
       purpose(identifier), Database::Commit::OnDisk,
       [&](SQLite::Database& database) {
         removed = findApplication(database, identifier);
-        if (!removed.any()) throw Refused{notInstalled(identifier)};
+        if (!removed.any()) throw notInstalled(identifier);
         brokenOff = removed.placeholder && isInstalling(database, identifier);
         enterRemoval(database, *(removed.installed ? removed.installed : removed.placeholder),
                      HistoryOrigin::Person);
