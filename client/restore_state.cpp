@@ -21,22 +21,15 @@ PropertyList::Dictionary& dictionaryUnder(PropertyList::Dictionary& parent, std:
 
 std::optional<Bytes> readState(FileManager& files, const ClientLog& log,
                                std::optional<Error>& error) {
-  std::optional<Bytes> bytes = files.contentsAtPath(paths::RestoreState, &error);
-  sayUnreadable(log, paths::RestoreState, error);
+  std::optional<Bytes> bytes = files.contentsAtPath(exchange::RestoreState, &error);
+  sayUnreadable(log, exchange::RestoreState, error);
   return bytes;
-}
-
-/// What the file holds; none when it is damaged.
-std::optional<PropertyList::Dictionary> stateIn(const Bytes& bytes) {
-  std::optional<PropertyList> parsed = parsePropertyList(bytes);
-  PropertyList::Dictionary* state = parsed ? parsed->asDictionary() : nullptr;
-  return state ? std::optional(std::move(*state)) : std::nullopt;
 }
 
 void writeXml(FileManager& files, PropertyList::Dictionary state) {
   const std::optional<Bytes> bytes =
       serializePropertyList(std::move(state), PropertyListFormat::Xml);
-  if (bytes) files.writeAtomically(paths::RestoreState, *bytes);
+  if (bytes) files.writeAtomically(exchange::RestoreState, *bytes);
 }
 
 }  // namespace
@@ -46,7 +39,8 @@ std::optional<PropertyList> AppsClient::_restoreStatePropertyForKey(
     const std::optional<std::string>& version) const {
   std::optional<Error> error;
   const std::optional<Bytes> bytes = readState(_platform.files, _log, error);
-  const std::optional<PropertyList::Dictionary> state = bytes ? stateIn(*bytes) : std::nullopt;
+  const std::optional<PropertyList::Dictionary> state =
+      bytes ? parseDictionary(*bytes) : std::nullopt;
   if (!state) return std::nullopt;
   const PropertyList* versions = find(*state, identifier);
   const PropertyList* properties = versions ? versions->find(version.value_or(NoVersion)) : nullptr;
@@ -64,7 +58,7 @@ void AppsClient::_setRestoreStatePropertyValue(const PropertyList& value, std::s
   if (!bytes && !isMissing(error)) return;
   // A damaged file is left for the next clean-up to delete.
   std::optional<PropertyList::Dictionary> state =
-      bytes ? stateIn(*bytes) : PropertyList::Dictionary{};
+      bytes ? parseDictionary(*bytes) : PropertyList::Dictionary{};
   if (!state) return;
   PropertyList::Dictionary& versions = dictionaryUnder(*state, identifier);
   dictionaryUnder(versions, version.value_or(NoVersion)).insert_or_assign(std::string(key), value);
@@ -77,10 +71,10 @@ void AppsClient::cleanRestoreStateForIdentifier(std::string_view identifier) {
   const std::optional<Bytes> bytes = readState(_platform.files, _log, error);
   if (!bytes) return;
   // A damaged file counts as empty, so that it goes away here; one that cannot be read stays.
-  PropertyList::Dictionary state = stateIn(*bytes).value_or(PropertyList::Dictionary{});
+  PropertyList::Dictionary state = parseDictionary(*bytes).value_or(PropertyList::Dictionary{});
   state.erase(std::string(identifier));
   if (state.empty()) {
-    _platform.files.removeItem(paths::RestoreState);
+    _platform.files.removeItem(exchange::RestoreState);
   } else {
     writeXml(_platform.files, std::move(state));
   }

@@ -3,6 +3,7 @@
 #include "coordination/failure.h"
 #include "coordination/install_options.h"
 #include "coordination/transaction_steps.h"
+#include "platform/property_list_codec.h"
 #include "restore/halvo_metadata.h"
 
 namespace appsync {

@@ -166,9 +166,8 @@ class FolderDevice final : public EmbeddedDevice {
 
   bool saveData(std::string_view bundleId, const DataSink& sink,
                 std::optional<Error>* error) noexcept override {
-    if (isUsableIdentifier(bundleId)) return saveApplicationData(core_, bundleId, sink, error);
-    setError(error, Error::posix(EINVAL, bundleId));
-    return false;
+    if (!isUsableIdentifier(bundleId)) return failWith(error, Error::posix(EINVAL, bundleId));
+    return saveApplicationData(core_, bundleId, sink, error);
   }
 
   bool restoreData(std::string_view bundleId, const DataSource& source,
@@ -220,9 +219,8 @@ class FolderDevice final : public EmbeddedDevice {
 
  private:
   bool takesData(std::string_view bundleId, std::optional<Error>* error) const {
-    if (isUsableIdentifier(bundleId) && database_->writable()) return true;
-    setError(error, Error::posix(database_->writable() ? EINVAL : EROFS, bundleId));
-    return false;
+    if (!database_->writable()) return failWith(error, Error::posix(EROFS, bundleId));
+    return isUsableIdentifier(bundleId) || failWith(error, Error::posix(EINVAL, bundleId));
   }
 
   std::optional<Error> tap(std::string_view bundleId) {
@@ -319,10 +317,7 @@ bool fulfil(PersonWish wish, const std::filesystem::path& folder, std::string_vi
   {
     const std::optional<OpenFolder> opened = openFolder(folder, Access::ReadOnly, deviceError);
     if (!opened) return false;
-    if (!isUsableIdentifier(bundleId)) {
-      setError(error, notInstalling(bundleId));
-      return false;
-    }
+    if (!isUsableIdentifier(bundleId)) return failWith(error, notInstalling(bundleId));
   }
   std::optional<Error> refusal;
   switch (askWriter(DevicePaths(folder), wish, bundleId, &refusal)) {
@@ -340,9 +335,7 @@ bool fulfil(PersonWish wish, const std::filesystem::path& folder, std::string_vi
       if (!device) return false;
       refusal = device->carryOut(wish, bundleId);
   }
-  if (!refusal) return true;
-  setError(error, *refusal);
-  return false;
+  return !refusal || failWith(error, *refusal);
 }
 
 }  // namespace

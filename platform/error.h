@@ -46,5 +46,10 @@ std::string description(const Error& error);
 inline void setError(std::optional<Error>* error, Error reason) {
   if (error) *error = std::move(reason);
 }
+/// The same, for an operation that is false when it fails: false.
+inline bool failWith(std::optional<Error>* error, Error reason) {
+  setError(error, std::move(reason));
+  return false;
+}
 
 }  // namespace appsync

@@ -3,6 +3,7 @@
 #include <cerrno>
 
 #include "platform/bundle.h"
+#include "platform/property_list_codec.h"
 
 namespace appsync {
 
@@ -24,8 +25,15 @@ bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>
   std::optional<Error> reason;
   contents = files.contentsAtPath(path, &reason);
   if (contents || isMissing(reason)) return true;
-  setError(error, reason.value_or(Error::posix(EIO, path)));
-  return false;
+  return failWith(error, reason.value_or(Error::posix(EIO, path)));
+}
+
+std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,
+                                                       std::optional<Error>* error) {
+  std::optional<Bytes> bytes;
+  if (!readIfThere(files, path, bytes, error)) return std::nullopt;
+  auto dictionary = bytes ? parseDictionary(*bytes) : std::nullopt;
+  return dictionary ? dictionary : PropertyList::Dictionary{};
 }
 
 std::optional<bool> isExecutableThere(FileManager& files, std::string_view bundlePath,

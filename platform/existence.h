@@ -21,6 +21,11 @@ std::optional<bool> isThere(FileManager& files, std::string_view path, std::opti
 bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>& contents,
                  std::optional<Error>* error);
 
+/// The dictionary in a file, empty when the file is missing or holds none. nullopt (with a reason)
+/// when it cannot be read.
+std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,
+                                                       std::optional<Error>* error);
+
 /// Whether the executable that a bundle's information names is in it; true when it names none.
 /// nullopt (with a reason) when that cannot be told.
 std::optional<bool> isExecutableThere(FileManager& files, std::string_view bundlePath,

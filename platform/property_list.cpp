@@ -223,6 +223,36 @@ const std::string* findString(const PropertyList::Dictionary& dictionary, std::s
   return value ? value->asString() : nullptr;
 }
 
+const PropertyList::Dictionary* findDictionary(const PropertyList::Dictionary& dictionary,
+                                               std::string_view key) {
+  const PropertyList* value = find(dictionary, key);
+  return value ? value->asDictionary() : nullptr;
+}
+
+std::optional<PropertyList::Data> findData(const PropertyList::Dictionary& dictionary,
+                                           std::string_view key) {
+  const PropertyList* value = find(dictionary, key);
+  const PropertyList::Data* data = value ? value->asData() : nullptr;
+  return data ? std::optional(*data) : std::nullopt;
+}
+
+std::vector<std::string> findStrings(const PropertyList::Dictionary& dictionary,
+                                     std::string_view key) {
+  std::vector<std::string> strings;
+  const PropertyList* value = find(dictionary, key);
+  const PropertyList::Array* array = value ? value->asArray() : nullptr;
+  if (!array) return strings;
+  for (const PropertyList& item : *array) {
+    if (const std::string* text = item.asString()) strings.push_back(*text);
+  }
+  return strings;
+}
+
+bool findFlag(const PropertyList::Dictionary& dictionary, std::string_view key) {
+  const PropertyList* value = find(dictionary, key);
+  return value && value->booleanValue();
+}
+
 std::string description(const PropertyList& value) {
   std::string out;
   append(out, value);

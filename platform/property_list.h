@@ -96,6 +96,17 @@ class PropertyList {
 const PropertyList* find(const PropertyList::Dictionary& dictionary, std::string_view key);
 /// The string under `key`; nullptr when there is none or it is of another type.
 const std::string* findString(const PropertyList::Dictionary& dictionary, std::string_view key);
+/// The dictionary under `key`; nullptr when there is none or it is of another type.
+const PropertyList::Dictionary* findDictionary(const PropertyList::Dictionary& dictionary,
+                                               std::string_view key);
+/// The data under `key`; nullopt when there is none or it is of another type.
+std::optional<PropertyList::Data> findData(const PropertyList::Dictionary& dictionary,
+                                           std::string_view key);
+/// The strings of the array under `key`; none when there is no array.
+std::vector<std::string> findStrings(const PropertyList::Dictionary& dictionary,
+                                     std::string_view key);
+/// Whether there is a value under `key` that read as a boolean is true.
+bool findFlag(const PropertyList::Dictionary& dictionary, std::string_view key);
 
 /// One line for log messages and errors: "(a, b)" for arrays, "{k = v; l = w}" for dictionaries,
 /// "<0a0b>" for data (shortened past 16 bytes: "<0a0b... 4096 bytes>"), "1" and "0" for booleans,

@@ -354,6 +354,15 @@ std::optional<PropertyList> parsePropertyList(ByteView bytes, std::optional<Erro
   return std::nullopt;
 }
 
+std::optional<PropertyList::Dictionary> parseDictionary(ByteView bytes, std::optional<Error>* error,
+                                                        const PropertyListLimits& limits) {
+  std::optional<PropertyList> parsed = parsePropertyList(bytes, error, limits);
+  if (!parsed) return std::nullopt;
+  if (PropertyList::Dictionary* dictionary = parsed->asDictionary()) return std::move(*dictionary);
+  setError(error, Error::withDescription(PropertyListErrorDomain, 0, "not a dictionary"));
+  return std::nullopt;
+}
+
 std::optional<Bytes> serializePropertyList(const PropertyList& value, PropertyListFormat format,
                                            std::optional<Error>* error) {
   const PlainLocale locale;

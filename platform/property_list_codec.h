@@ -26,6 +26,12 @@ struct PropertyListLimits {
 std::optional<PropertyList> parsePropertyList(ByteView bytes, std::optional<Error>* error = nullptr,
                                               const PropertyListLimits& limits = {});
 
+/// The dictionary that the bytes hold. nullopt and an error when they are no property list or hold
+/// something else.
+std::optional<PropertyList::Dictionary> parseDictionary(ByteView bytes,
+                                                        std::optional<Error>* error = nullptr,
+                                                        const PropertyListLimits& limits = {});
+
 /// Serialises a tree, so that parsing gives an equal one. Fails (nullopt, error) on what a reader
 /// could not have back: a null anywhere, a string or key with a NUL byte or that is no UTF-8, a
 /// date that is no finite number, a tree beyond the parser's default limits; in XML also a control

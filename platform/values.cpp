@@ -75,16 +75,7 @@ std::string joinPath(std::string_view directory, std::string_view name) {
 std::optional<PropertyList::Dictionary> loadDictionary(FileManager& files, std::string_view path,
                                                        std::optional<Error>* error) {
   const std::optional<Bytes> bytes = files.contentsAtPath(path, error);
-  if (!bytes) return std::nullopt;
-  std::optional<PropertyList> parsed = parsePropertyList(*bytes, error);
-  if (!parsed) return std::nullopt;
-  PropertyList::Dictionary* dictionary = parsed->asDictionary();
-  if (!dictionary) {
-    setError(error, Error::withDescription(PropertyListErrorDomain, 0,
-                                           std::string(path) + " holds no dictionary"));
-    return std::nullopt;
-  }
-  return std::move(*dictionary);
+  return bytes ? parseDictionary(*bytes, error) : std::nullopt;
 }
 
 std::optional<Bundle> Bundle::open(FileManager& files, const FileLocation& location) {

@@ -5,16 +5,9 @@
 #include <string_view>
 
 #include "client/log_message.h"
-#include "platform/bytes.h"
-#include "platform/error.h"
 #include "platform/property_list.h"
 
 namespace appsync {
-
-/// The dictionary that the bytes hold. nullopt and an error when they are no property list or hold
-/// something else.
-std::optional<PropertyList::Dictionary> parseDictionary(ByteView bytes,
-                                                        std::optional<Error>* error);
 
 // What an application's store metadata says of it. A version or a name that is a number is taken in
 // digits; of another type it counts as missing.

@@ -35,8 +35,7 @@ PropertyList periodicalFlag(const PropertyList::Dictionary& info) {
 }
 
 bool infoProhibitsLaunch(const PropertyList::Dictionary& info) {
-  const PropertyList* flag = find(info, LaunchProhibitedKey);
-  return flag && flag->booleanValue();
+  return findFlag(info, LaunchProhibitedKey);
 }
 
 bool writePlaceholderInfo(FileManager& files, std::string_view path,

@@ -5,6 +5,7 @@
 #include "client/paths.h"
 #include "client/unreadable.h"
 #include "platform/existence.h"
+#include "platform/property_list_codec.h"
 #include "restore/halvo_metadata.h"
 #include "restore/placeholder_info.h"
 
@@ -30,14 +31,8 @@ class DemotedApps {
  private:
   static std::set<std::string> namesUnder(const PropertyList::Dictionary& lists,
                                           std::string_view key) {
-    std::set<std::string> names;
-    const PropertyList* list = find(lists, key);
-    const PropertyList::Array* entries = list ? list->asArray() : nullptr;
-    if (!entries) return names;
-    for (const PropertyList& entry : *entries) {
-      if (const std::string* name = entry.asString()) names.insert(*name);
-    }
-    return names;
+    const std::vector<std::string> names = findStrings(lists, key);
+    return {names.begin(), names.end()};
   }
 
   const std::set<std::string> automatic_;
@@ -51,12 +46,6 @@ struct RestoreEntry {
   std::optional<Bytes> icon;
 };
 
-std::optional<Bytes> dataUnder(const PropertyList::Dictionary& entry, std::string_view key) {
-  const PropertyList* value = find(entry, key);
-  const Bytes* data = value ? value->asData() : nullptr;
-  return data ? std::optional(*data) : std::nullopt;
-}
-
 std::optional<RestoreEntry> readEntry(const ClientLog& log, std::string_view bundleId,
                                       const PropertyList& value) {
   const PropertyList::Dictionary* entry = value.asDictionary();
@@ -64,13 +53,13 @@ std::optional<RestoreEntry> readEntry(const ClientLog& log, std::string_view bun
     log.normal("no halvo restore info for '%{public}@' - skipping", bundleId);
     return std::nullopt;
   }
-  std::optional<Bytes> metadata = dataUnder(*entry, exchange::RestoreMetadataKey);
+  std::optional<Bytes> metadata = findData(*entry, exchange::RestoreMetadataKey);
   if (!metadata) {
     log.normal("no HalvoMetadata for '%{public}@' - ignoring", bundleId);
     return std::nullopt;
   }
-  return RestoreEntry{std::move(*metadata), dataUnder(*entry, exchange::RestoreSinfKey),
-                      dataUnder(*entry, exchange::RestoreIconKey)};
+  return RestoreEntry{std::move(*metadata), findData(*entry, exchange::RestoreSinfKey),
+                      findData(*entry, exchange::RestoreIconKey)};
 }
 
 std::optional<PropertyList::Dictionary> loadRestoreList(FileManager& files, const ClientLog& log) {

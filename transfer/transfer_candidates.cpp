@@ -33,7 +33,7 @@ PropertyList::Dictionary todoEntry(const PropertyList& item, const std::string& 
   sayUnexpectedTypes(log, identifier, *item.asDictionary(),
                      {exchange::TodoVersionKey, exchange::TodoNameKey});
   const TodoEntry todo(item);
-  const std::string path = std::string(paths::InWorkArea) + identifier;
+  const std::string path = std::string(exchange::InWorkArea) + identifier;
   PropertyList::Dictionary entry;
   entry.emplace(PathKey, path);
   entry.emplace(ContainerKey, path);
@@ -46,11 +46,6 @@ PropertyList::Dictionary todoEntry(const PropertyList& item, const std::string& 
 std::optional<std::string> stringOf(const PropertyList::Dictionary& entry, std::string_view key) {
   const std::string* value = findString(entry, key);
   return value ? std::optional(*value) : std::nullopt;
-}
-
-bool flagOf(const PropertyList::Dictionary& entry, std::string_view key) {
-  const PropertyList* value = find(entry, key);
-  return value && value->booleanValue();
 }
 
 std::optional<std::string> displayNameOf(FileManager& files,
@@ -108,10 +103,10 @@ std::optional<TransferCandidate> readCandidate(const PropertyList& value, FileMa
   candidate.displayName = displayNameOf(files, candidate.bundlePath);
   candidate.nameFromHalvo = usableText(*entry, NameFromHalvoKey);
   candidate.iconPath = joinPath(paths::IconScratch, *identifier + ".png");
-  candidate.isRestore = flagOf(*entry, IsRestoreKey);
-  candidate.isAutoDemoted = flagOf(*entry, AutoDemotedKey);
-  candidate.isIntentionallyDemoted = flagOf(*entry, IntentionallyDemotedKey);
-  candidate.isSystemApp = flagOf(*entry, SystemAppKey);
+  candidate.isRestore = findFlag(*entry, IsRestoreKey);
+  candidate.isAutoDemoted = findFlag(*entry, AutoDemotedKey);
+  candidate.isIntentionallyDemoted = findFlag(*entry, IntentionallyDemotedKey);
+  candidate.isSystemApp = findFlag(*entry, SystemAppKey);
   return candidate;
 }
 

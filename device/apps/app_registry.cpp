@@ -36,12 +36,6 @@ Error invalid(std::string_view text) {
   return Error::withDescription(POSIXErrorDomain, EINVAL, text);
 }
 
-std::optional<Bytes> dataOption(const PropertyList::Dictionary& options, std::string_view key) {
-  const PropertyList* value = find(options, key);
-  const PropertyList::Data* data = value ? value->asData() : nullptr;
-  return data ? std::optional(*data) : std::nullopt;
-}
-
 /// Who brings a package.
 HistoryOrigin originOf(const PropertyList::Dictionary& options) {
   const PropertyList* type = find(options, SWInstallTypeKey);
@@ -53,7 +47,7 @@ HistoryOrigin originOf(const PropertyList::Dictionary& options) {
 InstallDetails placeholderDetails(const PropertyList::Dictionary& options) {
   const PropertyList* type = find(options, SWInstallTypeKey);
   return {static_cast<InstallType>(type ? type->asUnsigned().value_or(0) : 0),
-          dataOption(options, SWHalvoMetadataKey), dataOption(options, SWApplicationSINFKey),
+          findData(options, SWHalvoMetadataKey), findData(options, SWApplicationSINFKey),
           HistoryOrigin::Sync};
 }
 
@@ -109,21 +103,19 @@ bool DeviceAppRegistry::changeApplication(
     std::optional<Error>* error) noexcept {
   try {
     if (!core_.database.writable()) {
-      setError(error, Error::withDescription(POSIXErrorDomain, EROFS,
-                                             "the device is open for reading only"));
-      return false;
+      return failWith(error, Error::withDescription(POSIXErrorDomain, EROFS,
+                                                    "the device is open for reading only"));
     }
     if (!isUsableIdentifier(bundleId)) {
-      setError(error, refusal(PackageRefusal::BadInfo,
+      return failWith(error,
+                      refusal(PackageRefusal::BadInfo,
                               "the identifier holds characters that no identifier may have"));
-      return false;
     }
     const std::string identifier(bundleId);
     const KeyedMutex::Guard guard(core_.applicationLocks, identifier);
     return change(identifier, error);
   } catch (const std::exception& failure) {
-    setError(error, Error::withDescription(POSIXErrorDomain, EIO, failure.what()));
-    return false;
+    return failWith(error, Error::withDescription(POSIXErrorDomain, EIO, failure.what()));
   }
 }
 
@@ -134,12 +126,10 @@ bool DeviceAppRegistry::installApplication(const FileLocation& package,
   const std::string* identifier = findString(options, KBBundleIdentifier);
   const bool placeholder = type && *type == SWPackageTypePlaceholder;
   if (!identifier || !type || (!placeholder && *type != SWPackageTypeCustomer)) {
-    setError(error, invalid("the options lack an identifier or a known package type"));
-    return false;
+    return failWith(error, invalid("the options lack an identifier or a known package type"));
   }
   if (placeholder && !package.isDirectory) {
-    setError(error, invalid("a placeholder is installed from its directory"));
-    return false;
+    return failWith(error, invalid("a placeholder is installed from its directory"));
   }
   if (placeholder) {
     const auto install = [&](const std::string& id, std::optional<Error>* reason) {
@@ -159,8 +149,7 @@ bool DeviceAppRegistry::installPackageWith(const FileLocation& package,
   std::optional<Error> reason;
   const auto install = [&](const std::string& id, std::optional<Error>* why) {
     if (!package.isDirectory) return installPackage(core_, package.path, id, details, why);
-    setError(why, invalid("a package is installed from a file"));
-    return false;
+    return failWith(why, invalid("a package is installed from a file"));
   };
   const bool installed = changeApplication(identifier, install, &reason);
   core_.watcher.installFinished(identifier, reason);
@@ -179,8 +168,7 @@ bool DeviceAppRegistry::buildPlaceholder(const std::string& identifier, const Pl
 
 bool DeviceAppRegistry::uninstallApplication(std::string_view bundleId,
                                              const PropertyList::Dictionary& options) noexcept {
-  const PropertyList* only = find(options, UninstallPlaceholdersOnlyKey);
-  const bool placeholderOnly = only && only->booleanValue();
+  const bool placeholderOnly = findFlag(options, UninstallPlaceholdersOnlyKey);
   const auto remove = [&](const std::string& identifier, std::optional<Error>* error) {
     return removeForClient(core_, identifier, placeholderOnly, error);
   };

@@ -155,8 +155,7 @@ bool guarded(std::optional<Error>* error, Work work) {
     reason = Error::posix(ENOMEM);
   }
   if (!reason) return true;
-  setError(error, std::move(*reason));
-  return false;
+  return failWith(error, std::move(*reason));
 }
 
 }  // namespace

@@ -55,8 +55,7 @@ bool demoteForPerson(DeviceCore& core, const std::string& identifier, std::optio
   const std::optional<IdleApplication> idle = holdIdle(core, identifier, error);
   if (!idle) return false;
   if (idle->row.type == ApplicationTypeSystem) {
-    setError(error, objection(EPERM, identifier, "belongs to the system"));
-    return false;
+    return failWith(error, objection(EPERM, identifier, "belongs to the system"));
   }
   return layPlaceholder(core, idle->row, error) && takePackage(core, idle->row, error);
 }

@@ -9,7 +9,6 @@
 #include "device/journal/history.h"
 #include "platform/bundle.h"
 #include "platform/existence.h"
-#include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
 
 namespace appsync::device {
@@ -35,8 +34,7 @@ bool undoEarlierAdoption(DeviceCore& core, const std::string& identifier,
   const auto there = isThere(core.files, Containers::dataPath(aside), error);
   if (!there || !*there) return there.has_value();
   if (!core.database.settle()) {
-    setError(error, Error::posix(EIO, Containers::dataPath(aside)));
-    return false;
+    return failWith(error, Error::posix(EIO, Containers::dataPath(aside)));
   }
   return removeAbandonedData(core, aside, error) && core.containers.undoAdoption(identifier, error);
 }
@@ -85,13 +83,10 @@ bool extractInto(DeviceCore& core, const std::string& package, const std::string
 
 /// What the metadata says; of one that does not parse nothing is expected.
 bool readMetadata(DeviceCore& core, ApplicationRow& row, std::optional<Error>* error) {
-  std::optional<Bytes> contents;
-  const std::string file = joinPath(row.container, exchange::MetadataName);
-  if (!readIfThere(core.files, file, contents, error)) return false;
-  const auto metadata = contents ? parsePropertyList(*contents) : std::nullopt;
-  const PropertyList* flag = metadata ? metadata->find("DeviceBasedQLP") : nullptr;
-  row.deviceBased = flag && flag->booleanValue();
-  return true;
+  const auto metadata =
+      readDictionary(core.files, joinPath(row.container, exchange::MetadataName), error);
+  row.deviceBased = metadata && findFlag(*metadata, "DeviceBasedQLP");
+  return metadata.has_value();
 }
 
 void inherit(ApplicationRow& row, const ApplicationRows& before, const InstallDetails& details) {

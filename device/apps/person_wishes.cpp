@@ -1,12 +1,12 @@
 #include "device/apps/person_wishes.h"
 
+#include <algorithm>
 #include <cerrno>
 
 #include "device/apps/installs.h"
 #include "device/state/application_rows.h"
 #include "device/state/device_policy.h"
 #include "platform/existence.h"
-#include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
 
 namespace appsync::device {
@@ -38,18 +38,12 @@ Asked findAsked(SQLite::Database& database, std::string_view identifier) {
 /// without coordination; nullopt (with an error) when that cannot be read.
 std::optional<bool> isListedAsDemoted(FileManager& files, const std::string& identifier,
                                       std::optional<Error>* error) {
-  std::optional<Bytes> bytes;
-  if (!readIfThere(files, exchange::DemotedApplications, bytes, error)) return std::nullopt;
-  const auto lists = bytes ? parsePropertyList(*bytes) : std::nullopt;
-  for (const std::string_view key :
-       {exchange::AutomaticDowngradesKey, exchange::IntentionalDowngradesKey}) {
-    const PropertyList* list = lists ? lists->find(key) : nullptr;
-    if (!list || !list->asArray()) continue;
-    for (const PropertyList& item : *list->asArray()) {
-      if (item.asString() && *item.asString() == identifier) return true;
-    }
-  }
-  return false;
+  const auto lists = readDictionary(files, exchange::DemotedApplications, error);
+  if (!lists) return std::nullopt;
+  const auto isIn = [&](std::string_view key) {
+    return std::ranges::count(findStrings(*lists, key), identifier) > 0;
+  };
+  return isIn(exchange::AutomaticDowngradesKey) || isIn(exchange::IntentionalDowngradesKey);
 }
 
 bool isComing(DeviceCore& core, const std::string& identifier) {
@@ -112,9 +106,9 @@ bool mayRemove(DeviceCore& core, std::optional<Error>* error) {
   const PolicyValue wish =
       StoredDevicePolicy(core.database).effectiveBoolValue(PolicySetting::AppRemovalAllowed);
   if (wish != PolicyValue::ExplicitlyNo) return true;
-  setError(error, Error::withDescription(POSIXErrorDomain, EPERM,
+  return failWith(error,
+                  Error::withDescription(POSIXErrorDomain, EPERM,
                                          "removing applications is forbidden on this phone"));
-  return false;
 }
 
 }  // namespace appsync::device

@@ -137,8 +137,7 @@ bool removeAbandonedData(DeviceCore& core, const std::string& name, std::optiona
   if (!abandoned || !*abandoned) return abandoned.has_value();
   if (!core.containers.removeData(Containers::asideName(name)) ||
       !core.containers.removeData(name) || !core.containers.removeWaitingData(name)) {
-    setError(error, Error::posix(EIO, Containers::dataPath(name)));
-    return false;
+    return failWith(error, Error::posix(EIO, Containers::dataPath(name)));
   }
   return core.database.change(
       // On disk before the application can have new data, which a list come back would name.

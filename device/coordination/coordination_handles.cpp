@@ -276,10 +276,7 @@ bool CoordinatorHandle::setUserDataPromise(const std::shared_ptr<OutOfBandTransf
 
 bool CoordinatorHandle::setPlaceholderPromise(
     const std::shared_ptr<InstallPlaceholder>& placeholder, std::optional<Error>* error) noexcept {
-  if (!placeholder) {
-    setError(error, posixError(EINVAL, "there is no placeholder"));
-    return false;
-  }
+  if (!placeholder) return failWith(error, posixError(EINVAL, "there is no placeholder"));
   return change(
       [&](SQLite::Database& database, CoordinatorRow& row) {
         const std::int64_t number = numberOf(placeholder, *this, "placeholder");

@@ -103,22 +103,13 @@ PropertyList::Dictionary treeOf(const Error& error) {
 std::optional<Error> errorIn(const PropertyList::Dictionary& tree) {
   const std::string* domain = findString(tree, "Domain");
   const PropertyList* code = find(tree, "Code");
-  const PropertyList* info = find(tree, "UserInfo");
-  if (!domain || !code || !code->asInteger() || !info || !info->asDictionary()) return std::nullopt;
-  Error error{*domain, *code->asInteger(), *info->asDictionary(), nullptr};
-  const PropertyList* underlying = find(tree, "Underlying");
-  if (underlying && underlying->asDictionary()) {
-    if (const auto cause = errorIn(*underlying->asDictionary())) {
-      error.underlying = std::make_shared<const Error>(*cause);
-    }
-  }
+  const auto* info = findDictionary(tree, "UserInfo");
+  if (!domain || !code || !code->asInteger() || !info) return std::nullopt;
+  Error error{*domain, *code->asInteger(), *info, nullptr};
+  const auto* underlying = findDictionary(tree, "Underlying");
+  const auto cause = underlying ? errorIn(*underlying) : std::nullopt;
+  if (cause) error.underlying = std::make_shared<const Error>(*cause);
   return error;
-}
-
-std::optional<PropertyList::Dictionary> dictionaryFrom(const Bytes& bytes) {
-  const std::optional<PropertyList> value = parsePropertyList(bytes);
-  const PropertyList::Dictionary* dictionary = value ? value->asDictionary() : nullptr;
-  return dictionary ? std::optional(*dictionary) : std::nullopt;
 }
 
 }  // namespace
@@ -255,7 +246,7 @@ Bytes bytesOf(const Error& error) {
 }
 
 std::optional<Error> errorFrom(const Bytes& bytes) {
-  const auto tree = dictionaryFrom(bytes);
+  const auto tree = parseDictionary(bytes);
   return tree ? errorIn(*tree) : std::nullopt;
 }
 
@@ -268,7 +259,7 @@ std::optional<Bytes> bytesOf(const InstallOptions& options, std::optional<Error>
 }
 
 std::optional<InstallOptions> optionsFrom(const Bytes& bytes) {
-  const auto tree = dictionaryFrom(bytes);
+  const auto tree = parseDictionary(bytes);
   if (!tree) return std::nullopt;
   const PropertyList* type = find(*tree, "InstallType");
   const PropertyList* target = find(*tree, "TargetType");
@@ -276,12 +267,10 @@ std::optional<InstallOptions> optionsFrom(const Bytes& bytes) {
   InstallOptions options;
   options.installType = static_cast<InstallType>(*type->asUnsigned());
   options.installTargetType = *target->asUnsigned();
-  const PropertyList* metadata = find(*tree, "StoreMetadata");
-  if (metadata && metadata->asDictionary()) {
-    options.storeMetadata = StoreMetadata::fromDictionary(*metadata->asDictionary());
+  if (const auto* metadata = findDictionary(*tree, "StoreMetadata")) {
+    options.storeMetadata = StoreMetadata::fromDictionary(*metadata);
   }
-  const PropertyList* sinf = find(*tree, "Sinf");
-  if (sinf && sinf->asData()) options.sinfData = *sinf->asData();
+  options.sinfData = findData(*tree, "Sinf");
   return options;
 }
 
@@ -293,12 +282,11 @@ std::optional<Bytes> bytesOf(const PlaceholderAttributes& attributes, std::optio
 }
 
 std::optional<PlaceholderAttributes> attributesFrom(const Bytes& bytes) {
-  const auto tree = dictionaryFrom(bytes);
-  const PropertyList* info = tree ? find(*tree, "Info") : nullptr;
+  const auto tree = parseDictionary(bytes);
+  const auto* info = tree ? findDictionary(*tree, "Info") : nullptr;
   const PropertyList* prohibited = tree ? find(*tree, "LaunchProhibited") : nullptr;
-  if (!info || !info->asDictionary() || !prohibited) return std::nullopt;
-  PlaceholderAttributes attributes =
-      PlaceholderAttributes::fromInfoDictionary(*info->asDictionary());
+  if (!info || !prohibited) return std::nullopt;
+  PlaceholderAttributes attributes = PlaceholderAttributes::fromInfoDictionary(*info);
   attributes.setLaunchProhibited(prohibited->booleanValue());
   if (const std::string* version = findString(*tree, "Version")) {
     attributes.setBundleVersion(*version);
@@ -311,7 +299,7 @@ std::optional<Bytes> bytesOf(const StoreMetadata& metadata, std::optional<Error>
 }
 
 std::optional<StoreMetadata> metadataFrom(const Bytes& bytes) {
-  auto tree = dictionaryFrom(bytes);
+  auto tree = parseDictionary(bytes);
   if (!tree) return std::nullopt;
   return StoreMetadata::fromDictionary(std::move(*tree));
 }

@@ -90,9 +90,8 @@ std::optional<std::vector<std::string>> Containers::list(std::optional<Error>* e
 bool Containers::flush(std::optional<Error>* error) {
   const FileDescriptor directory = handles_.openDirectory(ApplicationsDirectory, error);
   if (!directory) return false;
-  if (syncFileSystem(directory.get())) return true;
-  setError(error, Error::posix(errno, ApplicationsDirectory));
-  return false;
+  return syncFileSystem(directory.get()) ||
+         failWith(error, Error::posix(errno, ApplicationsDirectory));
 }
 
 std::optional<bool> Containers::dataWaits(std::string_view identifier,
@@ -111,8 +110,7 @@ bool Containers::adoptWaitingData(std::string_view identifier, std::optional<Err
       (hadData || isMissing(reason)) && files_.moveItem(waitingDataPath(identifier), data, &reason);
   if (adopted) return true;
   if (hadData) files_.moveItem(aside, data);
-  setError(error, reason.value_or(Error::posix(EIO, data)));
-  return false;
+  return failWith(error, reason.value_or(Error::posix(EIO, data)));
 }
 
 bool Containers::undoAdoption(std::string_view identifier, std::optional<Error>* error) {

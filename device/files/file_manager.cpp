@@ -77,8 +77,7 @@ int readAll(int fd, std::size_t expected, Bytes& bytes) {
 }
 
 bool fail(std::optional<Error>* error, int reason, std::string_view path) {
-  setError(error, Error::posix(reason, path));
-  return false;
+  return failWith(error, Error::posix(reason, path));
 }
 
 /// Nobody looks for a temporary file after a power failure, so none waits for the disk.

@@ -45,10 +45,9 @@ std::string ApplicationRows::type() const {
 void describe(ApplicationRow& row, const PropertyList::Dictionary& info) {
   const std::string* version = findString(info, KBBundleVersion);
   const std::string* name = findString(info, KBBundleDisplayName);
-  const PropertyList* prohibited = find(info, "SWApplicationLaunchProhibited");
   if (version) row.version = *version;
   if (name) row.displayName = *name;
-  row.launchProhibited = prohibited && prohibited->booleanValue();
+  row.launchProhibited = findFlag(info, "SWApplicationLaunchProhibited");
 }
 
 ApplicationRows findApplication(SQLite::Database& database, std::string_view identifier) {

@@ -71,8 +71,7 @@ bool Database::attempt(std::string_view purpose, const std::function<void()>& wo
     work();
     return true;
   } catch (const Refused& refused) {
-    setError(error, refused.error);
-    return false;
+    return failWith(error, refused.error);
   } catch (const SQLite::Exception& exception) {
     reason = errorOf(exception);
     cause = exception.what();
@@ -82,8 +81,7 @@ bool Database::attempt(std::string_view purpose, const std::function<void()>& wo
   }
   log_.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
              fmt::format("{} (the device's database: {})", purpose, cause));
-  setError(error, std::move(reason));
-  return false;
+  return failWith(error, std::move(reason));
 }
 
 bool Database::read(std::string_view purpose, const Work& work,

@@ -87,30 +87,20 @@ std::vector<std::string> Foreground::running() const {
 bool Foreground::launch(const std::string& identifier,
                         const std::function<std::optional<Error>()>& objection,
                         std::optional<Error>* error) const {
+  const auto fail = [&] { return failWith(error, Error::posix(errno, directory_.native())); };
   const FileDescriptor directory = lockDirectory(directory_);
-  if (!directory) {
-    setError(error, Error::posix(errno, directory_.native()));
-    return false;
-  }
-  if (std::optional<Error> reason = objection()) {
-    setError(error, std::move(*reason));
-    return false;
-  }
+  if (!directory) return fail();
+  if (const auto reason = objection()) return failWith(error, *reason);
   const std::optional<bool> held = isHeld(directory, identifier);
-  if (!held) {
-    setError(error, Error::posix(errno, directory_.native()));
-    return false;
-  }
+  if (!held) return fail();
   if (*held) {
-    setError(error, Error::withDescription(
-                        POSIXErrorDomain, EBUSY,
-                        fmt::format("{} is being installed; try again later", identifier)));
-    return false;
+    return failWith(error, Error::withDescription(
+                               POSIXErrorDomain, EBUSY,
+                               fmt::format("{} is being installed; try again later", identifier)));
   }
   const FileDescriptor file(openat(directory.get(), fileFor(identifier, RunningSuffix).c_str(),
                                    O_WRONLY | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644));
-  if (!file) setError(error, Error::posix(errno, directory_.native()));
-  return static_cast<bool>(file);
+  return file || fail();
 }
 
 bool Foreground::quit(const std::string& identifier, std::optional<Error>* error) const {
@@ -119,8 +109,7 @@ bool Foreground::quit(const std::string& identifier, std::optional<Error>* error
                     errno == ENOENT)) {
     return true;
   }
-  setError(error, Error::posix(errno, directory_.native()));
-  return false;
+  return failWith(error, Error::posix(errno, directory_.native()));
 }
 
 Foreground::HoldResult Foreground::hold(const std::string& identifier) const {

@@ -30,17 +30,13 @@ void complete(PropertyList::Dictionary& metadata, const AppRecord& record) {
 /// same way, since a phone that coordinates installs does not keep the file's own bytes.
 std::optional<Bytes> metadataOf(FileManager& files, const AppRecord& record,
                                 std::optional<Error>* error) {
-  std::optional<Bytes> bytes;
-  if (record.bundleContainerPath &&
-      !readIfThere(files, joinPath(*record.bundleContainerPath, exchange::MetadataName), bytes,
-                   error)) {
-    return std::nullopt;
+  std::optional metadata = PropertyList::Dictionary();
+  if (const auto& container = record.bundleContainerPath) {
+    metadata = readDictionary(files, joinPath(*container, exchange::MetadataName), error);
   }
-  const auto parsed = bytes ? parsePropertyList(*bytes) : std::nullopt;
-  const PropertyList::Dictionary* stored = parsed ? parsed->asDictionary() : nullptr;
-  PropertyList::Dictionary metadata = stored ? *stored : PropertyList::Dictionary();
-  complete(metadata, record);
-  return serializePropertyList(std::move(metadata), PropertyListFormat::Binary, error);
+  if (!metadata) return std::nullopt;
+  complete(*metadata, record);
+  return serializePropertyList(std::move(*metadata), PropertyListFormat::Binary, error);
 }
 
 std::optional<Bytes> renderedIcon(const Phone& phone, const std::string& bundlePath) {
@@ -56,16 +52,10 @@ std::optional<Bytes> renderedIcon(const Phone& phone, const std::string& bundleP
 
 /// False when an icon may be there though none could be drawn.
 bool canTellIcon(FileManager& files, const std::string& bundlePath, std::optional<Error>* error) {
-  std::optional<Bytes> bytes;
-  if (!readIfThere(files, joinPath(bundlePath, "Info.plist"), bytes, error)) return false;
-  const auto info = bytes ? parsePropertyList(*bytes) : std::nullopt;
-  const PropertyList* name = info ? info->find(KBBundleIconFile) : nullptr;
-  if (!name || !name->asString()) return true;
-  std::optional<Error> reason;
-  files.attributesOfItem(joinPath(bundlePath, *name->asString()), &reason);
-  if (!reason || isMissing(reason)) return true;
-  setError(error, *std::move(reason));
-  return false;
+  const auto info = readDictionary(files, joinPath(bundlePath, "Info.plist"), error);
+  if (!info) return false;
+  const std::string* name = findString(*info, KBBundleIconFile);
+  return !name || isThere(files, joinPath(bundlePath, *name), error).has_value();
 }
 
 /// None for an application without an icon that can be drawn. False when that cannot be told.
@@ -132,8 +122,8 @@ std::optional<PropertyList::Dictionary> restoreEntry(const Phone& phone, const A
 std::optional<PropertyList::Dictionary> demotionsAmong(FileManager& files,
                                                        const std::vector<AppRecord>& applications,
                                                        std::optional<Error>* error) {
-  std::optional<Bytes> bytes;
-  if (!readIfThere(files, exchange::DemotedApplications, bytes, error)) return std::nullopt;
+  const auto stored = readDictionary(files, exchange::DemotedApplications, error);
+  if (!stored) return std::nullopt;
   std::map<std::string_view, std::set<std::string>> demoted{
       {exchange::AutomaticDowngradesKey, {}}, {exchange::IntentionalDowngradesKey, {}}};
   std::set<std::string, std::less<>> candidates;
@@ -146,13 +136,9 @@ std::optional<PropertyList::Dictionary> demotionsAmong(FileManager& files,
         .insert(record.applicationIdentifier);
   }
   // Without coordination, a placeholder does not show that it is demoted.
-  const auto stored = bytes ? parsePropertyList(*bytes) : std::nullopt;
   for (auto& [key, identifiers] : demoted) {
-    const PropertyList* list = stored ? stored->find(key) : nullptr;
-    if (!list || !list->asArray()) continue;
-    for (const PropertyList& item : *list->asArray()) {
-      const std::string* identifier = item.asString();
-      if (identifier && candidates.contains(*identifier)) identifiers.insert(*identifier);
+    for (const std::string& identifier : findStrings(*stored, key)) {
+      if (candidates.contains(identifier)) identifiers.insert(identifier);
     }
   }
   PropertyList::Dictionary lists;

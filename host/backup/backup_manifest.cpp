@@ -74,17 +74,17 @@ std::string_view identifierOfBackupData(std::string_view name) {
 }
 
 std::optional<BackupManifest> parseManifest(ByteView bytes, std::string& problem) {
-  const auto root = parsePropertyList(bytes);
-  const PropertyList* version = root ? root->find(VersionKey) : nullptr;
+  const auto root = parseDictionary(bytes);
+  const PropertyList* version = root ? find(*root, VersionKey) : nullptr;
   const auto number = version ? version->asInteger() : std::nullopt;
   if (!number || *number < 1) return refuse(problem, "its manifest is damaged");
   if (*number > FormatVersion) {
     return refuse(problem, "it was made by a newer appsync; use that one");
   }
-  const PropertyList* files = root->find(FilesKey);
-  if (!files || !files->asDictionary()) return refuse(problem, "its manifest is damaged");
+  const auto* files = findDictionary(*root, FilesKey);
+  if (!files) return refuse(problem, "its manifest is damaged");
   BackupManifest manifest;
-  for (const auto& [path, value] : *files->asDictionary()) {
+  for (const auto& [path, value] : *files) {
     auto entry = entryOf(value);
     if (!entry) {
       return refuse(

@@ -204,13 +204,13 @@ class FolderWriter final : public BackupWriter {
  private:
   /// The older backup's list of applications, read once; nullptr when it cannot be.
   const PropertyList::Dictionary* older() {
-    if (!older_) {
+    if (!isOlderRead_) {
       std::string ignored;
       const auto backup = readBackup(target_.path, ignored);
-      older_ = PropertyList();
-      if (backup) older_ = parsePropertyList(backup->applications).value_or(PropertyList());
+      older_ = backup ? parseDictionary(backup->applications) : std::nullopt;
+      isOlderRead_ = true;
     }
-    return older_->asDictionary();
+    return older_ ? &*older_ : nullptr;
   }
 
   using Entries = std::map<std::string, ManifestEntry, std::less<>>;
@@ -280,7 +280,8 @@ class FolderWriter final : public BackupWriter {
   }
 
   const Target target_;
-  std::optional<PropertyList> older_;  ///< the applications of the older backup, once asked for
+  std::optional<PropertyList::Dictionary> older_;  ///< the applications of the older backup
+  bool isOlderRead_ = false;
   std::string unfinished_;  ///< name beside the target; empty when there is none any more
   FileDescriptor folder_;
   FileDescriptor data_;

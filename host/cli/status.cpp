@@ -7,7 +7,6 @@
 #include "base/text.h"
 #include "host/cli/plugin_session.h"
 #include "host/phone/phone_state.h"
-#include "platform/property_list_codec.h"
 
 namespace appsync::host {
 namespace {
@@ -23,12 +22,9 @@ std::map<std::string, std::size_t> todoCounts(FileManager& files) {
 /// Applications with a package that waits for its data to be restored.
 std::vector<std::string> restoring(FileManager& files) {
   std::vector<std::string> identifiers;
-  const auto bytes = files.contentsAtPath(exchange::RestoreState);
-  const auto state = bytes ? parsePropertyList(*bytes) : std::nullopt;
-  if (!state || !state->asDictionary()) return identifiers;
-  for (const auto& [identifier, versions] : *state->asDictionary()) {
-    identifiers.push_back(identifier);
-  }
+  const auto state = readDictionary(files, exchange::RestoreState, nullptr);
+  if (!state) return identifiers;
+  for (const auto& [identifier, versions] : *state) identifiers.push_back(identifier);
   return identifiers;
 }
 

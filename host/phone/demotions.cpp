@@ -16,11 +16,9 @@ Demotions::Demotions(FileManager& files) {
   }
   for (const std::string_view key :
        {exchange::AutomaticDowngradesKey, exchange::IntentionalDowngradesKey}) {
-    const PropertyList* list = lists ? find(*lists, key) : nullptr;
-    if (!list || !list->asArray()) continue;
-    for (const PropertyList& item : *list->asArray()) {
-      if (const std::string* identifier = item.asString()) named_.insert(*identifier);
-    }
+    if (!lists) break;
+    const std::vector<std::string> names = findStrings(*lists, key);
+    named_.insert(names.begin(), names.end());
   }
 }
 

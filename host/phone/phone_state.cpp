@@ -14,15 +14,6 @@ constexpr std::chrono::milliseconds IdlePoll{10};
 
 }  // namespace
 
-std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,
-                                                       std::optional<Error>* error) {
-  std::optional<Bytes> bytes;
-  if (!readIfThere(files, path, bytes, error)) return std::nullopt;
-  auto parsed = bytes ? parsePropertyList(*bytes) : std::nullopt;
-  PropertyList::Dictionary* dictionary = parsed ? parsed->asDictionary() : nullptr;
-  return dictionary ? std::move(*dictionary) : PropertyList::Dictionary{};
-}
-
 std::optional<bool> ownsData(const Phone& phone, const std::string& identifier,
                              std::optional<Error>* error) {
   const auto waits = isThere(phone.files, joinPath(exchange::WaitingData, identifier), error);

@@ -12,11 +12,6 @@
 
 namespace appsync::host {
 
-/// The dictionary in a file of the phone, empty when the file is missing or holds none; nullopt
-/// (with an error) when it cannot be read.
-std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,
-                                                       std::optional<Error>* error);
-
 /// Whether an application that has only a placeholder has data of its own, which it made before it
 /// lost its package and which is worth more than a backup's; nullopt (with an error) when that
 /// cannot be told.

@@ -21,10 +21,10 @@ struct BundleDescription {
   fs::path executable;  ///< absolute
 };
 
-std::optional<PropertyList> readInfo(const fs::path& bundle) {
+std::optional<PropertyList::Dictionary> readInfo(const fs::path& bundle) {
   std::ifstream file(bundle / "Info.plist", std::ios::binary);
   const std::string text{std::istreambuf_iterator<char>(file), {}};
-  return file ? parsePropertyList(asBytes(text)) : std::nullopt;
+  return file ? parseDictionary(asBytes(text)) : std::nullopt;
 }
 
 std::string otherVersion(std::uint64_t version) {
@@ -42,13 +42,13 @@ std::optional<BundleDescription> describe(const fs::path& bundle, std::string& r
     return std::nullopt;
   }
   const auto info = readInfo(absolute);
-  if (!info || !info->asDictionary()) {
+  if (!info) {
     reason = "it has no readable Info.plist, so it is no plug-in";
     return std::nullopt;
   }
-  const std::string* identifier = findString(*info->asDictionary(), KBBundleIdentifier);
-  const std::string* executable = findString(*info->asDictionary(), KBBundleExecutable);
-  const PropertyList* version = info->find(PluginInterfaceVersionKey);
+  const std::string* identifier = findString(*info, KBBundleIdentifier);
+  const std::string* executable = findString(*info, KBBundleExecutable);
+  const PropertyList* version = find(*info, PluginInterfaceVersionKey);
   if (!identifier || identifier->empty() || !executable || executable->empty() || !version ||
       !version->asUnsigned()) {
     reason = "its Info.plist does not describe a sync plug-in";

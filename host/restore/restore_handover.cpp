@@ -17,22 +17,18 @@ std::optional<Bytes> demotionsOf(const Backup& backup, const RestoreList& list, 
   if (!list.isPart()) return backup.demotions;
   const auto onPhone = readDictionary(files, exchange::DemotedApplications, error);
   if (!onPhone) return std::nullopt;
-  const auto parsed = parsePropertyList(backup.demotions);
-  const PropertyList::Dictionary none;
-  const PropertyList::Dictionary* inBackup = parsed ? parsed->asDictionary() : nullptr;
+  const auto inBackup = parseDictionary(backup.demotions).value_or(PropertyList::Dictionary());
   PropertyList::Dictionary merged;
   for (const std::string_view key :
        {exchange::AutomaticDowngradesKey, exchange::IntentionalDowngradesKey}) {
     PropertyList::Array names;
     const auto take = [&](const PropertyList::Dictionary& lists, bool named) {
-      const PropertyList* entries = find(lists, key);
-      if (!entries || !entries->asArray()) return;
-      for (const PropertyList& entry : *entries->asArray()) {
-        if (entry.asString() && list.names(*entry.asString()) == named) names.push_back(entry);
+      for (std::string& name : findStrings(lists, key)) {
+        if (list.names(name) == named) names.emplace_back(std::move(name));
       }
     };
     take(*onPhone, false);
-    take(inBackup ? *inBackup : none, true);
+    take(inBackup, true);
     merged.emplace(key, std::move(names));
   }
   return serializePropertyList(std::move(merged), PropertyListFormat::Xml, error);

@@ -15,10 +15,9 @@ const std::string* nameIn(const PropertyList::Dictionary& metadata) {
 
 BackedUpApplication describe(const std::string& identifier, const PropertyList& entry) {
   BackedUpApplication app{identifier, {}, identifier, {}};
-  const PropertyList* value = entry.find(exchange::RestoreMetadataKey);
-  const Bytes* bytes = value ? value->asData() : nullptr;
-  const auto parsed = bytes ? parsePropertyList(*bytes) : std::nullopt;
-  const PropertyList::Dictionary* metadata = parsed ? parsed->asDictionary() : nullptr;
+  const auto* known = entry.asDictionary();
+  const auto bytes = known ? findData(*known, exchange::RestoreMetadataKey) : std::nullopt;
+  const auto metadata = bytes ? parseDictionary(*bytes) : std::nullopt;
   if (!isSendableIdentifier(identifier)) {
     app.flaw = "no application can have this identifier";
   } else if (!bytes) {
@@ -39,8 +38,7 @@ BackedUpApplication describe(const std::string& identifier, const PropertyList& 
 }  // namespace
 
 std::optional<RestoreList> RestoreList::of(const Backup& backup, std::string& problem) {
-  auto parsed = parsePropertyList(backup.applications);
-  PropertyList::Dictionary* entries = parsed ? parsed->asDictionary() : nullptr;
+  auto entries = parseDictionary(backup.applications);
   if (!entries) {
     problem = "the backup's list of applications cannot be read";
     return std::nullopt;

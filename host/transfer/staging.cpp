@@ -19,13 +19,11 @@ constexpr std::string_view PlainEnding = ".package";
 /// installed application.
 std::optional<Bytes> withoutEmptyName(std::optional<Bytes> infoPlist) {
   if (!infoPlist) return infoPlist;
-  std::optional<PropertyList> parsed = parsePropertyList(*infoPlist);
-  if (!parsed) return infoPlist;
-  PropertyList::Dictionary* const info = parsed->asDictionary();
+  auto info = parseDictionary(*infoPlist);
   const std::string* const name = info ? findString(*info, KBBundleDisplayName) : nullptr;
   if (!name || !name->empty()) return infoPlist;
   info->erase(std::string(KBBundleDisplayName));
-  return serializePropertyList(*parsed, PropertyListFormat::Binary);
+  return serializePropertyList(std::move(*info), PropertyListFormat::Binary);
 }
 
 class Stage {
@@ -41,8 +39,7 @@ class Stage {
     if (!bytes) return true;
     const std::string path = joinPath(directory, name);
     if (files_.createFile(path, *bytes, {})) return true;
-    setError(error_, Error::posix(EIO, path));
-    return false;
+    return failWith(error_, Error::posix(EIO, path));
   }
 
   bool writeApplication(const PackageFacts& package) {
