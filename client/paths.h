@@ -5,25 +5,24 @@
 
 #include "platform/sync_files.h"
 
-/// The client's own files, and those it shares with the host where they lie once it has taken them.
+/// The client's own files, and what the host staged where it lies once the client has taken it
+/// over.
 namespace appsync::paths {
 
-using namespace exchange;
-
-inline const std::string TodoList = joinPath(WorkArea, TodoListName);
+inline const std::string TodoList = joinPath(exchange::WorkArea, exchange::TodoListName);
 /// The todo list as it stood when the reconcile finished; kept for diagnosis.
 inline const std::string TodoDebugCopy = TodoList + "-debug.plist";
-inline const std::string IconLayout = joinPath(WorkArea, IconLayoutName);
+inline const std::string IconLayout = joinPath(exchange::WorkArea, exchange::IconLayoutName);
 /// The home screen's order as last received; kept for diagnosis.
-inline const std::string SortOrder = joinPath(SyncRoot, "AssetSortOrder.plist");
+inline const std::string SortOrder = joinPath(exchange::SyncRoot, "AssetSortOrder.plist");
 inline constexpr std::string_view IconScratch = "/var/mobile/Library/ApplicationSync/Icons";
 
 // Files of a container and of a bundle, as an asset names them.
 inline std::string metadataIn(std::string_view container) {
-  return std::string(container) + "/HalvoMetadata.plist";
+  return std::string(container).append("/").append(exchange::MetadataName);
 }
 inline std::string artworkIn(std::string_view container) {
-  return std::string(container) + "/HalvoArtwork";
+  return std::string(container).append("/").append(exchange::ArtworkName);
 }
 inline std::string infoIn(std::string_view bundle) { return std::string(bundle) + "/Info.plist"; }
 

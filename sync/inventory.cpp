@@ -49,7 +49,8 @@ using DictionaryOf = const PropertyList::Dictionary* (PropertyList::*)() const;
 void addAccounts(const ClientLog& log, FileManager& files, const AppRecord& record,
                  std::set<std::string>& accounts) {
   std::optional<std::string> path;
-  if (record.bundleContainerPath) path = joinPath(*record.bundleContainerPath, paths::MetadataName);
+  if (record.bundleContainerPath)
+    path = joinPath(*record.bundleContainerPath, exchange::MetadataName);
   const auto metadata = path ? loadDictionary(files, *path) : std::nullopt;
   const PropertyList::Dictionary* root = metadata ? &*metadata : nullptr;
   const DictionaryOf dictionary = &PropertyList::asDictionary;
@@ -79,7 +80,7 @@ PropertyList::Dictionary AppsClient::installedAssets() noexcept {
   _log.normal("getting installed assets");
   PropertyList::Array deleted;
   const std::optional<PropertyList::Array> todoList = _loadListOrSay(paths::TodoList);
-  const std::optional<PropertyList::Array> lastSynced = _loadListOrSay(paths::LastSyncState);
+  const std::optional<PropertyList::Array> lastSynced = _loadListOrSay(exchange::LastSyncState);
 
   std::set<std::string> candidates;
   if (const auto uninstalled = _platform.installerService.lookupUninstalled()) {

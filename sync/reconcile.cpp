@@ -24,18 +24,18 @@ bool isSafeRemoval(const TodoEntry& entry) {
 /// the reconcile is over with this result.
 std::optional<bool> takeOverStagingArea(FileManager& files, const ClientLog& log,
                                         std::optional<Error>* error) {
-  files.removeItem(paths::WorkArea);
-  if (!files.createDirectory(paths::SyncRoot, true, {}, error)) {
+  files.removeItem(exchange::WorkArea);
+  if (!files.createDirectory(exchange::SyncRoot, true, {}, error)) {
     log.error("can't create work area");
     return false;
   }
   // One that cannot be looked at may be there: the move will tell.
   std::optional<Error> reason;
-  if (!files.attributesOfItem(paths::StagingArea, &reason) && isMissing(reason)) {
+  if (!files.attributesOfItem(exchange::StagingArea, &reason) && isMissing(reason)) {
     log.normal("Nothing to do");
     return true;
   }
-  if (!files.moveItem(paths::StagingArea, paths::WorkArea, error)) {
+  if (!files.moveItem(exchange::StagingArea, exchange::WorkArea, error)) {
     log.error("Can't move staging area");
     return false;
   }
@@ -113,7 +113,7 @@ void AppsClient::_sendIconLayout() {
 bool AppsClient::reconcileRestoreOfType(std::int32_t type, std::optional<Error>* error) noexcept {
   _log.normal("reconcileRestoreOfType %d", type);
   _notifyDashel(true);
-  _platform.files.createDirectory(paths::SyncRoot, true, {});
+  _platform.files.createDirectory(exchange::SyncRoot, true, {});
   if (type == RestoreFromDesktopBackup) _processHalvoRestoreInfo();
   if (error) error->reset();
   return true;

@@ -47,8 +47,8 @@ void AppsClient::syncEndedWithSuccess(bool success) noexcept {
   if (!success) return;
 
   std::optional<Error> error;
-  if (!_platform.files.touch(paths::SyncRoot, &error)) {
-    _log.error("Failed to update utimes of \"%s\": %s", paths::SyncRoot, systemText(error));
+  if (!_platform.files.touch(exchange::SyncRoot, &error)) {
+    _log.error("Failed to update utimes of \"%s\": %s", exchange::SyncRoot, systemText(error));
   }
   if (_uninstalledApps) {
     _log.normal("clearing uninstalled apps: %{public}@", *_uninstalledApps);
@@ -59,14 +59,14 @@ void AppsClient::syncEndedWithSuccess(bool success) noexcept {
       _uninstalledApps.reset();
     }
   }
-  _platform.files.removeItem(paths::LastSyncState);
+  _platform.files.removeItem(exchange::LastSyncState);
 }
 
 void AppsClient::clearSyncData() noexcept {
   _log.normal("blasting work area");
   {
     const std::lock_guard lock(_stateFileMutex);
-    _platform.files.removeItem(paths::SyncRoot);
+    _platform.files.removeItem(exchange::SyncRoot);
   }
 
   _log.normal("Uninstalling all placeholder apps");
@@ -91,7 +91,7 @@ void AppsClient::prepareForBackup() noexcept {
   _log.normal("preparing for backup");
   _platform.appRegistry.enumerateBundles(BundleKind::User, [this](const AppRecord& record, bool&) {
     if (!record.bundleContainerPath) return;
-    const std::string path = joinPath(*record.bundleContainerPath, paths::MetadataName);
+    const std::string path = joinPath(*record.bundleContainerPath, exchange::MetadataName);
     std::optional<PropertyList::Dictionary> metadata = loadDictionary(_platform.files, path);
     if (!metadata || !tidyMetadata(record, *metadata, _log)) return;
     const std::optional<Bytes> bytes =

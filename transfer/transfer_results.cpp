@@ -90,7 +90,7 @@ void AppsClient::_assetReceived(const SyncAssetPtr& asset,
   }
 
   if (asset->path && !asset->path->starts_with('/')) {
-    asset->path = joinPath(paths::StagingRoot, *asset->path);
+    asset->path = joinPath(exchange::StagingRoot, *asset->path);
   } else if (!asset->path) {
     const std::optional<PropertyList> remembered =
         _restoreStatePropertyForKey(exchange::RestorePathKey, identifier, versionOf(*asset));

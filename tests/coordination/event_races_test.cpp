@@ -51,7 +51,7 @@ class EventRaceTest : public CoordinationTest {
       client->_createAppAssetPromiseForBundleIdentifier(id, std::nullopt, coordinator.get());
     }
     phone.files.putPlist(paths::TodoList, todo);
-    phone.files.putPlist(paths::RestoreState, restoreState);
+    phone.files.putPlist(exchange::RestoreState, restoreState);
     forget();
   }
 
@@ -106,7 +106,7 @@ TEST_F(EventRaceTest, EventsOfOtherApplicationsLoseNoEntryWhileTransfersEnd) {
     EXPECT_EQ(client->_operationStateForIdentifier(idOf(3)), "INSTALLED");
     EXPECT_EQ(client->_operationStateForIdentifier(idOf(4)), "FAILED");
     EXPECT_EQ(client->_operationStateForIdentifier(idOf(5)), "install");
-    const auto restoreState = phone.files.plistAt(paths::RestoreState);
+    const auto restoreState = phone.files.plistAt(exchange::RestoreState);
     ASSERT_TRUE(restoreState && restoreState->asDictionary());
     EXPECT_EQ(restoreState->asDictionary()->size(), 4u) << "those of both that completed are gone";
     EXPECT_EQ(timesSaid("coordinatorDidInstallPlaceholder for "), ids.size());
@@ -182,7 +182,7 @@ TEST_F(EventRaceTest, CompletionsAtOnceLoseNoEntry) {
       EXPECT_EQ(client->_operationStateForIdentifier(id), "INSTALLED");
       service().coordinator(id)->cancel(Refused, SyncHostClientID);
     }
-    EXPECT_FALSE(phone.files.exists(paths::RestoreState)) << "its last entry has gone";
+    EXPECT_FALSE(phone.files.exists(exchange::RestoreState)) << "its last entry has gone";
   }
 }
 
@@ -234,7 +234,7 @@ class ReconcileRaceTest : public EventRaceTest {
 };
 
 TEST_F(ReconcileRaceTest, ChangesWhileANewSyncBeginsNeverBringTheOldTodoListBack) {
-  const std::string staged = std::string(paths::StagingArea) + "/ApplicationsSync.plist";
+  const std::string staged = std::string(exchange::StagingArea) + "/ApplicationsSync.plist";
   for (int round = 0; round < Rounds; ++round) {
     prepare({idOf(0), idOf(1)});
     phone.files.putPlist(paths::TodoList, todoOf(round));

@@ -16,7 +16,7 @@ class CoordinatorEventTest : public CoordinationTest {
     phone.files.putPlist(paths::TodoList,
                          PropertyList::Array{PropertyList::Dictionary{
                              {"identifier", "com.a"}, {"operation", "DOWNLOADED"}}});
-    phone.files.putPlist(paths::RestoreState,
+    phone.files.putPlist(exchange::RestoreState,
                          PropertyList::Dictionary{{"com.a", PropertyList::Dictionary{}},
                                                   {"com.b", PropertyList::Dictionary{}}});
     forget();
@@ -94,14 +94,15 @@ TEST_F(CoordinatorEventTest, AnInstalledPlaceholderIsLogged) {
 
 TEST_F(CoordinatorEventTest, ACompletedInstallIsSettledInTheStateFiles) {
   service().fireDidComplete(*coordinator);
-  EXPECT_THAT(effects(),
-              ElementsAre(said("coordinatorDidCompleteSuccessfully for com.a with error (null)"),
-                          said("Changing com.a from DOWNLOADED to INSTALLED"),
-                          "FileManager.writeAtomically(" + std::string(paths::TodoList) + ")",
-                          "FileManager.writeAtomically(" + std::string(paths::RestoreState) + ")"));
+  EXPECT_THAT(
+      effects(),
+      ElementsAre(said("coordinatorDidCompleteSuccessfully for com.a with error (null)"),
+                  said("Changing com.a from DOWNLOADED to INSTALLED"),
+                  "FileManager.writeAtomically(" + std::string(paths::TodoList) + ")",
+                  "FileManager.writeAtomically(" + std::string(exchange::RestoreState) + ")"));
   EXPECT_EQ(client->_operationStateForIdentifier("com.a"), "INSTALLED");
   const PropertyList::Dictionary left{{"com.b", PropertyList::Dictionary{}}};
-  EXPECT_EQ(phone.files.plistAt(paths::RestoreState), PropertyList(left));
+  EXPECT_EQ(phone.files.plistAt(exchange::RestoreState), PropertyList(left));
 }
 
 TEST_F(CoordinatorEventTest, ACompletionWithAnErrorIsAFailure) {
@@ -111,7 +112,7 @@ TEST_F(CoordinatorEventTest, ACompletionWithAnErrorIsAFailure) {
                                "Domain=Fault Code=7"),
                           said("Changing com.a from DOWNLOADED to FAILED")));
   const PropertyList::Dictionary left{{"com.b", PropertyList::Dictionary{}}};
-  EXPECT_EQ(phone.files.plistAt(paths::RestoreState), PropertyList(left));
+  EXPECT_EQ(phone.files.plistAt(exchange::RestoreState), PropertyList(left));
 }
 
 TEST_F(CoordinatorEventTest, ACompletionOfAnUnknownApplicationSettlesNothing) {

@@ -12,7 +12,7 @@ using testing::IsEmpty;
 const std::string Failure = description(Refused);
 const std::string WriteTodo = "FileManager.writeAtomically(" + std::string(paths::TodoList) + ")";
 const std::string WriteRestoreState =
-    "FileManager.writeAtomically(" + std::string(paths::RestoreState) + ")";
+    "FileManager.writeAtomically(" + std::string(exchange::RestoreState) + ")";
 
 Trace uninstallTold(const std::string& error) {
   return {said("Uninstall of com.a with install coordinator succeeded wiht error " + error + "."),
@@ -45,7 +45,7 @@ class RepeatedCallbackTest : public CoordinationTest {
   RepeatedCallbackTest() {
     phone.notifier.post(TWStartupCompleteNotification);
     putTodo("DOWNLOADED");
-    phone.files.putPlist(paths::RestoreState,
+    phone.files.putPlist(exchange::RestoreState,
                          PropertyList::Dictionary{{"com.z", PropertyList::Dictionary{}}});
     forget();
   }
@@ -72,7 +72,7 @@ class RepeatedCallbackTest : public CoordinationTest {
   }
   /// The desktop asks for both applications once more.
   void beginNextSync() {
-    const std::string staged = std::string(paths::StagingArea) + "/ApplicationsSync.plist";
+    const std::string staged = std::string(exchange::StagingArea) + "/ApplicationsSync.plist";
     phone.files.putPlist(staged, todoOf("install"));
     EXPECT_TRUE(client->prepareForSyncWithHostAnchor("", {}, nullptr));
     EXPECT_TRUE(client->reconcileSync({}, "anchor", {}, nullptr));
