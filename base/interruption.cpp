@@ -49,13 +49,13 @@ int readEnd = -1;
 void setCursorHidden(bool hidden) noexcept { cursorHidden = hidden; }
 
 void Interruption::request() {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   if (requested_.exchange(true)) return;
   if (listener_) listener_();
 }
 
 void Interruption::setListener(std::function<void()> listener) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   listener_ = std::move(listener);
   if (requested_ && listener_) listener_();
 }

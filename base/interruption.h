@@ -2,8 +2,9 @@
 
 #include <atomic>
 #include <functional>
-#include <mutex>
 #include <thread>
+
+#include "platform/mutex.h"
 
 namespace appsync {
 
@@ -20,8 +21,8 @@ class Interruption {
 
  private:
   std::atomic<bool> requested_{false};
-  std::mutex mutex_;
-  std::function<void()> listener_;
+  Mutex mutex_;
+  std::function<void()> listener_ APPSYNC_GUARDED_BY(mutex_);
 };
 
 /// Turns the first SIGINT, SIGTERM or SIGHUP into a request; another SIGINT or SIGTERM ends the

@@ -4,7 +4,6 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <set>
 #include <string>
@@ -14,6 +13,7 @@
 #include "client/log_message.h"
 #include "client/queues.h"
 #include "client/todo_file.h"
+#include "platform/mutex.h"
 #include "platform/platform.h"
 #include "platform/sync_client.h"
 
@@ -195,7 +195,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   /// The list, as _loadPlist gives it; a file that is there but cannot be read is said in the log.
   std::optional<PropertyList::Array> _loadListOrSay(std::string_view path) const;
   /// changeAssetID for a list of any form.
-  void _changeParsed(const Bytes& list, std::string_view identifier, std::string_view toDo);
+  void _changeParsed(const Bytes& list, std::string_view identifier, std::string_view toDo)
+      APPSYNC_REQUIRES(_stateFileMutex);
   void _performDeletions(const PropertyList::Array& todoList);
   void _sendIconLayout();
   SyncAssetPtr _prepareAsset(const TransferCandidate& candidate);
@@ -232,7 +233,7 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   TaskGroup _installGroup;
   std::atomic<std::uint32_t> _numAppInstallsAttempted{0};
   /// Assets whose transfer has reported progress and has not ended.
-  std::set<std::string> _outstandingXFTTransfers;
+  std::set<std::string> _outstandingXFTTransfers APPSYNC_GUARDED_BY(_accessQueue);
   OperationQueue _installOperationQueue;
   BackupManager& _backupManager;
   /// Applications not to be requested in this sync. Emptied and asked by this client; nothing on
@@ -243,18 +244,18 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   /// The first cancellations may come before it is known.
   std::atomic<bool> _useInstallCoordinator = false;
   /// Applications whose transfer replaces an installed version.
-  std::set<std::string> _updatingApps;
-  std::set<std::string> _userCancelledApps;
-  std::unique_ptr<CoordinatorEventListener> _appInstallObserver;
+  std::set<std::string> _updatingApps APPSYNC_GUARDED_BY(_accessQueue);
+  std::set<std::string> _userCancelledApps APPSYNC_GUARDED_BY(_accessQueue);
+  std::unique_ptr<CoordinatorEventListener> _appInstallObserver APPSYNC_GUARDED_BY(_startUpMutex);
   /// Start-up may be announced on several threads at once.
-  std::mutex _startUpMutex;
+  Mutex _startUpMutex;
 
   /// Retries that wait for their delay.
   DelayedTasks _retries;
   /// Held while a state file is read, changed and written back: ten installs may end at once.
-  mutable std::mutex _stateFileMutex;
-  /// The todo list as last read or changed here. Touched only with _stateFileMutex held.
-  mutable TodoFile _todoFile;
+  mutable Mutex _stateFileMutex;
+  /// The todo list as last read or changed here.
+  mutable TodoFile _todoFile APPSYNC_GUARDED_BY(_stateFileMutex);
 };
 
 }  // namespace appsync

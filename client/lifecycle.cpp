@@ -36,8 +36,8 @@ AppsClient::~AppsClient() {
   _retries.close([this] { _installGroup.leave(); });
   _installOperationQueue.waitUntilAllOperationsAreFinished();
 
-  const std::size_t outstanding =
-      _accessQueue.sync([this] { return _outstandingXFTTransfers.size(); });
+  const std::size_t outstanding = _accessQueue.sync(
+      [this]() APPSYNC_REQUIRES(_accessQueue) { return _outstandingXFTTransfers.size(); });
   if (outstanding > 0) {
     _log.error("%{public}@ getting dealloc'd with %lu outstanding XFT transfers!", "<AppsClient>",
                outstanding);

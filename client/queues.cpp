@@ -7,38 +7,38 @@
 namespace appsync {
 
 void TaskGroup::enter() {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   ++outstanding_;
 }
 
 void TaskGroup::leave() {
   // Notified under the lock: a waiter may destroy the group as soon as it is empty.
-  const std::lock_guard lock(mutex_);
-  if (--outstanding_ == 0) empty_.notify_all();
+  const Lock lock(mutex_);
+  if (--outstanding_ == 0) empty_.notifyAll();
 }
 
 void TaskGroup::wait() {
-  std::unique_lock lock(mutex_);
-  empty_.wait(lock, [this] { return outstanding_ == 0; });
+  const Lock lock(mutex_);
+  while (outstanding_ > 0) empty_.wait(mutex_);
 }
 
 OperationQueue::~OperationQueue() {
   waitUntilAllOperationsAreFinished();
   {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     closing_ = true;
   }
-  changed_.notify_all();
+  changed_.notifyAll();
   for (std::thread& thread : threads_) thread.join();
 }
 
 void OperationQueue::add(std::function<void()> operation) {
   {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     if (waiting_.size() >= idle_ && threads_.size() < maximum_) addThread();
     if (!threads_.empty()) {
       waiting_.push_back(std::move(operation));
-      changed_.notify_all();
+      changed_.notifyAll();
       return;
     }
   }
@@ -59,26 +59,27 @@ void OperationQueue::addThread() {
 }
 
 void OperationQueue::waitUntilAllOperationsAreFinished() {
-  std::unique_lock lock(mutex_);
-  changed_.wait(lock, [this] { return running_ == 0 && waiting_.empty(); });
+  const Lock lock(mutex_);
+  while (running_ > 0 || !waiting_.empty()) changed_.wait(mutex_);
 }
 
 void OperationQueue::work() {
-  std::unique_lock lock(mutex_);
+  const Lock lock(mutex_);
   while (true) {
     ++idle_;
-    changed_.wait(lock, [this] { return closing_ || !waiting_.empty(); });
+    while (!closing_ && waiting_.empty()) changed_.wait(mutex_);
     --idle_;
     if (waiting_.empty()) return;
     std::function<void()> operation = std::move(waiting_.front());
     waiting_.pop_front();
     ++running_;
-    lock.unlock();
-    operation();
-    operation = nullptr;
-    lock.lock();
+    {
+      const Unlock unlocked(mutex_);
+      operation();
+      operation = nullptr;
+    }
     --running_;
-    if (running_ == 0 && waiting_.empty()) changed_.notify_all();
+    if (running_ == 0 && waiting_.empty()) changed_.notifyAll();
   }
 }
 
@@ -92,7 +93,7 @@ struct DelayedTasks::Tasks {
   void run(std::uint64_t id) {
     std::function<void()> task;
     {
-      const std::lock_guard lock(mutex);
+      const Lock lock(mutex);
       const auto found = pending.find(id);
       if (found == pending.end()) return;
       task = std::move(found->second.run);
@@ -101,15 +102,15 @@ struct DelayedTasks::Tasks {
     }
     task();
     task = nullptr;
-    const std::lock_guard lock(mutex);
+    const Lock lock(mutex);
     running.erase(id);
   }
 
-  std::mutex mutex;
-  std::map<std::uint64_t, Pending> pending;
-  std::map<std::uint64_t, BackgroundQueue::Token> running;
-  std::uint64_t next = 0;
-  bool closed = false;
+  Mutex mutex;
+  std::map<std::uint64_t, Pending> pending APPSYNC_GUARDED_BY(mutex);
+  std::map<std::uint64_t, BackgroundQueue::Token> running APPSYNC_GUARDED_BY(mutex);
+  std::uint64_t next APPSYNC_GUARDED_BY(mutex) = 0;
+  bool closed APPSYNC_GUARDED_BY(mutex) = false;
 };
 
 DelayedTasks::DelayedTasks(BackgroundQueue& queue)
@@ -117,7 +118,7 @@ DelayedTasks::DelayedTasks(BackgroundQueue& queue)
 
 bool DelayedTasks::after(std::chrono::milliseconds delay, std::function<void()> run) {
   // Held while the task is handed over, so that it cannot start before its token is known.
-  const std::lock_guard lock(tasks_->mutex);
+  const Lock lock(tasks_->mutex);
   if (tasks_->closed) return false;
   const std::uint64_t id = tasks_->next++;
   Tasks::Pending& task = tasks_->pending[id];
@@ -130,7 +131,7 @@ void DelayedTasks::close(const std::function<void()>& dropped) {
   std::map<std::uint64_t, Tasks::Pending> pending;
   std::map<std::uint64_t, BackgroundQueue::Token> running;
   {
-    const std::lock_guard lock(tasks_->mutex);
+    const Lock lock(tasks_->mutex);
     tasks_->closed = true;
     pending.swap(tasks_->pending);
     running = tasks_->running;
@@ -143,18 +144,21 @@ void DelayedTasks::close(const std::function<void()>& dropped) {
 }
 
 void Semaphore::signal() {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   ++count_;
-  signalled_.notify_one();
+  signalled_.notifyOne();
 }
 
 bool Semaphore::wait(std::optional<std::chrono::milliseconds> limit) {
-  std::unique_lock lock(mutex_);
-  const auto ready = [this] { return count_ > 0; };
-  if (!limit) {
-    signalled_.wait(lock, ready);
-  } else if (!signalled_.wait_for(lock, *limit, ready)) {
-    return false;
+  using Clock = std::chrono::steady_clock;
+  const Clock::time_point end = Clock::now() + limit.value_or(std::chrono::milliseconds(0));
+  const Lock lock(mutex_);
+  while (count_ == 0) {
+    if (!limit) {
+      signalled_.wait(mutex_);
+    } else if (!signalled_.waitUntil(mutex_, end) && count_ == 0) {
+      return false;
+    }
   }
   --count_;
   return true;

@@ -1,13 +1,11 @@
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <deque>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string_view>
 #include <thread>
@@ -15,6 +13,7 @@
 #include <vector>
 
 #include "platform/background_queue.h"
+#include "platform/mutex.h"
 
 namespace appsync {
 
@@ -27,28 +26,30 @@ class TaskGroup {
   void wait();
 
  private:
-  std::mutex mutex_;
-  std::condition_variable empty_;
-  std::size_t outstanding_ = 0;
+  Mutex mutex_;
+  Condition empty_;
+  std::size_t outstanding_ APPSYNC_GUARDED_BY(mutex_) = 0;
 };
 
-/// A serial queue for short bookkeeping: a task runs on the caller's thread, one at a time.
-class AccessQueue {
+/// A serial queue for short bookkeeping: a task runs on the caller's thread, one at a time. Guards
+/// what only tasks may touch.
+class APPSYNC_CAPABILITY("access queue") AccessQueue {
  public:
   explicit AccessQueue(std::string_view label) : label_(label) {}
 
   std::string_view label() const { return label_; }
 
-  /// Runs the task and returns its result. A task must not call `sync` again.
+  /// Runs the task and returns its result. A task must not call `sync` again. Not analysed, for a
+  /// task that says which queue it requires names it by its owner.
   template <typename Task>
-  auto sync(Task&& task) {
-    const std::lock_guard lock(mutex_);
+  auto sync(Task&& task) APPSYNC_EXCLUDES(this) APPSYNC_NOT_ANALYSED {
+    const Lock lock(mutex_);
     return std::forward<Task>(task)();
   }
 
  private:
   std::string_view label_;
-  std::mutex mutex_;
+  Mutex mutex_;
 };
 
 /// Runs operations in the order in which they were added, at most `maximum` at once. Threads are
@@ -71,18 +72,18 @@ class OperationQueue {
 
  private:
   static std::thread newThread(std::function<void()> work);
-  void addThread();
+  void addThread() APPSYNC_REQUIRES(mutex_);
   void work();
 
   const std::size_t maximum_;
   const StartThread startThread_;
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  std::deque<std::function<void()>> waiting_;
-  std::vector<std::thread> threads_;
-  std::size_t idle_ = 0;
-  std::size_t running_ = 0;
-  bool closing_ = false;
+  Mutex mutex_;
+  Condition changed_;
+  std::deque<std::function<void()>> waiting_ APPSYNC_GUARDED_BY(mutex_);
+  std::vector<std::thread> threads_ APPSYNC_GUARDED_BY(mutex_);
+  std::size_t idle_ APPSYNC_GUARDED_BY(mutex_) = 0;
+  std::size_t running_ APPSYNC_GUARDED_BY(mutex_) = 0;
+  bool closing_ APPSYNC_GUARDED_BY(mutex_) = false;
 };
 
 /// Delayed tasks that belong to one owner. After `close` none runs any more, and what they held is
@@ -115,9 +116,9 @@ class Semaphore {
   bool wait(std::optional<std::chrono::milliseconds> limit = std::nullopt);
 
  private:
-  std::mutex mutex_;
-  std::condition_variable signalled_;
-  std::size_t count_ = 0;
+  Mutex mutex_;
+  Condition signalled_;
+  std::size_t count_ APPSYNC_GUARDED_BY(mutex_) = 0;
 };
 
 }  // namespace appsync

@@ -51,7 +51,7 @@ std::optional<PropertyList> AppsClient::_restoreStatePropertyForKey(
 void AppsClient::_setRestoreStatePropertyValue(const PropertyList& value, std::string_view key,
                                                std::string_view identifier,
                                                const std::optional<std::string>& version) {
-  const std::lock_guard lock(_stateFileMutex);
+  const Lock lock(_stateFileMutex);
   std::optional<Error> error;
   const std::optional<Bytes> bytes = readState(_platform.files, _log, error);
   // What cannot be read now holds what other applications wait for.
@@ -66,7 +66,7 @@ void AppsClient::_setRestoreStatePropertyValue(const PropertyList& value, std::s
 }
 
 void AppsClient::cleanRestoreStateForIdentifier(std::string_view identifier) {
-  const std::lock_guard lock(_stateFileMutex);
+  const Lock lock(_stateFileMutex);
   std::optional<Error> error;
   const std::optional<Bytes> bytes = readState(_platform.files, _log, error);
   if (!bytes) return;

@@ -81,7 +81,7 @@ std::optional<PropertyList::Array> AppsClient::_loadListOrSay(std::string_view p
 }
 
 void AppsClient::changeAssetID(std::string_view identifier, std::string_view toDo) {
-  const std::lock_guard lock(_stateFileMutex);
+  const Lock lock(_stateFileMutex);
   std::optional<Bytes> bytes = _bytesOrSay(paths::TodoList);
   if (!bytes) return;
   if (!_todoFile.take(*bytes)) return _changeParsed(*bytes, identifier, toDo);
@@ -112,7 +112,7 @@ void AppsClient::_changeParsed(const Bytes& list, std::string_view identifier,
 
 std::optional<std::string> AppsClient::_operationStateForIdentifier(
     std::string_view identifier) const {
-  const std::lock_guard lock(_stateFileMutex);
+  const Lock lock(_stateFileMutex);
   std::optional<Bytes> bytes = _bytesOrSay(paths::TodoList);
   if (!bytes) return std::nullopt;
   if (_todoFile.take(*bytes)) {

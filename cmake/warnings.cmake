@@ -1,5 +1,5 @@
 add_compile_options(-Wall -Wextra -Wconversion -Wshadow -Wold-style-cast -Wsuggest-override
-                    -Wnon-virtual-dtor -Werror)
+                    -Wnon-virtual-dtor $<$<CXX_COMPILER_ID:Clang>:-Wthread-safety> -Werror)
 # Lets ccache keep objects that use a precompiled header; clang needs nothing for that.
 add_compile_options($<$<CXX_COMPILER_ID:GNU>:-fpch-preprocess>)
 

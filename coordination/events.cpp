@@ -16,7 +16,7 @@ SyncAssetPtr assetNamed(SyncHost& host, std::string_view bundleId) {
 }  // namespace
 
 void AppsClient::setupInstallCoordinatorObserver() {
-  const std::lock_guard lock(_startUpMutex);
+  const Lock lock(_startUpMutex);
   if (_appInstallObserver) return;
   _appInstallObserver = _platform.installCoordination.createEventListener(
       EventServiceName, {SyncHostClientID}, *this);
@@ -62,8 +62,9 @@ void AppsClient::coordinatorCanceledWithReason(InstallCoordinator& coordinator, 
                                                CoordinationClientId) noexcept {
   const std::optional<std::string> bundleId = coordinator.bundleIdentifier();
   if (!bundleId) return;
-  const bool alreadyCancelled =
-      _accessQueue.sync([&] { return !_userCancelledApps.insert(*bundleId).second; });
+  const bool alreadyCancelled = _accessQueue.sync([&]() APPSYNC_REQUIRES(_accessQueue) {
+    return !_userCancelledApps.insert(*bundleId).second;
+  });
   SyncHostService& service = _platform.syncHost.service();
   if (alreadyCancelled || !service.supportsCancelAssetAsFailed()) {
     _log.error("Cannot cancel %{public}@ as it's already cancelled %d OR the call is not supported",

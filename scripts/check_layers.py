@@ -12,6 +12,8 @@
 Inside device/ and host/ each folder may include only those that stand before it in ORDER; the files
 beside device/'s folders put everything together, and no folder knows them.
 
+Locks are those of platform/mutex.h everywhere, since the compiler checks them.
+
 The plug-in and platform/ see no header but those of the C++ standard library. The one exception is
 the property-list codec, which alone may include libplist, and <locale.h> to shield it from the
 process's locale.
@@ -43,6 +45,8 @@ DOOR = "device/embedded_device.h"
 STANDARD_ONLY = PLUGIN | {"platform"}
 PLIST_FILE = "platform/property_list_codec.cpp"
 PLIST_HEADERS = {"plist/plist.h", "locale.h"}
+LOCKS_FILE = "platform/mutex.h"
+LOCKS_HEADERS = {"mutex", "shared_mutex", "condition_variable"}
 
 STANDARD = set(
     """algorithm any array atomic barrier bit bitset charconv chrono codecvt compare complex concepts
@@ -101,6 +105,8 @@ def problem(path, header, quoted):
         return None
     if top == "plist":
         return f"only {PLIST_FILE} may use libplist"
+    if header in LOCKS_HEADERS and path != LOCKS_FILE:
+        return f"locks are those of {LOCKS_FILE}"
     if folder in STANDARD_ONLY and header not in STANDARD:
         return f"{folder}/ may use no header but those of the C++ standard library"
     return None

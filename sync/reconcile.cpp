@@ -50,7 +50,7 @@ bool AppsClient::reconcileSync(const PropertyList&, std::string_view newAnchor,
   std::optional<bool> result;
   {
     // A change on its way must not write the old list back over the new one.
-    const std::lock_guard lock(_stateFileMutex);
+    const Lock lock(_stateFileMutex);
     result = takeOverStagingArea(_platform.files, _log, error);
   }
   if (!result) {

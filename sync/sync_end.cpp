@@ -65,7 +65,7 @@ void AppsClient::syncEndedWithSuccess(bool success) noexcept {
 void AppsClient::clearSyncData() noexcept {
   _log.normal("blasting work area");
   {
-    const std::lock_guard lock(_stateFileMutex);
+    const Lock lock(_stateFileMutex);
     _platform.files.removeItem(exchange::SyncRoot);
   }
 

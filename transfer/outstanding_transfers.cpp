@@ -174,7 +174,8 @@ bool AppsClient::_handOffCoordinated(const SyncAssetPtr& asset) {
     changeAssetID(identifier, exchange::TodoFailed);
     return false;
   }
-  if (existing) _accessQueue.sync([&] { _updatingApps.insert(identifier); });
+  if (existing)
+    _accessQueue.sync([&]() APPSYNC_REQUIRES(_accessQueue) { _updatingApps.insert(identifier); });
   return true;
 }
 

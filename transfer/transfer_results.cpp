@@ -45,14 +45,16 @@ void AppsClient::assetTransferUpdatedProgress(const SyncAssetPtr& asset, double 
   const std::string& identifier = asset->identifier;
   _log.normal("finished transferring %lf for %{public}@", fraction, identifier);
   if (_useInstallCoordinator) {
-    const bool existing = _accessQueue.sync([&] { return _updatingApps.contains(identifier); });
+    const bool existing = _accessQueue.sync(
+        [&]() APPSYNC_REQUIRES(_accessQueue) { return _updatingApps.contains(identifier); });
     updateTransferProgressForApp(asset, existing);
   } else if (const auto progress = _progressForAssetIdentifier(identifier)) {
     progress->setInstallState(InstallState::Active);
     if (progress->totalUnitCount() != ProgressUnits) progress->setTotalUnitCount(ProgressUnits);
     progress->setCompletedUnitCount(completedUnits(fraction));
   }
-  _accessQueue.sync([&] { _outstandingXFTTransfers.insert(identifier); });
+  _accessQueue.sync(
+      [&]() APPSYNC_REQUIRES(_accessQueue) { _outstandingXFTTransfers.insert(identifier); });
 }
 
 void AppsClient::assetTransferSucceeded(const SyncAssetPtr& asset, bool succeeded,
@@ -60,7 +62,7 @@ void AppsClient::assetTransferSucceeded(const SyncAssetPtr& asset, bool succeede
   const std::string& identifier = asset->identifier;
   bool existingApp = false;
   bool userCancelled = false;
-  _accessQueue.sync([&] {
+  _accessQueue.sync([&]() APPSYNC_REQUIRES(_accessQueue) {
     existingApp = _updatingApps.erase(identifier) > 0;
     userCancelled = _userCancelledApps.erase(identifier) > 0;
     _outstandingXFTTransfers.erase(identifier);
@@ -196,8 +198,8 @@ void AppsClient::assetTransferEndedWithSuccess(bool success) noexcept {
   _installGroup.wait();
   _notifyDashel(false);
   _getAndResetNumAppInstallsAttempted();
-  const std::set<std::string> outstanding =
-      _accessQueue.sync([this] { return _outstandingXFTTransfers; });
+  const std::set<std::string> outstanding = _accessQueue.sync(
+      [this]() APPSYNC_REQUIRES(_accessQueue) { return _outstandingXFTTransfers; });
   if (outstanding.empty()) return;
 
   if (_useInstallCoordinator) {
@@ -209,7 +211,7 @@ void AppsClient::assetTransferEndedWithSuccess(bool success) noexcept {
     _log.error("Called with success == YES but with %lu outstanding XFT transfers!",
                outstanding.size());
   }
-  _accessQueue.sync([this] {
+  _accessQueue.sync([this]() APPSYNC_REQUIRES(_accessQueue) {
     _outstandingXFTTransfers.clear();
     _updatingApps.clear();
     _userCancelledApps.clear();

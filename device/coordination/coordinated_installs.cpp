@@ -75,17 +75,17 @@ bool isToStay(SQLite::Database& database, const PlaceholderRow& placeholder) {
 }  // namespace
 
 void CoordinatedInstalls::expedite() {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   expedited_ = true;
 }
 
 void CoordinatedInstalls::leaveWaiting() {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   leaving_ = true;
 }
 
 bool CoordinatedInstalls::isLeaving() {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   return leaving_;
 }
 
@@ -284,7 +284,7 @@ std::optional<Error> CoordinatedInstalls::waitForForeground(const CoordinatorRow
   const Wait wait{coordinator.number, true};
   Wait before;
   {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     if (expedited_) {
       return objection(EBUSY, identifier, "is in the foreground and was not closed in time");
     }
@@ -299,11 +299,11 @@ std::optional<Error> CoordinatedInstalls::waitForForeground(const CoordinatorRow
 
 void CoordinatedInstalls::lookAgain(const std::string& identifier, std::int64_t coordinator) {
   {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     waits_[identifier].isLookDue = false;
   }
   advance(identifier, coordinator);
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   if (!waits_[identifier].isLookDue) waits_.erase(identifier);
 }
 

@@ -2,13 +2,13 @@
 
 #include <functional>
 #include <map>
-#include <mutex>
 #include <string>
 
 #include "device/apps/app_registry.h"
 #include "device/coordination/coordination_store.h"
 #include "device/state/device_core.h"
 #include "device/state/keyed_workers.h"
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -72,11 +72,10 @@ class CoordinatedInstalls {
   DeviceAppRegistry& registry_;
   CoordinationStore& store_;
   KeyedWorkers& workers_;
-  std::mutex mutex_;
-  // Guarded by mutex_.
-  std::map<std::string, Wait> waits_;  ///< by application
-  bool expedited_ = false;
-  bool leaving_ = false;
+  Mutex mutex_;
+  std::map<std::string, Wait> waits_ APPSYNC_GUARDED_BY(mutex_);  ///< by application
+  bool expedited_ APPSYNC_GUARDED_BY(mutex_) = false;
+  bool leaving_ APPSYNC_GUARDED_BY(mutex_) = false;
 };
 
 }  // namespace appsync::device

@@ -82,7 +82,7 @@ std::shared_ptr<Handle> shared(std::map<std::int64_t, std::weak_ptr<Handle>>& ha
 }  // namespace
 
 std::shared_ptr<CoordinatorHandle> CoordinationObjects::of(const CoordinatorRow& row) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   auto handle = shared(coordinators_, row.number,
                        [&] { return std::make_shared<CoordinatorHandle>(gate_, row); });
   if (!row.isLive()) handle->settle(row);
@@ -90,7 +90,7 @@ std::shared_ptr<CoordinatorHandle> CoordinationObjects::of(const CoordinatorRow&
 }
 
 std::shared_ptr<PathPromiseHandle> CoordinationObjects::of(const PromiseRow& row) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   return shared(promises_, row.number,
                 [&] { return std::make_shared<PathPromiseHandle>(gate_, row); });
 }
@@ -177,13 +177,13 @@ bool PlaceholderHandle::cancel(const Error& reason, CoordinationClientId client)
 }
 
 void CoordinatorHandle::settle(const CoordinatorRow& row) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   settled_ = row;
 }
 
 std::optional<CoordinatorRow> CoordinatorHandle::find(std::optional<Error>* error) const {
   {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     if (settled_) return settled_;
   }
   return lookUp([&](SQLite::Database& database) { return findCoordinator(database, number()); },

@@ -1,9 +1,8 @@
 #pragma once
 
-#include <shared_mutex>
-
 #include "device/coordination/coordination_store.h"
 #include "device/coordination/event_delivery.h"
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -19,18 +18,18 @@ class CoordinationGate {
   /// Gives `otherwise` when the service is gone; else it stays until `use` has returned.
   template <typename Result, typename Use>
   Result with(Result otherwise, const Use& use) {
-    const std::shared_lock lock(mutex_);
+    const SharedLock lock(mutex_);
     return objects_ ? Result(use(*objects_)) : otherwise;
   }
   /// Waits for those who use the service.
   void close() {
-    const std::unique_lock lock(mutex_);
+    const Lock lock(mutex_);
     objects_ = nullptr;
   }
 
  private:
-  std::shared_mutex mutex_;
-  CoordinationObjects* objects_;
+  SharedMutex mutex_;
+  CoordinationObjects* objects_ APPSYNC_GUARDED_BY(mutex_);
 };
 
 /// Gives out the objects of the service, which are thin: they hold a row's number. Thread-safe.
@@ -49,10 +48,9 @@ class CoordinationObjects {
 
  private:
   const std::shared_ptr<CoordinationGate> gate_ = std::make_shared<CoordinationGate>(*this);
-  std::mutex mutex_;
-  // Guarded by mutex_.
-  std::map<std::int64_t, std::weak_ptr<CoordinatorHandle>> coordinators_;
-  std::map<std::int64_t, std::weak_ptr<PathPromiseHandle>> promises_;
+  Mutex mutex_;
+  std::map<std::int64_t, std::weak_ptr<CoordinatorHandle>> coordinators_ APPSYNC_GUARDED_BY(mutex_);
+  std::map<std::int64_t, std::weak_ptr<PathPromiseHandle>> promises_ APPSYNC_GUARDED_BY(mutex_);
 };
 
 /// What every object of the service has. It stays usable when the service is gone.
@@ -115,7 +113,7 @@ class PromiseHandle : public Promise, public ServiceObject {
   std::string description() const override { return "<Promise " + name_ + ">"; }
 
   std::optional<Error> trouble() const override {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     return trouble_;
   }
 
@@ -130,7 +128,7 @@ class PromiseHandle : public Promise, public ServiceObject {
       std::optional<Error> error;
       const bool done = service.store.changePromise(number(), change, &error);
       if (!done) service.store.noteTroubleWithPromise(number(), *error);
-      const std::lock_guard lock(mutex_);
+      const Lock lock(mutex_);
       if (!done) trouble_ = error;
       return done;
     });
@@ -138,8 +136,8 @@ class PromiseHandle : public Promise, public ServiceObject {
 
  private:
   const std::string name_;
-  mutable std::mutex mutex_;
-  std::optional<Error> trouble_;  ///< guarded by mutex_
+  mutable Mutex mutex_;
+  std::optional<Error> trouble_ APPSYNC_GUARDED_BY(mutex_);
 };
 
 class PathPromiseHandle final : public PromiseHandle<PathTransferPromise> {
@@ -222,8 +220,8 @@ class CoordinatorHandle final : public InstallCoordinator, public ServiceObject 
 
   const std::string identifier_;
   const CoordinationClientId creator_;
-  mutable std::mutex mutex_;
-  std::optional<CoordinatorRow> settled_;  ///< guarded by mutex_
+  mutable Mutex mutex_;
+  std::optional<CoordinatorRow> settled_ APPSYNC_GUARDED_BY(mutex_);
 };
 
 }  // namespace appsync::device

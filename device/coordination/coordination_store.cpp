@@ -125,7 +125,7 @@ bool CoordinationStore::cancelPlaceholder(std::int64_t number, const Error& reas
 }
 
 void CoordinationStore::noteTrouble(std::int64_t coordinator, const Error& error) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   troubles_.insert_or_assign(coordinator, error);
 }
 
@@ -137,7 +137,7 @@ void CoordinationStore::noteTroubleWithPromise(std::int64_t promise, const Error
 }
 
 std::optional<Error> CoordinationStore::trouble(std::int64_t coordinator) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   const auto found = troubles_.find(coordinator);
   return found == troubles_.end() ? std::nullopt : std::optional(found->second);
 }

@@ -2,9 +2,9 @@
 
 #include <functional>
 #include <map>
-#include <mutex>
 
 #include "device/coordination/coordination_state.h"
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -51,8 +51,8 @@ class CoordinationStore {
  private:
   Database& database_;
   const std::function<void(const Consequences&)> carryOut_;
-  std::mutex mutex_;
-  std::map<std::int64_t, Error> troubles_;  ///< by coordinator; guarded by mutex_
+  Mutex mutex_;
+  std::map<std::int64_t, Error> troubles_ APPSYNC_GUARDED_BY(mutex_);  ///< by coordinator
 };
 
 }  // namespace appsync::device

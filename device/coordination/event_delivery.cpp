@@ -12,7 +12,7 @@ constexpr std::chrono::milliseconds RetryDelay{200};
 }  // namespace
 
 void EventDelivery::start(Coordinators coordinators) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   coordinators_ = std::move(coordinators);
   thread_ = std::thread([this] { run(); });
   threadId_ = thread_.get_id();
@@ -20,27 +20,27 @@ void EventDelivery::start(Coordinators coordinators) {
 
 void EventDelivery::stop() {
   {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     stopping_ = true;
-    changed_.notify_all();
+    changed_.notifyAll();
   }
   if (thread_.joinable()) thread_.join();
 }
 
 void EventDelivery::check() {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   checkDue_ = true;
-  changed_.notify_all();
+  changed_.notifyAll();
 }
 
 void EventDelivery::post(std::function<void()> task) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   tasks_.push_back(std::move(task));
-  changed_.notify_all();
+  changed_.notifyAll();
 }
 
 void EventDelivery::setObserver(std::int64_t coordinator, CoordinatorObserver* observer) {
-  Lock lock(mutex_);
+  const Lock lock(mutex_);
   CoordinatorObserver* replaced = nullptr;
   if (const auto found = observers_.find(coordinator); found != observers_.end()) {
     replaced = found->second;
@@ -51,42 +51,43 @@ void EventDelivery::setObserver(std::int64_t coordinator, CoordinatorObserver* o
     observers_.erase(coordinator);
   }
   checkDue_ = true;
-  changed_.notify_all();
-  if (replaced && replaced != observer) waitUntilReturned(replaced, lock);
+  changed_.notifyAll();
+  if (replaced && replaced != observer) waitUntilReturned(replaced);
 }
 
 void EventDelivery::removeObserver(const CoordinatorObserver* observer) {
-  Lock lock(mutex_);
+  const Lock lock(mutex_);
   std::erase_if(observers_, [&](const auto& item) { return item.second == observer; });
   // A listener may be there for what the observer would have had.
   checkDue_ = true;
-  changed_.notify_all();
-  waitUntilReturned(observer, lock);
+  changed_.notifyAll();
+  waitUntilReturned(observer);
 }
 
 std::uint64_t EventDelivery::addListener(std::set<CoordinationClientId> clients,
                                          CoordinatorObserver& delegate) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   listeners_.emplace(++lastListener_, Listener{std::move(clients), &delegate});
   checkDue_ = true;
-  changed_.notify_all();
+  changed_.notifyAll();
   return lastListener_;
 }
 
 void EventDelivery::removeListener(std::uint64_t listener) {
-  Lock lock(mutex_);
+  const Lock lock(mutex_);
   const auto found = listeners_.find(listener);
   if (found == listeners_.end()) return;
   const CoordinatorObserver* const delegate = found->second.delegate;
   listeners_.erase(found);
-  waitUntilReturned(delegate, lock);
+  waitUntilReturned(delegate);
 }
 
 bool EventDelivery::isBusy(std::string_view identifier) {
   const auto events = pending();
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   if (!tasks_.empty() || runsTask_) return true;
-  return events && std::ranges::any_of(*events, [&](const EventRow& event) {
+  return events &&
+         std::ranges::any_of(*events, [&](const EventRow& event) APPSYNC_REQUIRES(mutex_) {
            return event.coordinator.identifier == identifier && receiver(event.coordinator);
          });
 }
@@ -100,38 +101,42 @@ CoordinatorObserver* EventDelivery::receiver(const CoordinatorRow& coordinator) 
   return nullptr;
 }
 
-void EventDelivery::waitUntilReturned(const CoordinatorObserver* observer, Lock& lock) {
+void EventDelivery::waitUntilReturned(const CoordinatorObserver* observer) {
   if (std::this_thread::get_id() == threadId_) return;
-  returned_.wait(lock, [&] { return delivering_ != observer; });
+  while (delivering_ == observer) returned_.wait(mutex_);
 }
 
 void EventDelivery::run() {
   bool readable = true;
-  Lock lock(mutex_);
+  const Lock lock(mutex_);
   while (true) {
     if (!tasks_.empty()) {
       std::function<void()> task = std::move(tasks_.front());
       tasks_.pop_front();
-      runsTask_ = true;
-      lock.unlock();
-      task();
-      task = nullptr;  // what it holds goes outside the lock too
-      lock.lock();
-      runsTask_ = false;
+      perform(std::move(task));
     } else if (stopping_) {
       return;
     } else if (checkDue_) {
       checkDue_ = false;
-      lock.unlock();
+      const Unlock unlocked(mutex_);
       readable = deliverAll();
-      lock.lock();
     } else if (!readable) {
-      changed_.wait_for(lock, RetryDelay);
+      changed_.waitUntil(mutex_, std::chrono::steady_clock::now() + RetryDelay);
       checkDue_ = true;
     } else {
-      changed_.wait(lock);
+      changed_.wait(mutex_);
     }
   }
+}
+
+void EventDelivery::perform(std::function<void()> task) {
+  runsTask_ = true;
+  {
+    const Unlock unlocked(mutex_);
+    task();
+    task = nullptr;  // what it holds goes outside the lock too
+  }
+  runsTask_ = false;
 }
 
 bool EventDelivery::deliverAll() {
@@ -153,21 +158,25 @@ std::optional<std::vector<EventRow>> EventDelivery::pending() {
   auto events =
       database_.lookUp("the events of install coordinators could not be read", pendingEvents);
   if (!events) return events;
-  const std::lock_guard lock(mutex_);
-  std::erase_if(*events, [&](const EventRow& event) { return delivered_.contains(event.number); });
+  const Lock lock(mutex_);
+  const auto isDelivered = [&](const EventRow& event) APPSYNC_REQUIRES(mutex_) {
+    return delivered_.contains(event.number);
+  };
+  std::erase_if(*events, isDelivered);
   return events;
 }
 
 bool EventDelivery::deliver(const EventRow& event) {
-  Lock lock(mutex_);
+  const Lock lock(mutex_);
   CoordinatorObserver* const observer = stopping_ ? nullptr : receiver(event.coordinator);
   if (!observer) return false;
   delivering_ = observer;
-  lock.unlock();
-  send(event, *observer);
-  lock.lock();
+  {
+    const Unlock unlocked(mutex_);
+    send(event, *observer);
+  }
   delivering_ = nullptr;
-  returned_.notify_all();
+  returned_.notifyAll();
   return true;
 }
 
@@ -200,7 +209,7 @@ void EventDelivery::remove(const EventRow& event) {
       "an event that was delivered could not be taken out", Database::Commit::Ordinary,
       [&](SQLite::Database& database) { removeEvent(database, event.number); });
   if (removed) return;
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   delivered_.insert(event.number);
 }
 

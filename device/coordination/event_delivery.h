@@ -1,17 +1,16 @@
 #pragma once
 
-#include <condition_variable>
 #include <deque>
 #include <functional>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <set>
 #include <thread>
 #include <vector>
 
 #include "device/coordination/coordination_rows.h"
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -54,7 +53,6 @@ class EventDelivery {
     std::set<CoordinationClientId> clients;
     CoordinatorObserver* delegate;
   };
-  using Lock = std::unique_lock<std::mutex>;
 
   void run();
   /// False when the events could not be read.
@@ -64,28 +62,28 @@ class EventDelivery {
   void remove(const EventRow& event);
   /// nullopt when they cannot be read.
   std::optional<std::vector<EventRow>> pending();
-  /// The lock is held.
-  CoordinatorObserver* receiver(const CoordinatorRow& coordinator) const;
-  void waitUntilReturned(const CoordinatorObserver* observer, Lock& lock);
+  CoordinatorObserver* receiver(const CoordinatorRow& coordinator) const APPSYNC_REQUIRES(mutex_);
+  void waitUntilReturned(const CoordinatorObserver* observer) APPSYNC_REQUIRES(mutex_);
+  void perform(std::function<void()> task) APPSYNC_REQUIRES(mutex_);
 
   Database& database_;
   Coordinators coordinators_;  ///< set before the thread begins
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  std::condition_variable returned_;
-  // Guarded by mutex_.
-  std::map<std::int64_t, CoordinatorObserver*> observers_;
-  std::map<std::uint64_t, Listener> listeners_;
-  std::uint64_t lastListener_ = 0;
-  std::deque<std::function<void()>> tasks_;
-  bool runsTask_ = false;
-  const CoordinatorObserver* delivering_ = nullptr;
-  std::set<std::int64_t> delivered_;  ///< events that could not be taken out of the store
-  bool checkDue_ = true;              // what was kept from before
-  bool stopping_ = false;
+  Mutex mutex_;
+  Condition changed_;
+  Condition returned_;
+  std::map<std::int64_t, CoordinatorObserver*> observers_ APPSYNC_GUARDED_BY(mutex_);
+  std::map<std::uint64_t, Listener> listeners_ APPSYNC_GUARDED_BY(mutex_);
+  std::uint64_t lastListener_ APPSYNC_GUARDED_BY(mutex_) = 0;
+  std::deque<std::function<void()>> tasks_ APPSYNC_GUARDED_BY(mutex_);
+  bool runsTask_ APPSYNC_GUARDED_BY(mutex_) = false;
+  const CoordinatorObserver* delivering_ APPSYNC_GUARDED_BY(mutex_) = nullptr;
+  /// Events that could not be taken out of the store.
+  std::set<std::int64_t> delivered_ APPSYNC_GUARDED_BY(mutex_);
+  bool checkDue_ APPSYNC_GUARDED_BY(mutex_) = true;  // what was kept from before
+  bool stopping_ APPSYNC_GUARDED_BY(mutex_) = false;
 
   std::thread thread_;
-  std::thread::id threadId_;  ///< stays when the thread has ended
+  std::thread::id threadId_ APPSYNC_GUARDED_BY(mutex_);  ///< stays when the thread has ended
 };
 
 }  // namespace appsync::device

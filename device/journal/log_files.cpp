@@ -45,7 +45,7 @@ LogFiles::LogFiles(const std::filesystem::path& folder, bool writable,
 void LogFiles::write(LogChannel channel, LogLevel level, std::string_view text) noexcept {
   if (!writable_) return;
   const std::string line = formatLogLine(std::chrono::system_clock::now(), channel, level, text);
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   if (size_ > 0 && size_ + line.size() > fileSize_) moveOn();
   if (!newest_) openNewest();
   if (!newest_) return;

@@ -3,12 +3,12 @@
 #include <cstdint>
 #include <filesystem>
 #include <functional>
-#include <mutex>
 #include <string>
 
 #include "base/file_descriptor.h"
 #include "device/journal/records.h"
 #include "platform/log.h"
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -33,18 +33,18 @@ class LogFiles final : public Log {
   void read(const std::function<void(const LogLine&)>& visitor) noexcept;
 
  private:
-  void openNewest() noexcept;
-  void moveOn() noexcept;
+  void openNewest() noexcept APPSYNC_REQUIRES(mutex_);
+  void moveOn() noexcept APPSYNC_REQUIRES(mutex_);
   std::string fileName(int age) const;
 
   FileDescriptor folder_;
   const bool writable_;
   const std::uint64_t fileSize_;
-  std::mutex mutex_;
-  // Guarded by mutex_.
-  FileDescriptor newest_;
-  std::uint64_t size_ = 0;
-  bool torn_ = false;  ///< the newest file does not end with a whole line
+  Mutex mutex_;
+  FileDescriptor newest_ APPSYNC_GUARDED_BY(mutex_);
+  std::uint64_t size_ APPSYNC_GUARDED_BY(mutex_) = 0;
+  bool torn_ APPSYNC_GUARDED_BY(mutex_) =
+      false;  ///< the newest file does not end with a whole line
 };
 
 }  // namespace appsync::device

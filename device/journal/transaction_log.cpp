@@ -15,7 +15,7 @@ TransactionRecord recordOf(const Query& query) {
 }  // namespace
 
 void StoredTransactionLog::initializeWithLog(const LogHandle& handle) noexcept {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   subsystem_ = handle.subsystem;
   category_ = handle.category;
 }
@@ -42,10 +42,10 @@ void StoredTransactionLog::logStep(std::uint32_t step, std::uint32_t party, std:
 }
 
 void StoredTransactionLog::keep(const TransactionRecord& record) noexcept {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   database_.change(
       "a transaction record could not be kept", Database::Commit::Ordinary,
-      [&](SQLite::Database& database) {
+      [&](SQLite::Database& database) APPSYNC_REQUIRES(mutex_) {
         Query(database,
               "INSERT INTO transactions (time, subsystem, category, scenario, step, party, phase, "
               "success, identifier, description) VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",

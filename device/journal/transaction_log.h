@@ -1,11 +1,11 @@
 #pragma once
 
-#include <mutex>
 #include <string>
 #include <vector>
 
 #include "device/journal/records.h"
 #include "device/state/database.h"
+#include "platform/mutex.h"
 #include "platform/transaction_log.h"
 
 namespace appsync::device {
@@ -32,10 +32,10 @@ class StoredTransactionLog final : public TransactionLog {
   void keep(const TransactionRecord& record) noexcept;
 
   Database& database_;
-  std::mutex mutex_;
-  // Who writes the records that come; guarded by mutex_.
-  std::string subsystem_;
-  std::string category_;
+  Mutex mutex_;
+  // Who writes the records that come.
+  std::string subsystem_ APPSYNC_GUARDED_BY(mutex_);
+  std::string category_ APPSYNC_GUARDED_BY(mutex_);
 };
 
 }  // namespace appsync::device

@@ -1,12 +1,12 @@
 #pragma once
 
-#include <condition_variable>
 #include <map>
-#include <mutex>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "device/state/background_queue.h"
+#include "platform/mutex.h"
 #include "platform/system_notifier.h"
 
 namespace appsync::device {
@@ -46,16 +46,17 @@ class LocalNotifier final : public SystemNotifier {
 
   void deliver(const Posting& posting);
 
-  std::mutex mutex_;
-  std::condition_variable returned_;  ///< a callback has returned
-  // Guarded by mutex_.
-  std::vector<std::string> tokenNames_;  ///< of token n + 1
-  std::map<std::string, std::uint64_t, std::less<>> states_;
-  std::map<std::uint64_t, Subscription> subscriptions_;  ///< in the order they were added
-  std::uint64_t lastSubscription_ = 0;
-  std::uint64_t running_ = 0;  ///< subscription being called, 0 for none
-  std::uint64_t postingCount_ = 0;
-  std::thread::id deliverer_;
+  Mutex mutex_;
+  Condition returned_;                                              ///< a callback has returned
+  std::vector<std::string> tokenNames_ APPSYNC_GUARDED_BY(mutex_);  ///< of token n + 1
+  std::map<std::string, std::uint64_t, std::less<>> states_ APPSYNC_GUARDED_BY(mutex_);
+  /// In the order they were added.
+  std::map<std::uint64_t, Subscription> subscriptions_ APPSYNC_GUARDED_BY(mutex_);
+  std::uint64_t lastSubscription_ APPSYNC_GUARDED_BY(mutex_) = 0;
+  /// Subscription being called, 0 for none.
+  std::uint64_t running_ APPSYNC_GUARDED_BY(mutex_) = 0;
+  std::uint64_t postingCount_ APPSYNC_GUARDED_BY(mutex_) = 0;
+  std::thread::id deliverer_ APPSYNC_GUARDED_BY(mutex_);
 
   ThreadBackgroundQueue queue_;  ///< one task for each posting
 };

@@ -20,31 +20,30 @@ ThreadBackgroundQueue::~ThreadBackgroundQueue() {
 
 BackgroundQueue::Token ThreadBackgroundQueue::after(std::chrono::milliseconds delay,
                                                     std::function<void()> task) noexcept {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   const Token token = ++lastToken_;
   const Clock::time_point now = Clock::now();
   const auto wait = std::clamp(delay, std::chrono::milliseconds(0), LongestDelay);
   const Clock::time_point due = expedited_ ? now : now + wait;
   due_.emplace(token, due);
   pending_.emplace(Key{due, token}, std::move(task));
-  changed_.notify_all();
+  changed_.notifyAll();
   return token;
 }
 
 void ThreadBackgroundQueue::cancel(Token token) noexcept {
   Tasks::node_type dropped;  // destroyed after the lock: what a task holds may call the queue
-  std::unique_lock lock(mutex_);
+  const Lock lock(mutex_);
   if (const auto due = due_.find(token); due != due_.end()) {
     dropped = pending_.extract(Key{due->second, token});
     due_.erase(due);
   } else if (std::this_thread::get_id() != thread_.get_id()) {
-    finished_.wait(lock, [&] { return running_ != token; });
+    while (running_ == token) finished_.wait(mutex_);
   }
-  lock.unlock();
 }
 
 void ThreadBackgroundQueue::expedite() noexcept {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   expedited_ = true;
   const Clock::time_point now = Clock::now();
   std::size_t ahead = pending_.size();
@@ -56,43 +55,44 @@ void ThreadBackgroundQueue::expedite() noexcept {
     expedited.emplace(Key{due, key.second}, std::move(task));
   }
   pending_ = std::move(expedited);
-  changed_.notify_all();
+  changed_.notifyAll();
 }
 
 void ThreadBackgroundQueue::stop() noexcept {
-  std::unique_lock lock(mutex_);
+  const Lock lock(mutex_);
   stopping_ = true;
-  changed_.notify_all();
+  changed_.notifyAll();
   if (std::this_thread::get_id() == thread_.get_id()) return;
-  finished_.wait(lock, [this] { return !running_; });
+  while (running_) finished_.wait(mutex_);
 }
 
 bool ThreadBackgroundQueue::isStopped() noexcept {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   return stopping_;
 }
 
 void ThreadBackgroundQueue::run() {
-  std::unique_lock lock(mutex_);
+  const Lock lock(mutex_);
   while (!stopping_) {
     if (pending_.empty()) {
-      changed_.wait(lock);
+      changed_.wait(mutex_);
       continue;
     }
     const Key next = pending_.begin()->first;
     if (next.first > Clock::now()) {
-      changed_.wait_until(lock, next.first);
+      changed_.waitUntil(mutex_, next.first);
       continue;
     }
     Tasks::node_type node = pending_.extract(pending_.begin());
     due_.erase(next.second);
     running_ = next.second;
-    lock.unlock();
-    node.mapped()();
-    node = {};  // what the task holds goes before anybody is told that it has ended
-    lock.lock();
+    {
+      const Unlock unlocked(mutex_);
+      node.mapped()();
+      node = {};  // what the task holds goes before anybody is told that it has ended
+    }
     running_.reset();
-    finished_.notify_all();
+    finished_.notifyAll();
   }
 }
 

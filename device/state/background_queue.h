@@ -1,13 +1,12 @@
 #pragma once
 
-#include <condition_variable>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <thread>
 #include <utility>
 
 #include "platform/background_queue.h"
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -37,16 +36,15 @@ class ThreadBackgroundQueue final : public BackgroundQueue {
 
   void run();
 
-  std::mutex mutex_;
-  std::condition_variable changed_;   ///< there is something new to wait for
-  std::condition_variable finished_;  ///< a task has ended
-  // Guarded by mutex_.
-  Tasks pending_;
-  std::map<Token, Clock::time_point> due_;  ///< of what is pending
-  Token lastToken_ = 0;
-  std::optional<Token> running_;
-  bool expedited_ = false;
-  bool stopping_ = false;
+  Mutex mutex_;
+  Condition changed_;   ///< there is something new to wait for
+  Condition finished_;  ///< a task has ended
+  Tasks pending_ APPSYNC_GUARDED_BY(mutex_);
+  std::map<Token, Clock::time_point> due_ APPSYNC_GUARDED_BY(mutex_);  ///< of what is pending
+  Token lastToken_ APPSYNC_GUARDED_BY(mutex_) = 0;
+  std::optional<Token> running_ APPSYNC_GUARDED_BY(mutex_);
+  bool expedited_ APPSYNC_GUARDED_BY(mutex_) = false;
+  bool stopping_ APPSYNC_GUARDED_BY(mutex_) = false;
 
   std::thread thread_;
 };

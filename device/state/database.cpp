@@ -67,7 +67,7 @@ bool Database::attempt(std::string_view purpose, const std::function<void()>& wo
   Error reason;
   std::string cause;
   try {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     work();
     return true;
   } catch (const Refused& refused) {
@@ -87,14 +87,14 @@ bool Database::attempt(std::string_view purpose, const std::function<void()>& wo
 bool Database::read(std::string_view purpose, const Work& work,
                     std::optional<Error>* error) noexcept {
   return attempt(
-      purpose, [&] { work(connection_); }, error);
+      purpose, [&]() APPSYNC_REQUIRES(mutex_) { work(connection_); }, error);
 }
 
 bool Database::change(std::string_view purpose, Commit commit, const Work& work,
                       std::optional<Error>* error) noexcept {
   return attempt(
       purpose,
-      [&] {
+      [&]() APPSYNC_REQUIRES(mutex_) {
         std::optional<FullSynchronisation> full;
         if (commit == Commit::OnDisk && writable_) full.emplace(connection_);
         SQLite::Transaction transaction(connection_, SQLite::TransactionBehavior::IMMEDIATE);
@@ -109,7 +109,7 @@ bool Database::change(std::string_view purpose, Commit commit, const Work& work,
 bool Database::settle() noexcept {
   return attempt(
       "it is not sure what the database will hold when it is next opened",
-      [&] {
+      [&]() APPSYNC_REQUIRES(mutex_) {
         if (settled_) return;
         const FullSynchronisation full(connection_);
         SQLite::Transaction transaction(connection_, SQLite::TransactionBehavior::IMMEDIATE);

@@ -4,7 +4,6 @@
 
 #include <concepts>
 #include <functional>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -14,6 +13,7 @@
 #include "platform/bytes.h"
 #include "platform/error.h"
 #include "platform/log.h"
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -135,13 +135,15 @@ class Database {
   bool settle() noexcept;
 
  private:
+  /// Runs work with mutex_ held.
   bool attempt(std::string_view purpose, const std::function<void()>& work,
                std::optional<Error>* error) noexcept;
 
-  std::mutex mutex_;
-  SQLite::Database connection_;
+  Mutex mutex_;
+  SQLite::Database connection_ APPSYNC_GUARDED_BY(mutex_);
   const bool writable_;
-  bool settled_ = false;  ///< guarded by mutex_; at first not, for a process may have been killed
+  /// At first not, for a process may have been killed.
+  bool settled_ APPSYNC_GUARDED_BY(mutex_) = false;
   Log& log_;
 };
 

@@ -1,9 +1,9 @@
 #pragma once
 
-#include <condition_variable>
-#include <mutex>
 #include <set>
 #include <string>
+
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -13,15 +13,15 @@ class KeyedMutex {
   class Guard {
    public:
     Guard(KeyedMutex& owner, std::string_view key) : owner_(owner), key_(key) {
-      std::unique_lock lock(owner_.mutex_);
-      owner_.released_.wait(lock, [&] { return owner_.held_.insert(key_).second; });
+      const Lock lock(owner_.mutex_);
+      while (!owner_.held_.insert(key_).second) owner_.released_.wait(owner_.mutex_);
     }
     ~Guard() {
       {
-        const std::lock_guard lock(owner_.mutex_);
+        const Lock lock(owner_.mutex_);
         owner_.held_.erase(key_);
       }
-      owner_.released_.notify_all();
+      owner_.released_.notifyAll();
     }
     Guard(const Guard&) = delete;
     Guard& operator=(const Guard&) = delete;
@@ -32,9 +32,9 @@ class KeyedMutex {
   };
 
  private:
-  std::mutex mutex_;
-  std::condition_variable released_;
-  std::set<std::string, std::less<>> held_;
+  Mutex mutex_;
+  Condition released_;
+  std::set<std::string, std::less<>> held_ APPSYNC_GUARDED_BY(mutex_);
 };
 
 }  // namespace appsync::device

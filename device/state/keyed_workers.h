@@ -1,16 +1,16 @@
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
 #include <deque>
 #include <functional>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <thread>
 #include <vector>
+
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -50,22 +50,21 @@ class KeyedWorkers {
                                                    Clock::time_point now);
 
  private:
-  using Lock = std::unique_lock<std::mutex>;
-
   void run();
   /// The first job that may run now; end() when there is none.
-  std::deque<Pending>::iterator next();
+  std::deque<Pending>::iterator next() APPSYNC_REQUIRES(mutex_);
   /// Until something changes or the next job falls due.
-  void waitForChange(Lock& lock);
-  void perform(const std::string& key, const Job& job, Lock& lock);
+  void waitForChange() APPSYNC_REQUIRES(mutex_);
+  void perform(const std::string& key, const Job& job) APPSYNC_REQUIRES(mutex_);
+  /// Whether this is called from a job of the key.
+  bool isRunHere(std::string_view key);
 
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  // Guarded by mutex_.
-  std::deque<Pending> pending_;
-  std::map<std::string, std::thread::id, std::less<>> running_;
-  bool expedited_ = false;
-  bool stopping_ = false;
+  Mutex mutex_;
+  Condition changed_;
+  std::deque<Pending> pending_ APPSYNC_GUARDED_BY(mutex_);
+  std::map<std::string, std::thread::id, std::less<>> running_ APPSYNC_GUARDED_BY(mutex_);
+  bool expedited_ APPSYNC_GUARDED_BY(mutex_) = false;
+  bool stopping_ APPSYNC_GUARDED_BY(mutex_) = false;
 
   std::vector<std::thread> threads_;
 };

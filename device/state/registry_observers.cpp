@@ -69,7 +69,7 @@ RegistryObservers::~RegistryObservers() = default;
 
 void RegistryObservers::add(AppRegistryObserver* observer) {
   if (!observer) return;
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   std::shared_ptr<Service>& service = services_[observer];
   // One that is on its way out, in another thread's remove, does not stand for this observer.
   if (!service || service->isStopping()) {
@@ -80,19 +80,19 @@ void RegistryObservers::add(AppRegistryObserver* observer) {
 void RegistryObservers::remove(AppRegistryObserver* observer) {
   std::shared_ptr<Service> service;
   {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     const auto found = services_.find(observer);
     if (found == services_.end()) return;
     service = found->second;
   }
   service->stop();
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   const auto found = services_.find(observer);
   if (found != services_.end() && found->second == service) services_.erase(found);
 }
 
 std::vector<std::shared_ptr<RegistryObservers::Service>> RegistryObservers::services() {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   std::vector<std::shared_ptr<Service>> all;
   for (const auto& [observer, service] : services_) all.push_back(service);
   return all;

@@ -3,10 +3,10 @@
 #include <functional>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <vector>
 
 #include "platform/app_registry.h"
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -38,8 +38,8 @@ class RegistryObservers {
   std::vector<std::shared_ptr<Service>> services();
 
   const std::function<Report()> report_;
-  std::mutex mutex_;
-  std::map<AppRegistryObserver*, std::shared_ptr<Service>> services_;
+  Mutex mutex_;
+  std::map<AppRegistryObserver*, std::shared_ptr<Service>> services_ APPSYNC_GUARDED_BY(mutex_);
 };
 
 }  // namespace appsync::device

@@ -1,11 +1,10 @@
 #pragma once
 
-#include <mutex>
 #include <optional>
-#include <shared_mutex>
 #include <string_view>
 
 #include "phone/phone.h"
+#include "platform/mutex.h"
 
 namespace appsync::device {
 
@@ -13,23 +12,23 @@ namespace appsync::device {
 class WatcherSlot {
  public:
   void set(PhoneWatcher* watcher) {
-    const std::unique_lock lock(mutex_);
+    const Lock lock(mutex_);
     watcher_ = watcher;
   }
 
   void assertionDenied(std::string_view identifier) {
-    const std::shared_lock lock(mutex_);
+    const SharedLock lock(mutex_);
     if (watcher_) watcher_->assertionDenied(identifier);
   }
 
   void installFinished(std::string_view identifier, const std::optional<Error>& error) {
-    const std::shared_lock lock(mutex_);
+    const SharedLock lock(mutex_);
     if (watcher_) watcher_->installFinished(identifier, error);
   }
 
  private:
-  std::shared_mutex mutex_;
-  PhoneWatcher* watcher_ = nullptr;
+  SharedMutex mutex_;
+  PhoneWatcher* watcher_ APPSYNC_GUARDED_BY(mutex_) = nullptr;
 };
 
 }  // namespace appsync::device

@@ -6,25 +6,25 @@
 namespace appsync::host {
 
 void TransferQueue::add(const std::vector<SyncAssetPtr>& assets) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   waiting_.insert(waiting_.end(), assets.begin(), assets.end());
   for (const SyncAssetPtr& asset : assets) finished_.erase(asset->identifier);
 }
 
 void TransferQueue::forgetCancelled() {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   cancelled_.clear();
 }
 
 TransferQueue::Next TransferQueue::next() {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   if (waiting_.empty()) return {};
   const SyncAssetPtr& first = waiting_.front();
   return {first, cancelled_.count(first->identifier) > 0};
 }
 
 void TransferQueue::finish(const SyncAssetPtr& asset) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   waiting_.erase(std::remove(waiting_.begin(), waiting_.end(), asset), waiting_.end());
   cancelled_.erase(asset->identifier);
   finished_.insert(asset->identifier);
@@ -45,7 +45,7 @@ void TransferQueue::prioritizeAsset(
     std::function<void(const std::optional<Error>&)> completion) noexcept {
   bool found = false;
   if (asset) {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     found = moveToFront(asset->identifier);
   }
   if (!completion) return;
@@ -59,7 +59,7 @@ void TransferQueue::prioritizeAsset(
 
 void TransferQueue::cancelAssetAsFailed(const SyncAssetPtr& asset) noexcept {
   if (!asset) return;
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   if (finished_.contains(asset->identifier)) return;
   moveToFront(asset->identifier);
   cancelled_.insert(asset->identifier);

@@ -1,11 +1,11 @@
 #pragma once
 
 #include <deque>
-#include <mutex>
 #include <set>
 #include <string>
 #include <vector>
 
+#include "platform/mutex.h"
 #include "platform/sync_host.h"
 
 namespace appsync::host {
@@ -41,13 +41,12 @@ class TransferQueue : public SyncHostService {
   void cancelAssetAsFailed(const SyncAssetPtr& asset) noexcept override;
 
  private:
-  /// Under mutex_.
-  bool moveToFront(const std::string& identifier);
+  bool moveToFront(const std::string& identifier) APPSYNC_REQUIRES(mutex_);
 
-  std::mutex mutex_;
-  std::deque<SyncAssetPtr> waiting_;
-  std::set<std::string> cancelled_;
-  std::set<std::string> finished_;
+  Mutex mutex_;
+  std::deque<SyncAssetPtr> waiting_ APPSYNC_GUARDED_BY(mutex_);
+  std::set<std::string> cancelled_ APPSYNC_GUARDED_BY(mutex_);
+  std::set<std::string> finished_ APPSYNC_GUARDED_BY(mutex_);
 };
 
 }  // namespace appsync::host

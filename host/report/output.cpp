@@ -11,7 +11,7 @@
 namespace appsync::host {
 
 void Output::write(std::string_view text) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   while (!text.empty() && error_ == 0) {
     const ssize_t written = ::write(fd_, text.data(), text.size());
     if (written >= 0) {
@@ -32,7 +32,7 @@ void Output::line(std::string_view text) {
 }
 
 int Output::error() const {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   return error_;
 }
 

@@ -1,7 +1,8 @@
 #pragma once
 
-#include <mutex>
 #include <string_view>
+
+#include "platform/mutex.h"
 
 namespace appsync::host {
 
@@ -25,8 +26,8 @@ class Output {
 
  private:
   const int fd_;
-  mutable std::mutex mutex_;
-  int error_ = 0;
+  mutable Mutex mutex_;
+  int error_ APPSYNC_GUARDED_BY(mutex_) = 0;
 };
 
 /// Opens on /dev/null what this process was started without of standard input, output and error:

@@ -29,7 +29,6 @@ TextReporter::TextReporter(Output& output, Output& errorOutput, const ReportOpti
       status_(output, terminal && !options.quiet) {}
 
 void TextReporter::report(const Event& event) {
-  const std::lock_guard lock(mutex_);
   std::visit([this](const auto& value) { tell(value); }, event);
 }
 

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <map>
-#include <mutex>
 #include <set>
 #include <string>
 
@@ -10,7 +9,7 @@
 
 namespace appsync::host {
 
-/// Lines for people; on a terminal with colour and a progress bar.
+/// Lines for people; on a terminal with colour and a progress bar. Used by one thread at a time.
 class TextReporter : public Reporter {
  public:
   TextReporter(Output& output, Output& errorOutput, const ReportOptions& options, bool terminal,
@@ -51,7 +50,6 @@ class TextReporter : public Reporter {
   Output& errorOutput_;
   const ReportOptions options_;
   const bool colour_;
-  std::mutex mutex_;
   StatusLine status_;
   std::map<std::string, PlannedEntry> planned_;
   std::set<std::string> installing_;

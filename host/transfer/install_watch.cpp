@@ -27,7 +27,7 @@ void InstallWatch::installFinished(std::string_view bundleId,
   InstallEnded ended{std::string(bundleId), std::nullopt};
   if (error) ended.failure = oneLine(error->localizedDescription());
   {
-    const std::lock_guard lock(mutex_);
+    const Lock lock(mutex_);
     if (ended.failure) failures_[ended.identifier] = *ended.failure;
     if (!ended.failure) installed_.insert(ended.identifier);
     const auto file = files_.find(ended.identifier);
@@ -37,7 +37,7 @@ void InstallWatch::installFinished(std::string_view bundleId,
 }
 
 void InstallWatch::nameFilesOf(const Library& library) {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   for (const auto& [identifier, package] : library.packages) {
     files_.emplace(identifier, package.file.filename().string());
   }
@@ -46,7 +46,7 @@ void InstallWatch::nameFilesOf(const Library& library) {
 void InstallWatch::tellInstalled(const std::set<std::string>& identifiers) {
   for (const std::string& identifier : identifiers) {
     const bool isTold = [&] {
-      const std::lock_guard lock(mutex_);
+      const Lock lock(mutex_);
       return !installed_.insert(identifier).second;
     }();
     if (!isTold) reporter_.report(InstallEnded{identifier, std::nullopt});
@@ -54,7 +54,7 @@ void InstallWatch::tellInstalled(const std::set<std::string>& identifiers) {
 }
 
 std::map<std::string, std::string> InstallWatch::failures() const {
-  const std::lock_guard lock(mutex_);
+  const Lock lock(mutex_);
   return failures_;
 }
 

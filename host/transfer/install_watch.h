@@ -1,7 +1,6 @@
 #pragma once
 
 #include <map>
-#include <mutex>
 #include <optional>
 #include <set>
 #include <string>
@@ -10,6 +9,7 @@
 #include "base/interruption.h"
 #include "host/library/events.h"
 #include "host/phone/phone_state.h"
+#include "platform/mutex.h"
 
 namespace appsync::host {
 
@@ -36,10 +36,10 @@ class InstallWatch : public PhoneWatcher {
   const Phone& phone_;
   Reporter& reporter_;
   Interruption& interruption_;
-  mutable std::mutex mutex_;
-  std::map<std::string, std::string> failures_;
-  std::set<std::string> installed_;
-  std::map<std::string, std::string> files_;  // by identifier
+  mutable Mutex mutex_;
+  std::map<std::string, std::string> failures_ APPSYNC_GUARDED_BY(mutex_);
+  std::set<std::string> installed_ APPSYNC_GUARDED_BY(mutex_);
+  std::map<std::string, std::string> files_ APPSYNC_GUARDED_BY(mutex_);  // by identifier
 };
 
 }  // namespace appsync::host

@@ -45,6 +45,12 @@ class Layers(unittest.TestCase):
         for header in ("unistd.h", "sys/stat.h", "sqlite3.h", "archive.h", "fmt/core.h", "linux/fs.h"):
             self.assertRefused("client/a.cpp", f"#include <{header}>\n", "standard library")
 
+    def test_locks_are_those_that_the_compiler_checks(self):
+        self.assertAllowed("platform/mutex.h", "#include <mutex>\n#include <condition_variable>\n")
+        self.assertAllowed("device/a.cpp", '#include "platform/mutex.h"\n')
+        for header in ("mutex", "shared_mutex", "condition_variable"):
+            self.assertRefused("device/a.h", f"#include <{header}>\n", "platform/mutex.h")
+
     def test_platform_knows_nobody(self):
         self.assertRefused("platform/a.h", '#include "client/apps_client.h"\n', "must not know")
         self.assertRefused("platform/a.h", "#include <fcntl.h>\n", "standard library")
