@@ -1,6 +1,8 @@
 // Decodes arbitrary bytes as each kind of icon. Checksums of PNG chunks are mended first, or hardly
 // any input would get past them.
 
+#include <zlib.h>
+
 #include <cstdint>
 #include <cstdlib>
 
@@ -17,21 +19,13 @@ std::uint32_t bigEndianAt(const Bytes& bytes, std::size_t at) {
   return value;
 }
 
-std::uint32_t checksum(const std::byte* bytes, std::size_t size) {
-  std::uint32_t crc = ~0u;
-  for (std::size_t i = 0; i < size; ++i) {
-    crc ^= std::to_integer<std::uint32_t>(bytes[i]);
-    for (int bit = 0; bit < 8; ++bit) crc = crc >> 1 ^ (crc & 1 ? 0xedb88320u : 0);
-  }
-  return ~crc;
-}
-
 void mendChecksums(Bytes& file) {
   constexpr std::size_t signature = 8, frame = 12;
   for (std::size_t at = signature; file.size() >= at + frame;) {
     const std::size_t length = bigEndianAt(file, at);
     if (length > file.size() - at - frame) return;
-    const std::uint32_t crc = checksum(&file[at + 4], length + 4);
+    const auto* chunk = reinterpret_cast<const Bytef*>(&file[at + 4]);
+    const uLong crc = crc32_z(0, chunk, length + 4);
     for (std::size_t i = 0; i < 4; ++i)
       file[at + 8 + length + i] = static_cast<std::byte>(crc >> (24 - 8 * i) & 0xff);
     at += frame + length;

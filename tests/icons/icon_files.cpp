@@ -1,6 +1,7 @@
 #include "tests/icons/icon_files.h"
 
 #include <png.h>
+#include <zlib.h>
 
 // <jpeglib.h> needs what <cstdio> declares.
 // clang-format off
@@ -85,15 +86,6 @@ void setExtras(png_structp png, png_infop info, PngForm form, std::string& text)
   chunk.text = text.data();
   chunk.text_length = text.size();
   png_set_text(png, info, &chunk, 1);
-}
-
-std::uint32_t checksum(const std::byte* bytes, std::size_t size) {
-  std::uint32_t crc = ~0u;
-  for (std::size_t i = 0; i < size; ++i) {
-    crc ^= std::to_integer<std::uint32_t>(bytes[i]);
-    for (int bit = 0; bit < 8; ++bit) crc = crc >> 1 ^ (crc & 1 ? 0xedb88320u : 0);
-  }
-  return ~crc;
 }
 
 void putBigEndian(std::byte* to, std::uint32_t value) {
@@ -194,7 +186,9 @@ void setPngSize(Bytes& file, std::uint32_t width, std::uint32_t height) {
   constexpr std::size_t header = 12, headerSize = 17;  // "IHDR" and its contents
   putBigEndian(&file.at(header + 4), width);
   putBigEndian(&file.at(header + 8), height);
-  putBigEndian(&file.at(header + headerSize), checksum(&file[header], headerSize));
+  const auto* chunk = reinterpret_cast<const Bytef*>(&file[header]);
+  putBigEndian(&file.at(header + headerSize),
+               static_cast<std::uint32_t>(crc32_z(0, chunk, headerSize)));
 }
 
 }  // namespace appsync
