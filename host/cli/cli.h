@@ -57,6 +57,10 @@ struct CommandContext {
 
   /// One line of a result: the object with --json, else the text.
   void tell(const Json& object, const std::string& text);
+  /// The same, unless only what failed is wanted.
+  void say(const Json& object, const std::string& text) {
+    if (json || !quiet) tell(object, text);
+  }
   void tellError(const std::string& message);
   /// Says that the work went on when nobody read the output any more, if that is so.
   void tellIfUnseen(std::string_view work);

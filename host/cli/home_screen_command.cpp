@@ -84,13 +84,12 @@ ExitCode runHomeScreen(const HomeScreenOptions& options, CommandContext& context
     if (auto icon = source.iconOf(order[i])) icons.push_back(std::move(*icon));
   }
   writeFile(fs::absolute(options.output), encode(drawHomeScreen(view, icons)));
-  if (context.quiet && !context.json) return ExitCode::Done;
-  context.tell({{"event", "home-screen"},
-                {"file", options.output},
-                {"pages", view.pagesShown},
-                {"icons", icons.size()}},
-               fmt::format("{}: {}, {}", printable(options.output),
-                           counted(view.pagesShown, "page"), counted(icons.size(), "icon")));
+  context.say({{"event", "home-screen"},
+               {"file", options.output},
+               {"pages", view.pagesShown},
+               {"icons", icons.size()}},
+              fmt::format("{}: {}, {}", printable(options.output), counted(view.pagesShown, "page"),
+                          counted(icons.size(), "icon")));
   return ExitCode::Done;
 }
 

@@ -19,8 +19,7 @@ ExitCode runPackage(const PackageOptions& options, CommandContext& context) {
   std::string problem;
   const auto package = writePackage(options.folder, options.output, problem);
   if (!package) throw CommandError(ExitCode::SomeFailed, "cannot make the package: " + problem);
-  if (context.quiet && !context.json) return ExitCode::Done;
-  context.tell(
+  context.say(
       {{"event", "packaged"},
        {"identifier", package->identifier},
        {"version", textOrNull(package->version)},

@@ -5,6 +5,7 @@
 
 #include "base/text.h"
 #include "host/cli/cli.h"
+#include "host/phone/phone_state.h"
 
 namespace appsync::host {
 namespace {
@@ -14,16 +15,10 @@ struct PolicyOptions {
   std::string removing;
 };
 
-void say(CommandContext& context, const Json& object, const std::string& text) {
-  if (context.json || !context.quiet) context.tell(object, text);
-}
-
 [[noreturn]] void fail(std::string_view what, const std::string& identifier,
                        const std::optional<Error>& error) {
-  throw CommandError(
-      ExitCode::SomeFailed,
-      fmt::format("cannot {} {}: {}", what, printable(identifier),
-                  printable(error ? oneLine(error->localizedDescription()) : "no reason")));
+  throw CommandError(ExitCode::SomeFailed,
+                     printable(withReason(fmt::format("cannot {} {}", what, identifier), error)));
 }
 
 ExitCode runInit(bool coordination, CommandContext& context) {
@@ -34,67 +29,69 @@ ExitCode runInit(bool coordination, CommandContext& context) {
   if (!device::EmbeddedDevice::initialize(folder, options, error)) {
     throw CommandError(ExitCode::DeviceUnusable, printable(error.message));
   }
-  say(context, {{"event", "initialized"}, {"device", folder}, {"coordination", coordination}},
-      fmt::format("Made a new phone in {}.", printable(folder)));
+  context.say({{"event", "initialized"}, {"device", folder}, {"coordination", coordination}},
+              fmt::format("Made a new phone in {}.", printable(folder)));
   return ExitCode::Done;
 }
 
-ExitCode runUninstall(const std::string& identifier, CommandContext& context) {
+/// What a person does to an application. False with a reason when it is not done.
+using Deed = bool (*)(const CommandContext&, const std::string& identifier, std::optional<Error>*);
+
+/// Done by this process, which writes the device meanwhile.
+template <bool (device::EmbeddedDevice::*Act)(std::string_view, std::optional<Error>*) noexcept>
+bool onOpenDevice(const CommandContext& context, const std::string& identifier,
+                  std::optional<Error>* error) {
   const auto device = context.openDevice(device::Access::Write);
-  std::optional<Error> error;
-  if (!device->uninstall(identifier, &error)) fail("uninstall", identifier, error);
-  say(context, {{"event", "uninstalled"}, {"identifier", identifier}},
-      fmt::format("Uninstalled {}.", printable(identifier)));
-  return ExitCode::Done;
+  return (device.get()->*Act)(identifier, error);
 }
 
-ExitCode runDemote(const std::string& identifier, CommandContext& context) {
-  const auto device = context.openDevice(device::Access::Write);
-  std::optional<Error> error;
-  if (!device->demote(identifier, &error)) fail("demote", identifier, error);
-  say(context, {{"event", "demoted"}, {"identifier", identifier}},
-      fmt::format("Demoted {}: its placeholder and data stay.", printable(identifier)));
-  return ExitCode::Done;
-}
-
-/// What a person can do while another process writes the device: EmbeddedDevice::launch and others.
-using Gesture = bool (*)(const std::filesystem::path&, std::string_view, device::DeviceError&,
-                         std::optional<Error>*);
-
-void make(Gesture gesture, std::string_view what, const std::string& identifier,
-          const CommandContext& context) {
+/// Done also while another process writes the device.
+template <bool (*Act)(const std::filesystem::path&, std::string_view, device::DeviceError&,
+                      std::optional<Error>*) noexcept>
+bool meanwhile(const CommandContext& context, const std::string& identifier,
+               std::optional<Error>* error) {
   device::DeviceError deviceError;
+  if (Act(context.deviceFolder(), identifier, deviceError, error)) return true;
+  if (!*error) throw CommandError(ExitCode::DeviceUnusable, printable(deviceError.message));
+  return false;
+}
+
+/// A command that a person gives for one application.
+struct Gesture {
+  const char* name;
+  const char* description;
+  const char* more;  ///< before the example: empty, or whole lines
+  const char* event;
+  const char* done;  ///< for people; "{}" stands for the application
+  Deed deed;
+};
+
+using device::EmbeddedDevice;
+
+constexpr Gesture Gestures[] = {
+    {"uninstall", "Uninstall an application, as a person would", "Its data goes with it.\n",
+     "uninstalled", "Uninstalled {}.", onOpenDevice<&EmbeddedDevice::uninstall>},
+    {"demote", "Keep only the placeholder and the data of an application",
+     "\"tap\" asks for it again.\n", "demoted", "Demoted {}: its placeholder and data stay.",
+     onOpenDevice<&EmbeddedDevice::demote>},
+    {"launch", "Open an application on the phone",
+     "While it is open, its update waits. Works while a sync runs.\n", "launched",
+     "{} is open now.", meanwhile<&EmbeddedDevice::launch>},
+    {"quit", "Close an application on the phone", "Works while a sync runs.\n", "quit",
+     "{} is closed.", meanwhile<&EmbeddedDevice::quit>},
+    {"tap", "Tap a placeholder: have its application come next", "Works while a sync runs.\n",
+     "tapped", "{} is asked for now.", meanwhile<&EmbeddedDevice::tap>},
+    {"cancel", "Cancel the install of an application on the phone",
+     "Works while a sync runs. A demoted application that was tapped is demoted again; one\n"
+     "that waits to be restored goes, with what the restore had for it.\n",
+     "cancelled", "The install of {} is cancelled.", meanwhile<&EmbeddedDevice::cancel>},
+};
+
+ExitCode run(const Gesture& gesture, const std::string& identifier, CommandContext& context) {
   std::optional<Error> error;
-  if (gesture(context.deviceFolder(), identifier, deviceError, &error)) return;
-  if (error) fail(what, identifier, error);
-  throw CommandError(ExitCode::DeviceUnusable, printable(deviceError.message));
-}
-
-ExitCode runLaunch(const std::string& identifier, CommandContext& context) {
-  make(&device::EmbeddedDevice::launch, "launch", identifier, context);
-  say(context, {{"event", "launched"}, {"identifier", identifier}},
-      fmt::format("{} is open now.", printable(identifier)));
-  return ExitCode::Done;
-}
-
-ExitCode runQuit(const std::string& identifier, CommandContext& context) {
-  make(&device::EmbeddedDevice::quit, "quit", identifier, context);
-  say(context, {{"event", "quit"}, {"identifier", identifier}},
-      fmt::format("{} is closed.", printable(identifier)));
-  return ExitCode::Done;
-}
-
-ExitCode runTap(const std::string& identifier, CommandContext& context) {
-  make(&device::EmbeddedDevice::tap, "tap", identifier, context);
-  say(context, {{"event", "tapped"}, {"identifier", identifier}},
-      fmt::format("{} is asked for now.", printable(identifier)));
-  return ExitCode::Done;
-}
-
-ExitCode runCancel(const std::string& identifier, CommandContext& context) {
-  make(&device::EmbeddedDevice::cancel, "cancel", identifier, context);
-  say(context, {{"event", "cancelled"}, {"identifier", identifier}},
-      fmt::format("The install of {} is cancelled.", printable(identifier)));
+  if (!gesture.deed(context, identifier, &error)) fail(gesture.name, identifier, error);
+  context.say({{"event", gesture.event}, {"identifier", identifier}},
+              fmt::format(fmt::runtime(gesture.done), printable(identifier)));
   return ExitCode::Done;
 }
 
@@ -119,21 +116,19 @@ ExitCode runPolicy(const PolicyOptions& options, CommandContext& context) {
   return ExitCode::Done;
 }
 
-using IdentifierCommand = ExitCode (*)(const std::string&, CommandContext&);
-
-/// `more` goes before the example; empty, or whole lines.
-void addIdentifierCommand(CLI::App& app, Command& chosen, const char* name, const char* description,
-                          const char* more, IdentifierCommand run) {
-  CLI::App* command = app.add_subcommand(name, description);
-  command->footer(
-      fmt::format("{}Example: appsync --device phone {} org.example.tally", more, name));
+void add(const Gesture& gesture, CLI::App& app, Command& chosen) {
+  CLI::App* command = app.add_subcommand(gesture.name, gesture.description);
+  command->footer(fmt::format("{}Example: appsync --device phone {} org.example.tally",
+                              gesture.more, gesture.name));
   auto identifier = std::make_shared<std::string>();
   command->add_option("identifier", *identifier, "Bundle identifier of the application")
       ->required()
       ->type_name("ID")
       ->check(checkIdentifier);
-  command->callback([identifier, run, &chosen] {
-    chosen = [identifier, run](CommandContext& context) { return run(*identifier, context); };
+  command->callback([identifier, &gesture, &chosen] {
+    chosen = [identifier, &gesture](CommandContext& context) {
+      return run(gesture, *identifier, context);
+    };
   });
 }
 
@@ -161,23 +156,7 @@ void addPhoneCommands(CLI::App& app, Command& chosen) {
     };
   });
 
-  addIdentifierCommand(app, chosen, "uninstall", "Uninstall an application, as a person would",
-                       "Its data goes with it.\n", &runUninstall);
-  addIdentifierCommand(app, chosen, "demote",
-                       "Keep only the placeholder and the data of an application",
-                       "\"tap\" asks for it again.\n", &runDemote);
-  addIdentifierCommand(app, chosen, "launch", "Open an application on the phone",
-                       "While it is open, its update waits. Works while a sync runs.\n",
-                       &runLaunch);
-  addIdentifierCommand(app, chosen, "quit", "Close an application on the phone",
-                       "Works while a sync runs.\n", &runQuit);
-  addIdentifierCommand(app, chosen, "tap", "Tap a placeholder: have its application come next",
-                       "Works while a sync runs.\n", &runTap);
-  addIdentifierCommand(
-      app, chosen, "cancel", "Cancel the install of an application on the phone",
-      "Works while a sync runs. A demoted application that was tapped is demoted again; one\n"
-      "that waits to be restored goes, with what the restore had for it.\n",
-      &runCancel);
+  for (const Gesture& gesture : Gestures) add(gesture, app, chosen);
 
   CLI::App* policy = app.add_subcommand("policy", "Show or set the phone's restrictions");
   policy->footer(

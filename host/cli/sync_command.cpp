@@ -111,9 +111,7 @@ ExitCode runClear(bool withData, CommandContext& context) {
   const std::set<std::string> sent = everSent(phone);
   loaded.client().clearSyncData();
   removeLeftOverPackages(phone, sent);
-  if (context.json || !context.quiet) {
-    context.tell({{"event", "cleared"}}, "Cleared all sync data and took every placeholder away.");
-  }
+  context.say({{"event", "cleared"}}, "Cleared all sync data and took every placeholder away.");
   return ExitCode::Done;
 }
 
