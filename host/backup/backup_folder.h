@@ -8,7 +8,8 @@
 #include <string>
 #include <string_view>
 
-#include "platform/bytes.h"
+#include "base/file_descriptor.h"
+#include "host/backup/digest.h"
 
 namespace appsync::host {
 
@@ -55,20 +56,24 @@ std::optional<Backup> readBackup(const std::filesystem::path& folder, std::strin
 class BackupFileReader {
  public:
   explicit BackupFileReader(const BackupFile& file);
-  ~BackupFileReader();
-  BackupFileReader(const BackupFileReader&) = delete;
-  BackupFileReader& operator=(const BackupFileReader&) = delete;
 
   /// The next bytes, at most as many as fit; 0 at the end. -1, with a problem, when the file cannot
   /// be read, is longer or shorter than it should be, or turns out, at its end, not to match its
   /// digest: only a 0 tells that what came was right.
   std::int64_t read(std::uint8_t* bytes, std::size_t size);
-  std::uint64_t position() const;  ///< bytes read so far
-  const std::string& problem() const;
+  std::uint64_t position() const { return position_; }  ///< bytes read so far
+  const std::string& problem() const { return problem_; }
 
  private:
-  struct State;
-  const std::unique_ptr<State> state_;
+  std::int64_t fail(const std::string& reason);
+  std::int64_t checkEnd();
+
+  const BackupFile file_;
+  FileDescriptor descriptor_;
+  Sha256 digest_;
+  std::uint64_t position_ = 0;
+  bool ended_ = false;
+  std::string problem_;
 };
 
 /// Makes a backup beside where it is to be and moves it there when it is whole, in the place of an

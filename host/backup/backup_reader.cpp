@@ -83,58 +83,37 @@ std::optional<Backup> readBackup(const fs::path& folder, std::string& problem) {
   return backup;
 }
 
-struct BackupFileReader::State {
-  explicit State(const BackupFile& described) : file(described) {
-    std::uint64_t size = 0;
-    BackupProblem unusable;
-    descriptor = openBackupFile(file.path, size, unusable);
-    problem = unusable.text;
-    if (descriptor && size != file.size) fail("is shorter or longer than the manifest tells");
-  }
-
-  std::int64_t fail(const std::string& reason) {
-    problem = fmt::format("{} {}", file.path.filename().string(), reason);
-    return -1;
-  }
-
-  std::int64_t checkEnd() {
-    if (position != file.size) return fail("is shorter or longer than the manifest tells");
-    if (!ended && digest.finish() != file.digest) return fail("does not match its digest");
-    ended = true;
-    return 0;
-  }
-
-  const BackupFile file;
-  FileDescriptor descriptor;
-  Sha256 digest;
-  std::uint64_t position = 0;
-  bool ended = false;
-  std::string problem;
-};
-
-BackupFileReader::BackupFileReader(const BackupFile& file)
-    : state_(std::make_unique<State>(file)) {}
-
-BackupFileReader::~BackupFileReader() = default;
-
-std::int64_t BackupFileReader::read(std::uint8_t* bytes, std::size_t size) {
-  State& state = *state_;
-  if (!state.problem.empty()) return -1;
-  if (size == 0 || state.ended) return 0;
-  const std::int64_t count =
-      readSome(state.descriptor.get(), std::as_writable_bytes(std::span(bytes, size)));
-  if (count < 0) {
-    return state.fail("cannot be read: " + systemText(errno));
-  }
-  if (count == 0) return state.checkEnd();
-  state.position += static_cast<std::uint64_t>(count);
-  if (state.position > state.file.size) return state.checkEnd();
-  state.digest.add(std::as_bytes(std::span(bytes, static_cast<std::size_t>(count))));
-  return count;
+BackupFileReader::BackupFileReader(const BackupFile& file) : file_(file) {
+  std::uint64_t size = 0;
+  BackupProblem unusable;
+  descriptor_ = openBackupFile(file.path, size, unusable);
+  problem_ = unusable.text;
+  if (descriptor_ && size != file.size) fail("is shorter or longer than the manifest tells");
 }
 
-std::uint64_t BackupFileReader::position() const { return state_->position; }
+std::int64_t BackupFileReader::fail(const std::string& reason) {
+  problem_ = fmt::format("{} {}", file_.path.filename().string(), reason);
+  return -1;
+}
 
-const std::string& BackupFileReader::problem() const { return state_->problem; }
+std::int64_t BackupFileReader::checkEnd() {
+  if (position_ != file_.size) return fail("is shorter or longer than the manifest tells");
+  if (!ended_ && digest_.finish() != file_.digest) return fail("does not match its digest");
+  ended_ = true;
+  return 0;
+}
+
+std::int64_t BackupFileReader::read(std::uint8_t* bytes, std::size_t size) {
+  if (!problem_.empty()) return -1;
+  if (size == 0 || ended_) return 0;
+  const std::span target = std::as_writable_bytes(std::span(bytes, size));
+  const std::int64_t count = readSome(descriptor_.get(), target);
+  if (count < 0) return fail("cannot be read: " + systemText(errno));
+  if (count == 0) return checkEnd();
+  position_ += static_cast<std::uint64_t>(count);
+  if (position_ > file_.size) return checkEnd();
+  digest_.add(target.first(static_cast<std::size_t>(count)));
+  return count;
+}
 
 }  // namespace appsync::host
