@@ -2,7 +2,6 @@
 
 #include <filesystem>
 #include <memory>
-#include <string>
 #include <string_view>
 
 #include "base/file_descriptor.h"

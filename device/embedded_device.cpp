@@ -23,7 +23,6 @@
 #include "device/recovery.h"
 #include "device/services/backup_manager.h"
 #include "device/services/system_notifier.h"
-#include "device/state/application_rows.h"
 #include "device/state/background_queue.h"
 #include "device/state/device_policy.h"
 #include "icons/icon_renderer.h"

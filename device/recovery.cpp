@@ -4,7 +4,6 @@
 
 #include <set>
 
-#include "device/apps/installs.h"
 #include "device/apps/removal.h"
 #include "device/state/application_rows.h"
 #include "platform/existence.h"

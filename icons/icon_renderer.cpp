@@ -1,7 +1,6 @@
 #include "icons/icon_renderer.h"
 
 #include <algorithm>
-#include <array>
 #include <cmath>
 
 #include "icons/icon_decoder.h"

@@ -1,6 +1,4 @@
 #include <algorithm>
-#include <array>
-#include <charconv>
 #include <cstdint>
 #include <vector>
 

@@ -1,8 +1,6 @@
 #pragma once
 
 #include <memory>
-#include <optional>
-#include <string>
 #include <string_view>
 
 #include "device/state/database.h"

@@ -6,7 +6,6 @@
 #include <chrono>
 #include <thread>
 
-#include "base/text.h"
 #include "host/phone/phone_state.h"
 
 namespace appsync::host {
@@ -18,10 +17,6 @@ constexpr int FlattenedIconState = 1;
 
 std::string nameOf(const AppRecord& record) {
   return record.displayName.empty() ? record.applicationIdentifier : record.displayName;
-}
-
-std::string reasonOf(const std::optional<Error>& error) {
-  return error ? oneLine(error->localizedDescription()) : "unknown reason";
 }
 
 }  // namespace
@@ -51,7 +46,7 @@ bool BackupRun::saveAll(const BackupOptions& options) {
   std::optional<Error> error;
   waitUntilIdle(applicationsToSave(phone_, &error));
   const std::vector<AppRecord> applications = applicationsToSave(phone_, &error);
-  if (error) return broken("the applications cannot be told: " + reasonOf(error));
+  if (error) return broken(withReason("the applications cannot be told", error));
   count_ = applications.size();
   for (const AppRecord& record : applications) {
     if (!save(record)) return false;
@@ -110,7 +105,7 @@ std::optional<std::string> BackupRun::saveData(const AppRecord& record) {
     writer_.dropData();
   }
   if (whole) return std::nullopt;
-  return "its data cannot be saved: " + reasonOf(error);
+  return withReason("its data cannot be saved", error);
 }
 
 void BackupRun::noteUnlisted() {
@@ -144,7 +139,7 @@ bool BackupRun::saveLists() {
   std::optional<Error> error;
   auto demotions = demotionsAmong(phone_.files, saved_, &error);
   if (!demotions)
-    return broken("the list of demoted applications cannot be read: " + reasonOf(error));
+    return broken(withReason("the list of demoted applications cannot be read", error));
   // Binary, since it is mostly icons.
   return addList(BackupApplicationsFile, std::move(entries_), PropertyListFormat::Binary) &&
          addList(BackupDemotionsFile, std::move(*demotions), PropertyListFormat::Xml) &&
@@ -155,7 +150,7 @@ bool BackupRun::addList(std::string_view name, const PropertyList& list,
                         PropertyListFormat format) {
   std::optional<Error> error;
   const auto bytes = serializePropertyList(list, format, &error);
-  if (!bytes) return broken(fmt::format("{} cannot be made: {}", name, reasonOf(error)));
+  if (!bytes) return broken(withReason(fmt::format("{} cannot be made", name), error));
   return writer_.addFile(name, *bytes) || broken(writer_.problem());
 }
 

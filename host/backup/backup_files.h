@@ -3,7 +3,6 @@
 #include <cstdint>
 #include <filesystem>
 #include <optional>
-#include <string>
 
 #include "base/file_descriptor.h"
 #include "host/backup/backup_folder.h"

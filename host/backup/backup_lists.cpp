@@ -102,8 +102,7 @@ std::optional<PropertyList::Dictionary> restoreEntry(const Phone& phone, const A
                                                      std::string& problem) {
   std::optional<Error> error;
   const auto refuse = [&](std::string_view what) {
-    problem = fmt::format("its {} cannot be read: {}", what,
-                          error ? error->localizedDescription() : "unknown reason");
+    problem = withReason(fmt::format("its {} cannot be read", what), error);
     return std::nullopt;
   };
   auto metadata = metadataOf(phone.files, record, &error);

@@ -2,7 +2,6 @@
 
 #include <functional>
 #include <memory>
-#include <string>
 
 #include "base/interruption.h"
 #include "device/embedded_device.h"

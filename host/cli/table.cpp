@@ -2,7 +2,6 @@
 
 #include <algorithm>
 
-#include "base/text.h"
 #include "host/report/columns.h"
 
 namespace appsync::host {

@@ -1,7 +1,6 @@
 #include "host/home_screen/home_screen_picture.h"
 
 #include <algorithm>
-#include <cmath>
 #include <memory>
 #include <numbers>
 #include <stdexcept>

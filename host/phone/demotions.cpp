@@ -1,8 +1,6 @@
 #include "host/phone/demotions.h"
 
-#include "base/text.h"
 #include "host/phone/phone_state.h"
-#include "platform/bundle.h"
 #include "platform/sync_files.h"
 
 namespace appsync::host {
@@ -11,8 +9,7 @@ Demotions::Demotions(FileManager& files) {
   std::optional<Error> error;
   const auto lists = readDictionary(files, exchange::DemotedApplications, &error);
   if (error) {
-    problem_ = "the phone's list of demoted applications could not be looked at: " +
-               oneLine(error->localizedDescription());
+    problem_ = withReason("the phone's list of demoted applications could not be looked at", error);
   }
   for (const std::string_view key :
        {exchange::AutomaticDowngradesKey, exchange::IntentionalDowngradesKey}) {

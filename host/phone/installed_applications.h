@@ -5,7 +5,7 @@
 #include <vector>
 
 #include "host/library/sync_plan.h"
-#include "host/phone/phone_state.h"
+#include "phone/phone.h"
 
 namespace appsync::host {
 

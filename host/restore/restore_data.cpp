@@ -1,6 +1,5 @@
 #include "host/restore/restore_data.h"
 
-#include "base/text.h"
 #include "host/backup/digest.h"
 
 namespace appsync::host {
@@ -45,10 +44,6 @@ class ReportedData {
   std::uint64_t reported_ = 0;
 };
 
-std::string cause(const std::optional<Error>& error) {
-  return error ? oneLine(error->localizedDescription()) : "no reason is known";
-}
-
 using Taker = decltype(&ApplicationData::restoreData);
 
 std::optional<std::string> giveData(const Phone& phone, Taker taker, const BackedUpApplication& app,
@@ -62,7 +57,7 @@ std::optional<std::string> giveData(const Phone& phone, Taker taker, const Backe
   if ((phone.data.*taker)(app.identifier, source, &error)) return std::nullopt;
   if (!data.problem().empty()) return "its data in the backup is damaged: " + data.problem();
   if (interruption.requested()) return InterruptedReason;
-  return "its data could not be given back: " + cause(error);
+  return withReason("its data could not be given back", error);
 }
 
 /// What an earlier restore left waiting belongs to another backup.
@@ -70,7 +65,7 @@ std::optional<std::string> clear(const Phone& phone, const std::string& identifi
   const auto nothing = [](std::uint8_t*, std::size_t) { return std::int64_t{0}; };
   std::optional<Error> error;
   if (phone.data.restoreData(identifier, nothing, &error)) return std::nullopt;
-  return "older data that waits for it could not be removed: " + cause(error);
+  return withReason("older data that waits for it could not be removed", error);
 }
 
 }  // namespace

@@ -1,9 +1,6 @@
 #include "host/restore/restore_handover.h"
 
-#include <cerrno>
-
 #include "base/identifiers.h"
-#include "base/text.h"
 #include "host/restore/restore_data.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
@@ -168,8 +165,8 @@ class HandoverInProgress {
     const int status =
         phone_.homeScreen.setIconState(phone_.homeScreen.serverPort(), backup_.iconLayout);
     if (status == 0) return;
-    result_.layoutRefused = "the home screen does not take its layout: " +
-                            oneLine(Error::posix(status).localizedDescription());
+    result_.layoutRefused =
+        withReason("the home screen does not take its layout", Error::posix(status));
   }
 
   bool write(std::string_view path, const Bytes& bytes, std::optional<Error>* error) {

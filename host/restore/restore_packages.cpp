@@ -1,7 +1,6 @@
 // Packages of restored applications that the host itself brings.
 #include <cerrno>
 
-#include "base/text.h"
 #include "host/phone/demotions.h"
 #include "host/restore/restore.h"
 #include "host/transfer/shipments.h"
@@ -37,8 +36,7 @@ class Remembered {
 
  private:
   void note(const Error& error) {
-    problem_ = "what the phone remembers of it could not be looked at: " +
-               oneLine(error.localizedDescription());
+    problem_ = withReason("what the phone remembers of it could not be looked at", error);
   }
 
   FileManager& files_;

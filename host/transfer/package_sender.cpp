@@ -2,8 +2,6 @@
 
 #include <cerrno>
 
-#include "base/text.h"
-
 namespace appsync::host {
 namespace {
 
@@ -44,8 +42,7 @@ void PackageSender::sendChunk(const SyncAssetPtr& asset) {
   const PackageTransfer::Step step = sending.transfer.sendChunk(phone_, &error);
   if (step == PackageTransfer::Step::Failed) {
     const Error cause = error.value_or(Error::posix(EIO));
-    return finish(asset,
-                  Failure{cause, "could not be sent: " + oneLine(cause.localizedDescription())});
+    return finish(asset, Failure{cause, withReason("could not be sent", cause)});
   }
   if (sending.transfer.progressed()) reportProgress(sending);
   if (step == PackageTransfer::Step::Done) finish(asset, std::nullopt);

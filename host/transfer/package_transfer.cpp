@@ -8,8 +8,7 @@
 namespace appsync::host {
 
 bool PackageTransfer::fail(int errnoValue, std::optional<Error>* error) const {
-  setError(error, Error::posix(errnoValue, source_.string()));
-  return false;
+  return failWith(error, Error::posix(errnoValue, source_.string()));
 }
 
 bool PackageTransfer::open(const Phone& phone, std::optional<Error>* error) {
@@ -35,9 +34,9 @@ PackageTransfer::Step PackageTransfer::sendChunk(const Phone& phone, std::option
   }
   if (ok && sent_ < total_ && count > 0) return Step::More;
   if (ok && sent_ != total_) {
-    setError(error, Error::withDescription(POSIXErrorDomain, ESTALE,
-                                           source_.string() + " changed while it was being sent"));
-    ok = false;
+    ok = failWith(error,
+                  Error::withDescription(POSIXErrorDomain, ESTALE,
+                                         source_.string() + " changed while it was being sent"));
   }
   ok = ok && receiver_->finish(error);
   receiver_.reset();

@@ -7,7 +7,7 @@
 #include <string>
 
 #include "base/file_descriptor.h"
-#include "host/phone/phone_state.h"
+#include "phone/phone.h"
 
 namespace appsync::host {
 
