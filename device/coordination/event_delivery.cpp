@@ -2,6 +2,8 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <future>
+#include <utility>
 
 namespace appsync::device {
 namespace {
@@ -14,29 +16,40 @@ constexpr std::chrono::milliseconds RetryDelay{200};
 void EventDelivery::start(Coordinators coordinators) {
   const Lock lock(mutex_);
   coordinators_ = std::move(coordinators);
-  thread_ = std::thread([this] { run(); });
-  threadId_ = thread_.get_id();
+  checkDue_ = false;
+  checkAfter({});  // what was kept from before
 }
 
 void EventDelivery::stop() {
+  if (queue_.isStopped()) return;
   {
     const Lock lock(mutex_);
     stopping_ = true;
-    changed_.notifyAll();
   }
-  if (thread_.joinable()) thread_.join();
+  std::promise<void> ran;
+  queue_.after({}, [&ran] { ran.set_value(); });
+  ran.get_future().wait();
+  queue_.stop();
 }
 
 void EventDelivery::check() {
   const Lock lock(mutex_);
-  checkDue_ = true;
-  changed_.notifyAll();
+  checkAfter({});
+}
+
+void EventDelivery::checkAfter(std::chrono::milliseconds delay) {
+  if (!std::exchange(checkDue_, true)) queue_.after(delay, [this] { deliverAll(); });
 }
 
 void EventDelivery::post(std::function<void()> task) {
   const Lock lock(mutex_);
-  tasks_.push_back(std::move(task));
-  changed_.notifyAll();
+  ++tasks_;
+  queue_.after({}, [this, task = std::move(task)]() mutable {
+    task();
+    task = nullptr;  // what it holds goes before it has ended
+    const Lock ended(mutex_);
+    --tasks_;
+  });
 }
 
 void EventDelivery::setObserver(std::int64_t coordinator, CoordinatorObserver* observer) {
@@ -50,8 +63,7 @@ void EventDelivery::setObserver(std::int64_t coordinator, CoordinatorObserver* o
   } else {
     observers_.erase(coordinator);
   }
-  checkDue_ = true;
-  changed_.notifyAll();
+  checkAfter({});
   if (replaced && replaced != observer) waitUntilReturned(replaced);
 }
 
@@ -59,8 +71,7 @@ void EventDelivery::removeObserver(const CoordinatorObserver* observer) {
   const Lock lock(mutex_);
   std::erase_if(observers_, [&](const auto& item) { return item.second == observer; });
   // A listener may be there for what the observer would have had.
-  checkDue_ = true;
-  changed_.notifyAll();
+  checkAfter({});
   waitUntilReturned(observer);
 }
 
@@ -68,8 +79,7 @@ std::uint64_t EventDelivery::addListener(std::set<CoordinationClientId> clients,
                                          CoordinatorObserver& delegate) {
   const Lock lock(mutex_);
   listeners_.emplace(++lastListener_, Listener{std::move(clients), &delegate});
-  checkDue_ = true;
-  changed_.notifyAll();
+  checkAfter({});
   return lastListener_;
 }
 
@@ -85,7 +95,7 @@ void EventDelivery::removeListener(std::uint64_t listener) {
 bool EventDelivery::isBusy(std::string_view identifier) {
   const auto events = pending();
   const Lock lock(mutex_);
-  if (!tasks_.empty() || runsTask_) return true;
+  if (tasks_ > 0) return true;
   return events &&
          std::ranges::any_of(*events, [&](const EventRow& event) APPSYNC_REQUIRES(mutex_) {
            return event.coordinator.identifier == identifier && receiver(event.coordinator);
@@ -102,46 +112,21 @@ CoordinatorObserver* EventDelivery::receiver(const CoordinatorRow& coordinator) 
 }
 
 void EventDelivery::waitUntilReturned(const CoordinatorObserver* observer) {
-  if (std::this_thread::get_id() == threadId_) return;
+  if (std::this_thread::get_id() == deliverer_) return;
   while (delivering_ == observer) returned_.wait(mutex_);
 }
 
-void EventDelivery::run() {
-  bool readable = true;
-  const Lock lock(mutex_);
-  while (true) {
-    if (!tasks_.empty()) {
-      std::function<void()> task = std::move(tasks_.front());
-      tasks_.pop_front();
-      perform(std::move(task));
-    } else if (stopping_) {
-      return;
-    } else if (checkDue_) {
-      checkDue_ = false;
-      const Unlock unlocked(mutex_);
-      readable = deliverAll();
-    } else if (!readable) {
-      changed_.waitUntil(mutex_, std::chrono::steady_clock::now() + RetryDelay);
-      checkDue_ = true;
-    } else {
-      changed_.wait(mutex_);
-    }
-  }
-}
-
-void EventDelivery::perform(std::function<void()> task) {
-  runsTask_ = true;
+void EventDelivery::deliverAll() {
   {
-    const Unlock unlocked(mutex_);
-    task();
-    task = nullptr;  // what it holds goes outside the lock too
+    const Lock lock(mutex_);
+    checkDue_ = false;
   }
-  runsTask_ = false;
-}
-
-bool EventDelivery::deliverAll() {
   const auto events = pending();
-  if (!events) return false;
+  if (!events) {
+    const Lock lock(mutex_);
+    checkAfter(RetryDelay);
+    return;
+  }
   std::set<std::int64_t> passedOver;  // so that a coordinator's events stay in their order
   for (const EventRow& event : *events) {
     const std::int64_t coordinator = event.coordinator.number;
@@ -151,7 +136,6 @@ bool EventDelivery::deliverAll() {
       passedOver.insert(coordinator);
     }
   }
-  return true;
 }
 
 std::optional<std::vector<EventRow>> EventDelivery::pending() {
@@ -171,6 +155,7 @@ bool EventDelivery::deliver(const EventRow& event) {
   CoordinatorObserver* const observer = stopping_ ? nullptr : receiver(event.coordinator);
   if (!observer) return false;
   delivering_ = observer;
+  deliverer_ = std::this_thread::get_id();
   {
     const Unlock unlocked(mutex_);
     send(event, *observer);

@@ -1,15 +1,14 @@
 #pragma once
 
-#include <deque>
 #include <functional>
 #include <map>
 #include <memory>
 #include <optional>
 #include <set>
-#include <thread>
 #include <vector>
 
 #include "device/coordination/coordination_rows.h"
+#include "device/state/background_queue.h"
 #include "platform/mutex.h"
 
 namespace appsync::device {
@@ -54,9 +53,8 @@ class EventDelivery {
     CoordinatorObserver* delegate;
   };
 
-  void run();
-  /// False when the events could not be read.
-  bool deliverAll();
+  void checkAfter(std::chrono::milliseconds delay) APPSYNC_REQUIRES(mutex_);
+  void deliverAll();
   bool deliver(const EventRow& event);
   void send(const EventRow& event, CoordinatorObserver& observer);
   void remove(const EventRow& event);
@@ -64,26 +62,23 @@ class EventDelivery {
   std::optional<std::vector<EventRow>> pending();
   CoordinatorObserver* receiver(const CoordinatorRow& coordinator) const APPSYNC_REQUIRES(mutex_);
   void waitUntilReturned(const CoordinatorObserver* observer) APPSYNC_REQUIRES(mutex_);
-  void perform(std::function<void()> task) APPSYNC_REQUIRES(mutex_);
 
   Database& database_;
-  Coordinators coordinators_;  ///< set before the thread begins
+  Coordinators coordinators_;  ///< set before there is anything to deliver
   Mutex mutex_;
-  Condition changed_;
   Condition returned_;
   std::map<std::int64_t, CoordinatorObserver*> observers_ APPSYNC_GUARDED_BY(mutex_);
   std::map<std::uint64_t, Listener> listeners_ APPSYNC_GUARDED_BY(mutex_);
   std::uint64_t lastListener_ APPSYNC_GUARDED_BY(mutex_) = 0;
-  std::deque<std::function<void()>> tasks_ APPSYNC_GUARDED_BY(mutex_);
-  bool runsTask_ APPSYNC_GUARDED_BY(mutex_) = false;
+  std::size_t tasks_ APPSYNC_GUARDED_BY(mutex_) = 0;  ///< that have not ended
   const CoordinatorObserver* delivering_ APPSYNC_GUARDED_BY(mutex_) = nullptr;
+  std::thread::id deliverer_ APPSYNC_GUARDED_BY(mutex_);
   /// Events that could not be taken out of the store.
   std::set<std::int64_t> delivered_ APPSYNC_GUARDED_BY(mutex_);
-  bool checkDue_ APPSYNC_GUARDED_BY(mutex_) = true;  // what was kept from before
+  bool checkDue_ APPSYNC_GUARDED_BY(mutex_) = true;  ///< before the start none is needed
   bool stopping_ APPSYNC_GUARDED_BY(mutex_) = false;
 
-  std::thread thread_;
-  std::thread::id threadId_ APPSYNC_GUARDED_BY(mutex_);  ///< stays when the thread has ended
+  ThreadBackgroundQueue queue_;
 };
 
 }  // namespace appsync::device
