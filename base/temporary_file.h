@@ -3,6 +3,7 @@
 #include <string>
 #include <string_view>
 
+#include "base/durability.h"
 #include "base/file_descriptor.h"
 
 namespace appsync {
@@ -10,11 +11,6 @@ namespace appsync {
 /// A name that nothing in any directory has by chance.
 std::string makeTemporaryName();
 bool isTemporaryName(std::string_view name) noexcept;
-
-enum class Durability {
-  Cached,  ///< a crash of the machine may lose it
-  Durable  ///< on disk before the call returns
-};
 
 /// A file being written under a temporary name; it takes its place in one step, or disappears with
 /// the object.

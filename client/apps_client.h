@@ -5,6 +5,7 @@
 #include <memory>
 #include <optional>
 #include <set>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -14,6 +15,7 @@
 #include "client/todo_file.h"
 #include "platform/mutex.h"
 #include "platform/platform.h"
+#include "platform/shared_work.h"
 #include "platform/sync_client.h"
 
 namespace appsync {
@@ -193,9 +195,17 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   std::optional<PropertyList::Array> _listIn(const Bytes& bytes) const;
   /// The list, as _loadPlist gives it; a file that is there but cannot be read is said in the log.
   std::optional<PropertyList::Array> _loadListOrSay(std::string_view path) const;
-  /// changeAssetID for a list of any form.
-  void _changeParsed(const Bytes& list, std::string_view identifier, std::string_view toDo)
-      APPSYNC_REQUIRES(_stateFileMutex);
+  struct TodoChange {
+    std::string_view identifier;
+    std::string_view toDo;
+  };
+  /// Makes changes that came together, each as if it were alone, with as few writes as can be.
+  void _changeTodoList(std::span<TodoChange* const> changes) APPSYNC_EXCLUDES(_stateFileMutex);
+  /// Makes a change in `_todoFile`, which is read first unless it is `unsaved`. True when it holds
+  /// something unsaved then.
+  bool _changeTodoFile(const TodoChange& change, bool unsaved) APPSYNC_REQUIRES(_stateFileMutex);
+  /// Makes and writes a change of a list of any form.
+  void _changeParsed(const Bytes& list, const TodoChange& change) APPSYNC_REQUIRES(_stateFileMutex);
   void _performDeletions(const PropertyList::Array& todoList);
   void _sendIconLayout();
   SyncAssetPtr _prepareAsset(const TransferCandidate& candidate);
@@ -255,6 +265,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   mutable Mutex _stateFileMutex;
   /// The todo list as last read or changed here.
   mutable TodoFile _todoFile APPSYNC_GUARDED_BY(_stateFileMutex);
+  SharedWork<TodoChange> _todoChanges{
+      [this](std::span<TodoChange* const> changes) { _changeTodoList(changes); }};
 };
 
 }  // namespace appsync

@@ -81,22 +81,39 @@ std::optional<PropertyList::Array> AppsClient::_loadListOrSay(std::string_view p
 }
 
 void AppsClient::changeAssetID(std::string_view identifier, std::string_view toDo) {
-  const Lock lock(_stateFileMutex);
-  std::optional<Bytes> bytes = _bytesOrSay(paths::TodoList);
-  if (!bytes) return;
-  if (!_todoFile.take(*bytes)) return _changeParsed(*bytes, identifier, toDo);
-
-  const std::optional<std::string_view> operation = _todoFile.operationOf(identifier);
-  if (!operation) return;
-  const PropertyList from(*operation);
-  if (!_todoFile.setOperation(identifier, toDo))
-    return _changeParsed(_todoFile.bytes(), identifier, toDo);
-  sayChange(_log, identifier, from, toDo);
-  _platform.files.writeAtomically(paths::TodoList, _todoFile.bytes());
+  TodoChange change{identifier, toDo};
+  _todoChanges.serve(change);
 }
 
-void AppsClient::_changeParsed(const Bytes& list, std::string_view identifier,
-                               std::string_view toDo) {
+void AppsClient::_changeTodoList(std::span<TodoChange* const> changes) {
+  const Lock lock(_stateFileMutex);
+  bool unsaved = false;
+  for (const TodoChange* const change : changes) unsaved = _changeTodoFile(*change, unsaved);
+  if (unsaved) _platform.files.writeAtomically(paths::TodoList, _todoFile.bytes());
+}
+
+bool AppsClient::_changeTodoFile(const TodoChange& change, bool unsaved) {
+  if (!unsaved) {
+    std::optional<Bytes> bytes = _bytesOrSay(paths::TodoList);
+    if (!bytes) return false;
+    if (!_todoFile.take(*bytes)) {
+      _changeParsed(*bytes, change);
+      return false;
+    }
+  }
+  const std::optional<std::string_view> operation = _todoFile.operationOf(change.identifier);
+  if (!operation) return unsaved;
+  const PropertyList from(*operation);
+  if (!_todoFile.setOperation(change.identifier, change.toDo)) {
+    _changeParsed(_todoFile.bytes(), change);
+    return false;
+  }
+  sayChange(_log, change.identifier, from, change.toDo);
+  return true;
+}
+
+void AppsClient::_changeParsed(const Bytes& list, const TodoChange& change) {
+  const auto& [identifier, toDo] = change;
   std::optional<PropertyList::Array> entries = _listIn(list);
   if (!entries) return;
   const auto entry = entryOf(*entries, identifier);

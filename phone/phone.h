@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "base/data_stream.h"
+#include "base/durability.h"
 #include "platform/platform.h"
 
 // What a host needs of a phone beside the client that runs on it. Whatever stands behind it, a
@@ -24,7 +25,7 @@ class FileReceiver {
   virtual ~FileReceiver() = default;
   virtual bool append(ByteView bytes, std::optional<Error>* error) noexcept = 0;
   /// The file is whole. False when it could not be completed.
-  virtual bool finish(std::optional<Error>* error) noexcept = 0;
+  virtual bool finish(Durability durability, std::optional<Error>* error) noexcept = 0;
 };
 
 /// Told of things that a person watching the phone would see, on the threads that bring them about

@@ -88,10 +88,18 @@ std::optional<std::vector<std::string>> Containers::list(std::optional<Error>* e
 }
 
 bool Containers::flush(std::optional<Error>* error) {
-  const FileDescriptor directory = handles_.openDirectory(ApplicationsDirectory, error);
-  if (!directory) return false;
-  return syncFileSystem(directory.get()) ||
-         failWith(error, Error::posix(errno, ApplicationsDirectory));
+  Flush failure;
+  flushes_.serve(failure);
+  return !failure || failWith(error, *std::move(failure));
+}
+
+Containers::Flush Containers::flushNow() {
+  Flush failure;
+  const FileDescriptor directory = handles_.openDirectory(ApplicationsDirectory, &failure);
+  if (directory && !syncFileSystem(directory.get())) {
+    failure = Error::posix(errno, ApplicationsDirectory);
+  }
+  return failure;
 }
 
 std::optional<bool> Containers::dataWaits(std::string_view identifier,

@@ -8,6 +8,7 @@
 
 #include "device/files/file_manager.h"
 #include "platform/log.h"
+#include "platform/shared_work.h"
 
 namespace appsync::device {
 
@@ -32,7 +33,7 @@ class Containers {
   /// nullopt (with a reason) when they cannot be looked at.
   std::optional<std::vector<std::string>> list(std::optional<Error>* error);
 
-  /// Puts all of the phone's files on disk.
+  /// Puts all of the phone's files on disk; installs that end together share it.
   bool flush(std::optional<Error>* error);
 
   /// Whether a restore left data that is still to be given back to the application; nullopt (with
@@ -61,11 +62,18 @@ class Containers {
                                                   std::optional<Error>* error);
 
  private:
+  using Flush = std::optional<Error>;  ///< why it failed
+
   bool removeIfThere(const std::string& path);
+  Flush flushNow();
 
   FileManager& files_;
   ConfinedFileManager& handles_;
   Log& log_;
+  SharedWork<Flush> flushes_{[this](std::span<Flush* const> flushes) {
+    const Flush done = flushNow();
+    for (Flush* const flush : flushes) *flush = done;
+  }};
 };
 
 }  // namespace appsync::device

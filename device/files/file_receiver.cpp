@@ -23,9 +23,9 @@ class ReceivedFile final : public FileReceiver {
     return report(error);
   }
 
-  bool finish(std::optional<Error>* error) noexcept override {
+  bool finish(Durability durability, std::optional<Error>* error) noexcept override {
     const std::string name = path_.substr(path_.rfind('/') + 1);
-    if (broken_ == 0 && !file_.takePlaceOf(name, Durability::Durable)) broken_ = errno;
+    if (broken_ == 0 && !file_.takePlaceOf(name, durability)) broken_ = errno;
     if (!report(error)) return false;
     broken_ = EBADF;  // whatever comes after the end
     return true;

@@ -14,6 +14,11 @@ class ClientDelivery final : public PackageDelivery {
   ClientDelivery(SyncClient& client, const SyncAssetPtr& asset, const std::string& name)
       : client_(client), asset_(asset), name_(name) {}
 
+  // The package of a sync that is broken off is sent once more; a restore's may wait for its data.
+  Durability durability() const override {
+    return asset_->isRestore ? Durability::Durable : Durability::Cached;
+  }
+
   void progressed(double fraction) override {
     asset_->downloadProgress = fraction;
     client_.assetTransferUpdatedProgress(asset_, fraction);
@@ -43,6 +48,8 @@ class CoordinatedDelivery final : public PackageDelivery {
         identifier_(identifier),
         coordinator_(std::move(coordinator)),
         client_(client) {}
+
+  Durability durability() const override { return Durability::Durable; }
 
   void progressed(double fraction) override {
     if (const auto package = promise()) package->setPercentComplete(fraction);
@@ -95,6 +102,9 @@ class RegistryDelivery final : public PackageDelivery {
         origin_(origin),
         identifier_(placeholder.applicationIdentifier),
         progress_(phone.apps.installProgress(placeholder, InstallPhase::Loading)) {}
+
+  // It is installed as soon as it has arrived.
+  Durability durability() const override { return Durability::Cached; }
 
   void progressed(double fraction) override {
     if (!progress_) return;

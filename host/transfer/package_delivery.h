@@ -14,6 +14,9 @@ class PackageDelivery {
  public:
   virtual ~PackageDelivery() = default;
 
+  /// What the package must survive on the phone once it has arrived: all, where the phone may
+  /// install it after this process has ended.
+  virtual Durability durability() const = 0;
   /// A fraction of the package has been sent.
   virtual void progressed(double fraction) = 0;
   /// The package will not come now.

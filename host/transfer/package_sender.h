@@ -58,7 +58,7 @@ class PackageSender {
     explicit Sending(Shipment what)
         : shipment(std::move(what)),
           transfer(shipment.package ? shipment.package->file : std::filesystem::path(),
-                   shipment.target) {}
+                   shipment.target, shipment.delivery->durability()) {}
 
     Shipment shipment;
     PackageTransfer transfer;

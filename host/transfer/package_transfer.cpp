@@ -38,7 +38,7 @@ PackageTransfer::Step PackageTransfer::sendChunk(const Phone& phone, std::option
                   Error::withDescription(POSIXErrorDomain, ESTALE,
                                          source_.string() + " changed while it was being sent"));
   }
-  ok = ok && receiver_->finish(error);
+  ok = ok && receiver_->finish(durability_, error);
   receiver_.reset();
   return ok ? Step::Done : Step::Failed;
 }

@@ -20,8 +20,8 @@ class PackageTransfer {
   enum class Step { More, Done, Failed };
 
   /// Touches nothing before the first step.
-  PackageTransfer(std::filesystem::path source, std::string target)
-      : source_(std::move(source)), target_(std::move(target)) {}
+  PackageTransfer(std::filesystem::path source, std::string target, Durability durability)
+      : source_(std::move(source)), target_(std::move(target)), durability_(durability) {}
 
   /// Sends the next chunk. After Failed (with an error) nothing of the package stays on the phone.
   Step sendChunk(const Phone& phone, std::optional<Error>* error);
@@ -37,6 +37,7 @@ class PackageTransfer {
 
   const std::filesystem::path source_;
   const std::string target_;
+  const Durability durability_;
   FileDescriptor file_;
   std::unique_ptr<FileReceiver> receiver_;
   Bytes chunk_;

@@ -130,7 +130,7 @@ TEST_F(DeviceServicesTest, AReceivedFileArrivesInsideThePhone) {
   ASSERT_TRUE(receiver) << error->localizedDescription();
   ASSERT_TRUE(receiver->append(asBytes("one "), &error));
   ASSERT_TRUE(receiver->append(asBytes("two"), &error));
-  ASSERT_TRUE(receiver->finish(&error));
+  ASSERT_TRUE(receiver->finish(Durability::Cached, &error));
   EXPECT_EQ(textAt("/var/mobile/Media/new/a.pkg"), "one two");
   std::filesystem::create_directory_symlink(temporary.path(), onDisk("/tmp/out"));
   receiver = device->receiveFile("/tmp/out/a.pkg", &error);

@@ -25,7 +25,7 @@ TEST_F(FileReceiverTest, FileAppearsWholeWhenItIsFinished) {
   EXPECT_TRUE(receiver->append({}, nullptr));
   EXPECT_TRUE(receiver->append(asBytes("two"), nullptr));
   EXPECT_FALSE(files_.fileExists("/staging/deep/package"));
-  EXPECT_TRUE(receiver->finish(nullptr));
+  EXPECT_TRUE(receiver->finish(Durability::Cached, nullptr));
   EXPECT_EQ(fakes::snapshot(folder_ / "root/staging/deep"),
             (std::map<std::string, std::string>{{"package", "file 0644 one two"}}));
 }
@@ -44,15 +44,15 @@ TEST_F(FileReceiverTest, ReplacesAnOlderFile) {
   fakes::putFile(folder_ / "root/package", "old");
   const auto receiver = receiveInto(files_, "/package", &error_);
   EXPECT_TRUE(receiver->append(asBytes("new"), nullptr));
-  EXPECT_TRUE(receiver->finish(nullptr));
+  EXPECT_TRUE(receiver->finish(Durability::Cached, nullptr));
   EXPECT_EQ(fakes::fileText(folder_ / "root/package"), "new");
 }
 
 TEST_F(FileReceiverTest, NothingComesAfterTheEnd) {
   const auto receiver = receiveInto(files_, "/package", &error_);
-  EXPECT_TRUE(receiver->finish(nullptr));
+  EXPECT_TRUE(receiver->finish(Durability::Cached, nullptr));
   EXPECT_FALSE(receiver->append(asBytes("late"), &error_));
-  EXPECT_FALSE(receiver->finish(&error_));
+  EXPECT_FALSE(receiver->finish(Durability::Cached, &error_));
   EXPECT_EQ(error_->code, EBADF);
   EXPECT_EQ(fakes::fileText(folder_ / "root/package"), "");
 }
@@ -77,7 +77,7 @@ TEST_F(FileReceiverTest, OutlivesTheFileManager) {
   const auto receiver = receiveInto(*files, "/package", &error_);
   files.reset();
   EXPECT_TRUE(receiver->append(asBytes("x"), nullptr));
-  EXPECT_TRUE(receiver->finish(nullptr));
+  EXPECT_TRUE(receiver->finish(Durability::Cached, nullptr));
 }
 
 }  // namespace

@@ -23,9 +23,11 @@ class FakeReceiver final : public FileReceiver {
     return true;
   }
 
-  bool finish(std::optional<Error>* error) noexcept override {
+  bool finish(Durability durability, std::optional<Error>* error) noexcept override {
     if (services_.faults.strikes("phone.finish", path_, error)) return false;
-    services_.trace.add(fakes::TraceFile, fmt::format("phone.received({})", path_));
+    services_.trace.add(fakes::TraceFile,
+                        fmt::format("phone.received({}{})", path_,
+                                    durability == Durability::Durable ? ", durable" : ""));
     services_.files.putFile(path_, received_);
     return true;
   }

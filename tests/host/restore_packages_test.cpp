@@ -21,6 +21,7 @@ TEST_F(RestorePackagesTest, PackageWithoutWaitingDataIsInstalledAtOnce) {
   EXPECT_EQ(restore(), "installed: com.a");
   EXPECT_THAT(trace("client.restoreParts"),
               ElementsAre("client.restoreParts(com.a, 1.0, asked 3, came 1)"));
+  EXPECT_THAT(trace("phone.received"), ElementsAre("phone.received(STAGING/com.a.tar, durable)"));
 }
 
 TEST_F(RestorePackagesTest, DataPartsFollowWhenAllPackagesAreThere) {

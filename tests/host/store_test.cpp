@@ -70,7 +70,7 @@ TEST_F(StoreTest, KeepsThePromiseOfACoordinatorsPackage) {
                   "InstallCoordinator.setAppAssetPromise(com.a, com.a-Asset)",
                   "DataPromise.setPercentComplete(com.a-Asset, 0.3339856490541422)",
                   "DataPromise.setPercentComplete(com.a-Asset, 0.6679712981082844)",
-                  "phone.received(/var/mobile/Media/Downloads/com.a.tar)",
+                  "phone.received(/var/mobile/Media/Downloads/com.a.tar, durable)",
                   "DataPromise.setPercentComplete(com.a-Asset, 1)",
                   "DataPromise.setTransferPath(com.a-Asset, /var/mobile/Media/Downloads/com.a.tar)",
                   "DataPromise.setComplete(com.a-Asset, true)"));
@@ -225,7 +225,7 @@ TEST_F(StoreTest, StopsAPackageThatIsCancelledOnThePhone) {
   EXPECT_THAT(deliver(), ElementsAre(Pair("com.a", "cancelled on the phone")));
   EXPECT_THAT(installed(), ElementsAre("com.b"));
   EXPECT_THAT(trace("phone.received"),
-              ElementsAre("phone.received(/var/mobile/Media/Downloads/com.b.tar)"));
+              ElementsAre("phone.received(/var/mobile/Media/Downloads/com.b.tar, durable)"));
 }
 
 TEST_F(StoreTest, InterruptionStopsWhatIsSentAndLetsWhatArrivedSettle) {
