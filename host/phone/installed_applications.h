@@ -5,7 +5,7 @@
 #include <vector>
 
 #include "host/library/sync_plan.h"
-#include "phone/phone.h"
+#include "host/phone/phone_state.h"
 
 namespace appsync::host {
 

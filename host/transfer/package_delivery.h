@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "phone/phone.h"
+#include "host/phone/phone_state.h"
 #include "platform/sync_client.h"
 
 namespace appsync::host {

@@ -7,7 +7,7 @@
 #include <string>
 
 #include "base/file_descriptor.h"
-#include "phone/phone.h"
+#include "host/phone/phone_state.h"
 
 namespace appsync::host {
 
