@@ -71,7 +71,7 @@ bool groundIsFree(const DevicePaths& paths, DeviceError& error) {
   if (isEmpty(paths) || fs::exists(paths.unfinished)) return true;
   const bool device = fs::exists(paths.database);
   error = deviceError(DeviceProblem::Exists, paths.folder,
-                      device ? "there is a device already" : "the folder is not empty",
+                      device ? "there is a phone already" : "the folder is not empty",
                       device ? "use it, or choose another folder" : "choose a new or empty one");
   return false;
 }
@@ -127,14 +127,14 @@ DeviceError deviceError(DeviceProblem problem, const fs::path& folder, std::stri
 }
 
 DeviceError foreignFolder(const fs::path& folder) {
-  return deviceError(DeviceProblem::Foreign, folder, "the folder holds something that is no device",
-                     "choose the folder of a device, or make one with 'appsync init'");
+  return deviceError(DeviceProblem::Foreign, folder, "the folder holds something that is no phone",
+                     "choose the folder of a phone, or make one with 'appsync init'");
 }
 
 DeviceError damagedDevice(const fs::path& folder, std::string_view damage) {
   return deviceError(DeviceProblem::Damaged, folder,
-                     fmt::format("the device is damaged ({})", damage),
-                     "restore the folder from a copy, or make a new device elsewhere");
+                     fmt::format("the phone is damaged ({})", damage),
+                     "restore the folder from a copy, or make a new phone elsewhere");
 }
 
 std::unique_ptr<WriteLock> WriteLock::take(const DevicePaths& paths, DeviceError& error) {
@@ -146,7 +146,7 @@ std::unique_ptr<WriteLock> WriteLock::take(const DevicePaths& paths, DeviceError
   if (flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
     error = errno == EWOULDBLOCK
                 ? deviceError(DeviceProblem::Busy, paths.folder,
-                              fmt::format("the device is in use by {}", holder(file.get())),
+                              fmt::format("the phone is in use by {}", holder(file.get())),
                               "try again when that has ended")
                 : unusable(paths.folder, lastError());
     return nullptr;
@@ -186,13 +186,13 @@ bool makeDeviceFolder(const DevicePaths& paths, const DeviceOptions& options, De
 bool checkDeviceFolder(const DevicePaths& paths, DeviceError& error) {
   try {
     if (!fs::exists(paths.folder)) {
-      error = missing(paths.folder, "there is no device");
+      error = missing(paths.folder, "there is no phone");
     } else if (!fs::is_directory(paths.folder)) {
       error = foreignFolder(paths.folder);
     } else if (isEmpty(paths)) {
       error = missing(paths.folder, "the folder is empty");
     } else if (fs::exists(paths.unfinished)) {
-      error = missing(paths.folder, "the device was not made to its end");
+      error = missing(paths.folder, "the phone was not made to its end");
     } else if (!fs::exists(paths.database)) {
       error = fs::is_directory(paths.root) ? damagedDevice(paths.folder, "its database is missing")
                                            : foreignFolder(paths.folder);

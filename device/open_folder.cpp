@@ -10,7 +10,7 @@ namespace {
 bool readOptions(OpenFolder& opened, DeviceError& error) {
   std::optional<Error> reason;
   const bool read = opened.database->read(
-      "the device's options could not be read",
+      "the phone's options could not be read",
       [&](SQLite::Database& connection) {
         Query query(connection, "SELECT value FROM settings WHERE key = 'coordination'");
         opened.options.coordination = query.next() && query.boolean(0);

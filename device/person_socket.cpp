@@ -216,7 +216,7 @@ WishOutcome askWriter(const DevicePaths& paths, PersonWish wish, std::string_vie
     return WishOutcome::Refused;
   }
   setError(error, Error::withDescription(POSIXErrorDomain, EPROTO,
-                                         "the process that writes the device does not answer"));
+                                         "the process that writes the phone does not answer"));
   return WishOutcome::Failed;
 }
 

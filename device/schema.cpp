@@ -123,7 +123,7 @@ std::string damage(SQLite::Database& database, Log& log) {
   const std::string found = database.execAndGet("PRAGMA quick_check(1)").getString();
   if (found != "ok") {
     log.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
-              fmt::format("the device's database is damaged: {}", found));
+              fmt::format("the phone's database is damaged: {}", found));
     return "its database is not whole";
   }
   const auto tables = database.execAndGet(
@@ -144,7 +144,7 @@ bool isCurrentDevice(SQLite::Database& database, const std::filesystem::path& fo
   const std::int64_t version = pragma(database, "user_version");
   if (version > FormatVersion) {
     error = deviceError(DeviceProblem::Foreign, folder,
-                        fmt::format("the device is of format {}, newer than the {} known here",
+                        fmt::format("the phone is of format {}, newer than the {} known here",
                                     version, FormatVersion),
                         "use the version of appsync that made it");
     return false;
@@ -204,7 +204,7 @@ std::unique_ptr<Database> openDatabase(const std::filesystem::path& folder,
     return std::make_unique<Database>(std::move(connection), access == Access::Write, log);
   } catch (const SQLite::Exception& exception) {
     log.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
-              fmt::format("the device's database cannot be opened: {}", exception.what()));
+              fmt::format("the phone's database cannot be opened: {}", exception.what()));
     error = problemOf(exception, folder);
     return nullptr;
   }

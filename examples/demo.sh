@@ -1,7 +1,7 @@
 #!/usr/bin/env bash
-# Takes the sample library through three desktop syncs of a new device, and checks what comes out.
-# Then a second device, which installs through coordinators, goes through the same. At the end both
-# come back from a backup on new devices.
+# Takes the sample library through three desktop syncs of a new phone, and checks what comes out.
+# Then a second phone, which installs through coordinators, goes through the same. At the end both
+# come back from a backup on new phones.
 #
 # usage: examples/demo.sh APPSYNC [FOLDER]      FOLDER: where it works, build/demo by default
 set -euo pipefail
@@ -24,7 +24,7 @@ run() { # EXPECTED_EXIT ARGUMENT...
   ((status == expected)) || fail "\"appsync $*\" gave exit code $status, not $expected"
 }
 
-# The applications of a device, a line "name version" each, in order.
+# The applications of a phone, a line "name version" each, in order.
 apps_of() { # DEVICE
   "$program" --device "$1" --json apps | python3 -c '
 import json, sys
@@ -42,7 +42,7 @@ expect_apps() { # "NAME VERSION"...
     fail "these applications were expected (<) and found (>):"$'\n'"$(cat difference)"
 }
 
-# Runs the installed Tally of a device with its own data there, and insists that it has counted.
+# Runs the installed Tally of a phone with its own data there, and insists that it has counted.
 run_tally() { # DEVICE ARGUMENT...
   local device=$1 path
   shift
@@ -55,7 +55,7 @@ print(next(a["path"] for a in map(json.loads, sys.stdin) if a["identifier"] == "
   grep -q '3  |||' output.txt || fail "Tally does not count"
 }
 
-# A person demotes an application; the device is backed up and comes back as another one, to which
+# A person demotes an application; the phone is backed up and comes back as another one, to which
 # the store brings the packages.
 come_back() { # DEVICE INIT_OPTION...
   local device=$1
@@ -71,12 +71,12 @@ come_back() { # DEVICE INIT_OPTION...
   run 0 restore "backup-$device" --store library/third
   apps_of "$APPSYNC_DEVICE" >after.txt
   paste before.txt after.txt | expand -t 36
-  cmp before.txt after.txt || fail "the restored device holds other applications"
+  cmp before.txt after.txt || fail "the restored phone holds other applications"
   run_tally "restored-$device"
 
   run 0 --quiet backup "backup-of-restored-$device"
   diff -r "backup-$device" "backup-of-restored-$device" ||
-    fail "a backup of the restored device is another one"
+    fail "a backup of the restored phone is another one"
   run 0 tap org.example.meridian
   run 0 --quiet restore "backup-$device" --store library/third
   apps_of "$APPSYNC_DEVICE" | grep -x "meridian 1.6" >/dev/null ||
@@ -87,7 +87,7 @@ title "The sample library: 12 applications, packed by appsync, zip, 7-Zip, Pytho
 "$root/examples/build-library" "$program" library
 ls -sh1 library/first
 
-title "A new device"
+title "A new phone"
 rm -rf phone
 run 0 init
 
@@ -128,7 +128,7 @@ run 0 history
 "$program" history | grep -q "removed 1.0 *org.example.lantern *by sync" ||
   fail "the history does not tell that Lantern was removed"
 
-title "The same on a second device, which installs through coordinators"
+title "The same on a second phone, which installs through coordinators"
 rm -rf coordinated
 export APPSYNC_DEVICE=$PWD/coordinated
 run 0 init --coordination on
@@ -136,22 +136,22 @@ run 1 --quiet sync library/first
 run 0 --quiet sync library/second --remove org.example.lantern
 run 0 --quiet uninstall org.example.jot
 run 0 --quiet sync library/third
-"$program" status | grep "coordination *on" >/dev/null || fail "the second device does not coordinate"
+"$program" status | grep "coordination *on" >/dev/null || fail "the second phone does not coordinate"
 
-title "Both devices side by side: without coordinators, and with them"
+title "Both phones side by side: without coordinators, and with them"
 apps_of phone >without.txt
 apps_of coordinated >with.txt
 paste without.txt with.txt | expand -t 24
-cmp without.txt with.txt || fail "the two devices hold different applications"
+cmp without.txt with.txt || fail "the two phones hold different applications"
 
-title "A backup of the first device, and a new device that comes back from it"
+title "A backup of the first phone, and a new phone that comes back from it"
 come_back phone
 
 title "The same where installs are coordinated"
 run_tally coordinated add "desktop sync" 3
 come_back coordinated --coordination on
 
-title "The home screen of the restored device"
+title "The home screen of the restored phone"
 run 0 --device restored-coordinated home-screen -o home-screen.png
 
-printf '\nAll is as it should be. The devices are in %s\n' "$PWD"
+printf '\nAll is as it should be. The phones are in %s\n' "$PWD"

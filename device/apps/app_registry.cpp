@@ -104,7 +104,7 @@ bool DeviceAppRegistry::changeApplication(
   try {
     if (!core_.database.writable()) {
       return failWith(error, Error::withDescription(POSIXErrorDomain, EROFS,
-                                                    "the device is open for reading only"));
+                                                    "the phone is open for reading only"));
     }
     if (!isUsableIdentifier(bundleId)) {
       return failWith(error,

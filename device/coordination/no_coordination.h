@@ -58,7 +58,7 @@ class NoCoordination final : public InstallCoordination {
 
   static Error switchedOff() {
     return Error::withDescription(POSIXErrorDomain, ENOTSUP,
-                                  "install coordination is switched off on this device");
+                                  "install coordination is switched off on this phone");
   }
 
   BackgroundQueue& queue_;

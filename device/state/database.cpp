@@ -80,7 +80,7 @@ bool Database::attempt(std::string_view purpose, const std::function<void()>& wo
     cause = exception.what();
   }
   log_.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
-             fmt::format("{} (the device's database: {})", purpose, cause));
+             fmt::format("{} (the phone's database: {})", purpose, cause));
   return failWith(error, std::move(reason));
 }
 

@@ -206,7 +206,7 @@ class HomeScreen(support.Case):
         self.assertIn("--output is required", message(code=2))
         self.assertIn("--page", message("-o", self.picture, "--page", "0", code=2))
         self.environment["APPSYNC_DEVICE"] = str(self.folder / "nowhere")
-        self.assertIn("there is no device", message("-o", self.picture, code=3))
+        self.assertIn("there is no phone", message("-o", self.picture, code=3))
         self.assertFalse(self.picture.exists())
 
 

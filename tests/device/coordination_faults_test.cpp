@@ -131,7 +131,7 @@ class CoordinationFaultsTest : public CoordinationTest,
   /// What was told in both lives of the device.
   void expectWhole(EventRecorder& before) {
     reopen();
-    EXPECT_TRUE(logMentions("the device's database: not authorized")) << "the log says what failed";
+    EXPECT_TRUE(logMentions("the phone's database: not authorized")) << "the log says what failed";
     EventRecorder after;
     const auto listener =
         service().createEventListener("com.corvane.test", {SyncHostClientID}, after);

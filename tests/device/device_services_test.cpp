@@ -109,7 +109,7 @@ TEST_F(DeviceServicesTest, ADatabaseThatFailsGivesTheDocumentedFailureAndALogLin
   EXPECT_EQ(containerCount(), 1U) << "nothing is removed on the word of a broken registry";
   EXPECT_GE(logTexts().size(), 8U);
   EXPECT_EQ(logTexts().front(),
-            "the policies could not be read (the device's database: no such table: policies)");
+            "the policies could not be read (the phone's database: no such table: policies)");
 }
 
 TEST_F(DeviceServicesTest, APhoneThatDoesNotTellHowItWorksIsNotOpened) {
