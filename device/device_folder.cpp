@@ -40,11 +40,6 @@ std::string onOneLine(std::string text) {
   return text;
 }
 
-DeviceError unusable(const fs::path& folder, const std::error_code& failure) {
-  return deviceError(DeviceProblem::Unusable, folder, failure.message(),
-                     "check the permissions of the folder and the free space");
-}
-
 DeviceError missing(const fs::path& folder, std::string_view reason) {
   return deviceError(DeviceProblem::Missing, folder, reason, "make one with 'appsync init'");
 }
@@ -106,7 +101,7 @@ void build(const DevicePaths& paths, const DeviceOptions& options) {
 
 bool mark(const DevicePaths& paths, DeviceError& error) {
   const FileDescriptor marker(open(paths.unfinished.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644));
-  if (!marker) error = unusable(paths.folder, lastError());
+  if (!marker) error = unusableFolder(paths.folder, lastError().message());
   return static_cast<bool>(marker);
 }
 
@@ -126,6 +121,11 @@ DeviceError deviceError(DeviceProblem problem, const fs::path& folder, std::stri
   return {problem, onOneLine(fmt::format("{}: {}; {}", folder.native(), reason, remedy))};
 }
 
+DeviceError unusableFolder(const fs::path& folder, std::string_view reason) {
+  return deviceError(DeviceProblem::Unusable, folder, reason,
+                     "check the permissions of the folder and the free space");
+}
+
 DeviceError foreignFolder(const fs::path& folder) {
   return deviceError(DeviceProblem::Foreign, folder, "the folder holds something that is no phone",
                      "choose the folder of a phone, or make one with 'appsync init'");
@@ -140,7 +140,7 @@ DeviceError damagedDevice(const fs::path& folder, std::string_view damage) {
 std::unique_ptr<WriteLock> WriteLock::take(const DevicePaths& paths, DeviceError& error) {
   FileDescriptor file(open(paths.lock.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644));
   if (!file) {
-    error = unusable(paths.folder, lastError());
+    error = unusableFolder(paths.folder, lastError().message());
     return nullptr;
   }
   if (flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
@@ -148,12 +148,12 @@ std::unique_ptr<WriteLock> WriteLock::take(const DevicePaths& paths, DeviceError
                 ? deviceError(DeviceProblem::Busy, paths.folder,
                               fmt::format("the phone is in use by {}", holder(file.get())),
                               "try again when that has ended")
-                : unusable(paths.folder, lastError());
+                : unusableFolder(paths.folder, lastError().message());
     return nullptr;
   }
   if (ftruncate(file.get(), 0) != 0 ||
       !writeAll(file.get(), asBytes(fmt::format("{}\n", getpid())))) {
-    error = unusable(paths.folder, lastError());
+    error = unusableFolder(paths.folder, lastError().message());
     return nullptr;
   }
   return std::unique_ptr<WriteLock>(new WriteLock(std::move(file)));
@@ -175,10 +175,9 @@ bool makeDeviceFolder(const DevicePaths& paths, const DeviceOptions& options, De
     build(paths, options);
     return true;
   } catch (const fs::filesystem_error& failure) {
-    error = unusable(paths.folder, failure.code());
+    error = unusableFolder(paths.folder, failure.code().message());
   } catch (const std::exception& failure) {
-    error = deviceError(DeviceProblem::Unusable, paths.folder, failure.what(),
-                        "check the permissions of the folder and the free space");
+    error = unusableFolder(paths.folder, failure.what());
   }
   return false;
 }
@@ -200,7 +199,7 @@ bool checkDeviceFolder(const DevicePaths& paths, DeviceError& error) {
       return true;
     }
   } catch (const fs::filesystem_error& failure) {
-    error = unusable(paths.folder, failure.code());
+    error = unusableFolder(paths.folder, failure.code().message());
   }
   return false;
 }

@@ -25,6 +25,7 @@ struct DevicePaths {
 /// "folder: reason; remedy", on one line whatever the folder's name holds.
 DeviceError deviceError(DeviceProblem problem, const std::filesystem::path& folder,
                         std::string_view reason, std::string_view remedy);
+DeviceError unusableFolder(const std::filesystem::path& folder, std::string_view reason);
 DeviceError foreignFolder(const std::filesystem::path& folder);
 DeviceError damagedDevice(const std::filesystem::path& folder, std::string_view damage);
 

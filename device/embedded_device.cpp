@@ -8,10 +8,13 @@
 #include "base/identifiers.h"
 #include "device/apps/app_registry.h"
 #include "device/apps/application_data.h"
+#include "device/apps/demotion.h"
 #include "device/apps/idle_application.h"
 #include "device/apps/installer_service.h"
 #include "device/apps/installs.h"
 #include "device/apps/launching.h"
+#include "device/apps/person_wishes.h"
+#include "device/apps/removal.h"
 #include "device/coordination/install_coordination_service.h"
 #include "device/coordination/no_coordination.h"
 #include "device/files/file_receiver.h"
@@ -133,18 +136,18 @@ class FolderDevice final : public EmbeddedDevice {
     return busy;
   }
 
-  std::vector<std::string> packagesOwedBy(CoordinationClientId client) noexcept override {
-    return coordination_ ? coordination_->packagesOwedBy(client) : std::vector<std::string>{};
+  std::set<std::string> packagesOwedBy(CoordinationClientId client) noexcept override {
+    return coordination_ ? coordination_->packagesOwedBy(client) : std::set<std::string>{};
   }
 
   bool uninstall(std::string_view bundleId, std::optional<Error>* error) noexcept override {
-    const bool removed = registry_.removeApplication(bundleId, error);
+    const bool removed = registry_.change(bundleId, removeForPerson, error);
     if (removed && coordination_) coordination_->cancelInstall(bundleId);
     return removed;
   }
 
   bool demote(std::string_view bundleId, std::optional<Error>* error) noexcept override {
-    return registry_.demote(bundleId, error);
+    return registry_.change(bundleId, demoteForPerson, error);
   }
 
   bool setPolicy(PolicySetting setting, PolicyValue value,
@@ -155,7 +158,11 @@ class FolderDevice final : public EmbeddedDevice {
   bool addSystemApplication(std::string_view bundleId, std::string_view displayName,
                             std::string_view version,
                             std::optional<Error>* error) noexcept override {
-    return registry_.addSystemApplication(bundleId, displayName, version, error);
+    const auto install = [&](DeviceCore& core, const std::string& id, std::optional<Error>* why) {
+      return installSystemApplication(core, id, std::string(displayName), std::string(version),
+                                      why);
+    };
+    return registry_.change(bundleId, install, error);
   }
 
   std::optional<Bytes> opaqueBlob(std::string_view bundleId,
@@ -226,7 +233,7 @@ class FolderDevice final : public EmbeddedDevice {
     const bool isHeard = coordination_ && coordination_->tap(bundleId);
     std::optional<Error> error;
     const bool isAsked =
-        (!isHeard || registry_.isDemoted(bundleId)) && registry_.askFor(bundleId, &error);
+        (!isHeard || registry_.isDemoted(bundleId)) && registry_.change(bundleId, askFor, &error);
     if (error) return error;
     if (isHeard || isAsked) return std::nullopt;
     return registry_.isBeingInstalled(bundleId)
@@ -238,13 +245,14 @@ class FolderDevice final : public EmbeddedDevice {
   /// What only waits for its restore goes like an application that is uninstalled.
   std::optional<Error> cancel(std::string_view bundleId) {
     std::optional<Error> error;
-    if (!registry_.mayCancel(bundleId, &error)) return error;
+    const auto effect = effectOfCancelling(core_, std::string(bundleId), &error);
+    if (!effect || (effect == Cancelling::Forgetting && !mayRemove(core_, &error))) return error;
     if (coordination_ && coordination_->cancelInstall(bundleId)) {
-      registry_.undoAsking(bundleId);
-      registry_.forgetWaitingData(bundleId);
+      registry_.change(bundleId, undoAsking, nullptr);
+      registry_.change(bundleId, forgetWaitingData, nullptr);
       return std::nullopt;
     }
-    if (registry_.cancelWish(bundleId, &error)) return std::nullopt;
+    if (registry_.change(bundleId, cancelWish, &error)) return std::nullopt;
     if (error) return error;
     const bool isLive =
         coordination_ && coordination_->coordinatorFor(CoordinatorKind::Any, bundleId,
@@ -283,11 +291,6 @@ class FolderDevice final : public EmbeddedDevice {
   std::unique_ptr<PersonSocket> personSocket_;
 };
 
-DeviceError unusable(const std::filesystem::path& folder, std::string_view reason) {
-  return deviceError(DeviceProblem::Unusable, folder, reason,
-                     "check the permissions of the folder and the free space");
-}
-
 /// Does work that may throw. What it throws is a problem of the folder.
 template <typename Work>
 std::invoke_result_t<Work> guarded(const std::filesystem::path& folder, DeviceError& error,
@@ -295,7 +298,7 @@ std::invoke_result_t<Work> guarded(const std::filesystem::path& folder, DeviceEr
   try {
     return work();
   } catch (const std::exception& failure) {
-    error = unusable(folder, failure.what());
+    error = unusableFolder(folder, failure.what());
     return {};
   }
 }
@@ -306,7 +309,7 @@ std::unique_ptr<FolderDevice> openDevice(const std::filesystem::path& folder, Ac
   if (!opened) return nullptr;
   auto device = std::make_unique<FolderDevice>(std::move(*opened));
   if (device->isUsable()) return device;
-  error = unusable(folder, "its files cannot be opened");
+  error = unusableFolder(folder, "its files cannot be opened");
   return nullptr;
 }
 

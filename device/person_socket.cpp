@@ -9,13 +9,13 @@
 #include <sys/un.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <string>
 #include <system_error>
 
 #include "base/identifiers.h"
+#include "base/text.h"
 
 namespace appsync::device {
 namespace {
@@ -104,12 +104,6 @@ std::optional<std::string> readRequest(int connection, int end) {
 
 std::string_view wordFor(PersonWish wish) { return wish == PersonWish::Tap ? "tap" : "cancel"; }
 
-std::string oneLine(std::string text) {
-  std::replace(text.begin(), text.end(), '\n', ' ');
-  if (text.size() > LongestAnswer / 2) text.resize(LongestAnswer / 2);
-  return text;
-}
-
 std::string answerTo(const std::optional<std::string>& request, const PersonAction& action) {
   if (!request) return "error the request is no line, is too long or took too long";
   const std::size_t space = request->find(' ');
@@ -120,7 +114,9 @@ std::string answerTo(const std::optional<std::string>& request, const PersonActi
     if (word != wordFor(wish)) continue;
     if (!isUsableIdentifier(bundleId)) return "error no application can have this identifier";
     const std::optional<Error> refusal = action(wish, bundleId);
-    return refusal ? std::string(ErrorWord) + oneLine(refusal->localizedDescription()) : "ok";
+    return refusal ? std::string(ErrorWord) +
+                         oneLine(refusal->localizedDescription()).substr(0, LongestAnswer / 2)
+                   : "ok";
   }
   return "error the request is neither to tap nor to cancel";
 }

@@ -173,8 +173,7 @@ DeviceError problemOf(const SQLite::Exception& exception, const std::filesystem:
     case SQLITE_CORRUPT:
       return damagedDevice(folder, "its database cannot be read");
     default:
-      return deviceError(DeviceProblem::Unusable, folder, errorOf(exception).localizedDescription(),
-                         "check the permissions of the folder and the free space");
+      return unusableFolder(folder, errorOf(exception).localizedDescription());
   }
 }
 

@@ -112,8 +112,8 @@ class PhoneActivity {
   virtual std::set<std::string> busyAmong(const std::set<std::string>& bundleIds) noexcept = 0;
 
   /// The applications whose coordinators named this client to bring the package, and still wait for
-  /// it; sorted.
-  virtual std::vector<std::string> packagesOwedBy(CoordinationClientId client) noexcept = 0;
+  /// it.
+  virtual std::set<std::string> packagesOwedBy(CoordinationClientId client) noexcept = 0;
 };
 
 /// A phone as a host sees it. All outlive its users.

@@ -5,9 +5,7 @@
 #include <cerrno>
 
 #include "base/identifiers.h"
-#include "device/apps/demotion.h"
 #include "device/apps/installs.h"
-#include "device/apps/person_wishes.h"
 #include "device/apps/removal.h"
 #include "device/state/application_rows.h"
 #include "platform/bundle.h"
@@ -97,10 +95,8 @@ void DeviceAppRegistry::enumerateBundles(BundleKind kind, const Visitor& visitor
   }
 }
 
-bool DeviceAppRegistry::changeApplication(
-    std::string_view bundleId,
-    const std::function<bool(const std::string&, std::optional<Error>*)>& change,
-    std::optional<Error>* error) noexcept {
+bool DeviceAppRegistry::change(std::string_view bundleId, const Change& change,
+                               std::optional<Error>* error) noexcept {
   try {
     if (!core_.database.writable()) {
       return failWith(error, Error::withDescription(POSIXErrorDomain, EROFS,
@@ -113,7 +109,7 @@ bool DeviceAppRegistry::changeApplication(
     }
     const std::string identifier(bundleId);
     const KeyedMutex::Guard guard(core_.applicationLocks, identifier);
-    return change(identifier, error);
+    return change(core_, identifier, error);
   } catch (const std::exception& failure) {
     return failWith(error, Error::withDescription(POSIXErrorDomain, EIO, failure.what()));
   }
@@ -132,10 +128,10 @@ bool DeviceAppRegistry::installApplication(const FileLocation& package,
     return failWith(error, invalid("a placeholder is installed from its directory"));
   }
   if (placeholder) {
-    const auto install = [&](const std::string& id, std::optional<Error>* reason) {
-      return installPlaceholder(core_, package.path, id, placeholderDetails(options), reason);
+    const auto install = [&](DeviceCore& core, const std::string& id, std::optional<Error>* why) {
+      return installPlaceholder(core, package.path, id, placeholderDetails(options), why);
     };
-    return changeApplication(*identifier, install, error);
+    return change(*identifier, install, error);
   }
   InstallDetails details;
   details.origin = originOf(options);
@@ -147,11 +143,11 @@ bool DeviceAppRegistry::installPackageWith(const FileLocation& package,
                                            const InstallDetails& details,
                                            std::optional<Error>* error) noexcept {
   std::optional<Error> reason;
-  const auto install = [&](const std::string& id, std::optional<Error>* why) {
-    if (!package.isDirectory) return installPackage(core_, package.path, id, details, why);
+  const auto install = [&](DeviceCore& core, const std::string& id, std::optional<Error>* why) {
+    if (!package.isDirectory) return installPackage(core, package.path, id, details, why);
     return failWith(why, invalid("a package is installed from a file"));
   };
-  const bool installed = changeApplication(identifier, install, &reason);
+  const bool installed = change(identifier, install, &reason);
   core_.watcher.installFinished(identifier, reason);
   if (reason) setError(error, std::move(*reason));
   return installed;
@@ -160,75 +156,19 @@ bool DeviceAppRegistry::installPackageWith(const FileLocation& package,
 bool DeviceAppRegistry::buildPlaceholder(const std::string& identifier, const PlaceholderFace& face,
                                          const InstallDetails& details,
                                          std::optional<Error>* error) noexcept {
-  const auto build = [&](const std::string& id, std::optional<Error>* reason) {
-    return device::buildPlaceholder(core_, id, face, details, reason);
+  const auto build = [&](DeviceCore& core, const std::string& id, std::optional<Error>* why) {
+    return device::buildPlaceholder(core, id, face, details, why);
   };
-  return changeApplication(identifier, build, error);
+  return change(identifier, build, error);
 }
 
 bool DeviceAppRegistry::uninstallApplication(std::string_view bundleId,
                                              const PropertyList::Dictionary& options) noexcept {
   const bool placeholderOnly = findFlag(options, UninstallPlaceholdersOnlyKey);
-  const auto remove = [&](const std::string& identifier, std::optional<Error>* error) {
-    return removeForClient(core_, identifier, placeholderOnly, error);
+  const auto remove = [&](DeviceCore& core, const std::string& id, std::optional<Error>* error) {
+    return removeForClient(core, id, placeholderOnly, error);
   };
-  return changeApplication(bundleId, remove, nullptr);
-}
-
-bool DeviceAppRegistry::removeApplication(std::string_view bundleId,
-                                          std::optional<Error>* error) noexcept {
-  const auto remove = [&](const std::string& identifier, std::optional<Error>* reason) {
-    return mayRemove(core_, reason) && removeForPerson(core_, identifier, reason);
-  };
-  return changeApplication(bundleId, remove, error);
-}
-
-bool DeviceAppRegistry::demote(std::string_view bundleId, std::optional<Error>* error) noexcept {
-  const auto demote = [&](const std::string& identifier, std::optional<Error>* reason) {
-    return mayRemove(core_, reason) && demoteForPerson(core_, identifier, reason);
-  };
-  return changeApplication(bundleId, demote, error);
-}
-
-bool DeviceAppRegistry::askFor(std::string_view bundleId, std::optional<Error>* error) noexcept {
-  return changeApplication(bundleId, std::bind_front(device::askFor, std::ref(core_)), error);
-}
-
-bool DeviceAppRegistry::mayCancel(std::string_view bundleId, std::optional<Error>* error) noexcept {
-  const auto effect = effectOfCancelling(core_, std::string(bundleId), error);
-  return effect && (*effect != Cancelling::Forbidden || mayRemove(core_, error));
-}
-
-bool DeviceAppRegistry::cancelWish(std::string_view bundleId,
-                                   std::optional<Error>* error) noexcept {
-  const auto cancel = [&](const std::string& identifier, std::optional<Error>* why) {
-    const auto effect = effectOfCancelling(core_, identifier, why);
-    switch (effect.value_or(Cancelling::Nothing)) {
-      case Cancelling::Nothing:
-        return false;
-      case Cancelling::Undoing:
-        return device::undoAsking(core_, identifier, why);
-      case Cancelling::Forbidden:
-        mayRemove(core_, why);
-        return false;
-      case Cancelling::Forgetting:
-        return removeForPerson(core_, identifier, why);
-    }
-    return false;
-  };
-  return changeApplication(bundleId, cancel, error);
-}
-
-void DeviceAppRegistry::undoAsking(std::string_view bundleId) noexcept {
-  changeApplication(bundleId, std::bind_front(device::undoAsking, std::ref(core_)), nullptr);
-}
-
-void DeviceAppRegistry::forgetWaitingData(std::string_view bundleId) noexcept {
-  const auto forget = [&](const std::string& identifier, std::optional<Error>* error) {
-    const auto rows = readApplication(core_.database, identifier, error);
-    return rows && !rows->any() && core_.containers.removeWaitingData(identifier);
-  };
-  changeApplication(bundleId, forget, nullptr);
+  return change(bundleId, remove, nullptr);
 }
 
 bool DeviceAppRegistry::isDemoted(std::string_view bundleId) noexcept {
@@ -243,16 +183,6 @@ bool DeviceAppRegistry::isBeingInstalled(std::string_view bundleId) noexcept {
   const InstallState state = progress->installState();
   return state == InstallState::Active ||
          (state == InstallState::Waiting && placeholder->installType == InstallType::Sync);
-}
-
-bool DeviceAppRegistry::addSystemApplication(std::string_view bundleId,
-                                             std::string_view displayName, std::string_view version,
-                                             std::optional<Error>* error) noexcept {
-  const auto install = [&](const std::string& identifier, std::optional<Error>* reason) {
-    return installSystemApplication(core_, identifier, std::string(displayName),
-                                    std::string(version), reason);
-  };
-  return changeApplication(bundleId, install, error);
 }
 
 std::shared_ptr<InstallProgress> DeviceAppRegistry::installProgress(const AppRecord& record,

@@ -35,32 +35,17 @@ class DeviceAppRegistry final : public AppRegistry {
   bool buildPlaceholder(const std::string& identifier, const PlaceholderFace& face,
                         const InstallDetails& details, std::optional<Error>* error) noexcept;
 
-  /// What a person does: the application goes with its placeholder and data.
-  bool removeApplication(std::string_view bundleId, std::optional<Error>* error) noexcept;
-  /// What a person does: only the application's placeholder and data stay.
-  bool demote(std::string_view bundleId, std::optional<Error>* error) noexcept;
-  /// What a person does: a demoted or restored application is to come. Its placeholder becomes that
-  /// of a download from the store. False when there is no such placeholder, and with an error when
-  /// that is not known or cannot be written.
-  bool askFor(std::string_view bundleId, std::optional<Error>* error) noexcept;
-  /// What a person does: an application is not to come after all. One that was asked for is as it
-  /// was before; one that only waits to be restored goes with what the restore had for it. False
-  /// when neither can be, and with an error when it is forbidden, not known or cannot be written.
-  bool cancelWish(std::string_view bundleId, std::optional<Error>* error) noexcept;
-  /// False with an error when cancelling would take away what the policy forbids to remove, or that
-  /// is not known.
-  bool mayCancel(std::string_view bundleId, std::optional<Error>* error) noexcept;
-  /// Of an application that was asked for: its placeholder is what it was before.
-  void undoAsking(std::string_view bundleId) noexcept;
-  /// Removes what a restore had for an application of which the registry knows nothing any more.
-  void forgetWaitingData(std::string_view bundleId) noexcept;
+  using Change = std::function<bool(DeviceCore& core, const std::string& identifier,
+                                    std::optional<Error>* error)>;
+  /// Runs a change of one application, alone on it. False with an error for an identifier that
+  /// cannot be used, a device opened for reading, or a change that failed.
+  bool change(std::string_view bundleId, const Change& change,
+              std::optional<Error>* error) noexcept;
+
   /// Whether only the placeholder and the data are left of it until somebody asks for it.
   bool isDemoted(std::string_view bundleId) noexcept;
   /// Whether an install is under way; not while a placeholder only waits for somebody to begin one.
   bool isBeingInstalled(std::string_view bundleId) noexcept;
-  /// Registers an application that comes with the system.
-  bool addSystemApplication(std::string_view bundleId, std::string_view displayName,
-                            std::string_view version, std::optional<Error>* error) noexcept;
   /// Every record, the placeholder after the installed version of the same identifier. None, with
   /// an error, when they cannot be read.
   std::vector<AppRecord> records(std::optional<Error>* error = nullptr) noexcept;
@@ -69,13 +54,6 @@ class DeviceAppRegistry final : public AppRegistry {
   std::optional<Bytes> opaqueBlob(std::string_view bundleId, std::optional<Error>* error) noexcept;
 
  private:
-  /// Runs a change of one application, alone on it. False with an error for an identifier that
-  /// cannot be used, a device opened for reading, or a change that failed.
-  bool changeApplication(
-      std::string_view bundleId,
-      const std::function<bool(const std::string& identifier, std::optional<Error>* error)>& change,
-      std::optional<Error>* error) noexcept;
-
   DeviceCore& core_;
 };
 

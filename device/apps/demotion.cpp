@@ -6,6 +6,7 @@
 
 #include "device/apps/idle_application.h"
 #include "device/apps/installers.h"
+#include "device/apps/removal.h"
 #include "device/journal/history.h"
 #include "platform/bundle.h"
 #include "platform/existence.h"
@@ -52,6 +53,7 @@ bool takePackage(DeviceCore& core, const ApplicationRow& installed, std::optiona
 }  // namespace
 
 bool demoteForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error) {
+  if (!mayRemove(core, error)) return false;
   const std::optional<IdleApplication> idle = holdIdle(core, identifier, error);
   if (!idle) return false;
   if (idle->row.type == ApplicationTypeSystem) {

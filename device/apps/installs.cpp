@@ -24,32 +24,21 @@ class RowProgress final : public InstallProgress {
         identifier_(std::move(identifier)) {}
 
   InstallState installState() const noexcept override {
-    return static_cast<InstallState>(read("SELECT state FROM installs WHERE number = ?"));
+    return static_cast<InstallState>(read("state"));
   }
   void setInstallState(InstallState state) noexcept override {
-    if (changeState(state)) observers_.installsChanged();
+    if (write("state", static_cast<std::int64_t>(state))) observers_.installsChanged();
   }
   InstallPhase installPhase() const noexcept override {
-    return static_cast<InstallPhase>(read("SELECT phase FROM installs WHERE number = ?"));
+    return static_cast<InstallPhase>(read("phase"));
   }
   void setInstallPhase(InstallPhase phase) noexcept override {
-    if (write("UPDATE installs SET phase = ?1 WHERE number = ?2 AND NOT over AND phase <> ?1",
-              static_cast<std::int64_t>(phase))) {
-      observers_.installsChanged();
-    }
+    if (write("phase", static_cast<std::int64_t>(phase))) observers_.installsChanged();
   }
-  std::int64_t totalUnitCount() const noexcept override {
-    return read("SELECT total FROM installs WHERE number = ?");
-  }
-  void setTotalUnitCount(std::int64_t count) noexcept override {
-    write("UPDATE installs SET total = ?1 WHERE number = ?2 AND NOT over", count);
-  }
-  std::int64_t completedUnitCount() const noexcept override {
-    return read("SELECT completed FROM installs WHERE number = ?");
-  }
-  void setCompletedUnitCount(std::int64_t count) noexcept override {
-    write("UPDATE installs SET completed = ?1 WHERE number = ?2 AND NOT over", count);
-  }
+  std::int64_t totalUnitCount() const noexcept override { return read("total"); }
+  void setTotalUnitCount(std::int64_t count) noexcept override { write("total", count); }
+  std::int64_t completedUnitCount() const noexcept override { return read("completed"); }
+  void setCompletedUnitCount(std::int64_t count) noexcept override { write("completed", count); }
   void cancel() noexcept override;
 
   std::string description() const override {
@@ -59,24 +48,22 @@ class RowProgress final : public InstallProgress {
   }
 
  private:
-  bool changeState(InstallState state) noexcept {
-    return write("UPDATE installs SET state = ?1 WHERE number = ?2 AND NOT over AND state <> ?1",
-                 static_cast<std::int64_t>(state));
-  }
-
-  std::int64_t read(const char* sql) const noexcept {
+  std::int64_t read(std::string_view column) const noexcept {
+    const std::string sql = fmt::format("SELECT {} FROM installs WHERE number = ?", column);
     const auto value = database_.lookUp(ReadFailed, [&](SQLite::Database& database) {
-      Query query(database, sql, number_);
+      Query query(database, sql.c_str(), number_);
       return query.next() ? query.integer(0) : 0;
     });
     return value.value_or(0);
   }
 
   /// True when the row changed.
-  bool write(const char* sql, std::int64_t value) noexcept {
+  bool write(std::string_view column, std::int64_t value) noexcept {
+    const std::string sql = fmt::format(
+        "UPDATE installs SET {0} = ?1 WHERE number = ?2 AND NOT over AND {0} <> ?1", column);
     int changed = 0;
     database_.change(ChangeFailed, Database::Commit::Ordinary, [&](SQLite::Database& database) {
-      changed = Query(database, sql, value, number_).run();
+      changed = Query(database, sql.c_str(), value, number_).run();
     });
     return changed > 0;
   }
@@ -88,7 +75,7 @@ class RowProgress final : public InstallProgress {
 };
 
 void RowProgress::cancel() noexcept {
-  if (!changeState(InstallState::Canceled)) return;
+  if (!write("state", static_cast<std::int64_t>(InstallState::Canceled))) return;
   std::vector<AppRecord> records;
   const auto rows = readApplication(database_, identifier_);
   if (rows && rows->any()) {

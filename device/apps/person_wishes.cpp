@@ -1,11 +1,10 @@
 #include "device/apps/person_wishes.h"
 
 #include <algorithm>
-#include <cerrno>
 
 #include "device/apps/installs.h"
+#include "device/apps/removal.h"
 #include "device/state/application_rows.h"
-#include "device/state/device_policy.h"
 #include "platform/existence.h"
 #include "platform/sync_files.h"
 
@@ -86,7 +85,7 @@ std::optional<Cancelling> effectOfCancelling(DeviceCore& core, const std::string
   const std::optional<bool> demoted = isListedAsDemoted(core.files, identifier, error);
   if (!demoted) return std::nullopt;
   if (*demoted) return asked->before ? Cancelling::Undoing : Cancelling::Nothing;
-  return mayRemove(core, nullptr) ? Cancelling::Forgetting : Cancelling::Forbidden;
+  return Cancelling::Forgetting;
 }
 
 bool undoAsking(DeviceCore& core, const std::string& identifier, std::optional<Error>* error) {
@@ -102,13 +101,17 @@ bool undoAsking(DeviceCore& core, const std::string& identifier, std::optional<E
       error);
 }
 
-bool mayRemove(DeviceCore& core, std::optional<Error>* error) {
-  const PolicyValue wish =
-      StoredDevicePolicy(core.database).effectiveBoolValue(PolicySetting::AppRemovalAllowed);
-  if (wish != PolicyValue::ExplicitlyNo) return true;
-  return failWith(error,
-                  Error::withDescription(POSIXErrorDomain, EPERM,
-                                         "removing applications is forbidden on this phone"));
+bool cancelWish(DeviceCore& core, const std::string& identifier, std::optional<Error>* error) {
+  const auto effect = effectOfCancelling(core, identifier, error);
+  switch (effect.value_or(Cancelling::Nothing)) {
+    case Cancelling::Nothing:
+      break;
+    case Cancelling::Undoing:
+      return undoAsking(core, identifier, error);
+    case Cancelling::Forgetting:
+      return removeForPerson(core, identifier, error);
+  }
+  return false;
 }
 
 }  // namespace appsync::device

@@ -14,7 +14,6 @@ namespace appsync::device {
 enum class Cancelling {
   Nothing,     ///< there is no wish, or an install is under way
   Undoing,     ///< the placeholder becomes what it was before it was asked for
-  Forbidden,   ///< it would take the application away, which the policy forbids
   Forgetting,  ///< the application goes like one that is uninstalled: it only waits to be restored
 };
 
@@ -27,10 +26,12 @@ bool askFor(DeviceCore& core, const std::string& identifier, std::optional<Error
 std::optional<Cancelling> effectOfCancelling(DeviceCore& core, const std::string& identifier,
                                              std::optional<Error>* error);
 
-/// Does what is Undoing. False with an error.
-bool undoAsking(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
+/// Takes the wish back. False when there is none, and with an error when that is forbidden, not
+/// known or cannot be written.
+bool cancelWish(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
 
-/// Whether the policy lets a person remove applications; else with an error.
-bool mayRemove(DeviceCore& core, std::optional<Error>* error);
+/// Of an application that was asked for: its placeholder is what it was before. False with an
+/// error.
+bool undoAsking(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
 
 }  // namespace appsync::device

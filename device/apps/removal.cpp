@@ -10,6 +10,7 @@
 #include "device/home/icon_order.h"
 #include "device/journal/history.h"
 #include "device/state/application_rows.h"
+#include "device/state/device_policy.h"
 
 namespace appsync::device {
 namespace {
@@ -95,7 +96,17 @@ bool removeForClient(DeviceCore& core, const std::string& identifier, bool place
   return true;
 }
 
+bool mayRemove(DeviceCore& core, std::optional<Error>* error) {
+  const PolicyValue wish =
+      StoredDevicePolicy(core.database).effectiveBoolValue(PolicySetting::AppRemovalAllowed);
+  if (wish != PolicyValue::ExplicitlyNo) return true;
+  return failWith(error,
+                  Error::withDescription(POSIXErrorDomain, EPERM,
+                                         "removing applications is forbidden on this phone"));
+}
+
 bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error) {
+  if (!mayRemove(core, error)) return false;
   ApplicationRows removed;
   bool brokenOff = false;
   const bool erased = core.database.change(
@@ -118,6 +129,12 @@ bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optio
   if (brokenOff) core.observers.installsCancelled({removed.placeholder->record()});
   core.observers.installsChanged();
   return true;
+}
+
+bool forgetWaitingData(DeviceCore& core, const std::string& identifier,
+                       std::optional<Error>* error) {
+  const auto rows = readApplication(core.database, identifier, error);
+  return rows && !rows->any() && core.containers.removeWaitingData(identifier);
 }
 
 void abandonData(SQLite::Database& database, std::string_view name) {

@@ -19,9 +19,16 @@ namespace appsync::device {
 bool removeForClient(DeviceCore& core, const std::string& identifier, bool placeholderOnly,
                      std::optional<Error>* error);
 
-/// What a person does: takes the application, its placeholder, its data and what a restore still
-/// had for it. Observers hear of an install that this breaks off.
+/// Whether the policy lets a person remove applications; else with an error.
+bool mayRemove(DeviceCore& core, std::optional<Error>* error);
+
+/// What a person does, if the policy lets them: takes the application, its placeholder, its data
+/// and what a restore still had for it. Observers hear of an install that this breaks off.
 bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
+
+/// Removes what a restore had for an application of which the registry knows nothing any more.
+bool forgetWaitingData(DeviceCore& core, const std::string& identifier,
+                       std::optional<Error>* error);
 
 /// Notes that an application's data, and what a restore still had for it, is to be removed, or what
 /// was set aside of it (Containers::asideName). It is only named in this change, so that a crash

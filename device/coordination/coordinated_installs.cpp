@@ -7,6 +7,7 @@
 
 #include "device/apps/idle_application.h"
 #include "device/apps/installs.h"
+#include "device/apps/person_wishes.h"
 #include "device/journal/history.h"
 #include "device/state/application_rows.h"
 #include "platform/bundle.h"
@@ -133,7 +134,7 @@ bool CoordinatedInstalls::take(Step step, const CoordinatorState& state) {
 void CoordinatedInstalls::removePlaceholder(const std::string& identifier,
                                             const PlaceholderRow& placeholder) {
   if (placeholder.presence == Presence::Forsaken) {
-    registry_.cancelWish(identifier, nullptr);
+    registry_.change(identifier, cancelWish, nullptr);
     return;
   }
   if (placeholder.presence != Presence::Adopted) {

@@ -2,7 +2,6 @@
 
 #include <fmt/format.h>
 
-#include <algorithm>
 #include <cerrno>
 
 #include "base/identifiers.h"
@@ -161,10 +160,10 @@ void DeviceInstallCoordination::removeObserver(CoordinatorObserver* observer) no
   events_.removeObserver(observer);
 }
 
-std::int64_t DeviceInstallCoordination::enterPromise(PromiseRow& row) {
-  const bool entered = store_.change(
-      [&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
-  return entered ? row.number : 0;
+template <typename Row>
+bool DeviceInstallCoordination::enter(Row& row) {
+  return store_.change([&](SQLite::Database& database, Consequences&) { put(database, row); },
+                       nullptr);
 }
 
 std::shared_ptr<PathTransferPromise> DeviceInstallCoordination::createPathTransferPromise(
@@ -175,7 +174,7 @@ std::shared_ptr<PathTransferPromise> DeviceInstallCoordination::createPathTransf
     row.path = transferPath->path;
     row.pathIsDirectory = transferPath->isDirectory;
   }
-  return enterPromise(row) ? objects_.of(row) : nullptr;
+  return enter(row) ? objects_.of(row) : nullptr;
 }
 
 std::shared_ptr<OutOfBandTransferPromise> DeviceInstallCoordination::createOutOfBandTransferPromise(
@@ -184,8 +183,7 @@ std::shared_ptr<OutOfBandTransferPromise> DeviceInstallCoordination::createOutOf
                  .name = std::string(name),
                  .client = client,
                  .diskSpace = diskSpaceNeeded};
-  return enterPromise(row) ? std::make_shared<OutOfBandPromiseHandle>(objects_.gate(), row)
-                           : nullptr;
+  return enter(row) ? std::make_shared<OutOfBandPromiseHandle>(objects_.gate(), row) : nullptr;
 }
 
 std::shared_ptr<InstallPlaceholder> DeviceInstallCoordination::createAppPlaceholder(
@@ -196,9 +194,7 @@ std::shared_ptr<InstallPlaceholder> DeviceInstallCoordination::createAppPlacehol
                      .name = std::string(appName),
                      .installType = installType,
                      .client = client};
-  const bool entered = store_.change(
-      [&](SQLite::Database& database, Consequences&) { put(database, row); }, nullptr);
-  return entered ? std::make_shared<PlaceholderHandle>(objects_.gate(), row) : nullptr;
+  return enter(row) ? std::make_shared<PlaceholderHandle>(objects_.gate(), row) : nullptr;
 }
 
 void DeviceInstallCoordination::uninstallApp(
@@ -274,19 +270,18 @@ bool DeviceInstallCoordination::isBusy(std::string_view bundleId) noexcept {
   return workers_.isBusy(bundleId) || events_.isBusy(bundleId);
 }
 
-std::vector<std::string> DeviceInstallCoordination::packagesOwedBy(
+std::set<std::string> DeviceInstallCoordination::packagesOwedBy(
     CoordinationClientId client) noexcept {
   const auto owed = [&](SQLite::Database& database) {
-    std::vector<std::string> identifiers;
+    std::set<std::string> identifiers;
     for (const CoordinatorRow& row : allCoordinators(database)) {
       if (!row.isLive() || row.responsible != client) continue;
       const auto package = findPromise(database, row.package);
-      if (!package || !package->complete) identifiers.push_back(row.identifier);
+      if (!package || !package->complete) identifiers.insert(row.identifier);
     }
-    std::ranges::sort(identifiers);
     return identifiers;
   };
-  return store_.lookUp(owed).value_or(std::vector<std::string>());
+  return store_.lookUp(owed).value_or(std::set<std::string>());
 }
 
 }  // namespace appsync::device

@@ -72,8 +72,8 @@ class DeviceInstallCoordination final : public InstallCoordination {
   /// Whether the service has something left to do for the application by itself: to install, to
   /// remove, or to tell somebody who is there. False for an install that waits for its client.
   bool isBusy(std::string_view bundleId) noexcept;
-  /// The applications whose package this client was named to bring and has not brought, sorted.
-  std::vector<std::string> packagesOwedBy(CoordinationClientId client) noexcept;
+  /// The applications whose package this client was named to bring and has not brought.
+  std::set<std::string> packagesOwedBy(CoordinationClientId client) noexcept;
   /// Installs that wait for an application to be closed fail, now and from now on.
   void expedite() noexcept;
 
@@ -92,8 +92,9 @@ class DeviceInstallCoordination final : public InstallCoordination {
   /// Refused when one that does not serve cannot be ended.
   bool endedFor(SQLite::Database& database, const CoordinatorRow& live, CoordinatorKind kind,
                 CoordinationClientId client, Consequences& consequences);
-  /// The row's number; 0 when it could not be entered.
-  std::int64_t enterPromise(PromiseRow& row);
+  /// Enters a promise or a placeholder.
+  template <typename Row>
+  bool enter(Row& row);
 
   // In the order in which they need one another.
   DeviceCore& device_;

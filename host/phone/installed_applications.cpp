@@ -5,25 +5,13 @@
 namespace appsync::host {
 namespace {
 
-/// What the client asks the host for.
-class ClientsWishes {
- public:
-  explicit ClientsWishes(const Phone& phone) : coordinated_(phone.coordination != nullptr) {
-    const std::vector<std::string> owed = phone.activity.packagesOwedBy(KQClientKiosk);
-    owedByStore_.insert(owed.begin(), owed.end());
-  }
-
-  /// Without coordination never for a package whose placeholder stands already; with it for none
-  /// that is the store's.
-  bool leaveOut(const AppRecord& placeholder) const {
-    return !coordinated_ || placeholder.installType == InstallType::Restore ||
-           owedByStore_.contains(placeholder.applicationIdentifier);
-  }
-
- private:
-  const bool coordinated_;
-  std::set<std::string, std::less<>> owedByStore_;
-};
+/// Whether the client does not ask the host for the package: without coordination never while the
+/// placeholder stands already; with it for none that is the store's.
+bool isLeftOut(const Phone& phone, const std::set<std::string>& owedByStore,
+               const AppRecord& placeholder) {
+  return !phone.coordination || placeholder.installType == InstallType::Restore ||
+         owedByStore.contains(placeholder.applicationIdentifier);
+}
 
 /// Those whose packages have come, with no word of their installs.
 std::set<std::string> withoutWord(FileManager& files) {
@@ -57,7 +45,7 @@ std::optional<std::vector<InstalledApplication>> installedApplications(const Pho
     problem = *demotions.problem();
     return std::nullopt;
   }
-  const ClientsWishes wishes(phone);
+  const std::set<std::string> owedByStore = phone.activity.packagesOwedBy(KQClientKiosk);
   const std::set<std::string> untold = withoutWord(phone.files);
   std::map<std::string, InstalledApplication> found;
   std::optional<Error> error;
@@ -81,7 +69,7 @@ std::optional<std::vector<InstalledApplication>> installedApplications(const Pho
                      isDamaged(phone.files, record),
                      !record.isPlaceholder && untold.contains(record.applicationIdentifier)};
     }
-    if (record.isPlaceholder) application.waits = wishes.leaveOut(record);
+    if (record.isPlaceholder) application.waits = isLeftOut(phone, owedByStore, record);
   }
   std::vector<InstalledApplication> result;
   result.reserve(found.size());

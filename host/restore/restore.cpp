@@ -1,7 +1,5 @@
 #include "host/restore/restore.h"
 
-#include <algorithm>
-
 #include "host/phone/demotions.h"
 #include "host/restore/restore_data.h"
 #include "host/restore/restore_settlement.h"
@@ -132,7 +130,7 @@ void Restore::explainPlaceholders(const RestoreInput& input, RestoreEnd& end) {
                 : input.packages  ? "the library does not have it"
                                   : "waits for its package";
   const std::optional<Library>& library = input.catalogue ? input.catalogue : input.packages;
-  const std::vector<std::string> owed = phone_.activity.packagesOwedBy(KQClientKiosk);
+  const std::set<std::string> owed = phone_.activity.packagesOwedBy(KQClientKiosk);
   const Demotions demotions(phone_.files);
   if (demotions.problem()) breakOff(*demotions.problem());
   for (const auto& [identifier, record] : end.present.placeholders) {
@@ -146,7 +144,7 @@ void Restore::explainPlaceholders(const RestoreInput& input, RestoreEnd& end) {
                                     : interruption_.requested() ? InterruptedReason
                                                                 : NotInstalled);
     } else if (phone_.coordination && record.installType == InstallType::Restore &&
-               input.list.names(identifier) && !std::ranges::count(owed, identifier)) {
+               input.list.names(identifier) && !owed.contains(identifier)) {
       failures_.emplace(identifier, "the phone could not make it ready; the next restore does it");
     }
   }

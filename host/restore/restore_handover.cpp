@@ -82,9 +82,7 @@ class HandoverInProgress {
   }
 
   void chooseForClient() {
-    for (const std::string& identifier : phone_.activity.packagesOwedBy(KQClientKiosk)) {
-      owed_.insert(identifier);
-    }
+    owed_ = phone_.activity.packagesOwedBy(KQClientKiosk);
     for (const BackedUpApplication& app : list_.applications()) {
       if (result_.installed.contains(app.identifier) || isRestoring(app.identifier)) continue;
       if (!isSendableIdentifier(app.identifier)) {

@@ -1,7 +1,5 @@
 #include "host/transfer/shipments.h"
 
-#include <algorithm>
-
 #include "host/phone/demotions.h"
 #include "host/transfer/staging.h"
 
@@ -35,8 +33,7 @@ std::vector<Shipment> shipmentsTo(SyncClient& client, const std::vector<SyncAsse
 }
 
 std::set<std::string> waitingForStore(const Phone& phone, const ApplicationsPresent& present) {
-  const std::vector<std::string> owed = phone.activity.packagesOwedBy(KQClientKiosk);
-  std::set<std::string> waiting(owed.begin(), owed.end());
+  std::set<std::string> waiting = phone.activity.packagesOwedBy(KQClientKiosk);
   const Demotions demotions(phone.files);
   for (const auto& [identifier, record] : present.placeholders) {
     const bool isStores = record.installType == InstallType::StoreDownload ||
@@ -51,13 +48,13 @@ std::vector<Shipment> shipmentsFromStore(HostProcess& host, const Phone& phone,
                                          const Library& catalogue,
                                          std::optional<InstallType> origin,
                                          const std::set<std::string>& identifiers) {
-  const std::vector<std::string> owed = phone.activity.packagesOwedBy(KQClientKiosk);
+  const std::set<std::string> owed = phone.activity.packagesOwedBy(KQClientKiosk);
   std::vector<Shipment> shipments;
   for (const std::string& identifier : identifiers) {
     const auto found = present.placeholders.find(identifier);
     const AppRecord* placeholder = found == present.placeholders.end() ? nullptr : &found->second;
-    const bool isOwed = std::ranges::count(owed, identifier) > 0;
-    auto delivery = deliveryOfStore(phone, identifier, placeholder, isOwed, origin);
+    auto delivery =
+        deliveryOfStore(phone, identifier, placeholder, owed.contains(identifier), origin);
     const PackageFacts* package = catalogue.find(identifier);
     if (!delivery || !package) continue;
     const bool named = placeholder && !placeholder->displayName.empty();

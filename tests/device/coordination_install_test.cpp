@@ -128,8 +128,8 @@ TEST_F(CoordinationInstallTest, ARestoredApplicationWaitsForTheStoreAndGetsItsDa
   ASSERT_TRUE(coordinator->setInstallOptions(options, nullptr));
   lay(*coordinator, placeholderOf(Id, InstallType::Restore));
   ASSERT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(KQClientKiosk, nullptr));
-  EXPECT_EQ(service().packagesOwedBy(KQClientKiosk), Lines{"com.example.a"});
-  EXPECT_EQ(service().packagesOwedBy(SyncHostClientID), Lines{});
+  EXPECT_EQ(service().packagesOwedBy(KQClientKiosk), std::set<std::string>{"com.example.a"});
+  EXPECT_EQ(service().packagesOwedBy(SyncHostClientID), std::set<std::string>{});
 
   const auto asStore =
       service().coordinatorFor(CoordinatorKind::Any, Id, KQClientKiosk, false, nullptr, nullptr);
@@ -138,10 +138,10 @@ TEST_F(CoordinationInstallTest, ARestoredApplicationWaitsForTheStoreAndGetsItsDa
   const auto package = service().createPathTransferPromise("com.example.a-Asset", KQClientKiosk,
                                                            stageApplication(Id), 0);
   ASSERT_TRUE(asStore->setAppAssetPromise(package, nullptr));
-  EXPECT_EQ(service().packagesOwedBy(KQClientKiosk), Lines{"com.example.a"});
+  EXPECT_EQ(service().packagesOwedBy(KQClientKiosk), std::set<std::string>{"com.example.a"});
   package->setComplete(true);
   ASSERT_TRUE(recorder.waitFor("complete"));
-  EXPECT_EQ(service().packagesOwedBy(KQClientKiosk), Lines{});
+  EXPECT_EQ(service().packagesOwedBy(KQClientKiosk), std::set<std::string>{});
   EXPECT_EQ(record(Id)->installType, InstallType::Restore);
   EXPECT_EQ(textAt("/var/mobile/Containers/Data/com.example.a/saved"), "kept");
 }

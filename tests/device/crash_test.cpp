@@ -152,8 +152,9 @@ TEST_F(CrashTest, AnUninstallOfAnApplicationWithData) {
 TEST_F(CrashTest, APersonsUninstallDuringAnUpdate) {
   ASSERT_TRUE(installPackage("com.example.a", "1.0"));
   ASSERT_TRUE(installPlaceholder("com.example.a", "2.0"));
-  expectOldOrNew(
-      [](DeviceAppRegistry& target) { return target.removeApplication("com.example.a", nullptr); });
+  expectOldOrNew([](DeviceAppRegistry& target) {
+    return target.change("com.example.a", removeForPerson, nullptr);
+  });
 }
 
 TEST_F(CrashTest, ARestoreOverDataThatIsThereAlready) {

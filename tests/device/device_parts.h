@@ -6,6 +6,7 @@
 
 #include "device/apps/app_registry.h"
 #include "device/apps/installs.h"
+#include "device/apps/removal.h"
 #include "device/device_folder.h"
 #include "device/journal/log_files.h"
 #include "device/schema.h"

@@ -124,10 +124,10 @@ TEST_F(RegistryTest, WaitingDataIsForgottenOnlyWhenItIsKnownThatNothingIsLeftOfT
         }));
   };
   rename("applications", "hidden");
-  parts.registry().forgetWaitingData("com.example.a");
+  parts.registry().change("com.example.a", forgetWaitingData, nullptr);
   EXPECT_EQ(fakes::fileText(onDisk(data)), "old");
   rename("hidden", "applications");
-  parts.registry().forgetWaitingData("com.example.a");
+  parts.registry().change("com.example.a", forgetWaitingData, nullptr);
   EXPECT_FALSE(std::filesystem::exists(onDisk(data)));
 }
 

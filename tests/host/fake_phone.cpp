@@ -153,14 +153,14 @@ std::set<std::string> FakePhone::busyAmong(const std::set<std::string>& identifi
   return busy;
 }
 
-std::vector<std::string> FakePhone::packagesOwedBy(CoordinationClientId responsible) noexcept {
-  std::vector<std::string> owed;
+std::set<std::string> FakePhone::packagesOwedBy(CoordinationClientId responsible) noexcept {
+  std::set<std::string> owed;
   for (const std::string& identifier : services_.appRegistry.placeholderIdentifiers()) {
     const auto coordinator = services_.installCoordination.coordinator(identifier);
     if (!coordinator || coordinator->error()) continue;
     const auto state = coordinator->state();
     const bool came = state.appAssetPromise && state.appAssetPromise->isComplete();
-    if (state.responsibleClient == responsible && !came) owed.push_back(identifier);
+    if (state.responsibleClient == responsible && !came) owed.insert(identifier);
   }
   return owed;
 }

@@ -34,7 +34,7 @@ class FakePhone final : public IncomingFiles, public ApplicationData, public Pho
   void setWatcher(PhoneWatcher* watcher) noexcept override { onWatcher(watcher); }
   void expedite() noexcept override;
   std::set<std::string> busyAmong(const std::set<std::string>& identifiers) noexcept override;
-  std::vector<std::string> packagesOwedBy(CoordinationClientId responsible) noexcept override;
+  std::set<std::string> packagesOwedBy(CoordinationClientId responsible) noexcept override;
 
   bool coordination = false;
   Texts waiting;  ///< restored data, by identifier
