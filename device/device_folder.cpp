@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <system_error>
 
+#include "base/text.h"
 #include "device/schema.h"
 
 namespace appsync::device {
@@ -31,13 +32,6 @@ fs::path normalized(const fs::path& folder) {
   const fs::path absolute = fs::absolute(folder, failure);
   fs::path path = (failure ? folder : absolute).lexically_normal();
   return path.has_filename() || !path.has_relative_path() ? path : path.parent_path();
-}
-
-std::string onOneLine(std::string text) {
-  for (char& c : text) {
-    if (static_cast<unsigned char>(c) < 0x20 || c == 0x7f) c = '?';
-  }
-  return text;
 }
 
 DeviceError missing(const fs::path& folder, std::string_view reason) {
@@ -118,7 +112,7 @@ DevicePaths::DevicePaths(const fs::path& givenFolder)
 
 DeviceError deviceError(DeviceProblem problem, const fs::path& folder, std::string_view reason,
                         std::string_view remedy) {
-  return {problem, onOneLine(fmt::format("{}: {}; {}", folder.native(), reason, remedy))};
+  return {problem, printable(fmt::format("{}: {}; {}", folder.native(), reason, remedy))};
 }
 
 DeviceError unusableFolder(const fs::path& folder, std::string_view reason) {

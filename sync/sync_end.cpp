@@ -31,8 +31,7 @@ bool tidyMetadata(const AppRecord& record, PropertyList::Dictionary& metadata,
                deviceBased);
     changed = true;
   }
-  const PropertyList* autoDownload = find(metadata, "is-auto-download");
-  if (autoDownload && autoDownload->booleanValue()) {
+  if (findFlag(metadata, "is-auto-download")) {
     metadata.erase("is-auto-download");
     log.normal("clearing is-auto-download value for %{public}@", identifierOf(record));
     changed = true;

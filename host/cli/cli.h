@@ -69,6 +69,9 @@ struct CommandContext {
 /// Ends the command when what it asked a phone for could not be read.
 void insistOnRead(const std::optional<Error>& error);
 
+/// The command "status": one object, or a few lines for people.
+ExitCode runStatus(CommandContext& context);
+
 /// What the chosen command does; it gives the exit code.
 using Command = std::function<ExitCode(CommandContext&)>;
 

@@ -9,7 +9,6 @@
 
 #include "base/text.h"
 #include "host/cli/cli.h"
-#include "host/cli/status.h"
 #include "host/cli/table.h"
 
 namespace appsync::host {
@@ -52,27 +51,13 @@ ExitCode runApps(CommandContext& context) {
   return ExitCode::Done;
 }
 
-int severity(LogLevel level) {
-  switch (level) {
-    case LogLevel::Debug:
-      return 0;
-    case LogLevel::Info:
-      return 1;
-    case LogLevel::Default:
-      return 2;
-    case LogLevel::Error:
-      return 3;
-    case LogLevel::Fault:
-      return 4;
-  }
-  return 2;
-}
-
 const std::map<std::string, int>& severities() {
   static const std::map<std::string, int> levels = {
       {"debug", 0}, {"info", 1}, {"default", 2}, {"error", 3}, {"fault", 4}};
   return levels;
 }
+
+int severity(LogLevel level) { return severities().at(std::string(name(level))); }
 
 void writeLogLine(const device::LogLine& line, CommandContext& context) {
   context.tell(

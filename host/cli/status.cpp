@@ -1,5 +1,3 @@
-#include "host/cli/status.h"
-
 #include <fmt/format.h>
 
 #include <map>

@@ -104,11 +104,14 @@ void TextReporter::tell(const DeletedOnPhone& event) {
   print(Style::Warning, "gone", printable(event.identifier) + " was deleted on the phone");
 }
 
+void TextReporter::showBytes(const std::string& what, std::uint64_t bytes, std::uint64_t total) {
+  if (total == 0) return;
+  status_.showBar(what, static_cast<double>(bytes) / static_cast<double>(total),
+                  fmt::format("{} of {}", byteCount(bytes), byteCount(total)));
+}
+
 void TextReporter::tell(const TransferProgress& event) {
-  if (event.total == 0) return;
-  status_.showBar("Sending " + event.name,
-                  static_cast<double>(event.sent) / static_cast<double>(event.total),
-                  fmt::format("{} of {}", byteCount(event.sent), byteCount(event.total)));
+  showBytes("Sending " + event.name, event.sent, event.total);
 }
 
 void TextReporter::tell(const TransferEnded& event) {
@@ -119,10 +122,7 @@ void TextReporter::tell(const TransferEnded& event) {
 }
 
 void TextReporter::tell(const DataProgress& event) {
-  if (event.total == 0) return;
-  status_.showBar("Data of " + event.name,
-                  static_cast<double>(event.done) / static_cast<double>(event.total),
-                  fmt::format("{} of {}", byteCount(event.done), byteCount(event.total)));
+  showBytes("Data of " + event.name, event.done, event.total);
 }
 
 void TextReporter::tell(const DataEnded& event) {

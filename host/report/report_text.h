@@ -46,6 +46,7 @@ class TextReporter : public Reporter {
   /// Name, version and identifier as far as the plan told them.
   std::string subject(const std::string& identifier) const;
   void showInstalling();
+  void showBytes(const std::string& what, std::uint64_t bytes, std::uint64_t total);
 
   Output& errorOutput_;
   const ReportOptions options_;
