@@ -101,9 +101,7 @@ bool complete(DeviceCore& core, const InstallDetails& details, ApplicationRow& r
 bool mustLast(const ApplicationRow& row) { return row.installType != InstallType::Sync; }
 
 bool isRestored(const ApplicationRow& placeholder) {
-  return placeholder.installType == InstallType::Restore ||
-         placeholder.installType == InstallType::Downgrade ||
-         placeholder.installType == InstallType::IntentionalDowngrade;
+  return placeholder.installType == InstallType::Restore || isDemotion(placeholder.installType);
 }
 
 /// Enters the placeholder; `replaced` is the one it takes the place of.

@@ -1,9 +1,18 @@
 #include "host/phone/sync_host.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <future>
 
 namespace appsync::host {
+namespace {
+
+constexpr int Recoverable[] = {
+    ECONNABORTED, ECONNREFUSED, ECONNRESET, EHOSTDOWN, EHOSTUNREACH, ENETDOWN, ENETRESET,
+    ENETUNREACH,  ENOTCONN,     EPIPE,      ETIMEDOUT, ECANCELED,    EINTR,    EDQUOT,
+    ENOSPC,       EAGAIN,       EBUSY,      EIO,       EMFILE,       ENFILE,   ENOMEM};
+
+}  // namespace
 
 HostProcess::HostProcess(std::string_view mainBundleIdentifier, std::string pluginBundleIdentifier,
                          const Interruption& interruption)
@@ -24,34 +33,8 @@ SyncAssetPtr HostProcess::makeDownload(std::string_view identifier, std::string_
 
 bool HostProcess::TWIsRecoverableError(const Error& error) noexcept {
   if (error.domain != POSIXErrorDomain) return false;
-  switch (error.code) {
-    case ECONNABORTED:
-    case ECONNREFUSED:
-    case ECONNRESET:
-    case EHOSTDOWN:
-    case EHOSTUNREACH:
-    case ENETDOWN:
-    case ENETRESET:
-    case ENETUNREACH:
-    case ENOTCONN:
-    case EPIPE:
-    case ETIMEDOUT:
-    case ECANCELED:
-    case EINTR:
-    case EDQUOT:
-    case ENOSPC:
-    case EAGAIN:
-    case EBUSY:
-    case EIO:
-    case EMFILE:
-    case ENFILE:
-    case ENOMEM:
-      return true;
-    case EINVAL:
-      return interruption_.requested();
-    default:
-      return false;
-  }
+  if (error.code == EINVAL) return interruption_.requested();
+  return std::ranges::find(Recoverable, error.code) != std::end(Recoverable);
 }
 
 void announceStartUp(SystemNotifier& notifier) {

@@ -32,28 +32,11 @@ void TextReporter::report(const Event& event) {
   std::visit([this](const auto& value) { tell(value); }, event);
 }
 
-void TextReporter::print(Style style, std::string_view word, const std::string& rest) {
+void TextReporter::print(std::string_view style, std::string_view word, const std::string& rest) {
   if (options_.quiet) return;
-  std::string_view begin;
-  switch (style) {
-    case Style::Plain:
-      break;
-    case Style::Good:
-      begin = "\x1b[32m";
-      break;
-    case Style::Bad:
-      begin = "\x1b[31m";
-      break;
-    case Style::Warning:
-      begin = "\x1b[33m";
-      break;
-    case Style::Dim:
-      begin = "\x1b[2m";
-      break;
-  }
-  const bool coloured = colour_ && !begin.empty();
+  const bool coloured = colour_ && !style.empty();
   status_.print(
-      fmt::format("{}{:<10}{} {}", coloured ? begin : "", word, coloured ? "\x1b[0m" : "", rest));
+      fmt::format("{}{:<10}{} {}", coloured ? style : "", word, coloured ? "\x1b[0m" : "", rest));
 }
 
 void TextReporter::printError(std::string_view word, const std::string& rest) {

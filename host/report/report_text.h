@@ -17,7 +17,14 @@ class TextReporter : public Reporter {
   void report(const Event& event) override;
 
  private:
-  enum class Style { Plain, Good, Bad, Warning, Dim };
+  /// How a word is shown on a terminal that can do so.
+  struct Style {
+    static constexpr std::string_view Plain = "";
+    static constexpr std::string_view Good = "\x1b[32m";
+    static constexpr std::string_view Bad = "\x1b[31m";
+    static constexpr std::string_view Warning = "\x1b[33m";
+    static constexpr std::string_view Dim = "\x1b[2m";
+  };
 
   void tell(const PackageProblem& event);
   void tell(const PlannedEntry& event);
@@ -41,7 +48,7 @@ class TextReporter : public Reporter {
   void tellCounts(const Summary& event);
 
   /// "word       rest", the word in the style's colour.
-  void print(Style style, std::string_view word, const std::string& rest);
+  void print(std::string_view style, std::string_view word, const std::string& rest);
   void printError(std::string_view word, const std::string& rest);
   /// Name, version and identifier as far as the plan told them.
   std::string subject(const std::string& identifier) const;

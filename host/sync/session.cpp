@@ -25,17 +25,11 @@ bool isDownloaded(const std::string& identifier, const TodoList& todo) {
   });
 }
 
-std::set<std::string> identifiersOf(const SyncPlan& plan) {
-  std::set<std::string> identifiers;
-  for (const PlannedEntry& entry : plan.entries) identifiers.insert(entry.identifier);
-  return identifiers;
-}
-
-/// Of the plan's applications those that the host brings by itself, or the others.
-std::set<std::string> identifiersOf(const SyncPlan& plan, bool byHost) {
+/// The plan's applications; only those that the host brings by itself, or the others, if asked.
+std::set<std::string> identifiersOf(const SyncPlan& plan, std::optional<bool> byHost = {}) {
   std::set<std::string> identifiers;
   for (const PlannedEntry& entry : plan.entries) {
-    if (entry.byHost == byHost) identifiers.insert(entry.identifier);
+    if (entry.byHost == byHost.value_or(entry.byHost)) identifiers.insert(entry.identifier);
   }
   return identifiers;
 }
