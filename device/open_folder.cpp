@@ -11,7 +11,7 @@ bool readOptions(OpenFolder& opened, DeviceError& error) {
   std::optional<Error> reason;
   const bool read = opened.database->read(
       "the phone's options could not be read",
-      [&](SQLite::Database& connection) {
+      [&](Connection& connection) {
         Query query(connection, "SELECT value FROM settings WHERE key = 'coordination'");
         opened.options.coordination = query.next() && query.boolean(0);
       },

@@ -34,9 +34,9 @@ void dropRowsWithoutBundle(DeviceCore& core, std::vector<ApplicationRow>& rows) 
     if (!isGone(core, row)) return false;
     note(core, fmt::format("{} is dropped from the registry: {} is gone", row.identifier,
                            row.bundlePath()));
-    return core.database.change(
-        "a row without a bundle could not be dropped", Database::Commit::Ordinary,
-        [&](SQLite::Database& database) { eraseApplication(database, row); });
+    return core.database.change("a row without a bundle could not be dropped",
+                                Database::Commit::Ordinary,
+                                [&](Connection& database) { eraseApplication(database, row); });
   });
 }
 
@@ -55,7 +55,7 @@ void removeUnnamedContainers(DeviceCore& core, const std::vector<ApplicationRow>
 
 void removeAllAbandonedData(DeviceCore& core) {
   const auto identifiers = core.database.lookUp(
-      "the list of abandoned data could not be read", [](SQLite::Database& database) {
+      "the list of abandoned data could not be read", [](Connection& database) {
         return Query(database, "SELECT identifier FROM abandoned_data").texts();
       });
   if (!identifiers) return;
@@ -74,7 +74,7 @@ void undoAdoptions(DeviceCore& core) {
 
 void pauseInstalls(DeviceCore& core) {
   core.database.change("the installs under way could not be paused", Database::Commit::Ordinary,
-                       [](SQLite::Database& database) {
+                       [](Connection& database) {
                          Query(database,
                                "DELETE FROM installs WHERE over OR identifier NOT IN "
                                "(SELECT identifier FROM applications WHERE placeholder)")

@@ -81,7 +81,7 @@ CREATE TABLE transactions (
 
 /// Keeps the write-ahead log and its index when the last connection closes, so that a reader finds
 /// them and need not make them.
-void keepLogFiles(SQLite::Database& database) {
+void keepLogFiles(Connection& database) {
   int keep = 1;
   sqlite3_file_control(database.getHandle(), "main", SQLITE_FCNTL_PERSIST_WAL, &keep);
 }
@@ -97,7 +97,7 @@ std::string uri(const std::filesystem::path& file, std::string_view parameters) 
   return text.append("?").append(parameters);
 }
 
-SQLite::Database connectForReading(const std::filesystem::path& file) {
+Connection connectForReading(const std::filesystem::path& file) {
   // A copy of a device may lack the log files, and a reader makes none. Whoever opens it for
   // writing makes them first: until then the database file alone is the whole state.
   const bool hasLog = std::filesystem::exists(file.native() + "-wal") &&
@@ -106,20 +106,20 @@ SQLite::Database connectForReading(const std::filesystem::path& file) {
           SQLite::OPEN_READONLY | SQLite::OPEN_URI, BusyTimeout};
 }
 
-SQLite::Database connect(const std::filesystem::path& file, Access access) {
+Connection connect(const std::filesystem::path& file, Access access) {
   if (access == Access::ReadOnly) return connectForReading(file);
-  SQLite::Database database(file.string(), SQLite::OPEN_READWRITE, BusyTimeout);
+  Connection database(file.string(), SQLite::OPEN_READWRITE, BusyTimeout);
   keepLogFiles(database);
   database.exec("PRAGMA synchronous=NORMAL");
   return database;
 }
 
-std::int64_t pragma(SQLite::Database& database, const char* name) {
+std::int64_t pragma(Connection& database, const char* name) {
   return database.execAndGet(fmt::format("PRAGMA {}", name)).getInt64();
 }
 
 /// Empty when the database is whole.
-std::string damage(SQLite::Database& database, Log& log) {
+std::string damage(Connection& database, Log& log) {
   const std::string found = database.execAndGet("PRAGMA quick_check(1)").getString();
   if (found != "ok") {
     log.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
@@ -133,7 +133,7 @@ std::string damage(SQLite::Database& database, Log& log) {
   return tables.getInt() == 8 ? "" : "tables are missing";
 }
 
-bool isCurrentDevice(SQLite::Database& database, const std::filesystem::path& folder, Log& log,
+bool isCurrentDevice(Connection& database, const std::filesystem::path& folder, Log& log,
                      DeviceError& error) {
   if (pragma(database, "application_id") != ApplicationId) {
     error = file_size(DevicePaths(folder).database) == 0
@@ -156,7 +156,7 @@ bool isCurrentDevice(SQLite::Database& database, const std::filesystem::path& fo
 }
 
 /// Those that the devices of older programs lack.
-void makeLaterTables(SQLite::Database& database) {
+void makeLaterTables(Connection& database) {
   // What the placeholders were that a person has asked for.
   database.exec(
       "CREATE TABLE IF NOT EXISTS asked_for "
@@ -180,8 +180,7 @@ DeviceError problemOf(const SQLite::Exception& exception, const std::filesystem:
 }  // namespace
 
 void createDatabase(const std::filesystem::path& file, const DeviceOptions& options) {
-  SQLite::Database database(file.string(), SQLite::OPEN_READWRITE | SQLite::OPEN_CREATE,
-                            BusyTimeout);
+  Connection database(file.string(), SQLite::OPEN_READWRITE | SQLite::OPEN_CREATE, BusyTimeout);
   keepLogFiles(database);
   database.exec("PRAGMA journal_mode=WAL");
   SQLite::Transaction transaction(database);
@@ -197,7 +196,7 @@ std::unique_ptr<Database> openDatabase(const std::filesystem::path& folder,
                                        const std::filesystem::path& file, Access access, Log& log,
                                        DeviceError& error) {
   try {
-    SQLite::Database connection = connect(file, access);
+    Connection connection = connect(file, access);
     if (!isCurrentDevice(connection, folder, log, error)) return nullptr;
     if (access == Access::Write) makeLaterTables(connection);
     return std::make_unique<Database>(std::move(connection), access == Access::Write, log);

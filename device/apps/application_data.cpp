@@ -128,7 +128,7 @@ void enterOverwriting(DeviceCore& core, const ApplicationRow& application) {
                            .bundleId = application.identifier,
                            .version = application.version};
   core.database.change("the history lacks an overwriting of data", Database::Commit::Ordinary,
-                       [&](SQLite::Database& database) { enterInHistory(database, entry); });
+                       [&](Connection& database) { enterInHistory(database, entry); });
 }
 
 std::optional<Error> overwrite(DeviceCore& core, const std::string& identifier,

@@ -38,7 +38,7 @@ bool layPlaceholder(DeviceCore& core, const ApplicationRow& installed,
 bool takePackage(DeviceCore& core, const ApplicationRow& installed, std::optional<Error>* error) {
   const bool erased = core.database.change(
       fmt::format("{} could not be demoted", installed.identifier), Database::Commit::OnDisk,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         eraseApplication(database, installed);
         enterInHistory(database, {.event = HistoryEvent::Demoted,
                                   .origin = HistoryOrigin::Person,

@@ -6,7 +6,7 @@ namespace appsync::device {
 
 std::optional<PropertyList::Dictionary> DeviceInstallerService::lookupUninstalled() noexcept {
   return database_.lookUp(
-      "the uninstalled applications could not be read", [](SQLite::Database& database) {
+      "the uninstalled applications could not be read", [](Connection& database) {
         PropertyList::Dictionary found;
         Query query(database, "SELECT identifier, time FROM uninstalled");
         while (query.next()) {
@@ -21,20 +21,20 @@ int DeviceInstallerService::clearUninstalled(const std::vector<std::string>& bun
   std::optional<Error> error;
   const bool cleared = database_.change(
       "the uninstalled applications could not be cleared", Database::Commit::Ordinary,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         for (const std::string& identifier : bundleIds) forgetUninstalled(database, identifier);
       },
       &error);
   return cleared ? 0 : static_cast<int>(error ? error->code : -1);
 }
 
-void recordUninstalled(SQLite::Database& database, std::string_view identifier) {
+void recordUninstalled(Connection& database, std::string_view identifier) {
   Query(database, "INSERT OR REPLACE INTO uninstalled VALUES (?, ?)", identifier,
         secondsSince1970())
       .run();
 }
 
-void forgetUninstalled(SQLite::Database& database, std::string_view identifier) {
+void forgetUninstalled(Connection& database, std::string_view identifier) {
   Query(database, "DELETE FROM uninstalled WHERE identifier = ?", identifier).run();
 }
 

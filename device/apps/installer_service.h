@@ -20,7 +20,7 @@ class DeviceInstallerService final : public InstallerService {
 
 // Used within Database's work; these throw SQLite::Exception.
 
-void recordUninstalled(SQLite::Database& database, std::string_view identifier);
-void forgetUninstalled(SQLite::Database& database, std::string_view identifier);
+void recordUninstalled(Connection& database, std::string_view identifier);
+void forgetUninstalled(Connection& database, std::string_view identifier);
 
 }  // namespace appsync::device

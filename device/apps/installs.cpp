@@ -50,7 +50,7 @@ class RowProgress final : public InstallProgress {
  private:
   std::int64_t read(std::string_view column) const noexcept {
     const std::string sql = fmt::format("SELECT {} FROM installs WHERE number = ?", column);
-    const auto value = database_.lookUp(ReadFailed, [&](SQLite::Database& database) {
+    const auto value = database_.lookUp(ReadFailed, [&](Connection& database) {
       Query query(database, sql.c_str(), number_);
       return query.next() ? query.integer(0) : 0;
     });
@@ -62,7 +62,7 @@ class RowProgress final : public InstallProgress {
     const std::string sql = fmt::format(
         "UPDATE installs SET {0} = ?1 WHERE number = ?2 AND NOT over AND {0} <> ?1", column);
     int changed = 0;
-    database_.change(ChangeFailed, Database::Commit::Ordinary, [&](SQLite::Database& database) {
+    database_.change(ChangeFailed, Database::Commit::Ordinary, [&](Connection& database) {
       changed = Query(database, sql.c_str(), value, number_).run();
     });
     return changed > 0;
@@ -87,7 +87,7 @@ void RowProgress::cancel() noexcept {
 
 }  // namespace
 
-void beginInstall(SQLite::Database& database, std::string_view identifier) {
+void beginInstall(Connection& database, std::string_view identifier) {
   endInstall(database, identifier, InstallState::Canceled);
   Query(database,
         "INSERT INTO installs (identifier, state, phase, total, completed, over) "
@@ -96,14 +96,14 @@ void beginInstall(SQLite::Database& database, std::string_view identifier) {
       .run();
 }
 
-bool endInstall(SQLite::Database& database, std::string_view identifier, InstallState finalState) {
+bool endInstall(Connection& database, std::string_view identifier, InstallState finalState) {
   return Query(database,
                "UPDATE installs SET over = 1, state = ? WHERE identifier = ? AND NOT over",
                finalState, identifier)
              .run() > 0;
 }
 
-bool isInstalling(SQLite::Database& database, std::string_view identifier) {
+bool isInstalling(Connection& database, std::string_view identifier) {
   return Query(database,
                "SELECT 1 FROM installs WHERE identifier = ? AND NOT over AND state IN (?, ?, ?)",
                identifier, InstallState::Waiting, InstallState::Active, InstallState::Paused)
@@ -112,7 +112,7 @@ bool isInstalling(SQLite::Database& database, std::string_view identifier) {
 
 RegistryObservers::Report reportInstalls(Database& database) {
   RegistryObservers::Report report;
-  database.read("the installs under way could not be read", [&](SQLite::Database& connection) {
+  database.read("the installs under way could not be read", [&](Connection& connection) {
     // All at once: one by one would take as long as a sync with thousands of placeholders.
     const std::vector<ApplicationRow> rows = allApplications(connection);
     std::unordered_map<std::string_view, const ApplicationRow*> shown;
@@ -134,7 +134,7 @@ RegistryObservers::Report reportInstalls(Database& database) {
 std::shared_ptr<InstallProgress> currentProgress(Database& database, RegistryObservers& observers,
                                                  std::string_view identifier) {
   std::shared_ptr<InstallProgress> progress;
-  database.read(ReadFailed, [&](SQLite::Database& connection) {
+  database.read(ReadFailed, [&](Connection& connection) {
     Query query(connection, "SELECT number FROM installs WHERE identifier = ? AND NOT over",
                 identifier);
     if (query.next()) {

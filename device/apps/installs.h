@@ -12,11 +12,11 @@ namespace appsync::device {
 // Installs that are under way. These throw SQLite::Exception and are used within Database's work.
 
 /// Begins an application's install: waiting, loading, nothing done. One that was under way is over.
-void beginInstall(SQLite::Database& database, std::string_view identifier);
+void beginInstall(Connection& database, std::string_view identifier);
 /// False when none was under way.
-bool endInstall(SQLite::Database& database, std::string_view identifier, InstallState finalState);
+bool endInstall(Connection& database, std::string_view identifier, InstallState finalState);
 /// Whether an install is under way that has neither failed nor been cancelled.
-bool isInstalling(SQLite::Database& database, std::string_view identifier);
+bool isInstalling(Connection& database, std::string_view identifier);
 
 /// The installs under way, by priority: first come, first served.
 RegistryObservers::Report reportInstalls(Database& database);

@@ -115,7 +115,7 @@ bool switchTo(DeviceCore& core, const ApplicationRow& row, const ApplicationRows
   const bool switched = core.database.change(
       fmt::format("{} could not be entered in the registry", row.identifier),
       Database::Commit::OnDisk,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         if (before.placeholder) eraseApplication(database, *before.placeholder);
         putApplication(database, row);
         endInstall(database, row.identifier, InstallState::Finished);
@@ -170,7 +170,7 @@ HistoryEntry failureOf(const std::string& identifier, const ApplicationRows& bef
 
 void markFailed(DeviceCore& core, const HistoryEntry& failure) {
   core.database.change("a failed install could not be ended", Database::Commit::Ordinary,
-                       [&](SQLite::Database& database) {
+                       [&](Connection& database) {
                          endInstall(database, failure.bundleId, InstallState::Failed);
                          enterInHistory(database, failure);
                        });

@@ -23,7 +23,7 @@ struct Asked {
   std::optional<InstallType> before;
 };
 
-Asked findAsked(SQLite::Database& database, std::string_view identifier) {
+Asked findAsked(Connection& database, std::string_view identifier) {
   ApplicationRows rows = findApplication(database, identifier);
   if (rows.installed || !rows.placeholder) return {};
   Asked asked{std::move(rows.placeholder), std::nullopt};
@@ -56,7 +56,7 @@ bool askFor(DeviceCore& core, const std::string& identifier, std::optional<Error
   bool asked = false;
   const bool changed = core.database.change(
       "the application could not be asked for", Database::Commit::OnDisk,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         std::optional<ApplicationRow> row = findApplication(database, identifier).placeholder;
         asked = row && canBeAskedFor(row->installType);
         if (!asked || row->installType == InstallType::StoreDownload) return;
@@ -74,7 +74,7 @@ std::optional<Cancelling> effectOfCancelling(DeviceCore& core, const std::string
                                              std::optional<Error>* error) {
   const auto asked = core.database.lookUp(
       "the registry could not be read",
-      [&](SQLite::Database& database) { return findAsked(database, identifier); }, error);
+      [&](Connection& database) { return findAsked(database, identifier); }, error);
   if (!asked) return std::nullopt;
   if (!asked->placeholder) return Cancelling::Nothing;
   if (asked->before && isComing(core, identifier)) return Cancelling::Nothing;
@@ -91,7 +91,7 @@ std::optional<Cancelling> effectOfCancelling(DeviceCore& core, const std::string
 bool undoAsking(DeviceCore& core, const std::string& identifier, std::optional<Error>* error) {
   return core.database.change(
       "the application could not be demoted again", Database::Commit::OnDisk,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         Asked asked = findAsked(database, identifier);
         if (!asked.before) return;
         asked.placeholder->installType = *asked.before;

@@ -110,7 +110,7 @@ bool enter(DeviceCore& core, ApplicationRow& row, std::optional<ApplicationRow>&
   return core.database.change(
       fmt::format("the placeholder of {} could not be entered in the registry", row.identifier),
       mustLast(row) ? Database::Commit::OnDisk : Database::Commit::Ordinary,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         ApplicationRows before = findApplication(database, row.identifier);
         row.type = before.type();
         putApplication(database, row);
@@ -196,7 +196,7 @@ bool installSystemApplication(DeviceCore& core, const std::string& identifier,
   ApplicationRows before;
   const bool entered = core.database.change(
       fmt::format("{} could not be entered in the registry", identifier), Database::Commit::OnDisk,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         before = findApplication(database, identifier);
         putApplication(database, row);
         appendToIconOrder(database, identifier);

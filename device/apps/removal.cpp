@@ -20,12 +20,12 @@ Refused notInstalled(std::string_view identifier) {
 }
 
 /// What the phone has of an application beside its rows.
-void forgetApplication(SQLite::Database& database, std::string_view identifier) {
+void forgetApplication(Connection& database, std::string_view identifier) {
   removeFromIconOrder(database, identifier);
   abandonData(database, identifier);
 }
 
-void eraseInstalled(SQLite::Database& database, const ApplicationRow& installed) {
+void eraseInstalled(Connection& database, const ApplicationRow& installed) {
   if (installed.type == ApplicationTypeSystem) {
     throw Refused{
         objection(EPERM, installed.identifier, "belongs to the system and cannot be removed")};
@@ -35,12 +35,12 @@ void eraseInstalled(SQLite::Database& database, const ApplicationRow& installed)
   forgetApplication(database, installed.identifier);
 }
 
-void erasePlaceholder(SQLite::Database& database, const ApplicationRow& placeholder) {
+void erasePlaceholder(Connection& database, const ApplicationRow& placeholder) {
   eraseApplication(database, placeholder);
   endInstall(database, placeholder.identifier, InstallState::Canceled);
 }
 
-void enterRemoval(SQLite::Database& database, const ApplicationRow& removed, HistoryOrigin origin) {
+void enterRemoval(Connection& database, const ApplicationRow& removed, HistoryOrigin origin) {
   enterInHistory(database, {.event = HistoryEvent::Removed,
                             .origin = origin,
                             .bundleId = removed.identifier,
@@ -72,7 +72,7 @@ bool removeForClient(DeviceCore& core, const std::string& identifier, bool place
   ApplicationRows removed;
   const bool erased = core.database.change(
       purpose(identifier), Database::Commit::OnDisk,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         ApplicationRows present = findApplication(database, identifier);
         if (present.placeholder) {
           erasePlaceholder(database, *present.placeholder);
@@ -111,7 +111,7 @@ bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optio
   bool brokenOff = false;
   const bool erased = core.database.change(
       purpose(identifier), Database::Commit::OnDisk,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         removed = findApplication(database, identifier);
         if (!removed.any()) throw notInstalled(identifier);
         brokenOff = removed.placeholder && isInstalling(database, identifier);
@@ -137,13 +137,13 @@ bool forgetWaitingData(DeviceCore& core, const std::string& identifier,
   return rows && !rows->any() && core.containers.removeWaitingData(identifier);
 }
 
-void abandonData(SQLite::Database& database, std::string_view name) {
+void abandonData(Connection& database, std::string_view name) {
   Query(database, "INSERT OR REPLACE INTO abandoned_data VALUES (?)", name).run();
 }
 
 std::optional<bool> isAbandoned(DeviceCore& core, std::string_view name,
                                 std::optional<Error>* error) {
-  const auto isNamed = [&](SQLite::Database& database) {
+  const auto isNamed = [&](Connection& database) {
     return Query(database, "SELECT 1 FROM abandoned_data WHERE identifier = ?", name).next();
   };
   return core.database.lookUp("the list of abandoned data could not be read", isNamed, error);
@@ -159,7 +159,7 @@ bool removeAbandonedData(DeviceCore& core, const std::string& name, std::optiona
   return core.database.change(
       // On disk before the application can have new data, which a list come back would name.
       "the list of abandoned data could not be changed", Database::Commit::OnDisk,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         Query(database, "DELETE FROM abandoned_data WHERE identifier = ?", name).run();
       },
       error);

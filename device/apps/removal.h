@@ -33,7 +33,7 @@ bool forgetWaitingData(DeviceCore& core, const std::string& identifier,
 /// Notes that an application's data, and what a restore still had for it, is to be removed, or what
 /// was set aside of it (Containers::asideName). It is only named in this change, so that a crash
 /// before all of it is gone is made good later.
-void abandonData(SQLite::Database& database, std::string_view name);
+void abandonData(Connection& database, std::string_view name);
 /// Whether that was noted and is not done; nullopt with an error.
 std::optional<bool> isAbandoned(DeviceCore& core, std::string_view name,
                                 std::optional<Error>* error);

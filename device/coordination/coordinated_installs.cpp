@@ -67,7 +67,7 @@ HistoryEntry failureOf(const CoordinatorState& state, const Error& reason) {
 
 /// Whether a sync finds all that is left of an application: if the sync comes to nothing, that must
 /// not be gone.
-bool isToStay(SQLite::Database& database, const PlaceholderRow& placeholder) {
+bool isToStay(Connection& database, const PlaceholderRow& placeholder) {
   const ApplicationRows present = findApplication(database, placeholder.identifier);
   return placeholder.installType == InstallType::Sync && !present.installed &&
          present.placeholder && present.placeholder->installType != InstallType::Sync;
@@ -104,7 +104,7 @@ void CoordinatedInstalls::advance(const std::string& identifier, std::int64_t co
 bool CoordinatedInstalls::carryOn(std::int64_t coordinator, std::optional<Error>* error) {
   while (!isLeaving()) {
     const auto state = store_.lookUp(
-        [&](SQLite::Database& database) -> std::optional<CoordinatorState> {
+        [&](Connection& database) -> std::optional<CoordinatorState> {
           const auto row = findCoordinator(database, coordinator);
           if (!row) return std::nullopt;
           return loadState(database, *row);
@@ -142,22 +142,21 @@ void CoordinatedInstalls::removePlaceholder(const std::string& identifier,
     registry_.uninstallApplication(identifier, options);
     return;
   }
-  device_.database.change("an install could not be ended", Database::Commit::Ordinary,
-                          [&](SQLite::Database& database) {
-                            endInstall(database, identifier, InstallState::Canceled);
-                          });
+  device_.database.change(
+      "an install could not be ended", Database::Commit::Ordinary,
+      [&](Connection& database) { endInstall(database, identifier, InstallState::Canceled); });
   device_.observers.installsChanged();
 }
 
 void CoordinatedInstalls::tidyUp(const std::string& identifier) {
-  auto left = store_.lookUp(
-      [&](SQLite::Database& database) { return findLeftovers(database, identifier); });
+  auto left =
+      store_.lookUp([&](Connection& database) { return findLeftovers(database, identifier); });
   if (!left) return;
   for (const PlaceholderRow& placeholder : left->placeholders) {
     removePlaceholder(identifier, placeholder);
     // What cannot be written is found, and tidied up, again.
     store_.change(
-        [&](SQLite::Database& database, Consequences&) {
+        [&](Connection& database, Consequences&) {
           const bool isAdopted = placeholder.presence == Presence::Adopted;
           if (!isAdopted && findApplication(database, identifier).placeholder) return;
           setPresence(database, placeholder, Presence::None);
@@ -168,13 +167,12 @@ void CoordinatedInstalls::tidyUp(const std::string& identifier) {
   for (PromiseRow& package : left->packages) {
     if (isFile(files, *package.path)) files.removeItem(*package.path);
     package.path.reset();
-    store_.change([&](SQLite::Database& database, Consequences&) { put(database, package); },
-                  nullptr);
+    store_.change([&](Connection& database, Consequences&) { put(database, package); }, nullptr);
   }
 }
 
 bool CoordinatedInstalls::change(const CoordinatorState& state,
-                                 const std::function<void(SQLite::Database&, Consequences&)>& work,
+                                 const std::function<void(Connection&, Consequences&)>& work,
                                  Database::Commit commit) {
   std::optional<Error> error;
   if (store_.change(work, &error, commit)) return true;
@@ -184,7 +182,7 @@ bool CoordinatedInstalls::change(const CoordinatorState& state,
 
 Presence CoordinatedInstalls::note(const CoordinatorState& state, Presence presence) {
   Presence noted = Presence::None;
-  const bool changed = change(state, [&](SQLite::Database& database, Consequences& consequences) {
+  const bool changed = change(state, [&](Connection& database, Consequences& consequences) {
     const auto row = findCoordinator(database, state.coordinator.number);
     const auto placeholder = findPlaceholder(database, state.placeholder->number);
     if (!row || !placeholder || !row->isLive() || row->placeholder != placeholder->number) return;
@@ -234,7 +232,7 @@ bool CoordinatedInstalls::installPackage(const CoordinatorState& state) {
 
 CoordinatedInstalls::Beginning CoordinatedInstalls::begin(const CoordinatorState& state) {
   bool ready = false;
-  const bool begun = change(state, [&](SQLite::Database& database, Consequences&) {
+  const bool begun = change(state, [&](Connection& database, Consequences&) {
     auto row = findCoordinator(database, state.coordinator.number);
     ready = row && row->package == state.coordinator.package &&
             nextStep(loadState(database, *row)) == Step::InstallPackage;
@@ -250,7 +248,7 @@ void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optio
   if (error && !fail(state, *error)) return;
   change(
       state,
-      [&](SQLite::Database& database, Consequences& consequences) {
+      [&](Connection& database, Consequences& consequences) {
         const auto row = findCoordinator(database, state.coordinator.number);
         if (row) complete(database, *row, error, consequences);
       },
@@ -265,7 +263,7 @@ bool CoordinatedInstalls::fail(const CoordinatorState& state, const Error& error
   PlaceholderRow left;
   // On record before anything is taken away: what is not, is tried again when the device is next
   // opened.
-  const bool noted = change(state, [&](SQLite::Database& database, Consequences&) {
+  const bool noted = change(state, [&](Connection& database, Consequences&) {
     auto row = findCoordinator(database, state.coordinator.number);
     if (!row || !row->isLive()) return;
     row->error = bytesOf(error);

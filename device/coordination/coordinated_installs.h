@@ -42,7 +42,7 @@ class CoordinatedInstalls {
 
   /// A change for a live coordinator; false, and trouble of the coordinator's, when it fails.
   bool change(const CoordinatorState& state,
-              const std::function<void(SQLite::Database&, Consequences&)>& work,
+              const std::function<void(Connection&, Consequences&)>& work,
               Database::Commit commit = Database::Commit::Ordinary);
   /// Notes the placeholder's presence, Adopted in the place of Begun where one stands already that
   /// is to stay. None when it is not wanted any more, or that failed.

@@ -30,7 +30,7 @@ std::int64_t numberOf(const std::shared_ptr<Object>& object, const ServiceObject
 }
 
 /// Throws Refused for a promise that cannot be kept any more or is another coordinator's.
-void checkPromise(SQLite::Database& database, std::int64_t number, std::int64_t coordinator) {
+void checkPromise(Connection& database, std::int64_t number, std::int64_t coordinator) {
   const auto promise = findPromise(database, number);
   if (!promise || promise->over) refuse(ECANCELED, "the promise has been cancelled or is settled");
   for (const CoordinatorRow& user : coordinatorsUsingPromise(database, number)) {
@@ -41,7 +41,7 @@ void checkPromise(SQLite::Database& database, std::int64_t number, std::int64_t 
 
 /// The number of a promise that can be made to the coordinator.
 template <typename Promise>
-std::int64_t promised(SQLite::Database& database, const std::shared_ptr<Promise>& promise,
+std::int64_t promised(Connection& database, const std::shared_ptr<Promise>& promise,
                       const ServiceObject& owner, std::string_view what, std::int64_t coordinator) {
   const std::int64_t number = numberOf(promise, owner, what);
   checkPromise(database, number, coordinator);
@@ -49,7 +49,7 @@ std::int64_t promised(SQLite::Database& database, const std::shared_ptr<Promise>
 }
 
 /// Throws Refused for a placeholder that the coordinator cannot have.
-void checkPlaceholder(SQLite::Database& database, std::int64_t number, const CoordinatorRow& row) {
+void checkPlaceholder(Connection& database, std::int64_t number, const CoordinatorRow& row) {
   const auto placeholder = findPlaceholder(database, number);
   if (!placeholder || placeholder->over) refuse(ECANCELED, "the placeholder has been cancelled");
   if (!placeholder->configured) {
@@ -139,7 +139,7 @@ bool PlaceholderHandle::change(const CoordinationStore::PlaceholderChange& chang
 bool PlaceholderHandle::setIconPromise(const std::shared_ptr<PathTransferPromise>& promise,
                                        std::optional<Error>* error) noexcept {
   return change(
-      [&](SQLite::Database& database, PlaceholderRow& row) {
+      [&](Connection& database, PlaceholderRow& row) {
         const auto coordinator = coordinatorWithPlaceholder(database, row.number);
         row.icon = promised(database, promise, *this, "icon promise",
                             coordinator ? coordinator->number : 0);
@@ -150,24 +150,22 @@ bool PlaceholderHandle::setIconPromise(const std::shared_ptr<PathTransferPromise
 bool PlaceholderHandle::setPlaceholderAttributes(const PlaceholderAttributes& attributes,
                                                  std::optional<Error>* error) noexcept {
   const auto bytes = bytesOf(attributes, error);
-  return bytes &&
-         change([&](SQLite::Database&, PlaceholderRow& row) { row.attributes = bytes; }, error);
+  return bytes && change([&](Connection&, PlaceholderRow& row) { row.attributes = bytes; }, error);
 }
 
 bool PlaceholderHandle::setMetadata(const StoreMetadata& metadata,
                                     std::optional<Error>* error) noexcept {
   const auto bytes = bytesOf(metadata, error);
-  return bytes &&
-         change([&](SQLite::Database&, PlaceholderRow& row) { row.metadata = bytes; }, error);
+  return bytes && change([&](Connection&, PlaceholderRow& row) { row.metadata = bytes; }, error);
 }
 
 bool PlaceholderHandle::setSinfData(ByteView sinf, std::optional<Error>* error) noexcept {
   const Bytes bytes(sinf.begin(), sinf.end());
-  return change([&](SQLite::Database&, PlaceholderRow& row) { row.sinf = bytes; }, error);
+  return change([&](Connection&, PlaceholderRow& row) { row.sinf = bytes; }, error);
 }
 
 bool PlaceholderHandle::setConfigurationComplete(std::optional<Error>* error) noexcept {
-  return change([](SQLite::Database&, PlaceholderRow& row) { row.configured = true; }, error);
+  return change([](Connection&, PlaceholderRow& row) { row.configured = true; }, error);
 }
 
 bool PlaceholderHandle::cancel(const Error& reason, CoordinationClientId client) noexcept {
@@ -186,8 +184,7 @@ std::optional<CoordinatorRow> CoordinatorHandle::find(std::optional<Error>* erro
     const Lock lock(mutex_);
     if (settled_) return settled_;
   }
-  return lookUp([&](SQLite::Database& database) { return findCoordinator(database, number()); },
-                error);
+  return lookUp([&](Connection& database) { return findCoordinator(database, number()); }, error);
 }
 
 bool CoordinatorHandle::change(const CoordinationStore::CoordinatorChange& change,
@@ -220,15 +217,14 @@ void CoordinatorHandle::setObserver(CoordinatorObserver* observer) noexcept {
 bool CoordinatorHandle::setInstallOptions(const InstallOptions& options,
                                           std::optional<Error>* error) noexcept {
   const auto bytes = bytesOf(options, error);
-  return bytes &&
-         change([&](SQLite::Database&, CoordinatorRow& row) { row.options = bytes; }, error);
+  return bytes && change([&](Connection&, CoordinatorRow& row) { row.options = bytes; }, error);
 }
 
 bool CoordinatorHandle::setInitialQPKAssetPromises(
     const std::vector<std::shared_ptr<DataPromise>>& promises,
     std::optional<Error>* error) noexcept {
   return change(
-      [&](SQLite::Database& database, CoordinatorRow& row) {
+      [&](Connection& database, CoordinatorRow& row) {
         std::vector<std::int64_t> numbers;
         for (const auto& promise : promises) {
           numbers.push_back(promised(database, promise, *this, "initial promise", row.number));
@@ -242,7 +238,7 @@ std::shared_ptr<PathTransferPromise> CoordinatorHandle::appAssetPromise(
     std::optional<Error>* error) noexcept {
   using Promise = std::shared_ptr<PathTransferPromise>;
   return with(Promise(), [&](CoordinationObjects& service) -> Promise {
-    const auto package = [&](SQLite::Database& database) {
+    const auto package = [&](Connection& database) {
       const auto row = findCoordinator(database, number());
       return row ? findPromise(database, row->package) : std::nullopt;
     };
@@ -254,7 +250,7 @@ std::shared_ptr<PathTransferPromise> CoordinatorHandle::appAssetPromise(
 bool CoordinatorHandle::setAppAssetPromise(const std::shared_ptr<PathTransferPromise>& promise,
                                            std::optional<Error>* error) noexcept {
   return change(
-      [&](SQLite::Database& database, CoordinatorRow& row) {
+      [&](Connection& database, CoordinatorRow& row) {
         row.package = promised(database, promise, *this, "package promise", row.number);
       },
       error);
@@ -262,13 +258,13 @@ bool CoordinatorHandle::setAppAssetPromise(const std::shared_ptr<PathTransferPro
 
 bool CoordinatorHandle::setAppAssetPromiseResponsibleClient(CoordinationClientId client,
                                                             std::optional<Error>* error) noexcept {
-  return change([&](SQLite::Database&, CoordinatorRow& row) { row.responsible = client; }, error);
+  return change([&](Connection&, CoordinatorRow& row) { row.responsible = client; }, error);
 }
 
 bool CoordinatorHandle::setUserDataPromise(const std::shared_ptr<OutOfBandTransferPromise>& promise,
                                            std::optional<Error>* error) noexcept {
   return change(
-      [&](SQLite::Database& database, CoordinatorRow& row) {
+      [&](Connection& database, CoordinatorRow& row) {
         row.userData = promised(database, promise, *this, "user data promise", row.number);
       },
       error);
@@ -278,7 +274,7 @@ bool CoordinatorHandle::setPlaceholderPromise(
     const std::shared_ptr<InstallPlaceholder>& placeholder, std::optional<Error>* error) noexcept {
   if (!placeholder) return failWith(error, posixError(EINVAL, "there is no placeholder"));
   return change(
-      [&](SQLite::Database& database, CoordinatorRow& row) {
+      [&](Connection& database, CoordinatorRow& row) {
         const std::int64_t number = numberOf(placeholder, *this, "placeholder");
         checkPlaceholder(database, number, row);
         row.placeholder = number;

@@ -75,7 +75,7 @@ class ServiceObject {
   /// an error) or the service is gone.
   template <typename LookUp>
   auto lookUp(const LookUp& work, std::optional<Error>* error) const {
-    using Found = std::invoke_result_t<LookUp, SQLite::Database&>;
+    using Found = std::invoke_result_t<LookUp, Connection&>;
     return with(Found(), [&](CoordinationObjects& service) {
       return service.store.lookUp(work, error).value_or(Found());
     });
@@ -119,7 +119,7 @@ class PromiseHandle : public Promise, public ServiceObject {
 
  protected:
   PromiseRow row() const {
-    const auto find = [&](SQLite::Database& database) { return findPromise(database, number()); };
+    const auto find = [&](Connection& database) { return findPromise(database, number()); };
     return lookUp(find, nullptr).value_or(PromiseRow());
   }
   /// For what its coordinator cannot do without.

@@ -18,7 +18,7 @@ constexpr std::size_t LongestShown = 200;
 /// Looks through one coordinator at a time.
 class Repair {
  public:
-  Repair(DeviceCore& device, SQLite::Database& database, Consequences& consequences,
+  Repair(DeviceCore& device, Connection& database, Consequences& consequences,
          std::vector<std::string>& notes)
       : device_(device), database_(database), consequences_(consequences), notes_(notes) {}
 
@@ -130,7 +130,7 @@ class Repair {
   }
 
   DeviceCore& device_;
-  SQLite::Database& database_;
+  Connection& database_;
   Consequences& consequences_;
   std::vector<std::string>& notes_;
 };
@@ -163,7 +163,7 @@ DELETE FROM data_promises WHERE number NOT IN
 )";
 
 /// Cancellations are for the process that was sending the package, which is gone.
-void forgetEventsForNobody(SQLite::Database& database) {
+void forgetEventsForNobody(Connection& database) {
   Query(database,
         "DELETE FROM coordinator_events WHERE kind NOT BETWEEN ?1 AND ?2 OR "
         "coordinator NOT IN (SELECT number FROM install_coordinators)",
@@ -172,7 +172,7 @@ void forgetEventsForNobody(SQLite::Database& database) {
 }
 
 /// How many were too old to be kept.
-int forgetOldEvents(SQLite::Database& database) {
+int forgetOldEvents(Connection& database) {
   return Query(database,
                "DELETE FROM coordinator_events WHERE number <= "
                "(SELECT max(number) FROM coordinator_events) - ?1",
@@ -187,7 +187,7 @@ std::optional<Consequences> repairCoordination(DeviceCore& device) {
   std::vector<std::string> notes;
   const bool repaired =
       device.database.change("the install coordinators could not be looked through",
-                             Database::Commit::OnDisk, [&](SQLite::Database& database) {
+                             Database::Commit::OnDisk, [&](Connection& database) {
                                Repair repair(device, database, consequences, notes);
                                for (CoordinatorRow& row : allCoordinators(database))
                                  repair.run(std::move(row));
@@ -202,7 +202,7 @@ std::optional<Consequences> repairCoordination(DeviceCore& device) {
 void sweepCoordination(DeviceCore& device) {
   int forgotten = 0;
   device.database.change("what install coordinators left could not be swept",
-                         Database::Commit::Ordinary, [&](SQLite::Database& database) {
+                         Database::Commit::Ordinary, [&](Connection& database) {
                            forgetEventsForNobody(database);
                            forgotten = forgetOldEvents(database);
                            database.exec(CoordinatorsOver);

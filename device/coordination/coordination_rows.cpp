@@ -87,7 +87,7 @@ std::optional<std::int64_t> keyOf(std::int64_t number) {
   return number == 0 ? std::nullopt : std::optional(number);
 }
 
-void take(std::int64_t& number, const SQLite::Database& database) {
+void take(std::int64_t& number, const Connection& database) {
   if (number == 0) number = database.getLastInsertRowid();
 }
 
@@ -114,16 +114,16 @@ std::optional<Error> errorIn(const PropertyList::Dictionary& tree) {
 
 }  // namespace
 
-void makeCoordinationTables(SQLite::Database& database) { database.exec(Schema); }
+void makeCoordinationTables(Connection& database) { database.exec(Schema); }
 
-std::optional<CoordinatorRow> findCoordinator(SQLite::Database& database, std::int64_t number) {
+std::optional<CoordinatorRow> findCoordinator(Connection& database, std::int64_t number) {
   return firstOf(Query(database,
                        "SELECT " COORDINATOR_COLUMNS " FROM install_coordinators c "
                        "WHERE c.number = ?",
                        number));
 }
 
-std::optional<CoordinatorRow> findLiveCoordinator(SQLite::Database& database,
+std::optional<CoordinatorRow> findLiveCoordinator(Connection& database,
                                                   std::string_view identifier) {
   return firstOf(Query(database,
                        "SELECT " COORDINATOR_COLUMNS " FROM install_coordinators c "
@@ -131,14 +131,13 @@ std::optional<CoordinatorRow> findLiveCoordinator(SQLite::Database& database,
                        identifier));
 }
 
-std::vector<CoordinatorRow> allCoordinators(SQLite::Database& database) {
+std::vector<CoordinatorRow> allCoordinators(Connection& database) {
   return Query(database,
                "SELECT " COORDINATOR_COLUMNS " FROM install_coordinators c ORDER BY c.number")
       .all(coordinatorIn);
 }
 
-std::vector<CoordinatorRow> coordinatorsUsingPromise(SQLite::Database& database,
-                                                     std::int64_t promise) {
+std::vector<CoordinatorRow> coordinatorsUsingPromise(Connection& database, std::int64_t promise) {
   return Query(database,
                "SELECT " COORDINATOR_COLUMNS
                " FROM install_coordinators c "
@@ -149,7 +148,7 @@ std::vector<CoordinatorRow> coordinatorsUsingPromise(SQLite::Database& database,
       .all(coordinatorIn);
 }
 
-std::optional<CoordinatorRow> coordinatorWithPlaceholder(SQLite::Database& database,
+std::optional<CoordinatorRow> coordinatorWithPlaceholder(Connection& database,
                                                          std::int64_t placeholder) {
   return firstOf(Query(database,
                        "SELECT " COORDINATOR_COLUMNS " FROM install_coordinators c "
@@ -157,7 +156,7 @@ std::optional<CoordinatorRow> coordinatorWithPlaceholder(SQLite::Database& datab
                        placeholder));
 }
 
-void put(SQLite::Database& database, CoordinatorRow& row) {
+void put(Connection& database, CoordinatorRow& row) {
   Query(database,
         "INSERT OR REPLACE INTO install_coordinators VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
         keyOf(row.number), row.identifier, row.kind, row.creator, row.stage, row.options,
@@ -166,8 +165,7 @@ void put(SQLite::Database& database, CoordinatorRow& row) {
   take(row.number, database);
 }
 
-std::optional<PromiseRow> findPromise(SQLite::Database& database,
-                                      std::optional<std::int64_t> number) {
+std::optional<PromiseRow> findPromise(Connection& database, std::optional<std::int64_t> number) {
   Query query(database,
               "SELECT number, sort, name, client, disk_space, path, path_is_directory, percent, "
               "complete, began, over FROM data_promises WHERE number = ?",
@@ -179,7 +177,7 @@ std::optional<PromiseRow> findPromise(SQLite::Database& database,
   return row;
 }
 
-void put(SQLite::Database& database, PromiseRow& row) {
+void put(Connection& database, PromiseRow& row) {
   Query(database, "INSERT OR REPLACE INTO data_promises VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
         keyOf(row.number), row.sort, row.name, row.client, row.diskSpace, row.path,
         row.pathIsDirectory, row.percent, row.complete, row.began, row.over)
@@ -187,7 +185,7 @@ void put(SQLite::Database& database, PromiseRow& row) {
   take(row.number, database);
 }
 
-std::optional<PlaceholderRow> findPlaceholder(SQLite::Database& database,
+std::optional<PlaceholderRow> findPlaceholder(Connection& database,
                                               std::optional<std::int64_t> number) {
   Query query(database,
               "SELECT number, identifier, name, install_type, client, icon_promise, attributes, "
@@ -201,7 +199,7 @@ std::optional<PlaceholderRow> findPlaceholder(SQLite::Database& database,
   return row;
 }
 
-void put(SQLite::Database& database, PlaceholderRow& row) {
+void put(Connection& database, PlaceholderRow& row) {
   Query(database,
         "INSERT OR REPLACE INTO install_placeholders VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
         keyOf(row.number), row.identifier, row.name, row.installType, row.client, row.icon,
@@ -210,7 +208,7 @@ void put(SQLite::Database& database, PlaceholderRow& row) {
   take(row.number, database);
 }
 
-void addEvent(SQLite::Database& database, const CoordinatorRow& coordinator, EventKind kind,
+void addEvent(Connection& database, const CoordinatorRow& coordinator, EventKind kind,
               std::uint64_t promise, const std::optional<Bytes>& reason,
               CoordinationClientId client) {
   Query(database, "INSERT INTO coordinator_events VALUES (NULL, ?, ?, ?, ?, ?)", coordinator.number,
@@ -218,7 +216,7 @@ void addEvent(SQLite::Database& database, const CoordinatorRow& coordinator, Eve
       .run();
 }
 
-std::vector<EventRow> pendingEvents(SQLite::Database& database) {
+std::vector<EventRow> pendingEvents(Connection& database) {
   return Query(database, "SELECT " COORDINATOR_COLUMNS
                          ", e.number, e.kind, e.promise, e.reason, e.client "
                          "FROM coordinator_events e JOIN install_coordinators c "
@@ -232,7 +230,7 @@ std::vector<EventRow> pendingEvents(SQLite::Database& database) {
       });
 }
 
-void removeEvent(SQLite::Database& database, std::int64_t number) {
+void removeEvent(Connection& database, std::int64_t number) {
   Query(database, "DELETE FROM coordinator_events WHERE number = ?", number).run();
 }
 

@@ -97,37 +97,35 @@ struct EventRow {
 };
 
 /// Makes those of the coordination service's tables that are missing. Throws SQLite::Exception.
-void makeCoordinationTables(SQLite::Database& database);
+void makeCoordinationTables(Connection& database);
 
 // These throw SQLite::Exception and are used within Database's work. "put" enters a row that has no
 // number yet and gives it one.
 
-std::optional<CoordinatorRow> findCoordinator(SQLite::Database& database, std::int64_t number);
-std::optional<CoordinatorRow> findLiveCoordinator(SQLite::Database& database,
+std::optional<CoordinatorRow> findCoordinator(Connection& database, std::int64_t number);
+std::optional<CoordinatorRow> findLiveCoordinator(Connection& database,
                                                   std::string_view identifier);
-std::vector<CoordinatorRow> allCoordinators(SQLite::Database& database);
+std::vector<CoordinatorRow> allCoordinators(Connection& database);
 /// The live coordinators that use a promise for their package, their user data or their
 /// placeholder's icon.
-std::vector<CoordinatorRow> coordinatorsUsingPromise(SQLite::Database& database,
-                                                     std::int64_t promise);
-std::optional<CoordinatorRow> coordinatorWithPlaceholder(SQLite::Database& database,
+std::vector<CoordinatorRow> coordinatorsUsingPromise(Connection& database, std::int64_t promise);
+std::optional<CoordinatorRow> coordinatorWithPlaceholder(Connection& database,
                                                          std::int64_t placeholder);
-void put(SQLite::Database& database, CoordinatorRow& row);
+void put(Connection& database, CoordinatorRow& row);
 
-std::optional<PromiseRow> findPromise(SQLite::Database& database,
-                                      std::optional<std::int64_t> number);
-void put(SQLite::Database& database, PromiseRow& row);
+std::optional<PromiseRow> findPromise(Connection& database, std::optional<std::int64_t> number);
+void put(Connection& database, PromiseRow& row);
 
-std::optional<PlaceholderRow> findPlaceholder(SQLite::Database& database,
+std::optional<PlaceholderRow> findPlaceholder(Connection& database,
                                               std::optional<std::int64_t> number);
-void put(SQLite::Database& database, PlaceholderRow& row);
+void put(Connection& database, PlaceholderRow& row);
 
-void addEvent(SQLite::Database& database, const CoordinatorRow& coordinator, EventKind kind,
+void addEvent(Connection& database, const CoordinatorRow& coordinator, EventKind kind,
               std::uint64_t promise = 0, const std::optional<Bytes>& reason = std::nullopt,
               CoordinationClientId client = 0);
 /// In the order in which they came about.
-std::vector<EventRow> pendingEvents(SQLite::Database& database);
-void removeEvent(SQLite::Database& database, std::int64_t number);
+std::vector<EventRow> pendingEvents(Connection& database);
+void removeEvent(Connection& database, std::int64_t number);
 
 // Values of the coordination service as binary property lists. Those that come from clients may
 // hold what no property list can (then nullopt and an error); bytes that are not what was written

@@ -7,14 +7,14 @@ namespace {
 
 bool isFulfilled(const PromiseRow& package) { return package.complete && package.path; }
 
-void end(SQLite::Database& database, std::optional<PromiseRow> promise) {
+void end(Connection& database, std::optional<PromiseRow> promise) {
   if (!promise || promise->over) return;
   promise->over = true;
   put(database, *promise);
 }
 
 /// Nothing that belongs to the coordinator changes any more.
-void settle(SQLite::Database& database, const CoordinatorRow& coordinator) {
+void settle(Connection& database, const CoordinatorRow& coordinator) {
   end(database, findPromise(database, coordinator.package));
   end(database, findPromise(database, coordinator.userData));
   if (coordinator.initialPromises) {
@@ -30,7 +30,7 @@ void settle(SQLite::Database& database, const CoordinatorRow& coordinator) {
   }
 }
 
-void noteBeginning(SQLite::Database& database, const CoordinatorRow& coordinator,
+void noteBeginning(Connection& database, const CoordinatorRow& coordinator,
                    std::optional<PromiseRow> promise, Consequences& consequences) {
   if (!promise || promise->over || promise->began) return;
   if (promise->percent <= 0 && !promise->path) return;
@@ -42,7 +42,7 @@ void noteBeginning(SQLite::Database& database, const CoordinatorRow& coordinator
 }
 
 /// A restored application that a person does not want goes with what the restore had for it.
-void forsake(SQLite::Database& database, const CoordinatorRow& coordinator) {
+void forsake(Connection& database, const CoordinatorRow& coordinator) {
   const auto placeholder = findPlaceholder(database, coordinator.placeholder);
   const bool waits =
       placeholder && placeholder->installType == InstallType::Restore &&
@@ -67,14 +67,14 @@ Step nextStep(const CoordinatorState& state) {
   return ready ? Step::InstallPackage : Step::None;
 }
 
-CoordinatorState loadState(SQLite::Database& database, const CoordinatorRow& coordinator) {
+CoordinatorState loadState(Connection& database, const CoordinatorRow& coordinator) {
   CoordinatorState state{coordinator, findPlaceholder(database, coordinator.placeholder),
                          std::nullopt, findPromise(database, coordinator.package)};
   if (state.placeholder) state.icon = findPromise(database, state.placeholder->icon);
   return state;
 }
 
-void noteConsequences(SQLite::Database& database, const CoordinatorRow& coordinator,
+void noteConsequences(Connection& database, const CoordinatorRow& coordinator,
                       Consequences& consequences) {
   if (!coordinator.isLive()) return;
   const CoordinatorState state = loadState(database, coordinator);
@@ -85,7 +85,7 @@ void noteConsequences(SQLite::Database& database, const CoordinatorRow& coordina
   }
 }
 
-bool cancel(SQLite::Database& database, CoordinatorRow coordinator, const Error& reason,
+bool cancel(Connection& database, CoordinatorRow coordinator, const Error& reason,
             CoordinationClientId client, Consequences& consequences) {
   if (coordinator.stage != Stage::Waiting) return false;
   coordinator.stage = Stage::Cancelled;
@@ -101,8 +101,8 @@ bool cancel(SQLite::Database& database, CoordinatorRow coordinator, const Error&
   return true;
 }
 
-void complete(SQLite::Database& database, CoordinatorRow coordinator,
-              const std::optional<Error>& error, Consequences& consequences) {
+void complete(Connection& database, CoordinatorRow coordinator, const std::optional<Error>& error,
+              Consequences& consequences) {
   if (!coordinator.isLive()) return;
   coordinator.stage = Stage::Completed;
   if (error) coordinator.error = bytesOf(*error);
@@ -113,25 +113,25 @@ void complete(SQLite::Database& database, CoordinatorRow coordinator,
   consequences.over.insert(coordinator.identifier);
 }
 
-bool lostItsPlaceholder(SQLite::Database& database, const CoordinatorRow& coordinator) {
+bool lostItsPlaceholder(Connection& database, const CoordinatorRow& coordinator) {
   const auto placeholder = findPlaceholder(database, coordinator.placeholder);
   return coordinator.stage == Stage::Waiting && placeholder && placeholder->stands() &&
          !findApplication(database, coordinator.identifier).placeholder;
 }
 
-bool waitsOn(SQLite::Database& database, const CoordinatorRow& coordinator,
+bool waitsOn(Connection& database, const CoordinatorRow& coordinator,
              const PlaceholderRow& placeholder) {
   return coordinator.kind == CoordinatorKind::Restoring && placeholder.stands() &&
          placeholder.identifier == coordinator.identifier &&
          !findApplication(database, coordinator.identifier).installed;
 }
 
-void setPresence(SQLite::Database& database, PlaceholderRow placeholder, Presence presence) {
+void setPresence(Connection& database, PlaceholderRow placeholder, Presence presence) {
   placeholder.presence = presence;
   put(database, placeholder);
 }
 
-Leftovers findLeftovers(SQLite::Database& database, std::string_view identifier) {
+Leftovers findLeftovers(Connection& database, std::string_view identifier) {
   Leftovers left;
   Query placeholders(database,
                      "SELECT p.number FROM install_placeholders p JOIN install_coordinators c "

@@ -38,37 +38,37 @@ struct Consequences {
 
 // Changes of state. These throw SQLite::Exception and are used within Database's work.
 
-CoordinatorState loadState(SQLite::Database& database, const CoordinatorRow& coordinator);
+CoordinatorState loadState(Connection& database, const CoordinatorRow& coordinator);
 
 /// To be called when anything has changed that a live coordinator depends on: enters the events
 /// that this brings about.
-void noteConsequences(SQLite::Database& database, const CoordinatorRow& coordinator,
+void noteConsequences(Connection& database, const CoordinatorRow& coordinator,
                       Consequences& consequences);
 
 /// False when the coordinator is past cancelling.
-bool cancel(SQLite::Database& database, CoordinatorRow coordinator, const Error& reason,
+bool cancel(Connection& database, CoordinatorRow coordinator, const Error& reason,
             CoordinationClientId client, Consequences& consequences);
 
 /// The coordinator has come to its end, with an error if it failed.
-void complete(SQLite::Database& database, CoordinatorRow coordinator,
-              const std::optional<Error>& error, Consequences& consequences);
+void complete(Connection& database, CoordinatorRow coordinator, const std::optional<Error>& error,
+              Consequences& consequences);
 
 /// Whether what stood in the registry for the coordinator was taken away by somebody else. While a
 /// package is being installed it goes by itself.
-bool lostItsPlaceholder(SQLite::Database& database, const CoordinatorRow& coordinator);
+bool lostItsPlaceholder(Connection& database, const CoordinatorRow& coordinator);
 
 /// Whether a restored application waits on, as its placeholder, when its package does not come.
-bool waitsOn(SQLite::Database& database, const CoordinatorRow& coordinator,
+bool waitsOn(Connection& database, const CoordinatorRow& coordinator,
              const PlaceholderRow& placeholder);
 
 /// Changes a placeholder's presence.
-void setPresence(SQLite::Database& database, PlaceholderRow placeholder, Presence presence);
+void setPresence(Connection& database, PlaceholderRow placeholder, Presence presence);
 
 /// What coordinators that are over leave behind.
 struct Leftovers {
   std::vector<PlaceholderRow> placeholders;  ///< that nobody wants; perhaps in the registry
   std::vector<PromiseRow> packages;          ///< with a path to a file that is the service's
 };
-Leftovers findLeftovers(SQLite::Database& database, std::string_view identifier);
+Leftovers findLeftovers(Connection& database, std::string_view identifier);
 
 }  // namespace appsync::device

@@ -13,12 +13,11 @@ Refused isOver(std::string_view what) {
 
 }  // namespace
 
-bool CoordinationStore::change(const std::function<void(SQLite::Database&, Consequences&)>& work,
+bool CoordinationStore::change(const std::function<void(Connection&, Consequences&)>& work,
                                std::optional<Error>* error, Database::Commit commit) {
   Consequences consequences;
   const bool changed = database_.change(
-      ChangeFailed, commit, [&](SQLite::Database& database) { work(database, consequences); },
-      error);
+      ChangeFailed, commit, [&](Connection& database) { work(database, consequences); }, error);
   if (changed) carryOut_(consequences);
   return changed;
 }
@@ -26,7 +25,7 @@ bool CoordinationStore::change(const std::function<void(SQLite::Database&, Conse
 bool CoordinationStore::changeCoordinator(std::int64_t number, const CoordinatorChange& work,
                                           std::optional<Error>* error) {
   return change(
-      [&](SQLite::Database& database, Consequences& consequences) {
+      [&](Connection& database, Consequences& consequences) {
         auto row = findCoordinator(database, number);
         if (!row || !row->isLive()) throw isOver("the install is over");
         if (row->stage != Stage::Waiting) throw isOver("the package is being installed already");
@@ -40,7 +39,7 @@ bool CoordinationStore::changeCoordinator(std::int64_t number, const Coordinator
 bool CoordinationStore::changePromise(std::int64_t number, const PromiseChange& work,
                                       std::optional<Error>* error) {
   return change(
-      [&](SQLite::Database& database, Consequences& consequences) {
+      [&](Connection& database, Consequences& consequences) {
         auto row = findPromise(database, number);
         if (!row || row->over) return;
         work(*row);
@@ -57,7 +56,7 @@ bool CoordinationStore::changePromise(std::int64_t number, const PromiseChange& 
 bool CoordinationStore::changePlaceholder(std::int64_t number, const PlaceholderChange& work,
                                           std::optional<Error>* error) {
   return change(
-      [&](SQLite::Database& database, Consequences& consequences) {
+      [&](Connection& database, Consequences& consequences) {
         auto row = findPlaceholder(database, number);
         if (!row || row->over) throw isOver("the placeholder is over");
         work(database, *row);
@@ -73,7 +72,7 @@ bool CoordinationStore::cancelCoordinator(std::int64_t number, const Error& reas
                                           CoordinationClientId client) {
   bool cancelled = false;
   const bool changed = change(
-      [&](SQLite::Database& database, Consequences& consequences) {
+      [&](Connection& database, Consequences& consequences) {
         const auto row = findCoordinator(database, number);
         cancelled = row && (row->stage == Stage::Cancelled ||
                             device::cancel(database, *row, reason, client, consequences));
@@ -85,7 +84,7 @@ bool CoordinationStore::cancelCoordinator(std::int64_t number, const Error& reas
 bool CoordinationStore::cancelPromise(std::int64_t number, const Error& reason,
                                       CoordinationClientId client) {
   return change(
-      [&](SQLite::Database& database, Consequences& consequences) {
+      [&](Connection& database, Consequences& consequences) {
         auto row = findPromise(database, number);
         if (!row || row->over) return;
         const auto users = coordinatorsUsingPromise(database, number);
@@ -110,7 +109,7 @@ bool CoordinationStore::cancelPlaceholder(std::int64_t number, const Error& reas
                                           CoordinationClientId client) {
   bool cancelled = true;
   const bool changed = change(
-      [&](SQLite::Database& database, Consequences& consequences) {
+      [&](Connection& database, Consequences& consequences) {
         auto row = findPlaceholder(database, number);
         if (!row || row->over) return;
         if (const auto coordinator = coordinatorWithPlaceholder(database, number)) {
@@ -130,8 +129,8 @@ void CoordinationStore::noteTrouble(std::int64_t coordinator, const Error& error
 }
 
 void CoordinationStore::noteTroubleWithPromise(std::int64_t promise, const Error& error) {
-  const auto users = lookUp(
-      [&](SQLite::Database& database) { return coordinatorsUsingPromise(database, promise); });
+  const auto users =
+      lookUp([&](Connection& database) { return coordinatorsUsingPromise(database, promise); });
   if (!users) return;
   for (const CoordinatorRow& user : *users) noteTrouble(user.number, error);
 }

@@ -17,7 +17,7 @@ class CoordinationStore {
       : database_(database), carryOut_(std::move(carryOut)) {}
 
   /// Runs work in one transaction and then does what follows from it.
-  bool change(const std::function<void(SQLite::Database&, Consequences&)>& work,
+  bool change(const std::function<void(Connection&, Consequences&)>& work,
               std::optional<Error>* error, Database::Commit commit = Database::Commit::Ordinary);
   /// What the work finds; nullopt, with an error, when it fails.
   template <typename LookUp>
@@ -27,9 +27,9 @@ class CoordinationStore {
 
   // Changes. False with an error when the object is over, or the change is refused (Refused thrown
   // by `change`) or fails. A promise that is over is left as it is, which is no failure.
-  using CoordinatorChange = std::function<void(SQLite::Database&, CoordinatorRow&)>;
+  using CoordinatorChange = std::function<void(Connection&, CoordinatorRow&)>;
   using PromiseChange = std::function<void(PromiseRow&)>;
-  using PlaceholderChange = std::function<void(SQLite::Database&, PlaceholderRow&)>;
+  using PlaceholderChange = std::function<void(Connection&, PlaceholderRow&)>;
   bool changeCoordinator(std::int64_t number, const CoordinatorChange& change,
                          std::optional<Error>* error);
   bool changePromise(std::int64_t number, const PromiseChange& change, std::optional<Error>* error);

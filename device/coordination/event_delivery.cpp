@@ -192,7 +192,7 @@ void EventDelivery::send(const EventRow& event, CoordinatorObserver& observer) {
 void EventDelivery::remove(const EventRow& event) {
   const bool removed = database_.change(
       "an event that was delivered could not be taken out", Database::Commit::Ordinary,
-      [&](SQLite::Database& database) { removeEvent(database, event.number); });
+      [&](Connection& database) { removeEvent(database, event.number); });
   if (removed) return;
   const Lock lock(mutex_);
   delivered_.insert(event.number);

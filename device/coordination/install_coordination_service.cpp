@@ -45,7 +45,7 @@ bool endAlike(CoordinatorKind one, CoordinatorKind other) {
 }
 
 /// Why nobody is served by going on with a live coordinator; none if it can be taken up again.
-std::optional<std::string> objectionTo(SQLite::Database& database, const CoordinatorRow& row,
+std::optional<std::string> objectionTo(Connection& database, const CoordinatorRow& row,
                                        CoordinatorKind kind) {
   if (lostItsPlaceholder(database, row)) return "its placeholder was taken away";
   if (!endAlike(row.kind, kind)) return "it is restored in another way";
@@ -117,7 +117,7 @@ std::shared_ptr<InstallCoordinator> DeviceInstallCoordination::coordinatorFor(
   std::optional<CoordinatorRow> found;
   bool made = false;
   const bool changed = store_.change(
-      [&](SQLite::Database& database, Consequences& consequences) {
+      [&](Connection& database, Consequences& consequences) {
         found = findLiveCoordinator(database, bundleId);
         if (found && endedFor(database, *found, kind, client, consequences)) found.reset();
         made = !found;
@@ -135,12 +135,11 @@ std::shared_ptr<InstallCoordinator> DeviceInstallCoordination::coordinatorFor(
 std::optional<CoordinatorRow> DeviceInstallCoordination::liveCoordinator(
     std::string_view bundleId, std::optional<Error>* error) {
   return store_
-      .lookUp([&](SQLite::Database& database) { return findLiveCoordinator(database, bundleId); },
-              error)
+      .lookUp([&](Connection& database) { return findLiveCoordinator(database, bundleId); }, error)
       .value_or(std::nullopt);
 }
 
-bool DeviceInstallCoordination::endedFor(SQLite::Database& database, const CoordinatorRow& live,
+bool DeviceInstallCoordination::endedFor(Connection& database, const CoordinatorRow& live,
                                          CoordinatorKind kind, CoordinationClientId client,
                                          Consequences& consequences) {
   std::optional<std::string> why = objectionTo(database, live, kind);
@@ -162,8 +161,7 @@ void DeviceInstallCoordination::removeObserver(CoordinatorObserver* observer) no
 
 template <typename Row>
 bool DeviceInstallCoordination::enter(Row& row) {
-  return store_.change([&](SQLite::Database& database, Consequences&) { put(database, row); },
-                       nullptr);
+  return store_.change([&](Connection& database, Consequences&) { put(database, row); }, nullptr);
 }
 
 std::shared_ptr<PathTransferPromise> DeviceInstallCoordination::createPathTransferPromise(
@@ -230,7 +228,7 @@ std::optional<bool> DeviceInstallCoordination::endLive(const std::string& identi
                                                        std::optional<Error>* error) {
   const Error reason = objection(ECANCELED, identifier, "was uninstalled");
   bool ended = false;
-  const auto end = [&](SQLite::Database& database, Consequences& consequences) {
+  const auto end = [&](Connection& database, Consequences& consequences) {
     const auto live = findLiveCoordinator(database, identifier);
     ended = live && cancel(database, *live, reason, DeviceClientID, consequences);
   };
@@ -246,7 +244,7 @@ std::unique_ptr<CoordinatorEventListener> DeviceInstallCoordination::createEvent
 bool DeviceInstallCoordination::tap(std::string_view bundleId) noexcept {
   bool live = false;
   const bool noted = store_.change(
-      [&](SQLite::Database& database, Consequences& consequences) {
+      [&](Connection& database, Consequences& consequences) {
         const auto row = findLiveCoordinator(database, bundleId);
         live = row.has_value();
         if (!live) return;
@@ -272,7 +270,7 @@ bool DeviceInstallCoordination::isBusy(std::string_view bundleId) noexcept {
 
 std::set<std::string> DeviceInstallCoordination::packagesOwedBy(
     CoordinationClientId client) noexcept {
-  const auto owed = [&](SQLite::Database& database) {
+  const auto owed = [&](Connection& database) {
     std::set<std::string> identifiers;
     for (const CoordinatorRow& row : allCoordinators(database)) {
       if (!row.isLive() || row.responsible != client) continue;

@@ -90,7 +90,7 @@ class DeviceInstallCoordination final : public InstallCoordination {
   std::optional<bool> endLive(const std::string& identifier, std::optional<Error>* error);
   /// Ends a live coordinator that nobody is served by going on with, if it is this client's. Throws
   /// Refused when one that does not serve cannot be ended.
-  bool endedFor(SQLite::Database& database, const CoordinatorRow& live, CoordinatorKind kind,
+  bool endedFor(Connection& database, const CoordinatorRow& live, CoordinatorKind kind,
                 CoordinationClientId client, Consequences& consequences);
   /// Enters a promise or a placeholder.
   template <typename Row>

@@ -52,9 +52,9 @@ int DeviceHomeScreen::setIconState(Port port, ByteView layout) noexcept {
   const std::optional<PropertyList> parsed = parsePropertyList(layout);
   const auto identifiers = parsed ? flattenIconLayout(*parsed) : std::nullopt;
   if (!identifiers) return EINVAL;
-  const bool adopted = core_.database.change(
-      "the icon layout could not be kept", Database::Commit::Ordinary,
-      [&](SQLite::Database& database) { adoptIconOrder(database, *identifiers); });
+  const bool adopted =
+      core_.database.change("the icon layout could not be kept", Database::Commit::Ordinary,
+                            [&](Connection& database) { adoptIconOrder(database, *identifiers); });
   return adopted ? 0 : EIO;
 }
 

@@ -12,11 +12,11 @@ namespace appsync::device {
 // Database's work.
 
 /// An application that has no place yet gets the last one.
-void appendToIconOrder(SQLite::Database& database, std::string_view identifier);
-void removeFromIconOrder(SQLite::Database& database, std::string_view identifier);
+void appendToIconOrder(Connection& database, std::string_view identifier);
+void removeFromIconOrder(Connection& database, std::string_view identifier);
 /// Puts these first, in this order, and all others behind them as they stood.
-void adoptIconOrder(SQLite::Database& database, const std::vector<std::string>& identifiers);
+void adoptIconOrder(Connection& database, const std::vector<std::string>& identifiers);
 /// The applications and placeholders on the device, in the order of their icons.
-std::vector<std::string> shownIconOrder(SQLite::Database& database);
+std::vector<std::string> shownIconOrder(Connection& database);
 
 }  // namespace appsync::device

@@ -6,7 +6,7 @@ namespace appsync::device {
 namespace {
 
 /// A device made by an older program has it only after it was opened for writing.
-bool hasTable(SQLite::Database& database) {
+bool hasTable(Connection& database) {
   return Query(database, "SELECT 1 FROM sqlite_schema WHERE type = 'table' AND name = 'history'")
       .next();
 }
@@ -20,7 +20,7 @@ HistoryEntry entryOf(const Query& query) {
 
 }  // namespace
 
-void makeHistoryTable(SQLite::Database& database) {
+void makeHistoryTable(Connection& database) {
   database.exec(R"(
 CREATE TABLE IF NOT EXISTS history (
   number INTEGER PRIMARY KEY AUTOINCREMENT,
@@ -34,7 +34,7 @@ CREATE TABLE IF NOT EXISTS history (
 ))");
 }
 
-void enterInHistory(SQLite::Database& database, const HistoryEntry& entry) {
+void enterInHistory(Connection& database, const HistoryEntry& entry) {
   Query(database,
         "INSERT INTO history (time, event, origin, identifier, version, replaced, reason) "
         "VALUES (?, ?, ?, ?, ?, ?, ?)",
@@ -46,7 +46,7 @@ void enterInHistory(SQLite::Database& database, const HistoryEntry& entry) {
 }
 
 std::vector<HistoryEntry> readHistory(Database& database, std::optional<Error>* error) {
-  const auto allEntries = [](SQLite::Database& connection) {
+  const auto allEntries = [](Connection& connection) {
     if (!hasTable(connection)) return std::vector<HistoryEntry>();
     return Query(connection,
                  "SELECT number, time, event, origin, identifier, version, replaced, reason "

@@ -13,11 +13,11 @@ namespace appsync::device {
 inline constexpr std::int64_t HistoryEntriesKept = 10'000;
 
 /// What happened to the device's applications, one entry an application and event.
-void makeHistoryTable(SQLite::Database& database);
+void makeHistoryTable(Connection& database);
 
 /// Belongs into the transaction that brings about what the entry tells; number and time are filled
 /// in. Throws SQLite::Exception.
-void enterInHistory(SQLite::Database& database, const HistoryEntry& entry);
+void enterInHistory(Connection& database, const HistoryEntry& entry);
 
 /// Oldest first. None, with an error, when it cannot be read.
 std::vector<HistoryEntry> readHistory(Database& database, std::optional<Error>* error);

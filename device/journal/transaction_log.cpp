@@ -45,7 +45,7 @@ void StoredTransactionLog::keep(const TransactionRecord& record) noexcept {
   const Lock lock(mutex_);
   database_.change(
       "a transaction record could not be kept", Database::Commit::Ordinary,
-      [&](SQLite::Database& database) APPSYNC_REQUIRES(mutex_) {
+      [&](Connection& database) APPSYNC_REQUIRES(mutex_) {
         Query(database,
               "INSERT INTO transactions (time, subsystem, category, scenario, step, party, phase, "
               "success, identifier, description) VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
@@ -60,7 +60,7 @@ void StoredTransactionLog::keep(const TransactionRecord& record) noexcept {
 
 std::vector<TransactionRecord> StoredTransactionLog::recordsAfter(
     std::int64_t number, std::optional<Error>* error) noexcept {
-  const auto laterRecords = [&](SQLite::Database& database) {
+  const auto laterRecords = [&](Connection& database) {
     return Query(database,
                  "SELECT number, time, scenario, step, party, phase, success, identifier, "
                  "description FROM transactions WHERE number > ? ORDER BY number",

@@ -50,7 +50,7 @@ void describe(ApplicationRow& row, const PropertyList::Dictionary& info) {
   row.launchProhibited = findFlag(info, "SWApplicationLaunchProhibited");
 }
 
-ApplicationRows findApplication(SQLite::Database& database, std::string_view identifier) {
+ApplicationRows findApplication(Connection& database, std::string_view identifier) {
   ApplicationRows rows;
   Query query(database, "SELECT " APPLICATION_COLUMNS " FROM applications WHERE identifier = ?",
               identifier);
@@ -61,13 +61,13 @@ ApplicationRows findApplication(SQLite::Database& database, std::string_view ide
   return rows;
 }
 
-std::vector<ApplicationRow> allApplications(SQLite::Database& database) {
+std::vector<ApplicationRow> allApplications(Connection& database) {
   return Query(database,
                "SELECT " APPLICATION_COLUMNS " FROM applications ORDER BY identifier, placeholder")
       .all(rowOf);
 }
 
-void putApplication(SQLite::Database& database, const ApplicationRow& row) {
+void putApplication(Connection& database, const ApplicationRow& row) {
   Query(database,
         "INSERT OR REPLACE INTO applications (" APPLICATION_COLUMNS
         ") VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
@@ -77,7 +77,7 @@ void putApplication(SQLite::Database& database, const ApplicationRow& row) {
       .run();
 }
 
-void eraseApplication(SQLite::Database& database, const ApplicationRow& row) {
+void eraseApplication(Connection& database, const ApplicationRow& row) {
   Query(database, "DELETE FROM applications WHERE identifier = ? AND placeholder = ?",
         row.identifier, row.placeholder)
       .run();
@@ -89,8 +89,8 @@ void eraseApplication(SQLite::Database& database, const ApplicationRow& row) {
 std::optional<ApplicationRows> readApplication(Database& database, std::string_view identifier,
                                                std::optional<Error>* error) {
   return database.lookUp(
-      ReadFailed,
-      [&](SQLite::Database& connection) { return findApplication(connection, identifier); }, error);
+      ReadFailed, [&](Connection& connection) { return findApplication(connection, identifier); },
+      error);
 }
 
 std::optional<std::vector<ApplicationRow>> readApplications(Database& database,

@@ -49,12 +49,12 @@ void describe(ApplicationRow& row, const PropertyList::Dictionary& info);
 
 // These throw SQLite::Exception and are used within Database's work.
 
-ApplicationRows findApplication(SQLite::Database& database, std::string_view identifier);
+ApplicationRows findApplication(Connection& database, std::string_view identifier);
 /// Sorted by identifier, the placeholder after the installed version.
-std::vector<ApplicationRow> allApplications(SQLite::Database& database);
+std::vector<ApplicationRow> allApplications(Connection& database);
 /// Replaces the row of the same sort, if there is one.
-void putApplication(SQLite::Database& database, const ApplicationRow& row);
-void eraseApplication(SQLite::Database& database, const ApplicationRow& row);
+void putApplication(Connection& database, const ApplicationRow& row);
+void eraseApplication(Connection& database, const ApplicationRow& row);
 
 // The same as work of their own. nullopt, with an error, when the registry cannot be read.
 

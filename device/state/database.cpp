@@ -43,7 +43,7 @@ Reason reasonOf(int code) {
 /// costs no disk flush.
 class FullSynchronisation {
  public:
-  explicit FullSynchronisation(SQLite::Database& database) : database_(database) {
+  explicit FullSynchronisation(Connection& database) : database_(database) {
     database_.exec("PRAGMA synchronous=FULL");
   }
   ~FullSynchronisation() { database_.tryExec("PRAGMA synchronous=NORMAL"); }
@@ -51,7 +51,7 @@ class FullSynchronisation {
   FullSynchronisation& operator=(const FullSynchronisation&) = delete;
 
  private:
-  SQLite::Database& database_;
+  Connection& database_;
 };
 
 }  // namespace

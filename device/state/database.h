@@ -1,7 +1,5 @@
 #pragma once
 
-#include <SQLiteCpp/SQLiteCpp.h>
-
 #include <concepts>
 #include <functional>
 #include <optional>
@@ -10,6 +8,7 @@
 #include <type_traits>
 #include <vector>
 
+#include "device/state/connection.h"
 #include "platform/bytes.h"
 #include "platform/error.h"
 #include "platform/log.h"
@@ -21,14 +20,17 @@ namespace appsync::device {
 class Query {
  public:
   template <typename... Arguments>
-  Query(SQLite::Database& database, const char* sql, const Arguments&... arguments)
-      : statement_(database, sql) {
+  Query(Connection& database, const char* sql, const Arguments&... arguments)
+      : database_(database), statement_(database.prepare(sql)) {
     int index = 0;
     (bind(++index, arguments), ...);
   }
+  ~Query() { database_.giveBack(std::move(statement_)); }
+  Query(const Query&) = delete;
+  Query& operator=(const Query&) = delete;
 
   /// Steps to the next row; false when there is none.
-  bool next() { return statement_.executeStep(); }
+  bool next() { return statement_->executeStep(); }
   /// What `read` makes of each row that is left.
   template <typename Read>
   auto all(const Read& read) {
@@ -41,13 +43,13 @@ class Query {
     return all([](const Query& row) { return row.text(0); });
   }
   /// Runs a statement that gives no rows; the number of rows it changed.
-  int run() { return statement_.exec(); }
+  int run() { return statement_->exec(); }
 
   // Columns of the current row, from 0.
-  std::int64_t integer(int column) const { return statement_.getColumn(column).getInt64(); }
+  std::int64_t integer(int column) const { return statement_->getColumn(column).getInt64(); }
   bool boolean(int column) const { return integer(column) != 0; }
-  double real(int column) const { return statement_.getColumn(column).getDouble(); }
-  std::string text(int column) const { return statement_.getColumn(column).getString(); }
+  double real(int column) const { return statement_->getColumn(column).getDouble(); }
+  std::string text(int column) const { return statement_->getColumn(column).getString(); }
   template <typename Enumeration>
   Enumeration as(int column) const {
     return static_cast<Enumeration>(integer(column));
@@ -69,26 +71,27 @@ class Query {
   template <typename Value>
   void read(int column, std::optional<Value>& value) const {
     value.reset();
-    if (!statement_.isColumnNull(column)) read(column, value.emplace());
+    if (!statement_->isColumnNull(column)) read(column, value.emplace());
   }
 
-  void bind(int index, std::nullopt_t) { statement_.bind(index); }
-  void bind(int index, std::string_view text) { statement_.bind(index, std::string(text)); }
+  void bind(int index, std::nullopt_t) { statement_->bind(index); }
+  void bind(int index, std::string_view text) { statement_->bind(index, std::string(text)); }
   void bind(int index, const char* text) { bind(index, std::string_view(text)); }
-  void bind(int index, const std::string& text) { statement_.bind(index, text); }
-  void bind(int index, double value) { statement_.bind(index, value); }
+  void bind(int index, const std::string& text) { statement_->bind(index, text); }
+  void bind(int index, double value) { statement_->bind(index, value); }
   void bind(int index, const Bytes& bytes) {
-    statement_.bind(index, bytes.data(), static_cast<int>(bytes.size()));
+    statement_->bind(index, bytes.data(), static_cast<int>(bytes.size()));
   }
   template <typename Number>
   requires std::integral<Number> || std::is_enum_v<Number>
-  void bind(int index, Number value) { statement_.bind(index, static_cast<std::int64_t>(value)); }
+  void bind(int index, Number value) { statement_->bind(index, static_cast<std::int64_t>(value)); }
   template <typename Value>
   void bind(int index, const std::optional<Value>& value) {
     value ? bind(index, *value) : bind(index, std::nullopt);
   }
 
-  mutable SQLite::Statement statement_;
+  Connection& database_;
+  std::unique_ptr<SQLite::Statement> statement_;
 };
 
 /// Thrown by work to roll it back and give its caller this error.
@@ -100,14 +103,14 @@ struct Refused {
 /// must not call back into the database. Failures are logged and become errors; nothing throws.
 class Database {
  public:
-  using Work = std::function<void(SQLite::Database&)>;
+  using Work = std::function<void(Connection&)>;
 
   enum class Commit {
     Ordinary,  ///< survives the end of the process; a power failure may undo the last changes
     OnDisk     ///< on disk when the call returns, with all changes before it
   };
 
-  Database(SQLite::Database connection, bool writable, Log& log)
+  Database(Connection connection, bool writable, Log& log)
       : connection_(std::move(connection)), writable_(writable), log_(log) {}
 
   bool writable() const { return writable_; }
@@ -119,9 +122,9 @@ class Database {
   template <typename LookUp>
   auto lookUp(std::string_view purpose, const LookUp& work,
               std::optional<Error>* error = nullptr) noexcept {
-    std::optional<std::invoke_result_t<LookUp, SQLite::Database&>> found;
+    std::optional<std::invoke_result_t<LookUp, Connection&>> found;
     read(
-        purpose, [&](SQLite::Database& database) { found.emplace(work(database)); }, error);
+        purpose, [&](Connection& database) { found.emplace(work(database)); }, error);
     return found;
   }
   /// Runs the work in one transaction. False: the change does not hold, and never will once
@@ -140,7 +143,7 @@ class Database {
                std::optional<Error>* error) noexcept;
 
   Mutex mutex_;
-  SQLite::Database connection_ APPSYNC_GUARDED_BY(mutex_);
+  Connection connection_ APPSYNC_GUARDED_BY(mutex_);
   const bool writable_;
   /// At first not, for a process may have been killed.
   bool settled_ APPSYNC_GUARDED_BY(mutex_) = false;

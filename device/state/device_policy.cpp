@@ -4,11 +4,10 @@ namespace appsync::device {
 
 PolicyValue StoredDevicePolicy::effectiveBoolValue(PolicySetting setting) noexcept {
   PolicyValue value = PolicyValue::NotSet;
-  const bool read =
-      database_.read("the policies could not be read", [&](SQLite::Database& database) {
-        Query query(database, "SELECT value FROM policies WHERE setting = ?", setting);
-        if (query.next()) value = query.as<PolicyValue>(0);
-      });
+  const bool read = database_.read("the policies could not be read", [&](Connection& database) {
+    Query query(database, "SELECT value FROM policies WHERE setting = ?", setting);
+    if (query.next()) value = query.as<PolicyValue>(0);
+  });
   return read ? value : PolicyValue::ExplicitlyNo;
 }
 
@@ -16,7 +15,7 @@ bool StoredDevicePolicy::set(PolicySetting setting, PolicyValue value,
                              std::optional<Error>* error) noexcept {
   return database_.change(
       "a policy could not be set", Database::Commit::OnDisk,
-      [&](SQLite::Database& database) {
+      [&](Connection& database) {
         Query(database, "INSERT OR REPLACE INTO policies VALUES (?, ?)", setting, value).run();
       },
       error);

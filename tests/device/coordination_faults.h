@@ -34,7 +34,8 @@ class DatabaseFaults {
   DatabaseFaults(const Mode& mode, int step) : mode_(mode), left_(step) {}
 
   void strike(Database& database) {
-    database.read("", [this](SQLite::Database& connection) {
+    database.read("", [this](Connection& connection) {
+      connection.keepNothing();  // the authorizer is asked when a statement is prepared
       handle_ = connection.getHandle();
       sqlite3_set_authorizer(
           handle_,

@@ -3,6 +3,8 @@
 
 #include "tests/device/coordination_faults.h"
 
+#include <gmock/gmock.h>
+
 #include <future>
 
 #include "device/recovery.h"

@@ -118,10 +118,9 @@ TEST_F(RegistryTest, WaitingDataIsForgottenOnlyWhenItIsKnownThatNothingIsLeftOfT
   device.reset();
   DeviceParts parts(folder);
   const auto rename = [&](const std::string& from, const std::string& to) {
-    ASSERT_TRUE(
-        parts.database().change("", Database::Commit::Ordinary, [&](SQLite::Database& database) {
-          database.exec("ALTER TABLE " + from + " RENAME TO " + to);
-        }));
+    ASSERT_TRUE(parts.database().change("", Database::Commit::Ordinary, [&](Connection& database) {
+      database.exec("ALTER TABLE " + from + " RENAME TO " + to);
+    }));
   };
   rename("applications", "hidden");
   parts.registry().change("com.example.a", forgetWaitingData, nullptr);
