@@ -2,9 +2,11 @@
 
 #include <cerrno>
 #include <set>
+#include <tuple>
 
 #include "base/identifiers.h"
 #include "platform/bundle.h"
+#include "platform/existence.h"
 #include "platform/property_list_codec.h"
 #include "platform/sync_files.h"
 
@@ -109,7 +111,10 @@ bool isBeingInstalled(const Phone& phone, const std::string& identifier) {
 bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
            const std::optional<Bytes>& iconLayout, std::optional<Error>* error) {
   Stage area(files, error);
-  files.removeItem(exchange::StagingArea);
+  std::optional<Error> reason;
+  if (!files.removeItem(exchange::StagingArea, &reason) && !isMissing(reason)) {
+    return failWith(error, *std::move(reason));
+  }
   if (!area.makeDirectory(exchange::StagingArea)) return false;
   for (const PlannedEntry& entry : plan.entries) {
     const PackageFacts* package = library.find(entry.identifier);
@@ -160,7 +165,7 @@ void removeLeftOverPackages(const Phone& phone, const std::set<std::string>& sen
           isBeingInstalled(phone, *identifier)) {
         continue;
       }
-      phone.files.removeItem(path);
+      std::ignore = phone.files.removeItem(path);
     }
   }
 }

@@ -283,6 +283,16 @@ TEST_F(SessionTest, EndsWhenThePhoneDoesNotTakeTheStagingArea) {
   EXPECT_THAT(result.summary.failed, SizeIs(1));
 }
 
+TEST_F(SessionTest, EndsWhenAStaleStagingAreaCannotBeRemoved) {
+  offer("com.a");
+  phone.files.putFile(joinPath(exchange::StagingArea, exchange::IconLayoutName), "old");
+  phone.faults.failWhere("FileManager.removeItem", exchange::StagingArea, Error::posix(EIO));
+  const SyncResult result = sync();
+  EXPECT_FALSE(result.completed);
+  EXPECT_THAT(trace("client.reconcileSync"), IsEmpty());
+  EXPECT_THAT(result.summary.failed, SizeIs(1));
+}
+
 TEST_F(SessionTest, IsNotCompleteWhenTheApplicationsPresentCannotBeWritten) {
   offer("com.a");
   phone.faults.failWhere("FileManager.writeAtomically", exchange::LastSyncState,
