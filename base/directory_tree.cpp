@@ -8,6 +8,7 @@
 #include <array>
 #include <cerrno>
 #include <climits>
+#include <tuple>
 #include <vector>
 
 #include "base/file_descriptor.h"
@@ -166,7 +167,7 @@ bool copyTree(int fromDirectory, const std::string& from, int toDirectory,
       ::renameat2(toDirectory, unfinished.c_str(), toDirectory, to.c_str(), RENAME_NOREPLACE) == 0)
     return true;
   const int failure = errno;
-  removeTree(toDirectory, unfinished);
+  std::ignore = removeTree(toDirectory, unfinished);  // else swept with other temporary files
   return failWith(failure);
 }
 

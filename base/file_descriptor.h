@@ -9,7 +9,7 @@
 namespace appsync {
 
 /// Owns an open descriptor and closes it. Not valid: -1.
-class FileDescriptor {
+class [[nodiscard]] FileDescriptor {
  public:
   FileDescriptor() noexcept = default;
   explicit FileDescriptor(int fd) noexcept : fd_(fd) {}
@@ -39,12 +39,12 @@ std::int64_t readAt(int fd, std::span<std::byte> bytes, std::uint64_t offset) no
 
 // Each returns false with errno set.
 
-bool writeAll(int fd, ByteView bytes) noexcept;
+[[nodiscard]] bool writeAll(int fd, ByteView bytes) noexcept;
 /// Writes at `offset`; past the end of the file this leaves a hole.
-bool writeAllAt(int fd, ByteView bytes, std::uint64_t offset) noexcept;
+[[nodiscard]] bool writeAllAt(int fd, ByteView bytes, std::uint64_t offset) noexcept;
 /// Puts a file or directory on disk.
-bool syncToDisk(int fd) noexcept;
+[[nodiscard]] bool syncToDisk(int fd) noexcept;
 /// Puts everything of the descriptor's file system on disk.
-bool syncFileSystem(int fd) noexcept;
+[[nodiscard]] bool syncFileSystem(int fd) noexcept;
 
 }  // namespace appsync

@@ -27,7 +27,7 @@ class TemporaryFile {
 
   /// Replaces what has this name in the directory, except a directory. False with errno set; the
   /// name then still has what it had, unless only putting the directory on disk failed.
-  bool takePlaceOf(const std::string& name, Durability durability) noexcept;
+  [[nodiscard]] bool takePlaceOf(const std::string& name, Durability durability) noexcept;
 
  private:
   int directory_;

@@ -55,9 +55,9 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
 
   // --- State files (client/todo_list.cpp, client/restore_state.cpp) ---
   /// The array in the property list at `path`; none when the file is missing, empty or damaged.
-  std::optional<PropertyList::Array> _loadPlist(std::string_view path,
-                                                std::optional<Error>* error = nullptr) const;
-  std::optional<PropertyList::Dictionary> _loadDemotedAppsPlist(
+  [[nodiscard]] std::optional<PropertyList::Array> _loadPlist(
+      std::string_view path, std::optional<Error>* error = nullptr) const;
+  [[nodiscard]] std::optional<PropertyList::Dictionary> _loadDemotedAppsPlist(
       std::string_view path, std::optional<Error>* error = nullptr) const;
   /// Sets the operation of the identifier's first entry in the todo list.
   void changeAssetID(std::string_view identifier, std::string_view toDo);
@@ -110,20 +110,25 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   bool _isRecoverableError(const std::optional<Error>& error);
 
   // --- Installs through coordinators (coordination/install.cpp) ---
-  bool prepareAppForInstallUsingCoordination(const SyncAssetPtr& asset, bool existingApp);
+  [[nodiscard]] bool prepareAppForInstallUsingCoordination(const SyncAssetPtr& asset,
+                                                           bool existingApp);
   /// True when the progress was passed on.
-  bool updateTransferProgressForApp(const SyncAssetPtr& asset, bool existingApp);
+  [[nodiscard]] bool updateTransferProgressForApp(const SyncAssetPtr& asset, bool existingApp);
   void transferCompleteForApp(const SyncAssetPtr& asset, const std::optional<Error>& error,
                               bool isExistingApp);
   void assetSyncFinishedWithStatus(bool status, const std::set<std::string>& outstandingItems);
   void uninstallAppUsingCoordination(std::string_view bundleId);
 
   // --- Coordinators and promises (coordination/promises.cpp) ---
-  std::shared_ptr<InstallCoordinator> _initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(
-      std::string_view bundleId, bool existingApp, bool createIfNotExisting,
-      std::optional<Error>* error);
-  std::shared_ptr<InstallCoordinator> _restoringAppInstallCoordinatorForBundleIdentifier(
-      std::string_view bundleId, bool createIfNotExisting, std::optional<Error>* error);
+  [[nodiscard]] std::shared_ptr<InstallCoordinator>
+  _initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(std::string_view bundleId,
+                                                                bool existingApp,
+                                                                bool createIfNotExisting,
+                                                                std::optional<Error>* error);
+  [[nodiscard]] std::shared_ptr<InstallCoordinator>
+  _restoringAppInstallCoordinatorForBundleIdentifier(std::string_view bundleId,
+                                                     bool createIfNotExisting,
+                                                     std::optional<Error>* error);
   std::shared_ptr<PathTransferPromise> _createAppAssetPromiseForBundleIdentifier(
       std::string_view bundleId, const std::optional<std::string>& path,
       InstallCoordinator* coordinator);
@@ -147,45 +152,47 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   void applicationInstallsDidCancel(const std::vector<AppRecord>& records) noexcept override;
 
   // --- Restores through coordinators (coordination/restore.cpp) ---
-  bool prepareAppForRestoreUsingCoordination(std::string_view bundleId, ByteView halvoMetadata,
-                                             const std::optional<Bytes>& sinfData,
-                                             const std::optional<Bytes>& iconData,
-                                             DemotionStatus demotionStatus);
-  bool _prepareNonDemotedAppForRestoreWithBundleId(std::string_view bundleId,
-                                                   ByteView halvoMetadata,
-                                                   const std::optional<Bytes>& sinfData,
-                                                   const std::optional<Bytes>& iconData);
-  bool _prepareDemotedAppForRestoreWithBundleId(std::string_view bundleId, ByteView halvoMetadata,
-                                                const std::optional<Bytes>& sinfData,
-                                                const std::optional<Bytes>& iconData,
-                                                DemotionStatus demotionStatus);
+  [[nodiscard]] bool prepareAppForRestoreUsingCoordination(std::string_view bundleId,
+                                                           ByteView halvoMetadata,
+                                                           const std::optional<Bytes>& sinfData,
+                                                           const std::optional<Bytes>& iconData,
+                                                           DemotionStatus demotionStatus);
+  [[nodiscard]] bool _prepareNonDemotedAppForRestoreWithBundleId(
+      std::string_view bundleId, ByteView halvoMetadata, const std::optional<Bytes>& sinfData,
+      const std::optional<Bytes>& iconData);
+  [[nodiscard]] bool _prepareDemotedAppForRestoreWithBundleId(std::string_view bundleId,
+                                                              ByteView halvoMetadata,
+                                                              const std::optional<Bytes>& sinfData,
+                                                              const std::optional<Bytes>& iconData,
+                                                              DemotionStatus demotionStatus);
   std::shared_ptr<InstallPlaceholder> _placeHolderForBundleIdentifier(
       std::string_view bundleId, const PropertyList::Dictionary& halvoMetadata,
       const std::optional<Bytes>& sinfData, const std::optional<Bytes>& iconData,
       DemotionStatus demotionStatus);
 
   // --- Restored backups (restore/restore_info.cpp) ---
-  bool _processHalvoRestoreInfo();
-  bool _processHalvoRestoreInfoForApp(std::string_view bundleId, ByteView halvoMetaData,
-                                      const std::optional<Bytes>& sinfData,
-                                      const std::optional<Bytes>& iconData);
+  [[nodiscard]] bool _processHalvoRestoreInfo();
+  [[nodiscard]] bool _processHalvoRestoreInfoForApp(std::string_view bundleId,
+                                                    ByteView halvoMetaData,
+                                                    const std::optional<Bytes>& sinfData,
+                                                    const std::optional<Bytes>& iconData);
 
   // --- Placeholder bundles (restore/placeholder_bundles.cpp) ---
   std::string placeholderAppPathForBundleIdentifier(std::string_view bundleId) const;
-  bool createPlaceHolderPath(std::string_view path, std::string_view bundleId,
-                             const FileAttributes& attributes);
+  [[nodiscard]] bool createPlaceHolderPath(std::string_view path, std::string_view bundleId,
+                                           const FileAttributes& attributes);
   /// `fileSize` (bytes) may be null; it is written only when the size could be read.
-  bool writeIconData(const std::optional<Bytes>& iconData, std::string_view path,
-                     std::uint64_t* fileSize, std::string_view bundleId,
-                     const FileAttributes& attributes);
+  [[nodiscard]] bool writeIconData(const std::optional<Bytes>& iconData, std::string_view path,
+                                   std::uint64_t* fileSize, std::string_view bundleId,
+                                   const FileAttributes& attributes);
   void _createPlaceHolderApplication(const SyncAssetPtr& asset);
   bool _placeholderExistsForApplication(std::string_view bundleId);
   void _enumeratePlaceholdersWithBlock(const AppRegistry::Visitor& visitor);
   std::set<std::string> _getSystemAppPlaceholders();
 
   // --- Icons (restore/icon_rendering.cpp) ---
-  bool _makeIconFromBundlePath(const std::optional<std::string>& bundlePath,
-                               std::string_view saveTo) const;
+  [[nodiscard]] bool _makeIconFromBundlePath(const std::optional<std::string>& bundlePath,
+                                             std::string_view saveTo) const;
 
  private:
   bool _runsInSyncHost() const;
@@ -209,8 +216,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   void _performDeletions(const PropertyList::Array& todoList);
   void _sendIconLayout();
   SyncAssetPtr _prepareAsset(const TransferCandidate& candidate);
-  bool _handOffUncoordinated(const SyncAssetPtr& asset, bool hadPlaceholder);
-  bool _handOffCoordinated(const SyncAssetPtr& asset);
+  [[nodiscard]] bool _handOffUncoordinated(const SyncAssetPtr& asset, bool hadPlaceholder);
+  [[nodiscard]] bool _handOffCoordinated(const SyncAssetPtr& asset);
   void _assetReceived(const SyncAssetPtr& asset, const std::shared_ptr<InstallProgress>& progress,
                       bool existingApp);
   void _restoreAssetReceived(const SyncAssetPtr& asset,
@@ -227,11 +234,11 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   void _installPackage(const SyncAssetPtr& asset);
   void _installFailed(const SyncAssetPtr& asset, const std::optional<Error>& error);
   /// The result of the last application that was processed; false when none was.
-  bool _restoreApplications(const PropertyList::Dictionary& restoreList);
-  bool _installRestorePlaceholder(std::string_view bundleId,
-                                  const PropertyList::Dictionary& metadata,
-                                  const std::optional<Bytes>& iconData,
-                                  const PropertyList::Dictionary& options);
+  [[nodiscard]] bool _restoreApplications(const PropertyList::Dictionary& restoreList);
+  [[nodiscard]] bool _installRestorePlaceholder(std::string_view bundleId,
+                                                const PropertyList::Dictionary& metadata,
+                                                const std::optional<Bytes>& iconData,
+                                                const PropertyList::Dictionary& options);
 
   const Platform _platform;
   const ClientLog _log;

@@ -96,7 +96,7 @@ class DelayedTasks {
   DelayedTasks& operator=(const DelayedTasks&) = delete;
 
   /// Runs the task after the delay. False when closed: the task is dropped.
-  bool after(std::chrono::milliseconds delay, std::function<void()> task);
+  [[nodiscard]] bool after(std::chrono::milliseconds delay, std::function<void()> task);
   /// Drops what is pending and waits for what runs; `dropped` is called once for each dropped task.
   void close(const std::function<void()>& dropped = [] {});
 
@@ -113,7 +113,7 @@ class Semaphore {
  public:
   void signal();
   /// False when the limit passed first; without a limit that never happens.
-  bool wait(std::optional<std::chrono::milliseconds> limit = std::nullopt);
+  [[nodiscard]] bool wait(std::optional<std::chrono::milliseconds> limit = std::nullopt);
 
  private:
   Mutex mutex_;

@@ -1,5 +1,7 @@
 // The restore state: values kept per application and version until its install has ended.
 
+#include <tuple>
+
 #include "client/apps_client.h"
 #include "client/paths.h"
 #include "client/unreadable.h"
@@ -29,7 +31,7 @@ std::optional<Bytes> readState(FileManager& files, const ClientLog& log,
 void writeXml(FileManager& files, PropertyList::Dictionary state) {
   const std::optional<Bytes> bytes =
       serializePropertyList(std::move(state), PropertyListFormat::Xml);
-  if (bytes) files.writeAtomically(exchange::RestoreState, *bytes);
+  if (bytes) std::ignore = files.writeAtomically(exchange::RestoreState, *bytes);
 }
 
 }  // namespace
@@ -74,7 +76,7 @@ void AppsClient::cleanRestoreStateForIdentifier(std::string_view identifier) {
   PropertyList::Dictionary state = parseDictionary(*bytes).value_or(PropertyList::Dictionary{});
   state.erase(std::string(identifier));
   if (state.empty()) {
-    _platform.files.removeItem(exchange::RestoreState);
+    std::ignore = _platform.files.removeItem(exchange::RestoreState);
   } else {
     writeXml(_platform.files, std::move(state));
   }

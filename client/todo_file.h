@@ -16,7 +16,7 @@ class TodoFile {
  public:
   /// Takes the bytes of a list and checks all of them, unless it holds the same already. False,
   /// with the bytes left where they are and nothing held, for a list of any other form.
-  bool take(Bytes& list);
+  [[nodiscard]] bool take(Bytes& list);
 
   const Bytes& bytes() const { return bytes_; }
 
@@ -25,7 +25,7 @@ class TodoFile {
 
   /// Gives the identifier's first entry another operation. False, with nothing changed, when there
   /// is no entry, or no room for this operation in the file as it is.
-  bool setOperation(std::string_view identifier, std::string_view operation);
+  [[nodiscard]] bool setOperation(std::string_view identifier, std::string_view operation);
 
  private:
   BinaryPropertyList list() const;

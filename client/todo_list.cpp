@@ -1,6 +1,7 @@
 // The todo list: what the desktop wants of each application and how far it has got.
 
 #include <algorithm>
+#include <tuple>
 
 #include "client/apps_client.h"
 #include "client/paths.h"
@@ -89,7 +90,9 @@ void AppsClient::_changeTodoList(std::span<TodoChange* const> changes) {
   const Lock lock(_stateFileMutex);
   bool unsaved = false;
   for (const TodoChange* const change : changes) unsaved = _changeTodoFile(*change, unsaved);
-  if (unsaved) _platform.files.writeAtomically(paths::TodoList, _todoFile.bytes());
+  if (!unsaved) return;
+  // What cannot be written is asked for again by the next sync.
+  std::ignore = _platform.files.writeAtomically(paths::TodoList, _todoFile.bytes());
 }
 
 bool AppsClient::_changeTodoFile(const TodoChange& change, bool unsaved) {
@@ -124,7 +127,7 @@ void AppsClient::_changeParsed(const Bytes& list, const TodoChange& change) {
   operation = toDo;
   const std::optional<Bytes> bytes =
       serializePropertyList(std::move(*entries), PropertyListFormat::Binary);
-  if (bytes) _platform.files.writeAtomically(paths::TodoList, *bytes);
+  if (bytes) std::ignore = _platform.files.writeAtomically(paths::TodoList, *bytes);
 }
 
 std::optional<std::string> AppsClient::_operationStateForIdentifier(

@@ -1,5 +1,7 @@
 #include "coordination/install_preparation.h"
 
+#include <tuple>
+
 #include "coordination/failure.h"
 #include "coordination/install_options.h"
 #include "coordination/transaction_steps.h"
@@ -130,7 +132,7 @@ void InstallPreparation::copyIcon(const std::string& bundlePath) {
   const std::string target = joinPath(bundlePath, PlaceholderIconName);
   logStepBegin(platform_.transactionLog, TransactionStep::CopyIcon, bundleId_, "Copying icon");
   // The directory of an earlier placeholder is used again.
-  platform_.files.removeItem(target);
+  std::ignore = platform_.files.removeItem(target);
   std::optional<Error> error;
   if (platform_.files.copyItem(source, target, &error)) {
     const std::optional<ItemAttributes> attributes = platform_.files.attributesOfItem(target);

@@ -17,22 +17,22 @@ class InstallPreparation {
                      const SyncAsset& asset, bool existingApp);
 
   /// Whether the package may be sent. If not, what was begun has been cancelled.
-  bool run();
+  [[nodiscard]] bool run();
 
  private:
-  bool prepare();
-  bool addInstallOptions();
-  bool addInitialAssetPromises();
-  bool addAppAssetPromise();
-  bool addPlaceholder();
+  [[nodiscard]] bool prepare();
+  [[nodiscard]] bool addInstallOptions();
+  [[nodiscard]] bool addInitialAssetPromises();
+  [[nodiscard]] bool addAppAssetPromise();
+  [[nodiscard]] bool addPlaceholder();
 
   /// Copies the asset's icon into the placeholder bundle.
   void copyIcon(const std::string& bundlePath);
-  bool addIconPromise(const std::string& bundlePath);
+  [[nodiscard]] bool addIconPromise(const std::string& bundlePath);
   /// Fills in the placeholder up to the first failure.
   void configurePlaceholder();
-  bool setAttributes();
-  bool setStoreMetadata();
+  [[nodiscard]] bool setAttributes();
+  [[nodiscard]] bool setStoreMetadata();
   void setConfigurationComplete();
 
   void cancel();

@@ -1,5 +1,7 @@
 // Restores through the coordination service.
 
+#include <tuple>
+
 #include "client/apps_client.h"
 #include "coordination/failure.h"
 #include "coordination/restore_preparation.h"
@@ -113,7 +115,8 @@ std::shared_ptr<InstallPlaceholder> AppsClient::_placeHolderForBundleIdentifier(
   if (!createPlaceHolderPath(path, bundleId, placeholderFileAttributes())) return nullptr;
   const std::string iconPath = joinPath(path, PlaceholderIconName);
   std::uint64_t iconSize = 0;
-  writeIconData(iconData, iconPath, &iconSize, bundleId, placeholderFileAttributes());
+  // A placeholder without an icon is better than none.
+  std::ignore = writeIconData(iconData, iconPath, &iconSize, bundleId, placeholderFileAttributes());
 
   const std::string name = metadataName(halvoMetadata).value_or(std::string(bundleId));
   std::shared_ptr<InstallPlaceholder> placeholder =

@@ -26,22 +26,22 @@ class RestorePreparation {
 
   /// An application that was on the device: the store brings its package back. Whether all is
   /// ready; if not, what was begun has been cancelled.
-  bool runNonDemoted();
+  [[nodiscard]] bool runNonDemoted();
   /// An application of which only a placeholder was on the device: it gets that placeholder again.
-  bool runDemoted(DemotionStatus demotionStatus);
+  [[nodiscard]] bool runDemoted(DemotionStatus demotionStatus);
 
  private:
-  bool prepareNonDemoted();
-  bool prepareDemoted(DemotionStatus demotionStatus);
+  [[nodiscard]] bool prepareNonDemoted();
+  [[nodiscard]] bool prepareDemoted(DemotionStatus demotionStatus);
 
-  bool parseMetadata();
+  [[nodiscard]] bool parseMetadata();
   void obtainCoordinator();
   /// The package is the store's business already.
   bool storeBringsPackage() const;
-  bool addUserDataPromise();
-  bool addInstallOptions();
-  bool addPlaceholderPromise(DemotionStatus demotionStatus);
-  bool leavePackageToStore();
+  [[nodiscard]] bool addUserDataPromise();
+  [[nodiscard]] bool addInstallOptions();
+  [[nodiscard]] bool addPlaceholderPromise(DemotionStatus demotionStatus);
+  [[nodiscard]] bool leavePackageToStore();
   void cancel();
 
   AppsClient& client_;

@@ -33,7 +33,8 @@ DeviceError damagedDevice(const std::filesystem::path& folder, std::string_view 
 class WriteLock {
  public:
   /// nullptr (Busy, naming the process that has it, or Unusable) when it cannot be had.
-  static std::unique_ptr<WriteLock> take(const DevicePaths& paths, DeviceError& error);
+  [[nodiscard]] static std::unique_ptr<WriteLock> take(const DevicePaths& paths,
+                                                       DeviceError& error);
 
  private:
   explicit WriteLock(FileDescriptor file) : file_(std::move(file)) {}
@@ -41,9 +42,10 @@ class WriteLock {
 };
 
 /// Makes a new device in a folder that is missing, empty, or left by a making that was broken off.
-bool makeDeviceFolder(const DevicePaths& paths, const DeviceOptions& options, DeviceError& error);
+[[nodiscard]] bool makeDeviceFolder(const DevicePaths& paths, const DeviceOptions& options,
+                                    DeviceError& error);
 
 /// Whether the folder looks like a finished device; its database is looked at elsewhere.
-bool checkDeviceFolder(const DevicePaths& paths, DeviceError& error);
+[[nodiscard]] bool checkDeviceFolder(const DevicePaths& paths, DeviceError& error);
 
 }  // namespace appsync::device

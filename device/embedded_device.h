@@ -21,13 +21,14 @@ namespace appsync::device {
 class EmbeddedDevice : public IncomingFiles, public ApplicationData, public PhoneActivity {
  public:
   /// Makes a new device in a folder that is missing or empty.
-  static bool initialize(const std::filesystem::path& folder, const DeviceOptions& options,
-                         DeviceError& error) noexcept;
+  [[nodiscard]] static bool initialize(const std::filesystem::path& folder,
+                                       const DeviceOptions& options, DeviceError& error) noexcept;
 
   /// Opens a device. With Access::Write it first finishes what a killed process left behind: sweeps
   /// left-over containers and ends the progress of installs that nobody carries on.
-  static std::unique_ptr<EmbeddedDevice> open(const std::filesystem::path& folder, Access access,
-                                              DeviceError& error) noexcept;
+  [[nodiscard]] static std::unique_ptr<EmbeddedDevice> open(const std::filesystem::path& folder,
+                                                            Access access,
+                                                            DeviceError& error) noexcept;
 
   /// The device's services together with the host's own.
   virtual Platform platform(SyncHost& host) noexcept = 0;
@@ -48,30 +49,33 @@ class EmbeddedDevice : public IncomingFiles, public ApplicationData, public Phon
 
   /// Removes an application with its placeholder and data. False (with a reason) when there is
   /// none.
-  virtual bool uninstall(std::string_view bundleId, std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool uninstall(std::string_view bundleId,
+                                       std::optional<Error>* error) noexcept = 0;
   /// Takes an application's package away; its data and a placeholder of
   /// InstallType::IntentionalDowngrade stay. False (with a reason) when it is not installed, is
   /// open, is being updated or belongs to the system.
-  virtual bool demote(std::string_view bundleId, std::optional<Error>* error) noexcept = 0;
-  virtual bool setPolicy(PolicySetting setting, PolicyValue value,
-                         std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool demote(std::string_view bundleId,
+                                    std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setPolicy(PolicySetting setting, PolicyValue value,
+                                       std::optional<Error>* error) noexcept = 0;
 
   /// Puts an application on the device that comes with the system: kind BundleKind::System, not to
   /// be uninstalled.
-  virtual bool addSystemApplication(std::string_view bundleId, std::string_view displayName,
-                                    std::string_view version,
-                                    std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool addSystemApplication(std::string_view bundleId,
+                                                  std::string_view displayName,
+                                                  std::string_view version,
+                                                  std::optional<Error>* error) noexcept = 0;
 
   // Bringing an application to the foreground and ending it need no device lock, so that a person
   // can do both while a sync runs in another process.
 
   /// False (with a reason) when the application is not installed, is a placeholder, may not be
   /// launched or is kept from running by an install.
-  static bool launch(const std::filesystem::path& folder, std::string_view bundleId,
-                     DeviceError& deviceError, std::optional<Error>* error) noexcept;
+  [[nodiscard]] static bool launch(const std::filesystem::path& folder, std::string_view bundleId,
+                                   DeviceError& deviceError, std::optional<Error>* error) noexcept;
   /// Ending an application that does not run is no failure.
-  static bool quit(const std::filesystem::path& folder, std::string_view bundleId,
-                   DeviceError& deviceError, std::optional<Error>* error) noexcept;
+  [[nodiscard]] static bool quit(const std::filesystem::path& folder, std::string_view bundleId,
+                                 DeviceError& deviceError, std::optional<Error>* error) noexcept;
 
   // Tapping the placeholder of an application, and cancelling its install, reach the process that
   // writes the device; without one they are done here. False (with a reason) when no coordinated
@@ -83,10 +87,10 @@ class EmbeddedDevice : public IncomingFiles, public ApplicationData, public Phon
   /// The install's client is asked to bring this application first. A demoted or restored
   /// application that waits is asked for: its placeholder's install type becomes
   /// InstallType::StoreDownload, also without coordination.
-  static bool tap(const std::filesystem::path& folder, std::string_view bundleId,
-                  DeviceError& deviceError, std::optional<Error>* error) noexcept;
-  static bool cancel(const std::filesystem::path& folder, std::string_view bundleId,
-                     DeviceError& deviceError, std::optional<Error>* error) noexcept;
+  [[nodiscard]] static bool tap(const std::filesystem::path& folder, std::string_view bundleId,
+                                DeviceError& deviceError, std::optional<Error>* error) noexcept;
+  [[nodiscard]] static bool cancel(const std::filesystem::path& folder, std::string_view bundleId,
+                                   DeviceError& deviceError, std::optional<Error>* error) noexcept;
 
   // What people look at.
 
@@ -97,10 +101,11 @@ class EmbeddedDevice : public IncomingFiles, public ApplicationData, public Phon
   virtual std::vector<std::string> homeScreenOrder() noexcept = 0;
   /// What happened to the applications, oldest first; the device keeps the newest 10,000 entries.
   /// None, with an error, when it cannot be read.
-  virtual std::vector<HistoryEntry> history(std::optional<Error>* error = nullptr) noexcept = 0;
+  [[nodiscard]] virtual std::vector<HistoryEntry> history(
+      std::optional<Error>* error = nullptr) noexcept = 0;
   /// The transaction records after `afterNumber`, oldest first; the device keeps the newest 20,000.
   /// None, with an error, when they cannot be read.
-  virtual std::vector<TransactionRecord> transactions(
+  [[nodiscard]] virtual std::vector<TransactionRecord> transactions(
       std::int64_t afterNumber = 0, std::optional<Error>* error = nullptr) noexcept = 0;
   /// The log lines kept, oldest first.
   virtual void readLog(const std::function<void(const LogLine&)>& visitor) noexcept = 0;

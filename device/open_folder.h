@@ -18,7 +18,7 @@ struct OpenFolder {
   DeviceOptions options;
 };
 
-std::optional<OpenFolder> openFolder(const std::filesystem::path& folder, Access access,
-                                     DeviceError& error);
+[[nodiscard]] std::optional<OpenFolder> openFolder(const std::filesystem::path& folder,
+                                                   Access access, DeviceError& error);
 
 }  // namespace appsync::device

@@ -50,7 +50,7 @@ enum class WishOutcome {
 };
 
 /// Asks the process that writes the device. Waits some seconds at most.
-WishOutcome askWriter(const DevicePaths& paths, PersonWish wish, std::string_view bundleId,
-                      std::optional<Error>* error);
+[[nodiscard]] WishOutcome askWriter(const DevicePaths& paths, PersonWish wish,
+                                    std::string_view bundleId, std::optional<Error>* error);
 
 }  // namespace appsync::device

@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <set>
+#include <tuple>
 
 #include "device/apps/removal.h"
 #include "device/state/application_rows.h"
@@ -59,7 +60,9 @@ void removeAllAbandonedData(DeviceCore& core) {
         return Query(database, "SELECT identifier FROM abandoned_data").texts();
       });
   if (!identifiers) return;
-  for (const std::string& identifier : *identifiers) removeAbandonedData(core, identifier, nullptr);
+  for (const std::string& identifier : *identifiers) {
+    std::ignore = removeAbandonedData(core, identifier, nullptr);  // else the next time
+  }
 }
 
 /// The installs that set data aside never came to their end, or the data would be abandoned.
@@ -73,16 +76,17 @@ void undoAdoptions(DeviceCore& core) {
 }
 
 void pauseInstalls(DeviceCore& core) {
-  core.database.change("the installs under way could not be paused", Database::Commit::Ordinary,
-                       [](Connection& database) {
-                         Query(database,
-                               "DELETE FROM installs WHERE over OR identifier NOT IN "
-                               "(SELECT identifier FROM applications WHERE placeholder)")
-                             .run();
-                         Query(database, "UPDATE installs SET state = ? WHERE state IN (?, ?)",
-                               InstallState::Paused, InstallState::Waiting, InstallState::Active)
-                             .run();
-                       });
+  std::ignore = core.database.change(
+      "the installs under way could not be paused", Database::Commit::Ordinary,
+      [](Connection& database) {
+        Query(database,
+              "DELETE FROM installs WHERE over OR identifier NOT IN "
+              "(SELECT identifier FROM applications WHERE placeholder)")
+            .run();
+        Query(database, "UPDATE installs SET state = ? WHERE state IN (?, ?)", InstallState::Paused,
+              InstallState::Waiting, InstallState::Active)
+            .run();
+      });
 }
 
 std::set<std::string> installedAmong(const std::vector<ApplicationRow>& rows) {
@@ -96,7 +100,7 @@ std::set<std::string> installedAmong(const std::vector<ApplicationRow>& rows) {
 void clearForeground(const Foreground& foreground, const std::set<std::string>& installed) {
   foreground.sweep();
   for (const std::string& identifier : foreground.running()) {
-    if (!installed.contains(identifier)) foreground.quit(identifier, nullptr);
+    if (!installed.contains(identifier)) std::ignore = foreground.quit(identifier, nullptr);
   }
 }
 

@@ -13,8 +13,8 @@ void createDatabase(const std::filesystem::path& file, const DeviceOptions& opti
 
 /// Opens a device's database after checking that it is one, of this version, and whole. nullptr
 /// with a problem of `folder` otherwise.
-std::unique_ptr<Database> openDatabase(const std::filesystem::path& folder,
-                                       const std::filesystem::path& file, Access access, Log& log,
-                                       DeviceError& error);
+[[nodiscard]] std::unique_ptr<Database> openDatabase(const std::filesystem::path& folder,
+                                                     const std::filesystem::path& file,
+                                                     Access access, Log& log, DeviceError& error);
 
 }  // namespace appsync::device

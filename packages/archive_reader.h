@@ -41,7 +41,7 @@ class ArchiveReader {
   const std::optional<std::string>& problem() const { return problem_; }
 
  private:
-  bool readAll(const std::function<bool(std::span<const std::byte>)>& take);
+  [[nodiscard]] bool readAll(const std::function<bool(std::span<const std::byte>)>& take);
   bool end(std::string reason);
   void note(std::string reason);
   std::string libraryReason() const;

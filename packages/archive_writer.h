@@ -26,7 +26,7 @@ class ArchiveWriter {
   void addDirectory(const std::string& name);
   void addFile(const std::string& name, const std::filesystem::path& source, bool executable);
   /// Nothing more will be added. False when anything failed.
-  bool finish();
+  [[nodiscard]] bool finish();
   /// The first failure; empty while all is well.
   const std::string& problem() const { return problem_; }
 

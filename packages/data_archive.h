@@ -21,13 +21,13 @@ inline constexpr std::size_t LongestDataName = 4000;  ///< bytes
 /// Hands the archive of what lies in an open directory to `sink`; nothing at all for one that is
 /// empty. Sockets and the like are left out and named to `skipped`. An error of POSIX 125 when the
 /// sink ended it.
-std::optional<Error> writeDataArchive(int directory, const DataSink& sink,
-                                      const std::function<void(std::string_view path)>& skipped);
+[[nodiscard]] std::optional<Error> writeDataArchive(
+    int directory, const DataSink& sink, const std::function<void(std::string_view path)>& skipped);
 
 /// Lays out what the archive holds in an open and empty directory, beneath which everything stays,
 /// and counts the entries. On failure some of it may lie there. An error of POSIX 125 when the
 /// source failed, which it may do up to its end, and of POSIX 74 for a damaged archive.
-std::optional<Error> readDataArchive(const DataSource& source, int directory,
-                                     std::uint64_t& entries);
+[[nodiscard]] std::optional<Error> readDataArchive(const DataSource& source, int directory,
+                                                   std::uint64_t& entries);
 
 }  // namespace appsync

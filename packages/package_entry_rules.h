@@ -45,16 +45,16 @@ class PackageEntryRules {
   PackageEntryRules(const PackageLimits& limits, std::uint64_t packageBytes);
 
   /// nullopt and the item, or the reason for refusing the package.
-  std::optional<Error> admit(const ArchiveEntry& entry, PackageItem& item);
+  [[nodiscard]] std::optional<Error> admit(const ArchiveEntry& entry, PackageItem& item);
 
   /// Bytes of files that have been unpacked.
-  std::optional<Error> admitFileBytes(std::uint64_t count);
+  [[nodiscard]] std::optional<Error> admitFileBytes(std::uint64_t count);
   /// Bytes that a compressed package has given when it was uncompressed as a whole, its headers and
   /// padding with them.
-  std::optional<Error> admitStreamBytes(std::uint64_t count);
+  [[nodiscard]] std::optional<Error> admitStreamBytes(std::uint64_t count);
 
   /// The package is over: it must have held an application.
-  std::optional<Error> finish() const;
+  [[nodiscard]] std::optional<Error> finish() const;
 
   /// "<Name>.app"; empty until its first entry has come.
   const std::string& bundleName() const { return bundleName_; }
@@ -68,13 +68,13 @@ class PackageEntryRules {
     bool isDirectory;
   };
 
-  std::optional<Error> checkName(std::string_view name) const;
-  std::optional<Error> checkKind(const ArchiveEntry& entry) const;
-  std::optional<Error> plainPath(std::string_view name, std::string& path) const;
-  std::optional<Error> checkTop(std::string_view path, bool isDirectory);
-  std::optional<Error> remember(std::string_view path, bool isDirectory);
-  std::optional<Error> countEntry();
-  std::optional<Error> checkSize(std::uint64_t bytes) const;
+  [[nodiscard]] std::optional<Error> checkName(std::string_view name) const;
+  [[nodiscard]] std::optional<Error> checkKind(const ArchiveEntry& entry) const;
+  [[nodiscard]] std::optional<Error> plainPath(std::string_view name, std::string& path) const;
+  [[nodiscard]] std::optional<Error> checkTop(std::string_view path, bool isDirectory);
+  [[nodiscard]] std::optional<Error> remember(std::string_view path, bool isDirectory);
+  [[nodiscard]] std::optional<Error> countEntry();
+  [[nodiscard]] std::optional<Error> checkSize(std::uint64_t bytes) const;
 
   const PackageLimits limits_;
   const std::uint64_t expandedLimit_;  ///< bytes that a package of this size may grow to

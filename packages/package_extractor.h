@@ -61,9 +61,8 @@ struct ExtractedPackage {
 /// identifier. Borrows both descriptors for the call and moves the package's offset. Files become
 /// 0644, or 0755 where their owner may run them or KBBundleExecutable names them; nothing is put on
 /// disk yet. Besides refusals, the error may be one of POSIXErrorDomain. Thread-safe.
-std::optional<ExtractedPackage> extractPackage(int packageFd, int targetDirectoryFd,
-                                               std::optional<std::string_view> expectedIdentifier,
-                                               const PackageLimits& limits,
-                                               std::optional<Error>* error) noexcept;
+[[nodiscard]] std::optional<ExtractedPackage> extractPackage(
+    int packageFd, int targetDirectoryFd, std::optional<std::string_view> expectedIdentifier,
+    const PackageLimits& limits, std::optional<Error>* error) noexcept;
 
 }  // namespace appsync

@@ -30,11 +30,11 @@ class PackageReader {
 
   /// The next entry: true and the item; false at the end, or with `error` when the package is
   /// refused. Only after the end is it sure that the whole package is sound.
-  bool next(PackageItem& item, std::optional<Error>& error);
+  [[nodiscard]] bool next(PackageItem& item, std::optional<Error>& error);
 
   /// The bytes of the file that `next` gave last, at most once; `size` is the file's whole size,
   /// which may lie past the last piece. A file that is not read is passed over.
-  std::optional<Error> readFile(const Sink& sink, std::uint64_t& size);
+  [[nodiscard]] std::optional<Error> readFile(const Sink& sink, std::uint64_t& size);
 
   const PackageEntryRules& rules() const { return rules_; }
 
@@ -43,10 +43,10 @@ class PackageReader {
     void operator()(archive* a) const;
   };
 
-  std::optional<Error> openZip();
+  [[nodiscard]] std::optional<Error> openZip();
   void openTar();
-  std::optional<Error> finish();
-  std::optional<Error> drain();
+  [[nodiscard]] std::optional<Error> finish();
+  [[nodiscard]] std::optional<Error> drain();
   Error failure() const;
   static std::int64_t readStream(archive*, void* self, const void** block);
 

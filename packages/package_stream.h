@@ -16,7 +16,7 @@ class PackageStream {
 
   /// The next bytes, which stay valid until the next call; empty at the end. Data that is damaged
   /// or cut off gives an error.
-  virtual std::optional<Error> next(ByteView& bytes) = 0;
+  [[nodiscard]] virtual std::optional<Error> next(ByteView& bytes) = 0;
 };
 
 /// From the beginning of an open regular file, whose offset it moves: gzip, bzip2, compress, lzma,

@@ -18,8 +18,8 @@ struct WrittenPackage {
 /// HalvoArtwork beside it, in the format that the output's ending names. The same folder always
 /// gives the same bytes. What the phone would refuse is refused here; the output appears whole or
 /// not at all. nullopt with one line for people on failure.
-std::optional<WrittenPackage> writePackage(const std::filesystem::path& folder,
-                                           const std::filesystem::path& output,
-                                           std::string& problem);
+[[nodiscard]] std::optional<WrittenPackage> writePackage(const std::filesystem::path& folder,
+                                                         const std::filesystem::path& output,
+                                                         std::string& problem);
 
 }  // namespace appsync

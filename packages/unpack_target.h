@@ -18,7 +18,7 @@ class UnpackTarget {
   // False, or not valid, with errno set. Missing parents are made.
 
   /// A folder that stands already counts as made.
-  bool makeDirectory(std::string_view path);
+  [[nodiscard]] bool makeDirectory(std::string_view path);
   /// A new file, for reading and writing.
   FileDescriptor createFile(std::string_view path, bool executable);
   /// An existing file, for reading.
@@ -33,6 +33,6 @@ class UnpackTarget {
 };
 
 /// Lets everybody who may read the file run it.
-bool makeExecutable(int fd) noexcept;
+[[nodiscard]] bool makeExecutable(int fd) noexcept;
 
 }  // namespace appsync

@@ -15,6 +15,6 @@ bool looksLikeZip(int packageFd) noexcept;
 /// entries than it holds or spans several disks; names that hold a NUL or differ from the ones in
 /// front of the data; encryption; more entries than `maximumEntries`, for which it would take
 /// memory. The error is a refusal. Leaves the file's offset as it is.
-std::optional<Error> checkZipDirectory(int packageFd, std::uint64_t maximumEntries);
+[[nodiscard]] std::optional<Error> checkZipDirectory(int packageFd, std::uint64_t maximumEntries);
 
 }  // namespace appsync

@@ -23,9 +23,10 @@ namespace appsync {
 class FileReceiver {
  public:
   virtual ~FileReceiver() = default;
-  virtual bool append(ByteView bytes, std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool append(ByteView bytes, std::optional<Error>* error) noexcept = 0;
   /// The file is whole. False when it could not be completed.
-  virtual bool finish(Durability durability, std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool finish(Durability durability,
+                                    std::optional<Error>* error) noexcept = 0;
 };
 
 /// Told of things that a person watching the phone would see, on the threads that bring them about
@@ -49,13 +50,13 @@ class IncomingFiles {
 
   /// Begins to receive a file at a path of the phone; parents are made, an existing file is
   /// replaced when it is finished. nullptr (with an error) when that cannot be.
-  virtual std::unique_ptr<FileReceiver> receiveFile(std::string_view path,
-                                                    std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual std::unique_ptr<FileReceiver> receiveFile(
+      std::string_view path, std::optional<Error>* error) noexcept = 0;
 
   /// The names in a directory of the phone, sorted; none of one that is not there. nullopt (with an
   /// error) when they could not be read.
-  virtual std::optional<std::vector<std::string>> namesIn(std::string_view directory,
-                                                          std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual std::optional<std::vector<std::string>> namesIn(
+      std::string_view directory, std::optional<Error>* error) noexcept = 0;
 };
 
 /// What a backup saves of the applications beside their files, and a restore gives back.
@@ -65,32 +66,33 @@ class ApplicationData {
 
   /// One record per registry entry (BundleKind::All), sorted by identifier, placeholders last.
   /// None, with an error, when the registry cannot be read.
-  virtual std::vector<AppRecord> applications(std::optional<Error>* error = nullptr) noexcept = 0;
+  [[nodiscard]] virtual std::vector<AppRecord> applications(
+      std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// The opaque blob that came with the application or its placeholder; nullopt for none, and with
   /// an error when that cannot be read.
-  virtual std::optional<Bytes> opaqueBlob(std::string_view bundleId,
-                                          std::optional<Error>* error = nullptr) noexcept = 0;
+  [[nodiscard]] virtual std::optional<Bytes> opaqueBlob(
+      std::string_view bundleId, std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// Gives an application's own data, or for a placeholder what a restore has still to give back to
   /// it, as a tar archive whose bytes depend only on the data. Empty data gives no bytes at all.
   /// False (with an error) when it could not be read or the sink ended it (POSIX 125).
-  virtual bool saveData(std::string_view bundleId, const DataSink& sink,
-                        std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool saveData(std::string_view bundleId, const DataSink& sink,
+                                      std::optional<Error>* error) noexcept = 0;
 
   /// Takes such an archive and lays the data out where it waits for the application, in one step
   /// and on the disk; what waited there before is gone. False (with an error, POSIX 125 for the
   /// source's own failure) when it is no archive, holds what no data may hold, or cannot be stored;
   /// nothing has changed then.
-  virtual bool restoreData(std::string_view bundleId, const DataSource& source,
-                           std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool restoreData(std::string_view bundleId, const DataSource& source,
+                                         std::optional<Error>* error) noexcept = 0;
 
   /// Takes such an archive and gives it to an installed application in the place of its data, in
   /// one step and on the disk; no bytes at all leave it without any. Until then the old data is
   /// whole. False (with an error, POSIX 2 when it is not installed, 16 when it is open or being
   /// updated) as above; nothing has changed then. It cannot be brought to the foreground meanwhile.
-  virtual bool overwriteData(std::string_view bundleId, const DataSource& source,
-                             std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool overwriteData(std::string_view bundleId, const DataSource& source,
+                                           std::optional<Error>* error) noexcept = 0;
 };
 
 /// What the phone does by itself.

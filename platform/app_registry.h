@@ -159,15 +159,15 @@ class AppRegistry {
   /// SWHalvoMetadataKey (data) and SWApplicationSINFKey (data or null). A package replaces the
   /// installed version and the placeholder in one step; a crash or a failure leaves the old state
   /// whole.
-  virtual bool installApplication(const FileLocation& package,
-                                  const PropertyList::Dictionary& options,
-                                  std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool installApplication(const FileLocation& package,
+                                                const PropertyList::Dictionary& options,
+                                                std::optional<Error>* error) noexcept = 0;
 
   /// Without options takes away the application, or only the placeholder while one is laid over an
   /// installed version. With UninstallPlaceholdersOnlyKey true never touches an installed version.
   /// False when there was nothing of the kind or it could not be removed.
-  virtual bool uninstallApplication(std::string_view bundleId,
-                                    const PropertyList::Dictionary& options) noexcept = 0;
+  [[nodiscard]] virtual bool uninstallApplication(
+      std::string_view bundleId, const PropertyList::Dictionary& options) noexcept = 0;
 
   /// The progress of the application's install that begins at `phase`; nullptr when it is not being
   /// installed.

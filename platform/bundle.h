@@ -34,7 +34,7 @@ class Bundle {
 };
 
 /// The dictionary in the property-list file at `path`; nullopt when there is none to be had.
-std::optional<PropertyList::Dictionary> loadDictionary(FileManager& files, std::string_view path,
-                                                       std::optional<Error>* error = nullptr);
+[[nodiscard]] std::optional<PropertyList::Dictionary> loadDictionary(
+    FileManager& files, std::string_view path, std::optional<Error>* error = nullptr);
 
 }  // namespace appsync

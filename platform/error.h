@@ -47,7 +47,7 @@ inline void setError(std::optional<Error>* error, Error reason) {
   if (error) *error = std::move(reason);
 }
 /// The same, for an operation that is false when it fails: false.
-inline bool failWith(std::optional<Error>* error, Error reason) {
+[[nodiscard]] inline bool failWith(std::optional<Error>* error, Error reason) {
   setError(error, std::move(reason));
   return false;
 }

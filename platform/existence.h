@@ -15,21 +15,23 @@ namespace appsync {
 bool isMissing(const std::optional<Error>& reason);
 
 /// nullopt (with a reason) when the item cannot be looked at.
-std::optional<bool> isThere(FileManager& files, std::string_view path, std::optional<Error>* error);
+[[nodiscard]] std::optional<bool> isThere(FileManager& files, std::string_view path,
+                                          std::optional<Error>* error);
 
 /// The whole file, none when it is not there. False (with a reason) when it cannot be read.
-bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>& contents,
-                 std::optional<Error>* error);
+[[nodiscard]] bool readIfThere(FileManager& files, std::string_view path,
+                               std::optional<Bytes>& contents, std::optional<Error>* error);
 
 /// The dictionary in a file, empty when the file is missing or holds none. nullopt (with a reason)
 /// when it cannot be read.
-std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,
-                                                       std::optional<Error>* error);
+[[nodiscard]] std::optional<PropertyList::Dictionary> readDictionary(FileManager& files,
+                                                                     std::string_view path,
+                                                                     std::optional<Error>* error);
 
 /// Whether the executable that a bundle's information names is in it; true when it names none.
 /// nullopt (with a reason) when that cannot be told.
-std::optional<bool> isExecutableThere(FileManager& files, std::string_view bundlePath,
-                                      std::optional<Error>* error);
+[[nodiscard]] std::optional<bool> isExecutableThere(FileManager& files, std::string_view bundlePath,
+                                                    std::optional<Error>* error);
 
 /// Whether anything but a directory is there; false also when that cannot be told.
 bool isFile(FileManager& files, std::string_view path);

@@ -47,49 +47,50 @@ class FileManager {
 
   /// The whole file, read past any cache of this service. nullopt when it is missing or unreadable;
   /// an empty file gives empty bytes.
-  virtual std::optional<Bytes> contentsAtPath(std::string_view path,
-                                              std::optional<Error>* error = nullptr) noexcept = 0;
+  [[nodiscard]] virtual std::optional<Bytes> contentsAtPath(
+      std::string_view path, std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// Replaces the file in one step: a reader sees the old bytes or the new ones, also after a
   /// crash, and when this returns true they are on disk. The directory must exist. Files below the
   /// temporary directory need not survive a power failure.
-  virtual bool writeAtomically(std::string_view path, ByteView bytes,
-                               std::optional<Error>* error = nullptr) noexcept = 0;
+  [[nodiscard]] virtual bool writeAtomically(std::string_view path, ByteView bytes,
+                                             std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// Makes the file with these bytes and attributes, replacing an existing one. Not atomic.
-  virtual bool createFile(std::string_view path, ByteView bytes,
-                          const FileAttributes& attributes) noexcept = 0;
+  [[nodiscard]] virtual bool createFile(std::string_view path, ByteView bytes,
+                                        const FileAttributes& attributes) noexcept = 0;
 
   /// Makes a directory. With `withIntermediates`, missing parents are made too and an existing
   /// directory counts as success; without, an existing item fails (POSIX 17). The attributes go to
   /// every directory made.
-  virtual bool createDirectory(std::string_view path, bool withIntermediates,
-                               const FileAttributes& attributes,
-                               std::optional<Error>* error = nullptr) noexcept = 0;
+  [[nodiscard]] virtual bool createDirectory(std::string_view path, bool withIntermediates,
+                                             const FileAttributes& attributes,
+                                             std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// Removes a file, a link (never what it points to) or a directory with all in it. A missing item
   /// fails with POSIX 2.
-  virtual bool removeItem(std::string_view path,
-                          std::optional<Error>* error = nullptr) noexcept = 0;
+  [[nodiscard]] virtual bool removeItem(std::string_view path,
+                                        std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// Moves an item; the target must not exist (POSIX 17) and its directory must.
-  virtual bool moveItem(std::string_view from, std::string_view to,
-                        std::optional<Error>* error = nullptr) noexcept = 0;
+  [[nodiscard]] virtual bool moveItem(std::string_view from, std::string_view to,
+                                      std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// Copies a file, or a directory with all in it; the target must not exist (POSIX 17).
-  virtual bool copyItem(std::string_view from, std::string_view to,
-                        std::optional<Error>* error = nullptr) noexcept = 0;
+  [[nodiscard]] virtual bool copyItem(std::string_view from, std::string_view to,
+                                      std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// True for an existing file or directory.
   virtual bool fileExists(std::string_view path) noexcept = 0;
   /// True for an existing directory.
   virtual bool directoryExists(std::string_view path) noexcept = 0;
 
-  virtual std::optional<ItemAttributes> attributesOfItem(
+  [[nodiscard]] virtual std::optional<ItemAttributes> attributesOfItem(
       std::string_view path, std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// Sets access and modification time to now.
-  virtual bool touch(std::string_view path, std::optional<Error>* error = nullptr) noexcept = 0;
+  [[nodiscard]] virtual bool touch(std::string_view path,
+                                   std::optional<Error>* error = nullptr) noexcept = 0;
 
   /// The temporary directory of the process, without a "/" at its end.
   virtual std::string temporaryDirectory() noexcept = 0;

@@ -33,7 +33,7 @@ class HomeScreenService {
   virtual Port serverPort() noexcept = 0;
 
   /// Adopts an icon layout (a property list, parsed here). The status is 0 on success.
-  virtual int setIconState(Port port, ByteView layout) noexcept = 0;
+  [[nodiscard]] virtual int setIconState(Port port, ByteView layout) noexcept = 0;
 
   /// With format 1, a property list whose top level is an array of bundle identifiers in the order
   /// in which the home screen shows them. nullopt when the home screen does not answer.

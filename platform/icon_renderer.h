@@ -32,7 +32,7 @@ class ImageEncoder {
   /// Borrows the image until finalize.
   virtual void addImage(const Image& image) noexcept = 0;
   /// Writes the file into the buffer; false when images are missing or cannot be encoded.
-  virtual bool finalize() noexcept = 0;
+  [[nodiscard]] virtual bool finalize() noexcept = 0;
 };
 
 class ImageEncoderService {

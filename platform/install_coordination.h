@@ -104,14 +104,15 @@ class InstallPlaceholder {
   virtual ~InstallPlaceholder() = default;
 
   virtual std::string bundleIdentifier() const = 0;
-  virtual bool setIconPromise(const std::shared_ptr<PathTransferPromise>& promise,
-                              std::optional<Error>* error) noexcept = 0;
-  virtual bool setPlaceholderAttributes(const PlaceholderAttributes& attributes,
-                                        std::optional<Error>* error) noexcept = 0;
-  virtual bool setMetadata(const StoreMetadata& metadata, std::optional<Error>* error) noexcept = 0;
-  virtual bool setSinfData(ByteView sinf, std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setIconPromise(const std::shared_ptr<PathTransferPromise>& promise,
+                                            std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setPlaceholderAttributes(const PlaceholderAttributes& attributes,
+                                                      std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setMetadata(const StoreMetadata& metadata,
+                                         std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setSinfData(ByteView sinf, std::optional<Error>* error) noexcept = 0;
   /// Nothing more will be set; the placeholder may be handed over.
-  virtual bool setConfigurationComplete(std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setConfigurationComplete(std::optional<Error>* error) noexcept = 0;
   virtual bool cancel(const Error& reason, CoordinationClientId client) noexcept = 0;
   virtual std::string description() const = 0;
 };
@@ -154,33 +155,36 @@ class InstallCoordinator {
   virtual void setObserver(CoordinatorObserver* observer) noexcept = 0;
 
   virtual bool hasInstallOptions() const noexcept = 0;
-  virtual bool setInstallOptions(const InstallOptions& options,
-                                 std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setInstallOptions(const InstallOptions& options,
+                                               std::optional<Error>* error) noexcept = 0;
 
   virtual bool hasInitialQPKAssetPromises() const noexcept = 0;
-  virtual bool setInitialQPKAssetPromises(const std::vector<std::shared_ptr<DataPromise>>& promises,
-                                          std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setInitialQPKAssetPromises(
+      const std::vector<std::shared_ptr<DataPromise>>& promises,
+      std::optional<Error>* error) noexcept = 0;
 
   virtual bool hasAppAssetPromise() const noexcept = 0;
   /// The application package; nullptr when there is none or it cannot be had (then with an error).
-  virtual std::shared_ptr<PathTransferPromise> appAssetPromise(
+  [[nodiscard]] virtual std::shared_ptr<PathTransferPromise> appAssetPromise(
       std::optional<Error>* error) noexcept = 0;
-  virtual bool setAppAssetPromise(const std::shared_ptr<PathTransferPromise>& promise,
-                                  std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setAppAssetPromise(const std::shared_ptr<PathTransferPromise>& promise,
+                                                std::optional<Error>* error) noexcept = 0;
   /// The client that brings the application package; 0 when nobody was named.
   virtual CoordinationClientId appAssetPromiseResponsibleClient() const noexcept = 0;
-  virtual bool setAppAssetPromiseResponsibleClient(CoordinationClientId client,
-                                                   std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setAppAssetPromiseResponsibleClient(
+      CoordinationClientId client, std::optional<Error>* error) noexcept = 0;
 
   virtual bool hasUserDataPromise() const noexcept = 0;
-  virtual bool setUserDataPromise(const std::shared_ptr<OutOfBandTransferPromise>& promise,
-                                  std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setUserDataPromise(
+      const std::shared_ptr<OutOfBandTransferPromise>& promise,
+      std::optional<Error>* error) noexcept = 0;
 
   virtual bool hasPlaceholderPromise() const noexcept = 0;
   /// Refused with an error: none, one of another application, and one whose configuration is not
   /// complete, which nobody might ever complete.
-  virtual bool setPlaceholderPromise(const std::shared_ptr<InstallPlaceholder>& placeholder,
-                                     std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool setPlaceholderPromise(
+      const std::shared_ptr<InstallPlaceholder>& placeholder,
+      std::optional<Error>* error) noexcept = 0;
 
   virtual bool cancel(const Error& reason, CoordinationClientId client) noexcept = 0;
   virtual std::string description() const = 0;
@@ -208,7 +212,7 @@ class InstallCoordination {
   /// sort that is this client's own, untold, and refuses to while it is another client's or past
   /// cancelling. nullptr when there is none and none is to be made, or when it failed (with an
   /// error). `created` may be null.
-  virtual std::shared_ptr<InstallCoordinator> coordinatorFor(
+  [[nodiscard]] virtual std::shared_ptr<InstallCoordinator> coordinatorFor(
       CoordinatorKind kind, std::string_view bundleId, CoordinationClientId client,
       bool createIfNotExisting, bool* created, std::optional<Error>* error) noexcept = 0;
 

@@ -106,7 +106,7 @@ std::optional<PropertyList::Data> findData(const PropertyList::Dictionary& dicti
 std::vector<std::string> findStrings(const PropertyList::Dictionary& dictionary,
                                      std::string_view key);
 /// Whether there is a value under `key` that read as a boolean is true.
-bool findFlag(const PropertyList::Dictionary& dictionary, std::string_view key);
+[[nodiscard]] bool findFlag(const PropertyList::Dictionary& dictionary, std::string_view key);
 
 /// One line for log messages and errors: "(a, b)" for arrays, "{k = v; l = w}" for dictionaries,
 /// "<0a0b>" for data (shortened past 16 bytes: "<0a0b... 4096 bytes>"), "1" and "0" for booleans,

@@ -29,8 +29,8 @@ const char* problemOf(const BinaryPropertyList& list, const PropertyListLimits& 
 /// `false` an array's elements. (The library's own XML dictionaries have a hash table of fixed
 /// size, which many keys, or keys chosen to collide, make take hours.) nullopt, with `problem` told
 /// in one line, when it is malformed or beyond the limits. `document` has no byte-order mark.
-std::optional<std::string> canonicalXmlPropertyList(std::string_view document,
-                                                    const PropertyListLimits& limits,
-                                                    std::string& problem);
+[[nodiscard]] std::optional<std::string> canonicalXmlPropertyList(std::string_view document,
+                                                                  const PropertyListLimits& limits,
+                                                                  std::string& problem);
 
 }  // namespace appsync

@@ -38,7 +38,8 @@ std::optional<PropertyList::Dictionary> parseDictionary(ByteView bytes,
 /// character other than tab, line feed and carriage return, and a date outside the years 1000 to
 /// 9999. XML holds dates in whole seconds (rounded down) and neither a negative zero nor the bits
 /// of a NaN. Thread-safe.
-std::optional<Bytes> serializePropertyList(const PropertyList& value, PropertyListFormat format,
-                                           std::optional<Error>* error = nullptr);
+[[nodiscard]] std::optional<Bytes> serializePropertyList(const PropertyList& value,
+                                                         PropertyListFormat format,
+                                                         std::optional<Error>* error = nullptr);
 
 }  // namespace appsync

@@ -11,11 +11,11 @@ namespace appsync {
 // range; blanks around the text are gone already where they mean nothing.
 
 /// Decimal without leading zeros, from -2^63 to 2^64-1; hexadecimal is read too.
-bool canonicalXmlInteger(std::string& text);
+[[nodiscard]] bool canonicalXmlInteger(std::string& text);
 /// A decimal number, or an infinity or NaN by its usual names.
-bool canonicalXmlReal(std::string& text);
+[[nodiscard]] bool canonicalXmlReal(std::string& text);
 /// Base64 in whole groups, without blanks.
-bool canonicalXmlData(std::string& text);
+[[nodiscard]] bool canonicalXmlData(std::string& text);
 /// "2026-01-31T12:00:00Z", a moment that exists, in the years 1000 to 9999.
 bool isXmlDate(std::string_view text);
 /// No NUL or other control character but tab, line feed and carriage return.

@@ -25,9 +25,9 @@ class SyncClient {
   virtual std::vector<std::string> supportedDataclasses() noexcept = 0;
   virtual std::string currentSyncAnchor() noexcept = 0;
   /// First call of a sync. `hostAnchor` is the anchor that the desktop remembers.
-  virtual bool prepareForSyncWithHostAnchor(std::string_view hostAnchor,
-                                            const ProgressCallback& progressCallback,
-                                            std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool prepareForSyncWithHostAnchor(std::string_view hostAnchor,
+                                                          const ProgressCallback& progressCallback,
+                                                          std::optional<Error>* error) noexcept = 0;
   /// The dataclasses that device restrictions disable; nullopt when nothing is disabled.
   virtual std::optional<std::set<std::string>> disabledAssetTypes() noexcept = 0;
 
@@ -39,9 +39,10 @@ class SyncClient {
   virtual std::set<std::string> corvaneIDsForAssets() noexcept = 0;
 
   /// Takes over what the desktop staged and carries out its deletions.
-  virtual bool reconcileSync(const PropertyList& syncDescription, std::string_view newAnchor,
-                             const ProgressCallback& progressCallback,
-                             std::optional<Error>* error) noexcept = 0;
+  [[nodiscard]] virtual bool reconcileSync(const PropertyList& syncDescription,
+                                           std::string_view newAnchor,
+                                           const ProgressCallback& progressCallback,
+                                           std::optional<Error>* error) noexcept = 0;
   /// The counterpart after a device restore. Type 2: from a desktop backup. Always true; clears
   /// `error`.
   virtual bool reconcileRestoreOfType(std::int32_t type, std::optional<Error>* error) noexcept = 0;

@@ -1,5 +1,7 @@
 // Placeholder applications: the small bundles that the registry shows until the packages arrive.
 
+#include <tuple>
+
 #include "client/apps_client.h"
 #include "client/paths.h"
 #include "platform/bundle.h"
@@ -85,7 +87,7 @@ void AppsClient::_createPlaceHolderApplication(const SyncAssetPtr& asset) {
 void AppsClient::_copyIcon(const std::optional<FileLocation>& icon, const std::string& target) {
   if (!icon || icon->path.empty()) return;
   // The directory of an earlier placeholder is used again.
-  _platform.files.removeItem(target);
+  std::ignore = _platform.files.removeItem(target);
   std::optional<Error> error;
   if (!_platform.files.copyItem(icon->path, target, &error)) {
     _log.error("Copying icon from %{public}@ to %{public}@ failed: %{public}@", icon->path, target,

@@ -36,8 +36,8 @@ bool infoProhibitsLaunch(const PropertyList::Dictionary& info);
 
 /// Writes the Info.plist of the placeholder bundle at `path` atomically. False also when an entry
 /// is null.
-bool writePlaceholderInfo(FileManager& files, std::string_view path,
-                          const PropertyList::Dictionary& info);
+[[nodiscard]] bool writePlaceholderInfo(FileManager& files, std::string_view path,
+                                        const PropertyList::Dictionary& info);
 
 /// The options with which every placeholder bundle is handed to the registry.
 PropertyList::Dictionary placeholderOptions(std::string_view bundleId, InstallType installType);

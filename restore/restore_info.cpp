@@ -1,5 +1,7 @@
 // The applications of a restored backup: each becomes a placeholder or a coordinated restore.
 
+#include <tuple>
+
 #include "client/apps_client.h"
 #include "client/identifier_safety.h"
 #include "client/paths.h"
@@ -97,7 +99,7 @@ bool AppsClient::_processHalvoRestoreInfo() {
   const bool result = list && _restoreApplications(*list);
 
   // The list is used once, whatever came of it.
-  _platform.files.removeItem(KeptCopyPath);
+  std::ignore = _platform.files.removeItem(KeptCopyPath);
   std::optional<Error> error;
   if (!_platform.files.moveItem(exchange::RestoreList, KeptCopyPath, &error)) {
     _log.normal("failed to copy halvo metadata. err=%{public}@", error);
@@ -174,8 +176,8 @@ bool AppsClient::_installRestorePlaceholder(std::string_view bundleId,
     return false;
   }
   // A placeholder without an icon is better than none.
-  writeIconData(iconData, joinPath(path, PlaceholderIconName), nullptr, bundleId,
-                placeholderFileAttributes());
+  std::ignore = writeIconData(iconData, joinPath(path, PlaceholderIconName), nullptr, bundleId,
+                              placeholderFileAttributes());
   const PropertyList::Dictionary info =
       placeholderInfo(bundleId, metadataVersion(metadata), metadataName(metadata),
                       periodicalFlag(metadata), metadataProhibitsLaunch(metadata));

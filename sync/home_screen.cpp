@@ -1,5 +1,7 @@
 // The home screen's order of applications, and what it is told of a sync.
 
+#include <tuple>
+
 #include "client/apps_client.h"
 #include "client/paths.h"
 #include "platform/property_list_codec.h"
@@ -19,7 +21,8 @@ PropertyList::Array currentOrder(const Platform& platform, const ClientLog& log)
     return {};
   }
   log.normal("saved icon sort order");
-  platform.files.writeAtomically(paths::SortOrder, *state);
+  // Kept for those who look for mistakes; the order goes on without it.
+  std::ignore = platform.files.writeAtomically(paths::SortOrder, *state);
   std::optional<PropertyList> parsed = parsePropertyList(*state);
   PropertyList::Array* order = parsed ? parsed->asArray() : nullptr;
   return order ? std::move(*order) : PropertyList::Array{};

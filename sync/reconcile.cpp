@@ -1,6 +1,8 @@
 // Takes over what the desktop staged: deletions and the icon layout at once, installs as transfers
 // later.
 
+#include <tuple>
+
 #include "client/apps_client.h"
 #include "client/identifier_safety.h"
 #include "client/paths.h"
@@ -24,7 +26,8 @@ bool isSafeRemoval(const TodoEntry& entry) {
 /// the reconcile is over with this result.
 std::optional<bool> takeOverStagingArea(FileManager& files, const ClientLog& log,
                                         std::optional<Error>* error) {
-  files.removeItem(exchange::WorkArea);
+  // One that stays is in the way of the move below, which tells.
+  std::ignore = files.removeItem(exchange::WorkArea);
   if (!files.createDirectory(exchange::SyncRoot, true, {}, error)) {
     log.error("can't create work area");
     return false;
@@ -68,7 +71,7 @@ bool AppsClient::reconcileSync(const PropertyList&, std::string_view newAnchor,
     if (todoList) {
       const std::optional<Bytes> bytes =
           serializePropertyList(std::move(*todoList), PropertyListFormat::Binary);
-      if (bytes) _platform.files.writeAtomically(paths::TodoDebugCopy, *bytes);
+      if (bytes) std::ignore = _platform.files.writeAtomically(paths::TodoDebugCopy, *bytes);
     }
     result = true;
   }
@@ -107,14 +110,16 @@ void AppsClient::_sendIconLayout() {
   if (!layout || layout->empty()) return;
   _log.normal("Sending iconlayout to DS");
   const HomeScreenService::Port port = _platform.homeScreen.serverPort();
-  _platform.homeScreen.setIconState(port, *layout);
+  // An order that the home screen refuses is no reason to end the sync.
+  std::ignore = _platform.homeScreen.setIconState(port, *layout);
 }
 
 bool AppsClient::reconcileRestoreOfType(std::int32_t type, std::optional<Error>* error) noexcept {
   _log.normal("reconcileRestoreOfType %d", type);
   _notifyDashel(true);
-  _platform.files.createDirectory(exchange::SyncRoot, true, {});
-  if (type == RestoreFromDesktopBackup) _processHalvoRestoreInfo();
+  // A restore is over for the host whatever came of it; the log tells what failed.
+  std::ignore = _platform.files.createDirectory(exchange::SyncRoot, true, {});
+  if (type == RestoreFromDesktopBackup) std::ignore = _processHalvoRestoreInfo();
   if (error) error->reset();
   return true;
 }

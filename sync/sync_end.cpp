@@ -1,6 +1,7 @@
 // Closes or resets the application sync, and tidies metadata before a backup.
 
 #include <system_error>
+#include <tuple>
 
 #include "client/apps_client.h"
 #include "client/paths.h"
@@ -58,14 +59,16 @@ void AppsClient::syncEndedWithSuccess(bool success) noexcept {
       _uninstalledApps.reset();
     }
   }
-  _platform.files.removeItem(exchange::LastSyncState);
+  // A sync has ended all the same; the host writes the list anew.
+  std::ignore = _platform.files.removeItem(exchange::LastSyncState);
 }
 
 void AppsClient::clearSyncData() noexcept {
   _log.normal("blasting work area");
   {
     const Lock lock(_stateFileMutex);
-    _platform.files.removeItem(exchange::SyncRoot);
+    // Nobody is told of what could not be cleared.
+    std::ignore = _platform.files.removeItem(exchange::SyncRoot);
   }
 
   _log.normal("Uninstalling all placeholder apps");
@@ -95,7 +98,7 @@ void AppsClient::prepareForBackup() noexcept {
     if (!metadata || !tidyMetadata(record, *metadata, _log)) return;
     const std::optional<Bytes> bytes =
         serializePropertyList(std::move(*metadata), PropertyListFormat::Xml);
-    if (bytes) _platform.files.writeAtomically(path, *bytes);
+    if (bytes) std::ignore = _platform.files.writeAtomically(path, *bytes);
   });
   _log.normal("finished preparing for backup");
 }

@@ -29,7 +29,7 @@ class InProgressAssetQuery final : public AppRegistryObserver {
   InProgressAssetQuery(AppRegistry& registry, const ClientLog& log)
       : _registry(registry), _log(log) {}
 
-  bool _fetchResults();
+  [[nodiscard]] bool _fetchResults();
   void _sort(const AppRecord& record);
 
   AppRegistry& _registry;

@@ -2,6 +2,7 @@
 // install_plan; here are the effects.
 
 #include <cerrno>
+#include <tuple>
 
 #include "client/apps_client.h"
 #include "platform/bundle.h"
@@ -21,7 +22,7 @@ constexpr std::string_view StartwellErrorDomain = "StartwellError";
 /// Removes a package whose install is over. What is not seen to be a file stays: an empty path
 /// leads to the directory in which all packages arrive.
 void removePackage(FileManager& files, const std::string& path) {
-  if (isFile(files, path)) files.removeItem(path);
+  if (isFile(files, path)) std::ignore = files.removeItem(path);
 }
 
 /// Without a placeholder over it, the registry would take the working version that was to be

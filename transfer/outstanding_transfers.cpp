@@ -1,6 +1,7 @@
 // Which packages the host must still send, and what is made ready for each of them.
 
 #include <cerrno>
+#include <tuple>
 
 #include "client/apps_client.h"
 #include "client/identifier_safety.h"
@@ -31,7 +32,8 @@ void dropInProgress(AppRegistry& registry, PropertyList::Dictionary& entries,
 }
 
 void renewIconScratch(FileManager& files, const ClientLog& log) {
-  files.removeItem(paths::IconScratch);
+  // One that stays is in the way of the new one, which is told below.
+  std::ignore = files.removeItem(paths::IconScratch);
   std::optional<Error> error;
   if (!files.createDirectory(paths::IconScratch, false, {}, &error)) {
     log.error("Can't create icon scratch dir! %{public}@", error);

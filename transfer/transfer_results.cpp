@@ -1,6 +1,7 @@
 // How far each package's transfer has come, how it ended, and the end of them all.
 
 #include <cmath>
+#include <tuple>
 
 #include "client/apps_client.h"
 #include "client/identifier_safety.h"
@@ -47,7 +48,8 @@ void AppsClient::assetTransferUpdatedProgress(const SyncAssetPtr& asset, double 
   if (_useInstallCoordinator) {
     const bool existing = _accessQueue.sync(
         [&]() APPSYNC_REQUIRES(_accessQueue) { return _updatingApps.contains(identifier); });
-    updateTransferProgressForApp(asset, existing);
+    // Only shown; it has told of its failure.
+    std::ignore = updateTransferProgressForApp(asset, existing);
   } else if (const auto progress = _progressForAssetIdentifier(identifier)) {
     progress->setInstallState(InstallState::Active);
     if (progress->totalUnitCount() != ProgressUnits) progress->setTotalUnitCount(ProgressUnits);

@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <cerrno>
+#include <tuple>
 
 #include "base/identifiers.h"
 #include "device/apps/installs.h"

@@ -28,19 +28,21 @@ class DeviceAppRegistry final : public AppRegistry {
   void installPhaseFinished(InstallProgress& progress) noexcept override;
 
   /// Installs a package of which more is said than in its file, like installApplication.
-  bool installPackageWith(const FileLocation& package, const std::string& identifier,
-                          const InstallDetails& details, std::optional<Error>* error) noexcept;
+  [[nodiscard]] bool installPackageWith(const FileLocation& package, const std::string& identifier,
+                                        const InstallDetails& details,
+                                        std::optional<Error>* error) noexcept;
 
   /// Installs a placeholder and makes its bundle.
-  bool buildPlaceholder(const std::string& identifier, const PlaceholderFace& face,
-                        const InstallDetails& details, std::optional<Error>* error) noexcept;
+  [[nodiscard]] bool buildPlaceholder(const std::string& identifier, const PlaceholderFace& face,
+                                      const InstallDetails& details,
+                                      std::optional<Error>* error) noexcept;
 
   using Change = std::function<bool(DeviceCore& core, const std::string& identifier,
                                     std::optional<Error>* error)>;
   /// Runs a change of one application, alone on it. False with an error for an identifier that
   /// cannot be used, a device opened for reading, or a change that failed.
-  bool change(std::string_view bundleId, const Change& change,
-              std::optional<Error>* error) noexcept;
+  [[nodiscard]] bool change(std::string_view bundleId, const Change& change,
+                            std::optional<Error>* error) noexcept;
 
   /// Whether only the placeholder and the data are left of it until somebody asks for it.
   bool isDemoted(std::string_view bundleId) noexcept;
@@ -48,10 +50,11 @@ class DeviceAppRegistry final : public AppRegistry {
   bool isBeingInstalled(std::string_view bundleId) noexcept;
   /// Every record, the placeholder after the installed version of the same identifier. None, with
   /// an error, when they cannot be read.
-  std::vector<AppRecord> records(std::optional<Error>* error = nullptr) noexcept;
+  [[nodiscard]] std::vector<AppRecord> records(std::optional<Error>* error = nullptr) noexcept;
   /// The opaque blob of the installed version or, failing that, of the placeholder; nullopt for
   /// none, and with an error when it cannot be read.
-  std::optional<Bytes> opaqueBlob(std::string_view bundleId, std::optional<Error>* error) noexcept;
+  [[nodiscard]] std::optional<Bytes> opaqueBlob(std::string_view bundleId,
+                                                std::optional<Error>* error) noexcept;
 
  private:
   DeviceCore& core_;

@@ -8,6 +8,7 @@
 
 #include <cerrno>
 #include <new>
+#include <tuple>
 
 #include "base/directory_tree.h"
 #include "base/temporary_file.h"
@@ -62,7 +63,7 @@ class UnfinishedFolder {
     folder_ = FileDescriptor(
         ::openat(parent, name_.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
   }
-  ~UnfinishedFolder() { removeTree(parent_, name_); }
+  ~UnfinishedFolder() { std::ignore = removeTree(parent_, name_); }
   UnfinishedFolder(const UnfinishedFolder&) = delete;
   UnfinishedFolder& operator=(const UnfinishedFolder&) = delete;
 
@@ -127,8 +128,9 @@ void enterOverwriting(DeviceCore& core, const ApplicationRow& application) {
   const HistoryEntry entry{.event = HistoryEvent::DataOverwritten,
                            .bundleId = application.identifier,
                            .version = application.version};
-  core.database.change("the history lacks an overwriting of data", Database::Commit::Ordinary,
-                       [&](Connection& database) { enterInHistory(database, entry); });
+  std::ignore =
+      core.database.change("the history lacks an overwriting of data", Database::Commit::Ordinary,
+                           [&](Connection& database) { enterInHistory(database, entry); });
 }
 
 std::optional<Error> overwrite(DeviceCore& core, const std::string& identifier,

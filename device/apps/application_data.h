@@ -9,13 +9,13 @@ namespace appsync::device {
 // An application's own data on its way into a backup and back. See EmbeddedDevice; the identifier
 // is usable.
 
-bool saveApplicationData(DeviceCore& core, std::string_view identifier, const DataSink& sink,
-                         std::optional<Error>* error);
+[[nodiscard]] bool saveApplicationData(DeviceCore& core, std::string_view identifier,
+                                       const DataSink& sink, std::optional<Error>* error);
 // The device is open for writing.
 
-bool restoreApplicationData(DeviceCore& core, std::string_view identifier, const DataSource& source,
-                            std::optional<Error>* error);
-bool overwriteApplicationData(DeviceCore& core, std::string_view identifier,
-                              const DataSource& source, std::optional<Error>* error);
+[[nodiscard]] bool restoreApplicationData(DeviceCore& core, std::string_view identifier,
+                                          const DataSource& source, std::optional<Error>* error);
+[[nodiscard]] bool overwriteApplicationData(DeviceCore& core, std::string_view identifier,
+                                            const DataSource& source, std::optional<Error>* error);
 
 }  // namespace appsync::device

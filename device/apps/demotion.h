@@ -10,6 +10,7 @@ namespace appsync::device {
 /// a placeholder of InstallType::IntentionalDowngrade with its icon and metadata. A crash on the
 /// way leaves it installed; done again, it comes to its end. The identifier is usable and the
 /// caller holds its application lock.
-bool demoteForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
+[[nodiscard]] bool demoteForPerson(DeviceCore& core, const std::string& identifier,
+                                   std::optional<Error>* error);
 
 }  // namespace appsync::device

@@ -18,8 +18,9 @@ struct IdleApplication {
 
 /// nullopt (with a reason) when it is not installed, is open or is being updated. The identifier is
 /// usable and the caller holds its application lock.
-std::optional<IdleApplication> holdIdle(DeviceCore& core, const std::string& identifier,
-                                        std::optional<Error>* error);
+[[nodiscard]] std::optional<IdleApplication> holdIdle(DeviceCore& core,
+                                                      const std::string& identifier,
+                                                      std::optional<Error>* error);
 
 /// "<identifier> <reason>"
 Error objection(int code, std::string_view identifier, std::string_view reason);

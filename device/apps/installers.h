@@ -23,14 +23,15 @@ struct InstallDetails {
 
 /// Installs an application package in the place of the installed version and of the placeholder.
 /// What `details` leave open is taken over from those.
-bool installPackage(DeviceCore& core, const std::string& package, const std::string& identifier,
-                    const InstallDetails& details, std::optional<Error>* error);
+[[nodiscard]] bool installPackage(DeviceCore& core, const std::string& package,
+                                  const std::string& identifier, const InstallDetails& details,
+                                  std::optional<Error>* error);
 
 /// Installs a placeholder from its bundle directory, which it copies, and begins the application's
 /// install. It replaces an earlier placeholder and lies over an installed version.
-bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
-                        const std::string& identifier, const InstallDetails& details,
-                        std::optional<Error>* error);
+[[nodiscard]] bool installPlaceholder(DeviceCore& core, const std::string& bundleDirectory,
+                                      const std::string& identifier, const InstallDetails& details,
+                                      std::optional<Error>* error);
 
 /// What a placeholder shows that has no bundle yet.
 struct PlaceholderFace {
@@ -41,13 +42,15 @@ struct PlaceholderFace {
 };
 
 /// Installs a placeholder and makes its bundle.
-bool buildPlaceholder(DeviceCore& core, const std::string& identifier, const PlaceholderFace& face,
-                      const InstallDetails& details, std::optional<Error>* error);
+[[nodiscard]] bool buildPlaceholder(DeviceCore& core, const std::string& identifier,
+                                    const PlaceholderFace& face, const InstallDetails& details,
+                                    std::optional<Error>* error);
 
 /// Registers an application that comes with the system.
-bool installSystemApplication(DeviceCore& core, const std::string& identifier,
-                              const std::string& displayName, const std::string& version,
-                              std::optional<Error>* error);
+[[nodiscard]] bool installSystemApplication(DeviceCore& core, const std::string& identifier,
+                                            const std::string& displayName,
+                                            const std::string& version,
+                                            std::optional<Error>* error);
 
 /// A refusal with a text that begins with its name.
 Error refusal(PackageRefusal reason, std::string_view detail);

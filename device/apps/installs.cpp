@@ -62,10 +62,10 @@ class RowProgress final : public InstallProgress {
     const std::string sql = fmt::format(
         "UPDATE installs SET {0} = ?1 WHERE number = ?2 AND NOT over AND {0} <> ?1", column);
     int changed = 0;
-    database_.change(ChangeFailed, Database::Commit::Ordinary, [&](Connection& database) {
+    const auto set = [&](Connection& database) {
       changed = Query(database, sql.c_str(), value, number_).run();
-    });
-    return changed > 0;
+    };
+    return database_.change(ChangeFailed, Database::Commit::Ordinary, set) && changed > 0;
   }
 
   Database& database_;
@@ -111,8 +111,8 @@ bool isInstalling(Connection& database, std::string_view identifier) {
 }
 
 RegistryObservers::Report reportInstalls(Database& database) {
-  RegistryObservers::Report report;
-  database.read("the installs under way could not be read", [&](Connection& connection) {
+  const auto look = [](Connection& connection) {
+    RegistryObservers::Report report;
     // All at once: one by one would take as long as a sync with thousands of placeholders.
     const std::vector<ApplicationRow> rows = allApplications(connection);
     std::unordered_map<std::string_view, const ApplicationRow*> shown;
@@ -127,22 +127,23 @@ RegistryObservers::Report reportInstalls(Database& database) {
       const bool paused = query.as<InstallState>(1) == InstallState::Paused;
       (paused ? report.paused : report.prioritized).push_back(row->second->record());
     }
-  });
-  return report;
+    return report;
+  };
+  return database.lookUp("the installs under way could not be read", look)
+      .value_or(RegistryObservers::Report());
 }
 
 std::shared_ptr<InstallProgress> currentProgress(Database& database, RegistryObservers& observers,
                                                  std::string_view identifier) {
-  std::shared_ptr<InstallProgress> progress;
-  database.read(ReadFailed, [&](Connection& connection) {
+  using Progress = std::shared_ptr<InstallProgress>;
+  const auto look = [&](Connection& connection) -> Progress {
     Query query(connection, "SELECT number FROM installs WHERE identifier = ? AND NOT over",
                 identifier);
-    if (query.next()) {
-      progress = std::make_shared<RowProgress>(database, observers, query.integer(0),
-                                               std::string(identifier));
-    }
-  });
-  return progress;
+    if (!query.next()) return nullptr;
+    return std::make_shared<RowProgress>(database, observers, query.integer(0),
+                                         std::string(identifier));
+  };
+  return database.lookUp(ReadFailed, look).value_or(nullptr);
 }
 
 }  // namespace appsync::device

@@ -9,7 +9,7 @@
 namespace appsync::device {
 
 /// Why a person cannot bring the application to the foreground; none if they can.
-std::optional<Error> objectionToLaunch(Database& database, FileManager& files,
-                                       std::string_view identifier);
+[[nodiscard]] std::optional<Error> objectionToLaunch(Database& database, FileManager& files,
+                                                     std::string_view identifier);
 
 }  // namespace appsync::device

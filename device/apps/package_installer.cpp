@@ -1,5 +1,7 @@
 #include <fmt/format.h>
 
+#include <tuple>
+
 #include "device/apps/installer_service.h"
 #include "device/apps/installers.h"
 #include "device/apps/installs.h"
@@ -125,7 +127,8 @@ bool switchTo(DeviceCore& core, const ApplicationRow& row, const ApplicationRows
         if (*isAside) abandonData(database, aside);
       },
       error);
-  if (switched && *isAside) removeAbandonedData(core, aside, nullptr);
+  // What stays is on record as abandoned, and goes when the device is next opened.
+  if (switched && *isAside) std::ignore = removeAbandonedData(core, aside, nullptr);
   return switched;
 }
 
@@ -169,11 +172,12 @@ HistoryEntry failureOf(const std::string& identifier, const ApplicationRows& bef
 }
 
 void markFailed(DeviceCore& core, const HistoryEntry& failure) {
-  core.database.change("a failed install could not be ended", Database::Commit::Ordinary,
-                       [&](Connection& database) {
-                         endInstall(database, failure.bundleId, InstallState::Failed);
-                         enterInHistory(database, failure);
-                       });
+  // The log tells; the install counts as paused when the device is next opened.
+  std::ignore = core.database.change("a failed install could not be ended",
+                                     Database::Commit::Ordinary, [&](Connection& database) {
+                                       endInstall(database, failure.bundleId, InstallState::Failed);
+                                       enterInHistory(database, failure);
+                                     });
 }
 
 }  // namespace

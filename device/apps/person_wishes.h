@@ -20,18 +20,22 @@ enum class Cancelling {
 /// A demoted or restored application is to come: its placeholder becomes that of a download from
 /// the store. False when there is no such placeholder, and with an error when that is not known or
 /// cannot be written.
-bool askFor(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
+[[nodiscard]] bool askFor(DeviceCore& core, const std::string& identifier,
+                          std::optional<Error>* error);
 
 /// nullopt (with an error) when it cannot be told.
-std::optional<Cancelling> effectOfCancelling(DeviceCore& core, const std::string& identifier,
-                                             std::optional<Error>* error);
+[[nodiscard]] std::optional<Cancelling> effectOfCancelling(DeviceCore& core,
+                                                           const std::string& identifier,
+                                                           std::optional<Error>* error);
 
 /// Takes the wish back. False when there is none, and with an error when that is forbidden, not
 /// known or cannot be written.
-bool cancelWish(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
+[[nodiscard]] bool cancelWish(DeviceCore& core, const std::string& identifier,
+                              std::optional<Error>* error);
 
 /// Of an application that was asked for: its placeholder is what it was before. False with an
 /// error.
-bool undoAsking(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
+[[nodiscard]] bool undoAsking(DeviceCore& core, const std::string& identifier,
+                              std::optional<Error>* error);
 
 }  // namespace appsync::device

@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <cerrno>
+#include <tuple>
 
 #include "device/apps/idle_application.h"
 #include "device/apps/installer_service.h"
@@ -55,10 +56,12 @@ bool isMerelyOfAnInstall(const ApplicationRows& present) {
 void removeFiles(DeviceCore& core, const std::string& identifier, const ApplicationRows& removed) {
   if (removed.placeholder) core.containers.remove(removed.placeholder->container);
   if (removed.installed) {
-    core.foreground.quit(identifier, nullptr);
+    // Its files go whether or not its mark does; the mark goes when the device is next opened.
+    std::ignore = core.foreground.quit(identifier, nullptr);
     core.containers.remove(removed.installed->container);
   }
-  removeAbandonedData(core, identifier, nullptr);
+  // What stays is on record as abandoned, and goes when the device is next opened.
+  std::ignore = removeAbandonedData(core, identifier, nullptr);
 }
 
 std::string purpose(std::string_view identifier) {

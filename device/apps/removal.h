@@ -16,29 +16,31 @@ namespace appsync::device {
 /// `placeholderOnly`) the application with its data. A placeholder that is all that is left of an
 /// application counts as that: unless `placeholderOnly`, its data goes too, and what a restore
 /// still had for it.
-bool removeForClient(DeviceCore& core, const std::string& identifier, bool placeholderOnly,
-                     std::optional<Error>* error);
+[[nodiscard]] bool removeForClient(DeviceCore& core, const std::string& identifier,
+                                   bool placeholderOnly, std::optional<Error>* error);
 
 /// Whether the policy lets a person remove applications; else with an error.
-bool mayRemove(DeviceCore& core, std::optional<Error>* error);
+[[nodiscard]] bool mayRemove(DeviceCore& core, std::optional<Error>* error);
 
 /// What a person does, if the policy lets them: takes the application, its placeholder, its data
 /// and what a restore still had for it. Observers hear of an install that this breaks off.
-bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optional<Error>* error);
+[[nodiscard]] bool removeForPerson(DeviceCore& core, const std::string& identifier,
+                                   std::optional<Error>* error);
 
 /// Removes what a restore had for an application of which the registry knows nothing any more.
-bool forgetWaitingData(DeviceCore& core, const std::string& identifier,
-                       std::optional<Error>* error);
+[[nodiscard]] bool forgetWaitingData(DeviceCore& core, const std::string& identifier,
+                                     std::optional<Error>* error);
 
 /// Notes that an application's data, and what a restore still had for it, is to be removed, or what
 /// was set aside of it (Containers::asideName). It is only named in this change, so that a crash
 /// before all of it is gone is made good later.
 void abandonData(Connection& database, std::string_view name);
 /// Whether that was noted and is not done; nullopt with an error.
-std::optional<bool> isAbandoned(DeviceCore& core, std::string_view name,
-                                std::optional<Error>* error);
+[[nodiscard]] std::optional<bool> isAbandoned(DeviceCore& core, std::string_view name,
+                                              std::optional<Error>* error);
 /// Ends the removal of data that was noted, if there is such. Comes before anything new is put in
 /// its place.
-bool removeAbandonedData(DeviceCore& core, const std::string& name, std::optional<Error>* error);
+[[nodiscard]] bool removeAbandonedData(DeviceCore& core, const std::string& name,
+                                       std::optional<Error>* error);
 
 }  // namespace appsync::device

@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <cerrno>
+#include <tuple>
 #include <utility>
 
 #include "device/apps/idle_application.h"
@@ -133,16 +134,17 @@ bool CoordinatedInstalls::take(Step step, const CoordinatorState& state) {
 
 void CoordinatedInstalls::removePlaceholder(const std::string& identifier,
                                             const PlaceholderRow& placeholder) {
+  // What stays is still on record, and tidied up again.
   if (placeholder.presence == Presence::Forsaken) {
-    registry_.change(identifier, cancelWish, nullptr);
+    std::ignore = registry_.change(identifier, cancelWish, nullptr);
     return;
   }
   if (placeholder.presence != Presence::Adopted) {
     const PropertyList::Dictionary options{{std::string(UninstallPlaceholdersOnlyKey), true}};
-    registry_.uninstallApplication(identifier, options);
+    std::ignore = registry_.uninstallApplication(identifier, options);
     return;
   }
-  device_.database.change(
+  std::ignore = device_.database.change(
       "an install could not be ended", Database::Commit::Ordinary,
       [&](Connection& database) { endInstall(database, identifier, InstallState::Canceled); });
   device_.observers.installsChanged();
@@ -155,7 +157,7 @@ void CoordinatedInstalls::tidyUp(const std::string& identifier) {
   for (const PlaceholderRow& placeholder : left->placeholders) {
     removePlaceholder(identifier, placeholder);
     // What cannot be written is found, and tidied up, again.
-    store_.change(
+    std::ignore = store_.change(
         [&](Connection& database, Consequences&) {
           const bool isAdopted = placeholder.presence == Presence::Adopted;
           if (!isAdopted && findApplication(database, identifier).placeholder) return;
@@ -165,9 +167,11 @@ void CoordinatedInstalls::tidyUp(const std::string& identifier) {
   }
   FileManager& files = device_.files;
   for (PromiseRow& package : left->packages) {
-    if (isFile(files, *package.path)) files.removeItem(*package.path);
+    // What cannot be removed is swept by the next sync.
+    if (isFile(files, *package.path)) std::ignore = files.removeItem(*package.path);
     package.path.reset();
-    store_.change([&](Connection& database, Consequences&) { put(database, package); }, nullptr);
+    std::ignore = store_.change(
+        [&](Connection& database, Consequences&) { put(database, package); }, nullptr);
   }
 }
 
@@ -246,7 +250,7 @@ CoordinatedInstalls::Beginning CoordinatedInstalls::begin(const CoordinatorState
 
 void CoordinatedInstalls::finish(const CoordinatorState& state, const std::optional<Error>& error) {
   if (error && !fail(state, *error)) return;
-  change(
+  std::ignore = change(  // else trouble of the coordinator's
       state,
       [&](Connection& database, Consequences& consequences) {
         const auto row = findCoordinator(database, state.coordinator.number);

@@ -33,17 +33,17 @@ class CoordinatedInstalls {
 
  private:
   /// False when the coordinator cannot be read.
-  bool carryOn(std::int64_t coordinator, std::optional<Error>* error);
+  [[nodiscard]] bool carryOn(std::int64_t coordinator, std::optional<Error>* error);
 
   // False when there is nothing more to be done now.
-  bool take(Step step, const CoordinatorState& state);
-  bool installPlaceholder(const CoordinatorState& state);
-  bool installPackage(const CoordinatorState& state);
+  [[nodiscard]] bool take(Step step, const CoordinatorState& state);
+  [[nodiscard]] bool installPlaceholder(const CoordinatorState& state);
+  [[nodiscard]] bool installPackage(const CoordinatorState& state);
 
   /// A change for a live coordinator; false, and trouble of the coordinator's, when it fails.
-  bool change(const CoordinatorState& state,
-              const std::function<void(Connection&, Consequences&)>& work,
-              Database::Commit commit = Database::Commit::Ordinary);
+  [[nodiscard]] bool change(const CoordinatorState& state,
+                            const std::function<void(Connection&, Consequences&)>& work,
+                            Database::Commit commit = Database::Commit::Ordinary);
   /// Notes the placeholder's presence, Adopted in the place of Begun where one stands already that
   /// is to stay. None when it is not wanted any more, or that failed.
   Presence note(const CoordinatorState& state, Presence presence);
@@ -53,7 +53,7 @@ class CoordinatedInstalls {
   void finish(const CoordinatorState& state, const std::optional<Error>& error);
   /// Puts the failure on record and takes the placeholder away, before anybody hears of it, so that
   /// whoever does finds the phone as it is to stay. False when it cannot be recorded.
-  bool fail(const CoordinatorState& state, const Error& error);
+  [[nodiscard]] bool fail(const CoordinatorState& state, const Error& error);
   /// Takes away what the placeholder has in the registry, as a person does if it was forsaken; the
   /// registry stays as it was where it was only adopted.
   void removePlaceholder(const std::string& identifier, const PlaceholderRow& placeholder);
@@ -64,7 +64,7 @@ class CoordinatedInstalls {
     bool isLookDue = false;
   };
   /// Comes back later; an error when that is not to be.
-  std::optional<Error> waitForForeground(const CoordinatorRow& coordinator);
+  [[nodiscard]] std::optional<Error> waitForForeground(const CoordinatorRow& coordinator);
   void lookAgain(const std::string& identifier, std::int64_t coordinator);
   bool isLeaving();
 

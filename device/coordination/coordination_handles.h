@@ -81,8 +81,8 @@ class ServiceObject {
     });
   }
   /// False with an error when the service is gone, else what `use` gives.
-  bool attempt(const std::function<bool(CoordinationStore&)>& use,
-               std::optional<Error>* error) const;
+  [[nodiscard]] bool attempt(const std::function<bool(CoordinationStore&)>& use,
+                             std::optional<Error>* error) const;
 
  private:
   const std::shared_ptr<CoordinationGate> gate_;
@@ -166,7 +166,8 @@ class PlaceholderHandle final : public InstallPlaceholder, public ServiceObject 
   std::string description() const override { return "<Placeholder " + identifier_ + ">"; }
 
  private:
-  bool change(const CoordinationStore::PlaceholderChange& change, std::optional<Error>* error);
+  [[nodiscard]] bool change(const CoordinationStore::PlaceholderChange& change,
+                            std::optional<Error>* error);
 
   const std::string identifier_;
 };
@@ -214,9 +215,10 @@ class CoordinatorHandle final : public InstallCoordinator, public ServiceObject 
 
  private:
   /// nullopt when there is none any more, or when it cannot be read (then with an error).
-  std::optional<CoordinatorRow> find(std::optional<Error>* error) const;
+  [[nodiscard]] std::optional<CoordinatorRow> find(std::optional<Error>* error) const;
   CoordinatorRow row() const { return find(nullptr).value_or(CoordinatorRow()); }
-  bool change(const CoordinationStore::CoordinatorChange& change, std::optional<Error>* error);
+  [[nodiscard]] bool change(const CoordinationStore::CoordinatorChange& change,
+                            std::optional<Error>* error);
 
   const std::string identifier_;
   const CoordinationClientId creator_;

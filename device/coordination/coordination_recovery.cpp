@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <cerrno>
+#include <tuple>
 
 #include "base/identifiers.h"
 #include "device/state/application_rows.h"
@@ -201,14 +202,15 @@ std::optional<Consequences> repairCoordination(DeviceCore& device) {
 
 void sweepCoordination(DeviceCore& device) {
   int forgotten = 0;
-  device.database.change("what install coordinators left could not be swept",
-                         Database::Commit::Ordinary, [&](Connection& database) {
-                           forgetEventsForNobody(database);
-                           forgotten = forgetOldEvents(database);
-                           database.exec(CoordinatorsOver);
-                           database.exec(PlaceholdersOfNobody);
-                           database.exec(PromisesOfNobody);
-                         });
+  // Else the next time.
+  std::ignore = device.database.change("what install coordinators left could not be swept",
+                                       Database::Commit::Ordinary, [&](Connection& database) {
+                                         forgetEventsForNobody(database);
+                                         forgotten = forgetOldEvents(database);
+                                         database.exec(CoordinatorsOver);
+                                         database.exec(PlaceholdersOfNobody);
+                                         database.exec(PromisesOfNobody);
+                                       });
   if (forgotten == 0) return;
   device.log.write(LogChannel::TWLogCategoryFramework, LogLevel::Default,
                    fmt::format("{} events of install coordinators that nobody came to hear are "

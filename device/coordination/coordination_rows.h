@@ -135,13 +135,16 @@ void removeEvent(Connection& database, std::int64_t number);
 Bytes bytesOf(const Error& error);
 std::optional<Error> errorFrom(const Bytes& bytes);
 
-std::optional<Bytes> bytesOf(const InstallOptions& options, std::optional<Error>* error);
+[[nodiscard]] std::optional<Bytes> bytesOf(const InstallOptions& options,
+                                           std::optional<Error>* error);
 std::optional<InstallOptions> optionsFrom(const Bytes& bytes);
 
-std::optional<Bytes> bytesOf(const PlaceholderAttributes& attributes, std::optional<Error>* error);
+[[nodiscard]] std::optional<Bytes> bytesOf(const PlaceholderAttributes& attributes,
+                                           std::optional<Error>* error);
 std::optional<PlaceholderAttributes> attributesFrom(const Bytes& bytes);
 
-std::optional<Bytes> bytesOf(const StoreMetadata& metadata, std::optional<Error>* error);
+[[nodiscard]] std::optional<Bytes> bytesOf(const StoreMetadata& metadata,
+                                           std::optional<Error>* error);
 std::optional<StoreMetadata> metadataFrom(const Bytes& bytes);
 
 std::optional<Bytes> bytesOf(const std::vector<std::int64_t>& numbers);

@@ -17,8 +17,9 @@ class CoordinationStore {
       : database_(database), carryOut_(std::move(carryOut)) {}
 
   /// Runs work in one transaction and then does what follows from it.
-  bool change(const std::function<void(Connection&, Consequences&)>& work,
-              std::optional<Error>* error, Database::Commit commit = Database::Commit::Ordinary);
+  [[nodiscard]] bool change(const std::function<void(Connection&, Consequences&)>& work,
+                            std::optional<Error>* error,
+                            Database::Commit commit = Database::Commit::Ordinary);
   /// What the work finds; nullopt, with an error, when it fails.
   template <typename LookUp>
   auto lookUp(const LookUp& work, std::optional<Error>* error = nullptr) {
@@ -30,11 +31,12 @@ class CoordinationStore {
   using CoordinatorChange = std::function<void(Connection&, CoordinatorRow&)>;
   using PromiseChange = std::function<void(PromiseRow&)>;
   using PlaceholderChange = std::function<void(Connection&, PlaceholderRow&)>;
-  bool changeCoordinator(std::int64_t number, const CoordinatorChange& change,
-                         std::optional<Error>* error);
-  bool changePromise(std::int64_t number, const PromiseChange& change, std::optional<Error>* error);
-  bool changePlaceholder(std::int64_t number, const PlaceholderChange& change,
-                         std::optional<Error>* error);
+  [[nodiscard]] bool changeCoordinator(std::int64_t number, const CoordinatorChange& change,
+                                       std::optional<Error>* error);
+  [[nodiscard]] bool changePromise(std::int64_t number, const PromiseChange& change,
+                                   std::optional<Error>* error);
+  [[nodiscard]] bool changePlaceholder(std::int64_t number, const PlaceholderChange& change,
+                                       std::optional<Error>* error);
 
   // A cancelled package promise or placeholder takes its coordinator along. False when it is past
   // cancelling.

@@ -55,7 +55,7 @@ class EventDelivery {
 
   void checkAfter(std::chrono::milliseconds delay) APPSYNC_REQUIRES(mutex_);
   void deliverAll();
-  bool deliver(const EventRow& event);
+  [[nodiscard]] bool deliver(const EventRow& event);
   void send(const EventRow& event, CoordinatorObserver& observer);
   void remove(const EventRow& event);
   /// nullopt when they cannot be read.

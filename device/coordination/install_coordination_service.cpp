@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <cerrno>
+#include <tuple>
 
 #include "base/identifiers.h"
 #include "device/apps/idle_application.h"
@@ -215,7 +216,7 @@ std::optional<Error> DeviceInstallCoordination::uninstall(const std::string& ide
   };
   if (present->placeholder && !present->installed) {
     // All that is left takes its data along, if its install is not over yet.
-    if (remove(false)) endLive(identifier, &error);
+    if (remove(false)) std::ignore = endLive(identifier, &error);  // its error is the answer
     return error;
   }
   const std::optional<bool> ended = endLive(identifier, &error);

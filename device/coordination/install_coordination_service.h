@@ -66,7 +66,7 @@ class DeviceInstallCoordination final : public InstallCoordination {
 
   // What a person does on the home screen. False when no install of the application is live, or
   // when it is past cancelling.
-  bool tap(std::string_view bundleId) noexcept;
+  [[nodiscard]] bool tap(std::string_view bundleId) noexcept;
   bool cancelInstall(std::string_view bundleId) noexcept;
 
   /// Whether the service has something left to do for the application by itself: to install, to
@@ -82,12 +82,13 @@ class DeviceInstallCoordination final : public InstallCoordination {
   void carryOut(const Consequences& consequences);
   void showProgress(std::string_view identifier, double fraction);
   /// nullopt when there is none, and with an error when that cannot be read.
-  std::optional<CoordinatorRow> liveCoordinator(std::string_view bundleId,
-                                                std::optional<Error>* error);
+  [[nodiscard]] std::optional<CoordinatorRow> liveCoordinator(std::string_view bundleId,
+                                                              std::optional<Error>* error);
   /// Why it could not be uninstalled.
-  std::optional<Error> uninstall(const std::string& identifier);
+  [[nodiscard]] std::optional<Error> uninstall(const std::string& identifier);
   /// Whether there was a live coordinator that could be ended; nullopt with an error.
-  std::optional<bool> endLive(const std::string& identifier, std::optional<Error>* error);
+  [[nodiscard]] std::optional<bool> endLive(const std::string& identifier,
+                                            std::optional<Error>* error);
   /// Ends a live coordinator that nobody is served by going on with, if it is this client's. Throws
   /// Refused when one that does not serve cannot be ended.
   bool endedFor(Connection& database, const CoordinatorRow& live, CoordinatorKind kind,

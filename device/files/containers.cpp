@@ -7,6 +7,7 @@
 
 #include <array>
 #include <cerrno>
+#include <tuple>
 
 #include "base/temporary_file.h"
 #include "platform/existence.h"
@@ -58,7 +59,9 @@ std::optional<std::string> Containers::make(std::optional<Error>* error) {
   return path;
 }
 
-void Containers::remove(const std::string& container) { removeIfThere(container); }
+void Containers::remove(const std::string& container) {
+  std::ignore = removeIfThere(container);  // the log tells
+}
 
 bool Containers::removeIfThere(const std::string& path) {
   std::optional<Error> error;
@@ -117,7 +120,8 @@ bool Containers::adoptWaitingData(std::string_view identifier, std::optional<Err
   const bool adopted =
       (hadData || isMissing(reason)) && files_.moveItem(waitingDataPath(identifier), data, &reason);
   if (adopted) return true;
-  if (hadData) files_.moveItem(aside, data);
+  // What cannot be put back is when the device is next opened.
+  if (hadData) std::ignore = files_.moveItem(aside, data);
   return failWith(error, reason.value_or(Error::posix(EIO, data)));
 }
 

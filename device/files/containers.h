@@ -27,44 +27,45 @@ class Containers {
   static std::string waitingDataPath(std::string_view identifier);
 
   /// Makes an empty container, private until a row of the registry names it.
-  std::optional<std::string> make(std::optional<Error>* error);
+  [[nodiscard]] std::optional<std::string> make(std::optional<Error>* error);
   /// Removes a container. What cannot be removed is logged, and swept when the device is opened.
   void remove(const std::string& container);
   /// nullopt (with a reason) when they cannot be looked at.
-  std::optional<std::vector<std::string>> list(std::optional<Error>* error);
+  [[nodiscard]] std::optional<std::vector<std::string>> list(std::optional<Error>* error);
 
   /// Puts all of the phone's files on disk; installs that end together share it.
-  bool flush(std::optional<Error>* error);
+  [[nodiscard]] bool flush(std::optional<Error>* error);
 
   /// Whether a restore left data that is still to be given back to the application; nullopt (with
   /// a reason) when it cannot be looked at.
-  std::optional<bool> dataWaits(std::string_view identifier, std::optional<Error>* error);
+  [[nodiscard]] std::optional<bool> dataWaits(std::string_view identifier,
+                                              std::optional<Error>* error);
   /// Gives the waiting data to the application; what it has is set aside. On failure both are as
   /// they were.
-  bool adoptWaitingData(std::string_view identifier, std::optional<Error>* error);
+  [[nodiscard]] bool adoptWaitingData(std::string_view identifier, std::optional<Error>* error);
   /// Makes an adoption undone that set data aside: all waits, or is the application's, as before.
   /// Broken off, it is done again. True when there is nothing to undo.
-  bool undoAdoption(std::string_view identifier, std::optional<Error>* error);
+  [[nodiscard]] bool undoAdoption(std::string_view identifier, std::optional<Error>* error);
   /// The name among the applications' data of what was set aside. No application can have it.
   static std::string asideName(std::string_view identifier);
   /// The applications of which data is set aside.
   std::vector<std::string> setAside();
-  bool removeWaitingData(std::string_view identifier);
-  bool makeData(std::string_view identifier, std::optional<Error>* error);
+  [[nodiscard]] bool removeWaitingData(std::string_view identifier);
+  [[nodiscard]] bool makeData(std::string_view identifier, std::optional<Error>* error);
   /// Removes the data directories that have nothing in them, but for those of these applications.
   void removeEmptyData(const std::set<std::string>& besides);
   /// True when the application has no data any more.
-  bool removeData(std::string_view identifier);
+  [[nodiscard]] bool removeData(std::string_view identifier);
 
   /// The names in any directory, none of one that is not there; nullopt (with an error) when they
   /// cannot be read.
-  std::optional<std::vector<std::string>> namesIn(std::string_view directory,
-                                                  std::optional<Error>* error);
+  [[nodiscard]] std::optional<std::vector<std::string>> namesIn(std::string_view directory,
+                                                                std::optional<Error>* error);
 
  private:
   using Flush = std::optional<Error>;  ///< why it failed
 
-  bool removeIfThere(const std::string& path);
+  [[nodiscard]] bool removeIfThere(const std::string& path);
   Flush flushNow();
 
   FileManager& files_;

@@ -49,9 +49,10 @@ class ConfinedFileManager final : public FileManager {
   // For the device's own services, which work on handles. Not valid, with an error, on failure.
 
   /// A regular file, for reading; anything else is refused without waiting for it.
-  FileDescriptor openFile(std::string_view path, std::optional<Error>* error = nullptr) noexcept;
-  FileDescriptor openDirectory(std::string_view path,
-                               std::optional<Error>* error = nullptr) noexcept;
+  [[nodiscard]] FileDescriptor openFile(std::string_view path,
+                                        std::optional<Error>* error = nullptr) noexcept;
+  [[nodiscard]] FileDescriptor openDirectory(std::string_view path,
+                                             std::optional<Error>* error = nullptr) noexcept;
 
   /// Removes what killed processes left under temporary names in the directory. Only for a time
   /// when nobody writes there.
@@ -64,15 +65,18 @@ class ConfinedFileManager final : public FileManager {
     std::string name;
   };
 
-  bool usable(std::string_view path, std::optional<Error>* error) const noexcept;
-  std::optional<Place> placeOf(std::string_view path, std::optional<Error>* error) const noexcept;
-  FileDescriptor lookAt(std::string_view path, std::optional<Error>* error) const noexcept;
-  bool makeDirectory(std::string_view path, const FileAttributes& attributes,
-                     std::optional<Error>* error) noexcept;
-  bool replaceFile(std::string_view path, ByteView bytes, const FileAttributes& attributes,
-                   bool durable, std::optional<Error>* error) noexcept;
+  [[nodiscard]] bool usable(std::string_view path, std::optional<Error>* error) const noexcept;
+  [[nodiscard]] std::optional<Place> placeOf(std::string_view path,
+                                             std::optional<Error>* error) const noexcept;
+  [[nodiscard]] FileDescriptor lookAt(std::string_view path,
+                                      std::optional<Error>* error) const noexcept;
+  [[nodiscard]] bool makeDirectory(std::string_view path, const FileAttributes& attributes,
+                                   std::optional<Error>* error) noexcept;
+  [[nodiscard]] bool replaceFile(std::string_view path, ByteView bytes,
+                                 const FileAttributes& attributes, bool durable,
+                                 std::optional<Error>* error) noexcept;
   bool mayGive(const FileAttributes& attributes) const noexcept;
-  bool give(int fd, const FileAttributes& attributes) const noexcept;
+  [[nodiscard]] bool give(int fd, const FileAttributes& attributes) const noexcept;
 
   ConfinedDirectory root_;
   int openErrno_ = 0;  ///< why the root is not open

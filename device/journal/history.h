@@ -20,6 +20,7 @@ void makeHistoryTable(Connection& database);
 void enterInHistory(Connection& database, const HistoryEntry& entry);
 
 /// Oldest first. None, with an error, when it cannot be read.
-std::vector<HistoryEntry> readHistory(Database& database, std::optional<Error>* error);
+[[nodiscard]] std::vector<HistoryEntry> readHistory(Database& database,
+                                                    std::optional<Error>* error);
 
 }  // namespace appsync::device

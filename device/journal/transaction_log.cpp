@@ -1,5 +1,7 @@
 #include "device/journal/transaction_log.h"
 
+#include <tuple>
+
 #include "device/state/clock.h"
 
 namespace appsync::device {
@@ -43,7 +45,7 @@ void StoredTransactionLog::logStep(std::uint32_t step, std::uint32_t party, std:
 
 void StoredTransactionLog::keep(const TransactionRecord& record) noexcept {
   const Lock lock(mutex_);
-  database_.change(
+  std::ignore = database_.change(
       "a transaction record could not be kept", Database::Commit::Ordinary,
       [&](Connection& database) APPSYNC_REQUIRES(mutex_) {
         Query(database,

@@ -25,8 +25,8 @@ class StoredTransactionLog final : public TransactionLog {
                std::string_view bundleId, std::string_view description) noexcept override;
 
   /// The records after `number`, oldest first. None, with an error, when they cannot be read.
-  std::vector<TransactionRecord> recordsAfter(std::int64_t number,
-                                              std::optional<Error>* error) noexcept;
+  [[nodiscard]] std::vector<TransactionRecord> recordsAfter(std::int64_t number,
+                                                            std::optional<Error>* error) noexcept;
 
  private:
   void keep(const TransactionRecord& record) noexcept;

@@ -1,5 +1,7 @@
 #include "device/services/backup_manager.h"
 
+#include <tuple>
+
 #include "base/identifiers.h"
 
 namespace appsync::device {
@@ -12,7 +14,8 @@ bool DeviceBackupManager::restoreDataExists(std::string_view bundleId) noexcept 
 void DeviceBackupManager::cancelApplicationRestore(std::string_view bundleId) noexcept {
   if (!isUsableIdentifier(bundleId) || !core_.database.writable()) return;
   const KeyedMutex::Guard guard(core_.applicationLocks, bundleId);
-  core_.containers.removeWaitingData(bundleId);
+  // What stays is still said to wait.
+  std::ignore = core_.containers.removeWaitingData(bundleId);
 }
 
 }  // namespace appsync::device

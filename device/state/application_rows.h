@@ -58,9 +58,10 @@ void eraseApplication(Connection& database, const ApplicationRow& row);
 
 // The same as work of their own. nullopt, with an error, when the registry cannot be read.
 
-std::optional<ApplicationRows> readApplication(Database& database, std::string_view identifier,
-                                               std::optional<Error>* error = nullptr);
-std::optional<std::vector<ApplicationRow>> readApplications(Database& database,
-                                                            std::optional<Error>* error = nullptr);
+[[nodiscard]] std::optional<ApplicationRows> readApplication(Database& database,
+                                                             std::string_view identifier,
+                                                             std::optional<Error>* error = nullptr);
+[[nodiscard]] std::optional<std::vector<ApplicationRow>> readApplications(
+    Database& database, std::optional<Error>* error = nullptr);
 
 }  // namespace appsync::device

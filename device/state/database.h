@@ -116,31 +116,31 @@ class Database {
   bool writable() const { return writable_; }
 
   /// `purpose` names the work in the log: "the policies could not be read".
-  bool read(std::string_view purpose, const Work& work,
-            std::optional<Error>* error = nullptr) noexcept;
+  [[nodiscard]] bool read(std::string_view purpose, const Work& work,
+                          std::optional<Error>* error = nullptr) noexcept;
   /// What the work finds; nullopt, with an error, when it fails.
   template <typename LookUp>
-  auto lookUp(std::string_view purpose, const LookUp& work,
-              std::optional<Error>* error = nullptr) noexcept {
+  [[nodiscard]] auto lookUp(std::string_view purpose, const LookUp& work,
+                            std::optional<Error>* error = nullptr) noexcept {
     std::optional<std::invoke_result_t<LookUp, Connection&>> found;
-    read(
-        purpose, [&](Connection& database) { found.emplace(work(database)); }, error);
+    const auto find = [&](Connection& database) { found.emplace(work(database)); };
+    if (!read(purpose, find, error)) found.reset();
     return found;
   }
   /// Runs the work in one transaction. False: the change does not hold, and never will once
   /// `settle` says so.
-  bool change(std::string_view purpose, Commit commit, const Work& work,
-              std::optional<Error>* error = nullptr) noexcept;
+  [[nodiscard]] bool change(std::string_view purpose, Commit commit, const Work& work,
+                            std::optional<Error>* error = nullptr) noexcept;
 
   /// A commit whose last flush fails is undone, but stands in the write-ahead log: whoever opens
   /// the database next may find it made. Writes over it, if there may be such, and is true when no
   /// failed change can come back. Until then nothing may be removed that one of them names.
-  bool settle() noexcept;
+  [[nodiscard]] bool settle() noexcept;
 
  private:
   /// Runs work with mutex_ held.
-  bool attempt(std::string_view purpose, const std::function<void()>& work,
-               std::optional<Error>* error) noexcept;
+  [[nodiscard]] bool attempt(std::string_view purpose, const std::function<void()>& work,
+                             std::optional<Error>* error) noexcept;
 
   Mutex mutex_;
   Connection connection_ APPSYNC_GUARDED_BY(mutex_);

@@ -12,7 +12,8 @@ class StoredDevicePolicy final : public DevicePolicy {
   explicit StoredDevicePolicy(Database& database) : database_(database) {}
 
   PolicyValue effectiveBoolValue(PolicySetting setting) noexcept override;
-  bool set(PolicySetting setting, PolicyValue value, std::optional<Error>* error) noexcept;
+  [[nodiscard]] bool set(PolicySetting setting, PolicyValue value,
+                         std::optional<Error>* error) noexcept;
 
  private:
   Database& database_;

@@ -25,10 +25,11 @@ class Foreground {
 
   /// Brings the application to the foreground if `objection`, asked while nobody else can change
   /// anything here, has none.
-  bool launch(const std::string& identifier, const std::function<std::optional<Error>()>& objection,
-              std::optional<Error>* error) const;
+  [[nodiscard]] bool launch(const std::string& identifier,
+                            const std::function<std::optional<Error>()>& objection,
+                            std::optional<Error>* error) const;
   /// Ending an application that does not run is no failure.
-  bool quit(const std::string& identifier, std::optional<Error>* error) const;
+  [[nodiscard]] bool quit(const std::string& identifier, std::optional<Error>* error) const;
 
   struct HoldResult {
     std::unique_ptr<TerminationAssertion> hold;  ///< nullptr when it runs or on failure

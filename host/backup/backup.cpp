@@ -100,7 +100,7 @@ std::optional<std::string> BackupRun::saveData(const AppRecord& record) {
   if (!writer_.beginData(record.applicationIdentifier)) return writer_.problem();
   const bool whole = phone_.data.saveData(record.applicationIdentifier, take, &error);
   if (whole && bytes > 0) {
-    writer_.endData();
+    if (!writer_.endData()) return writer_.problem();
   } else {
     writer_.dropData();
   }

@@ -34,17 +34,18 @@ class BackupRun {
   BackupSummary run(const BackupOptions& options = {});
 
  private:
-  bool saveAll(const BackupOptions& options);
+  [[nodiscard]] bool saveAll(const BackupOptions& options);
   void waitUntilIdle(const std::vector<AppRecord>& applications);
-  bool save(const AppRecord& record);
+  [[nodiscard]] bool save(const AppRecord& record);
   /// Why the application's data is not in the backup.
   std::optional<std::string> saveData(const AppRecord& record);
   /// False when the older backup would be replaced by one that lacks what it holds.
   bool mayReplaceOlder();
   /// Notes those applications of the older backup that the phone does not list, but has data of.
   void noteUnlisted();
-  bool saveLists();
-  bool addList(std::string_view name, const PropertyList& list, PropertyListFormat format);
+  [[nodiscard]] bool saveLists();
+  [[nodiscard]] bool addList(std::string_view name, const PropertyList& list,
+                             PropertyListFormat format);
   void reportProgress(const AppRecord& record, std::uint64_t bytes);
   /// Always false.
   bool broken(const std::string& reason);

@@ -50,7 +50,8 @@ struct BackupProblem {
 
 /// nullopt, with one line for people, for what is no backup, and where a property list is missing
 /// or does not match its digest.
-std::optional<Backup> readBackup(const std::filesystem::path& folder, std::string& problem);
+[[nodiscard]] std::optional<Backup> readBackup(const std::filesystem::path& folder,
+                                               std::string& problem);
 
 /// Reads a file of a backup a piece at a time and checks it on the way. Used by one thread.
 class BackupFileReader {
@@ -95,16 +96,16 @@ class BackupWriter {
 
   // False when the file could not be written; problem() then tells why, and nothing more succeeds.
 
-  virtual bool addFile(std::string_view name, ByteView contents) = 0;
+  [[nodiscard]] virtual bool addFile(std::string_view name, ByteView contents) = 0;
   /// Begins, goes on with and ends an application's archive of data.
-  virtual bool beginData(std::string_view identifier) = 0;
-  virtual bool append(ByteView contents) = 0;
-  virtual bool endData() = 0;
+  [[nodiscard]] virtual bool beginData(std::string_view identifier) = 0;
+  [[nodiscard]] virtual bool append(ByteView contents) = 0;
+  [[nodiscard]] virtual bool endData() = 0;
   /// Takes back the archive that was begun: the application has no data, or not all of it came.
   virtual void dropData() = 0;
 
   /// The backup is whole and on the disk.
-  virtual bool finish() = 0;
+  [[nodiscard]] virtual bool finish() = 0;
   virtual const std::string& problem() const = 0;
 };
 

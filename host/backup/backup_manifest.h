@@ -30,7 +30,7 @@ struct BackupManifest {
 };
 
 /// nullopt, with what is wrong with it, for anything that is no whole manifest of this version.
-std::optional<BackupManifest> parseManifest(ByteView bytes, std::string& problem);
+[[nodiscard]] std::optional<BackupManifest> parseManifest(ByteView bytes, std::string& problem);
 /// nullopt when the property list gets too large.
 std::optional<Bytes> serializeManifest(const BackupManifest& manifest);
 

@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <system_error>
+#include <tuple>
 #include <vector>
 
 #include "base/directory_tree.h"
@@ -123,7 +124,8 @@ void sweep(const Target& target) {
   for (const std::string& name : names) {
     if (!isUnfinished(name, target.name())) continue;
     const FileDescriptor folder = openFolder(target.parent.get(), name);
-    if (folder && lockFolder(folder.get())) removeTree(target.parent.get(), name);
+    if (!folder || !lockFolder(folder.get())) continue;
+    std::ignore = removeTree(target.parent.get(), name);  // else the next writer does
   }
 }
 
@@ -133,7 +135,7 @@ class FolderWriter final : public BackupWriter {
 
   ~FolderWriter() override {
     file_.reset();
-    if (!unfinished_.empty()) removeTree(target_.parent.get(), unfinished_);
+    if (!unfinished_.empty()) std::ignore = removeTree(target_.parent.get(), unfinished_);
   }
 
   bool begin() {
@@ -275,7 +277,7 @@ class FolderWriter final : public BackupWriter {
     }
     if (!syncToDisk(parent)) return fail("", errno);
     // The older backup, now under the other name. What cannot be removed is swept the next time.
-    if (!unfinished_.empty()) removeTree(parent, std::exchange(unfinished_, {}));
+    if (!unfinished_.empty()) std::ignore = removeTree(parent, std::exchange(unfinished_, {}));
     return true;
   }
 

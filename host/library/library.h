@@ -22,6 +22,7 @@ struct Library {
 };
 
 /// nullopt, with one line for people, when the folder itself cannot be read.
-std::optional<Library> readLibrary(const std::filesystem::path& folder, std::string& problem);
+[[nodiscard]] std::optional<Library> readLibrary(const std::filesystem::path& folder,
+                                                 std::string& problem);
 
 }  // namespace appsync::host

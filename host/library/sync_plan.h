@@ -72,8 +72,8 @@ struct PlanOptions {
 };
 
 /// Pure. nullopt, with one line for people, when the wishes contradict each other or the library.
-std::optional<SyncPlan> makePlan(const Library& library,
-                                 const std::vector<InstalledApplication>& installed,
-                                 const PlanOptions& options, std::string& problem);
+[[nodiscard]] std::optional<SyncPlan> makePlan(const Library& library,
+                                               const std::vector<InstalledApplication>& installed,
+                                               const PlanOptions& options, std::string& problem);
 
 }  // namespace appsync::host

@@ -16,7 +16,7 @@ bool isLeftOver(const Phone& phone, const AppRecord& placeholder);
 /// What a sync finds on the phone: one per application, sorted by identifier. Placeholders that a
 /// broken-off sync left do not count. nullopt, with one line for people, when it cannot be told
 /// what is demoted.
-std::optional<std::vector<InstalledApplication>> installedApplications(const Phone& phone,
-                                                                       std::string& problem);
+[[nodiscard]] std::optional<std::vector<InstalledApplication>> installedApplications(
+    const Phone& phone, std::string& problem);
 
 }  // namespace appsync::host

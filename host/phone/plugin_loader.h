@@ -16,7 +16,8 @@ class Plugin {
  public:
   /// Checks the bundle's description and the interface version of its code before anything else of
   /// it runs. nullptr with one line for people: which bundle, why, what to do.
-  static std::unique_ptr<Plugin> load(const std::filesystem::path& bundle, std::string& problem);
+  [[nodiscard]] static std::unique_ptr<Plugin> load(const std::filesystem::path& bundle,
+                                                    std::string& problem);
 
   /// The bundle's own identifier.
   const std::string& identifier() const { return identifier_; }
@@ -37,7 +38,7 @@ inline constexpr std::string_view PluginBundleName = "AppsClient.syncplugin";
 
 /// Where the bundle is: `given` if not empty, else beside the running program, else in
 /// "../lib/appsync" seen from there. nullopt with one line for people when there is none.
-std::optional<std::filesystem::path> findPlugin(const std::filesystem::path& given,
-                                                std::string& problem);
+[[nodiscard]] std::optional<std::filesystem::path> findPlugin(const std::filesystem::path& given,
+                                                              std::string& problem);
 
 }  // namespace appsync::host

@@ -33,6 +33,6 @@ class Output {
 /// Opens on /dev/null what this process was started without of standard input, output and error:
 /// else the first files opened would take their places, and be written into. Called before anything
 /// is opened. False when that cannot be done.
-bool openStandardDescriptors();
+[[nodiscard]] bool openStandardDescriptors();
 
 }  // namespace appsync::host

@@ -36,7 +36,7 @@ class Restore : Visit {
 
  private:
   void overwriteData(const RestoreInput& input);
-  bool callClient(const RestoreInput& input);
+  [[nodiscard]] bool callClient(const RestoreInput& input);
   void transfer(const RestoreInput& input);
   /// For the placeholders of a restore that are not demoted or left out, on a phone that does not
   /// coordinate installs. The client installs such a package at once, or, when data waits for its

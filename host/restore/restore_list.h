@@ -24,10 +24,10 @@ struct BackedUpApplication {
 class RestoreList {
  public:
   /// nullopt, with one line for people, when the backup's list is none.
-  static std::optional<RestoreList> of(const Backup& backup, std::string& problem);
+  [[nodiscard]] static std::optional<RestoreList> of(const Backup& backup, std::string& problem);
 
   /// Keeps only these. False, with one line for people, when the backup lacks one of them.
-  bool keepOnly(const std::set<std::string>& identifiers, std::string& problem);
+  [[nodiscard]] bool keepOnly(const std::set<std::string>& identifiers, std::string& problem);
   /// Whether that was done: what concerns the phone as a whole stays as it is.
   bool isPart() const { return isPart_; }
   bool names(const std::string& identifier) const { return entries_.contains(identifier); }
@@ -36,8 +36,8 @@ class RestoreList {
   const std::vector<BackedUpApplication>& applications() const { return applications_; }
 
   /// The list that the phone gets: only these applications, as the backup holds them.
-  std::optional<Bytes> only(const std::set<std::string>& identifiers,
-                            std::optional<Error>* error) const;
+  [[nodiscard]] std::optional<Bytes> only(const std::set<std::string>& identifiers,
+                                          std::optional<Error>* error) const;
 
  private:
   PropertyList::Dictionary entries_;

@@ -30,17 +30,17 @@ class Session : Visit {
   SyncResult run(const SyncInput& input);
 
  private:
-  bool callClient(const SyncInput& input);
-  bool prepare();
-  bool reconcile(const SyncInput& input);
-  bool transfer(const SyncInput& input);
+  [[nodiscard]] bool callClient(const SyncInput& input);
+  [[nodiscard]] bool prepare();
+  [[nodiscard]] bool reconcile(const SyncInput& input);
+  [[nodiscard]] bool transfer(const SyncInput& input);
   void sendWhatIsAskedFor(const SyncInput& input);
   void findCoordinators(const std::vector<SyncAssetPtr>& assets);
   bool isSettled(const std::string& identifier, const std::optional<std::vector<TodoState>>& todo,
                  const std::set<std::string>& busy);
   void waitForCoordination(const SyncPlan& plan);
 
-  bool sweepPlaceholders();
+  [[nodiscard]] bool sweepPlaceholders();
   void reportDeletions(const PropertyList::Dictionary& inventory);
   void writeApplicationsPresent();
   SyncEnd end();

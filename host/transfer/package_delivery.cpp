@@ -1,5 +1,7 @@
 #include "host/transfer/package_delivery.h"
 
+#include <tuple>
+
 #include "base/text.h"
 #include "platform/bundle.h"
 
@@ -71,7 +73,7 @@ class CoordinatedDelivery final : public PackageDelivery {
     const auto record = phone_.apps.recordForIdentifier(identifier_, false);
     if (!error && record && !record->isPlaceholder) return std::nullopt;
     // One that is over before its package was promised leaves the file alone.
-    phone_.files.removeItem(path_);
+    std::ignore = phone_.files.removeItem(path_);
     return error ? oneLine(error->localizedDescription()) : NotInstalled;
   }
 
@@ -130,7 +132,8 @@ class RegistryDelivery final : public PackageDelivery {
     if (!phone_.apps.installApplication(FileLocation::file(path), options, &error)) {
       failure_ = error ? oneLine(error->localizedDescription()) : NotInstalled;
     }
-    phone_.files.removeItem(path);
+    // What stays is taken away by the next sync.
+    std::ignore = phone_.files.removeItem(path);
   }
 
   std::optional<std::string> settle() override { return failure_; }

@@ -24,7 +24,7 @@ class PackageTransfer {
       : source_(std::move(source)), target_(std::move(target)), durability_(durability) {}
 
   /// Sends the next chunk. After Failed (with an error) nothing of the package stays on the phone.
-  Step sendChunk(const Phone& phone, std::optional<Error>* error);
+  [[nodiscard]] Step sendChunk(const Phone& phone, std::optional<Error>* error);
 
   std::uint64_t sent() const { return sent_; }
   std::uint64_t total() const { return total_; }  ///< 0 before the first step
@@ -32,7 +32,7 @@ class PackageTransfer {
   bool progressed();
 
  private:
-  bool open(const Phone& phone, std::optional<Error>* error);
+  [[nodiscard]] bool open(const Phone& phone, std::optional<Error>* error);
   bool fail(int errnoValue, std::optional<Error>* error) const;
 
   const std::filesystem::path source_;

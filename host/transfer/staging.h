@@ -13,8 +13,8 @@ namespace appsync::host {
 /// Puts into the phone's staging area what the client takes over: the todo list, each application's
 /// description, icon and metadata, and the icon layout; nothing of what the host brings by itself.
 /// Whatever stood there before is gone. False with an error when the phone refuses.
-bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
-           const std::optional<Bytes>& iconLayout, std::optional<Error>* error);
+[[nodiscard]] bool stage(FileManager& files, const SyncPlan& plan, const Library& library,
+                         const std::optional<Bytes>& iconLayout, std::optional<Error>* error);
 
 /// The name under which a package is sent: the identifier and the ending of the library's file.
 std::string stagedPackageName(const PackageFacts& package);

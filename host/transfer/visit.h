@@ -34,7 +34,7 @@ class Visit {
   /// Whether the plug-in is one for applications; else the visit is broken off.
   bool isServed();
   /// Has the client begin; else the visit is broken off, told as this.
-  bool begin(std::string_view hostAnchor, std::string_view failure);
+  [[nodiscard]] bool begin(std::string_view hostAnchor, std::string_view failure);
 
   /// Sends what the client asks for.
   void sendToClient(const std::vector<SyncAssetPtr>& assets, const Library& library);
