@@ -77,8 +77,7 @@ std::optional<Error> readInfo(const PackageReader& reader, UnpackTarget& target,
   if (count != status.st_size) return systemError(count < 0 ? errno : EIO, path);
   std::optional<Error> cause;
   std::optional<PropertyList> parsed = parsePropertyList(bytes, &cause, InfoLimits);
-  if (!parsed)
-    return badInfo("Info.plist " + (cause ? cause->localizedDescription() : "did not parse"));
+  if (!parsed) return badInfo("Info.plist " + cause->localizedDescription());
   PropertyList::Dictionary* dictionary = parsed->asDictionary();
   if (!dictionary) return badInfo("Info.plist holds no dictionary");
   info = std::move(*dictionary);

@@ -196,7 +196,7 @@ class Packer {
     std::optional<Error> error;
     if (extractPackage(package.get(), directory.get(), result_.identifier, {}, &error)) return true;
     return fail("the phone would refuse this package: " +
-                printable(error ? oneLine(error->localizedDescription()) : "unknown reason"));
+                printable(oneLine(error->localizedDescription())));
   }
 
   fs::path folder_;

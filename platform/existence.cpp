@@ -16,7 +16,7 @@ std::optional<bool> isThere(FileManager& files, std::string_view path,
   std::optional<Error> reason;
   if (files.attributesOfItem(path, &reason)) return true;
   if (isMissing(reason)) return false;
-  setError(error, reason.value_or(Error::posix(EIO, path)));
+  setError(error, *std::move(reason));
   return std::nullopt;
 }
 
@@ -25,7 +25,7 @@ bool readIfThere(FileManager& files, std::string_view path, std::optional<Bytes>
   std::optional<Error> reason;
   contents = files.contentsAtPath(path, &reason);
   if (contents || isMissing(reason)) return true;
-  return failWith(error, reason.value_or(Error::posix(EIO, path)));
+  return failWith(error, *std::move(reason));
 }
 
 std::optional<PropertyList::Dictionary> readDictionary(FileManager& files, std::string_view path,

@@ -149,9 +149,8 @@ bool DeviceAppRegistry::installPackageWith(const FileLocation& package,
     return failWith(why, invalid("a package is installed from a file"));
   };
   const bool installed = change(identifier, install, &reason);
-  core_.watcher.installFinished(identifier, reason);
-  if (reason) setError(error, std::move(*reason));
-  return installed;
+  core_.watcher.installFinished(identifier, installed ? std::nullopt : reason);
+  return installed || failWith(error, *std::move(reason));
 }
 
 bool DeviceAppRegistry::buildPlaceholder(const std::string& identifier, const PlaceholderFace& face,

@@ -119,8 +119,8 @@ std::optional<Error> restore(DeviceCore& core, const std::string& identifier,
   const std::string path = Containers::waitingDataPath(identifier);
   std::uint64_t entries = 0;
   if (auto error = layOut(core, path, source, false, entries)) return error;
-  if (entries > 0 || core.containers.removeWaitingData(identifier)) return std::nullopt;
-  return Error::posix(EIO, path);
+  if (entries > 0 || core.containers.removeWaitingData(identifier, &failure)) return std::nullopt;
+  return failure;
 }
 
 /// The data is in its place whether or not this can be written.

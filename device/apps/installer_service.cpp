@@ -25,7 +25,7 @@ int DeviceInstallerService::clearUninstalled(const std::vector<std::string>& bun
         for (const std::string& identifier : bundleIds) forgetUninstalled(database, identifier);
       },
       &error);
-  return cleared ? 0 : static_cast<int>(error ? error->code : -1);
+  return cleared ? 0 : static_cast<int>(error->code);
 }
 
 void recordUninstalled(Connection& database, std::string_view identifier) {

@@ -35,10 +35,8 @@ bool undoEarlierAdoption(DeviceCore& core, const std::string& identifier,
   const std::string aside = Containers::asideName(identifier);
   const auto there = isThere(core.files, Containers::dataPath(aside), error);
   if (!there || !*there) return there.has_value();
-  if (!core.database.settle()) {
-    return failWith(error, Error::posix(EIO, Containers::dataPath(aside)));
-  }
-  return removeAbandonedData(core, aside, error) && core.containers.undoAdoption(identifier, error);
+  return core.database.settle(error) && removeAbandonedData(core, aside, error) &&
+         core.containers.undoAdoption(identifier, error);
 }
 
 /// Done before the switch: if that fails or never comes, the data waits where the next attempt
@@ -163,12 +161,12 @@ void markInstalling(DeviceCore& core, const std::string& identifier) {
 }
 
 HistoryEntry failureOf(const std::string& identifier, const ApplicationRows& before,
-                       HistoryOrigin origin, const std::optional<Error>& reason) {
+                       HistoryOrigin origin, const Error& reason) {
   return {.event = HistoryEvent::Failed,
           .origin = origin,
           .bundleId = identifier,
           .version = before.placeholder ? before.placeholder->version : std::nullopt,
-          .reason = reason ? reason->localizedDescription() : "no reason given"};
+          .reason = reason.localizedDescription()};
 }
 
 void markFailed(DeviceCore& core, const HistoryEntry& failure) {
@@ -190,8 +188,8 @@ bool installPackage(DeviceCore& core, const std::string& package, const std::str
   std::optional<Error> reason;
   const bool installed = replaceApplication(core, package, identifier, *before, details, &reason);
   if (!installed) {
-    markFailed(core, failureOf(identifier, *before, details.origin, reason));
-    if (reason) setError(error, *std::move(reason));
+    markFailed(core, failureOf(identifier, *before, details.origin, *reason));
+    setError(error, *std::move(reason));
   }
   core.observers.installsChanged();
   return installed;

@@ -25,13 +25,12 @@ std::optional<PropertyList::Dictionary> readInfo(DeviceCore& core, const std::st
                                                  std::optional<Error>* error) {
   std::optional<Error> cause;
   auto info = loadDictionary(core.files, joinPath(bundle, "Info.plist"), &cause);
-  if (!info && cause && cause->domain == POSIXErrorDomain && !isMissing(cause)) {
+  if (!info && cause->domain == POSIXErrorDomain && !isMissing(cause)) {
     setError(error, *cause);  // the phone's failure is no fault of the bundle
     return std::nullopt;
   }
   if (!info) {
-    setError(error, refusal(PackageRefusal::BadInfo,
-                            cause ? cause->localizedDescription() : "Info.plist is missing"));
+    setError(error, refusal(PackageRefusal::BadInfo, cause->localizedDescription()));
     return std::nullopt;
   }
   const std::string* found = findString(*info, KBBundleIdentifier);

@@ -137,7 +137,7 @@ bool removeForPerson(DeviceCore& core, const std::string& identifier, std::optio
 bool forgetWaitingData(DeviceCore& core, const std::string& identifier,
                        std::optional<Error>* error) {
   const auto rows = readApplication(core.database, identifier, error);
-  return rows && !rows->any() && core.containers.removeWaitingData(identifier);
+  return rows && !rows->any() && core.containers.removeWaitingData(identifier, error);
 }
 
 void abandonData(Connection& database, std::string_view name) {
@@ -155,9 +155,9 @@ std::optional<bool> isAbandoned(DeviceCore& core, std::string_view name,
 bool removeAbandonedData(DeviceCore& core, const std::string& name, std::optional<Error>* error) {
   const std::optional<bool> abandoned = isAbandoned(core, name, error);
   if (!abandoned || !*abandoned) return abandoned.has_value();
-  if (!core.containers.removeData(Containers::asideName(name)) ||
-      !core.containers.removeData(name) || !core.containers.removeWaitingData(name)) {
-    return failWith(error, Error::posix(EIO, Containers::dataPath(name)));
+  if (!core.containers.removeData(Containers::asideName(name), error) ||
+      !core.containers.removeData(name, error) || !core.containers.removeWaitingData(name, error)) {
+    return false;
   }
   return core.database.change(
       // On disk before the application can have new data, which a list come back would name.

@@ -60,16 +60,15 @@ std::optional<std::string> Containers::make(std::optional<Error>* error) {
 }
 
 void Containers::remove(const std::string& container) {
-  std::ignore = removeIfThere(container);  // the log tells
+  std::ignore = removeIfThere(container, nullptr);
 }
 
-bool Containers::removeIfThere(const std::string& path) {
-  std::optional<Error> error;
-  if (files_.removeItem(path, &error) || isMissing(error)) return true;
+bool Containers::removeIfThere(const std::string& path, std::optional<Error>* error) {
+  std::optional<Error> reason;
+  if (files_.removeItem(path, &reason) || isMissing(reason)) return true;
   log_.write(LogChannel::TWLogCategoryFramework, LogLevel::Error,
-             fmt::format("{} could not be removed: {}", path,
-                         error ? error->localizedDescription() : "unknown reason"));
-  return false;
+             fmt::format("{} could not be removed: {}", path, reason->localizedDescription()));
+  return failWith(error, *std::move(reason));
 }
 
 std::optional<std::vector<std::string>> Containers::namesIn(std::string_view directory,
@@ -122,7 +121,7 @@ bool Containers::adoptWaitingData(std::string_view identifier, std::optional<Err
   if (adopted) return true;
   // What cannot be put back is when the device is next opened.
   if (hadData) std::ignore = files_.moveItem(aside, data);
-  return failWith(error, reason.value_or(Error::posix(EIO, data)));
+  return failWith(error, *std::move(reason));
 }
 
 bool Containers::undoAdoption(std::string_view identifier, std::optional<Error>* error) {
@@ -156,8 +155,8 @@ std::vector<std::string> Containers::setAside() {
   return names;
 }
 
-bool Containers::removeWaitingData(std::string_view identifier) {
-  return removeIfThere(waitingDataPath(identifier));
+bool Containers::removeWaitingData(std::string_view identifier, std::optional<Error>* error) {
+  return removeIfThere(waitingDataPath(identifier), error);
 }
 
 bool Containers::makeData(std::string_view identifier, std::optional<Error>* error) {
@@ -174,8 +173,8 @@ void Containers::removeEmptyData(const std::set<std::string>& besides) {
   }
 }
 
-bool Containers::removeData(std::string_view identifier) {
-  return removeIfThere(dataPath(identifier));
+bool Containers::removeData(std::string_view identifier, std::optional<Error>* error) {
+  return removeIfThere(dataPath(identifier), error);
 }
 
 }  // namespace appsync::device

@@ -50,12 +50,12 @@ class Containers {
   static std::string asideName(std::string_view identifier);
   /// The applications of which data is set aside.
   std::vector<std::string> setAside();
-  [[nodiscard]] bool removeWaitingData(std::string_view identifier);
+  [[nodiscard]] bool removeWaitingData(std::string_view identifier, std::optional<Error>* error);
   [[nodiscard]] bool makeData(std::string_view identifier, std::optional<Error>* error);
   /// Removes the data directories that have nothing in them, but for those of these applications.
   void removeEmptyData(const std::set<std::string>& besides);
   /// True when the application has no data any more.
-  [[nodiscard]] bool removeData(std::string_view identifier);
+  [[nodiscard]] bool removeData(std::string_view identifier, std::optional<Error>* error);
 
   /// The names in any directory, none of one that is not there; nullopt (with an error) when they
   /// cannot be read.
@@ -65,7 +65,8 @@ class Containers {
  private:
   using Flush = std::optional<Error>;  ///< why it failed
 
-  [[nodiscard]] bool removeIfThere(const std::string& path);
+  /// A failure is logged, too.
+  [[nodiscard]] bool removeIfThere(const std::string& path, std::optional<Error>* error);
   Flush flushNow();
 
   FileManager& files_;

@@ -15,7 +15,7 @@ void DeviceBackupManager::cancelApplicationRestore(std::string_view bundleId) no
   if (!isUsableIdentifier(bundleId) || !core_.database.writable()) return;
   const KeyedMutex::Guard guard(core_.applicationLocks, bundleId);
   // What stays is still said to wait.
-  std::ignore = core_.containers.removeWaitingData(bundleId);
+  std::ignore = core_.containers.removeWaitingData(bundleId, nullptr);
 }
 
 }  // namespace appsync::device

@@ -106,7 +106,7 @@ bool Database::change(std::string_view purpose, Commit commit, const Work& work,
       error);
 }
 
-bool Database::settle() noexcept {
+bool Database::settle(std::optional<Error>* error) noexcept {
   return attempt(
       "it is not sure what the database will hold when it is next opened",
       [&]() APPSYNC_REQUIRES(mutex_) {
@@ -119,7 +119,7 @@ bool Database::settle() noexcept {
         transaction.commit();
         settled_ = true;
       },
-      nullptr);
+      error);
 }
 
 }  // namespace appsync::device

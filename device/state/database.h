@@ -135,7 +135,7 @@ class Database {
   /// A commit whose last flush fails is undone, but stands in the write-ahead log: whoever opens
   /// the database next may find it made. Writes over it, if there may be such, and is true when no
   /// failed change can come back. Until then nothing may be removed that one of them names.
-  [[nodiscard]] bool settle() noexcept;
+  [[nodiscard]] bool settle(std::optional<Error>* error = nullptr) noexcept;
 
  private:
   /// Runs work with mutex_ held.

@@ -27,7 +27,7 @@ class Remembered {
     if (!path || !path->asString()) return false;
     std::optional<Error> error;
     const auto there = isThere(files_, *path->asString(), &error);
-    if (!there) note(error.value_or(Error::posix(EIO, *path->asString())));
+    if (!there) note(*error);
     return there.value_or(false);
   }
 

@@ -130,7 +130,7 @@ class RegistryDelivery final : public PackageDelivery {
     }
     std::optional<Error> error;
     if (!phone_.apps.installApplication(FileLocation::file(path), options, &error)) {
-      failure_ = error ? oneLine(error->localizedDescription()) : NotInstalled;
+      failure_ = oneLine(error->localizedDescription());
     }
     // What stays is taken away by the next sync.
     std::ignore = phone_.files.removeItem(path);

@@ -41,8 +41,7 @@ void PackageSender::sendChunk(const SyncAssetPtr& asset) {
   std::optional<Error> error;
   const PackageTransfer::Step step = sending.transfer.sendChunk(phone_, &error);
   if (step == PackageTransfer::Step::Failed) {
-    const Error cause = error.value_or(Error::posix(EIO));
-    return finish(asset, Failure{cause, withReason("could not be sent", cause)});
+    return finish(asset, Failure{*error, withReason("could not be sent", error)});
   }
   if (sending.transfer.progressed()) reportProgress(sending);
   if (step == PackageTransfer::Step::Done) finish(asset, std::nullopt);

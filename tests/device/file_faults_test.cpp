@@ -51,12 +51,19 @@ class FileFaultsTest : public DeviceTest {
     EXPECT_TRUE(done);
   }
 
+  /// Whether the work was done; else it must have told why.
+  bool attempt(const std::function<bool()>& work) {
+    error.reset();
+    const bool done = work();
+    EXPECT_TRUE(done || error) << "it failed without a reason";
+    return done;
+  }
+
   bool install(const FileLocation& package) {
-    return device->appRegistry().installApplication(
-        package,
-        {{std::string(SWPackageTypeKey), SWPackageTypeCustomer},
-         {std::string(KBBundleIdentifier), Id}},
-        nullptr);
+    const PropertyList::Dictionary options{{std::string(SWPackageTypeKey), SWPackageTypeCustomer},
+                                           {std::string(KBBundleIdentifier), Id}};
+    return attempt(
+        [&] { return device->appRegistry().installApplication(package, options, &error); });
   }
   PackageArchive archive(std::string_view version) {
     return PackageArchive()
@@ -68,6 +75,32 @@ class FileFaultsTest : public DeviceTest {
   }
 };
 
+TEST_F(FileFaultsTest, AnOperationOnFilesThatFailsTellsWhy) {
+  FileManager& files = device->files();
+  const FileAttributes mobile{.owner = std::string("mobile"), .group = std::string("mobile")};
+  const std::map<std::string, std::function<bool()>> operations = {
+      {"contents", [&] { return files.contentsAtPath("/a/file", &error).has_value(); }},
+      {"write", [&] { return files.writeAtomically("/a/file", {}, &error); }},
+      {"make", [&] { return files.createDirectory("/a/new", false, mobile, &error); }},
+      {"make all", [&] { return files.createDirectory("/x/y", true, {}, &error); }},
+      {"remove", [&] { return files.removeItem("/a", &error); }},
+      {"move", [&] { return files.moveItem("/a", "/b", &error); }},
+      {"copy", [&] { return files.copyItem("/a", "/b", &error); }},
+      {"attributes", [&] { return files.attributesOfItem("/a", &error).has_value(); }},
+      {"touch", [&] { return files.touch("/a", &error); }}};
+  for (const auto& [name, operation] : operations) {
+    bool struck = true;
+    for (int call = 0; struck; ++call) {
+      SCOPED_TRACE(name + ", call " + std::to_string(call));
+      for (const std::string_view path : {"/a", "/b", "/x"}) files.removeItem(path);
+      putFile("/a/file", "text");
+      const FailingCalls failing(call);
+      attempt(operation);
+      struck = failing.struck();
+    }
+  }
+}
+
 TEST_F(FileFaultsTest, ADemotedAndTappedApplicationKeepsItsDataAndMetadata) {
   ASSERT_TRUE(installPackage(archive("1.0"), Id));
   putFile(Notes, "mine");
@@ -76,7 +109,7 @@ TEST_F(FileFaultsTest, ADemotedAndTappedApplicationKeepsItsDataAndMetadata) {
   const Lines between{whole.front(), demoted.front()};
   sweep(
       [&] {
-        const bool done = device->demote(Id, nullptr);
+        const bool done = attempt([&] { return device->demote(Id, &error); });
         device.reset();
         DeviceError problem;
         std::optional<Error> reason;
@@ -146,7 +179,7 @@ TEST_F(FileFaultsTest, DataThatIsOverwrittenIsTheOldOrTheNew) {
   const Snapshot after = {{"com.example.a", "folder 0755"},
                           {"com.example.a/kept", "folder 0755"},
                           {"com.example.a/kept/notes", "file 0644 given"}};
-  sweep([&] { return device->overwriteData(Id, piecesOf(given), nullptr); },
+  sweep([&] { return attempt([&] { return device->overwriteData(Id, piecesOf(given), &error); }); },
         [&](bool done) {
           EXPECT_EQ(fakes::snapshot(onDisk(Containers::DataDirectory)), done ? after : before);
         });
