@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <tuple>
 
 #include "base/identifiers.h"
 #include "device/apps/app_registry.h"
@@ -248,8 +249,9 @@ class FolderDevice final : public EmbeddedDevice {
     const auto effect = effectOfCancelling(core_, std::string(bundleId), &error);
     if (!effect || (effect == Cancelling::Forgetting && !mayRemove(core_, &error))) return error;
     if (coordination_ && coordination_->cancelInstall(bundleId)) {
-      registry_.change(bundleId, undoAsking, nullptr);
-      registry_.change(bundleId, forgetWaitingData, nullptr);
+      // The install is over; what cannot be tidied up after it is in the log.
+      std::ignore = registry_.change(bundleId, undoAsking, nullptr);
+      std::ignore = registry_.change(bundleId, forgetWaitingData, nullptr);
       return std::nullopt;
     }
     if (registry_.change(bundleId, cancelWish, &error)) return std::nullopt;
