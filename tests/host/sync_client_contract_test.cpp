@@ -50,7 +50,8 @@ class SyncClientContract : public ::testing::TestWithParam<Kind> {
     phone.appRegistry.failInstall("com.a", reason);
   }
   std::string operationOf(const std::string& identifier) {
-    for (const TodoState& state : readTodoList(phone.files, exchange::WorkArea).value()) {
+    const auto todo = readTodoList(phone.files, exchange::WorkArea);
+    for (const TodoState& state : todo.value()) {
       if (state.identifier == identifier) return state.operation;
     }
     return "none";
