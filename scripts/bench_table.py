@@ -1,65 +1,69 @@
 #!/usr/bin/env python3
 """Prints one table of Google Benchmark's JSON reports.
 
-A benchmark "name/size" is shown beside its floor "name_floor/size" of the same program: the least
-work that any solution has to do. Where a benchmark has no floor of its own, its counter
-"floor_ratio", if any, is shown. The counter "bytes_per_entry" is the memory that it took. With
---benchmark_repetitions the medians are taken.
+A work "name/size" is shown beside its floor "name_floor/size", the least work that any solution has
+to do, and with what bench/goals.txt asks of it. With --benchmark_repetitions the medians are taken.
+With --against an older build's reports are shown beside the newer ones instead.
 
-usage: bench_table.py REPORT.json...
+usage: bench_table.py [--goals FILE] REPORT.json... [--against REPORT.json...]
 """
 
-import json
+import argparse
+import fnmatch
 import pathlib
-import sys
 
-NANOSECONDS = {"ns": 1, "us": 1e3, "ms": 1e6, "s": 1e9}
-# What Google Benchmark appends to a name to tell how it was measured.
-DECORATIONS = {"real_time", "process_time", "manual_time"}
+from bench_report import duration, floor_of, is_floor, read
 
-
-def plain_name(run):
-    name = run.get("run_name", run["name"])
-    parts = [p for p in name.split("/") if p not in DECORATIONS]
-    return "/".join(p for p in parts if not p.startswith(("iterations:", "repeats:", "min_time:")))
+GOALS = pathlib.Path(__file__).resolve().parents[1] / "bench/goals.txt"
 
 
-def read(path):
-    """name -> (time in ns, run) of one report; medians where there are several runs."""
-    results = {}
-    for run in json.loads(pathlib.Path(path).read_text())["benchmarks"]:
-        if run.get("error_occurred"):
-            sys.exit(f"{path}: {run['name']}: {run.get('error_message')}")
-        aggregate = run.get("aggregate_name")
-        if aggregate not in (None, "median"):
-            continue
-        name = plain_name(run)
-        if aggregate == "median" or name not in results:
-            results[name] = (run["real_time"] * NANOSECONDS[run["time_unit"]], run)
-    return results
+def read_goals(path):
+    """[pattern, most, of what]; "of what" is "" for the work's own floor."""
+    lines = (line.split() for line in pathlib.Path(path).read_text().splitlines())
+    return [(*words, "")[:3] for words in lines if words and not words[0].startswith("#")]
 
 
-def floor_of(name, results):
-    head, *rest = name.split("/")
-    return results.get("/".join([head + "_floor", *rest]))
+def goals_of(name, goals):
+    """of what -> most."""
+    found = {}
+    for pattern, most, measure in goals:
+        if fnmatch.fnmatchcase(name, pattern):
+            found.setdefault(measure, float(most))
+    return found
 
 
-def duration(ns):
-    for unit, size in (("s", 1e9), ("ms", 1e6), ("us", 1e3)):
-        if ns >= size:
-            return f"{ns / size:.3g} {unit}"
-    return f"{ns:.3g} ns"
+def verdict(value, most):
+    return (f"{most:g}", "met" if value <= most else "missed") if most is not None else ("", "")
 
 
-def rows(results):
+def compared(label, time, other, most):
+    ratio = time / other
+    return (label, duration(other), duration(time), f"{ratio:.2f}", *verdict(ratio, most))
+
+
+def rows(results, goals):
     for name, (time, run) in results.items():
-        if name.split("/")[0].endswith("_floor"):
+        if is_floor(name):
             continue
-        floor = floor_of(name, results)
-        ratio = time / floor[0] if floor else run.get("floor_ratio")
-        beside = (duration(time / ratio), f"{ratio:.2f}") if ratio else ("", "")
-        memory = f"{run['bytes_per_entry']:.0f}" if "bytes_per_entry" in run else ""
-        yield (name, duration(time), *beside, memory)
+        wanted = goals_of(name, goals)
+        floor = results.get(floor_of(name))
+        if floor:
+            yield compared(name, time, floor[0], wanted.get(""))
+        else:
+            yield (name, "", duration(time), "", "", "")
+        for measure, most in wanted.items():
+            if measure in results:
+                yield compared(f"  to {measure}", time, results[measure][0], most)
+            elif measure in run:
+                value = run[measure]
+                yield (f"  {measure}", "", f"{value:.0f}", "", *verdict(value, most))
+
+
+def pairs(new, old):
+    for name, (time, _) in new.items():
+        if name in old:
+            before = old[name][0]
+            yield (name, duration(before), duration(time), f"{time / before:.2f}")
 
 
 def table(lines):
@@ -70,12 +74,17 @@ def table(lines):
 
 
 def main():
-    if len(sys.argv) < 2:
-        sys.exit("no benchmark reports")
-    lines = [("benchmark", "time", "floor", "ratio", "bytes/entry")]
-    for path in sys.argv[1:]:
-        lines.extend(rows(read(path)))
-    table(lines)
+    parser = argparse.ArgumentParser()
+    parser.add_argument("reports", nargs="+")
+    parser.add_argument("--goals", default=GOALS)
+    parser.add_argument("--against", nargs="+")
+    options = parser.parse_args()
+    results = read(*options.reports)
+    if options.against:
+        table([("work", "before", "now", "ratio"), *pairs(results, read(*options.against))])
+    else:
+        table([("work", "floor", "ours", "ratio", "goal", ""),
+               *rows(results, read_goals(options.goals))])
 
 
 if __name__ == "__main__":

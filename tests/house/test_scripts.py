@@ -9,6 +9,7 @@ import subprocess
 import sys
 import tempfile
 import unittest
+import xml.etree.ElementTree
 
 SCRIPTS = pathlib.Path(__file__).resolve().parents[2] / "scripts"
 
@@ -71,27 +72,86 @@ Codec/0.  # TypeParam = int
         self.assertIn("test_scripts.py::Behaviours.test_python_tests_are_found", names)
 
 
-class BenchTable(unittest.TestCase):
-    def report(self, *runs):
-        return json.dumps({"benchmarks": [
-            {"name": name, "run_name": name, "real_time": time, "time_unit": unit, **more}
-            for name, time, unit, more in runs]})
+def report(*runs):
+    """A report of Google Benchmark's: runs of (name, time, unit, further keys)."""
+    return json.dumps({"benchmarks": [
+        {"name": name, "run_name": name, "real_time": time, "time_unit": unit, **more}
+        for name, time, unit, more in runs]})
 
-    def test_shows_each_benchmark_beside_its_floor(self):
-        table = run("bench_table", self.report(
-            ("change/100/real_time", 15, "us", {}), ("change_floor/100/real_time", 10000, "ns", {}),
-            ("change/1000", 99, "us", {"bytes_per_entry": 180.4}), ("alone", 4, "ms", {"floor_ratio": 2.0})))
-        rows = [line.split() for line in table.splitlines()]
-        self.assertEqual(rows, [["benchmark", "time", "floor", "ratio", "bytes/entry"],
-                                ["change/100", "15", "us", "10", "us", "1.50"],
-                                ["change/1000", "99", "us", "180"],
-                                ["alone", "4", "ms", "2", "ms", "2.00"]])
+
+class BenchTable(unittest.TestCase):
+    GOALS = """# work most of-what
+change/1000   1.4
+change/*      1.2
+change/*      150  bytes_per_entry
+twice         2.5  once
+"""
+
+    def table(self, *runs, goals=GOALS, against=()):
+        with tempfile.TemporaryDirectory() as folder:
+            paths = [pathlib.Path(folder, name) for name in ("new", "old", "goals")]
+            for path, text in zip(paths, (report(*runs), report(*against), goals)):
+                path.write_text(text)
+            older = ["--against", paths[1]] if against else []
+            unused = pathlib.Path(folder, "unused")  # of a program that had nothing to run
+            unused.touch()
+            done = subprocess.run(
+                [sys.executable, "-B", SCRIPTS / "bench_table.py", "--goals", paths[2], paths[0], unused, *older],
+                capture_output=True, text=True, check=True)
+        return [" ".join(line.split()) for line in done.stdout.splitlines()]
+
+    def test_shows_each_work_beside_its_floor_and_goal(self):
+        self.assertEqual(
+            self.table(("change/100/real_time", 15, "us", {}),
+                       ("change_floor/100/real_time", 10000, "ns", {}),
+                       ("change/1000", 14, "us", {}), ("change_floor/1000", 10, "us", {}),
+                       ("alone", 4, "ms", {})),
+            ["work floor ours ratio goal",
+             "change/100 10 us 15 us 1.50 1.2 missed",
+             "change/1000 10 us 14 us 1.40 1.4 met",
+             "alone 4 ms"])
+
+    def test_a_goal_may_be_of_a_counter_or_of_another_work(self):
+        self.assertEqual(
+            self.table(("change/100", 1, "us", {"bytes_per_entry": 180.4}),
+                       ("once", 2, "s", {}), ("twice", 5, "s", {})),
+            ["work floor ours ratio goal",
+             "change/100 1 us", "bytes_per_entry 180 150 missed",
+             "once 2 s", "twice 5 s", "to once 2 s 5 s 2.50 2.5 met"])
+
+    def test_shows_an_older_build_beside_the_newer(self):
+        self.assertEqual(
+            self.table(("x", 5, "ms", {}), ("new", 1, "s", {}), against=[("x", 4, "ms", {}), ("gone", 1, "s", {})]),
+            ["work before now ratio", "x 4 ms 5 ms 1.25"])
 
     def test_takes_the_median_of_repetitions(self):
-        table = run("bench_table", self.report(
-            ("x", 1, "ns", {}), ("x", 9, "ns", {}),
-            ("x", 5, "ns", {"aggregate_name": "median"}), ("x", 3, "ns", {"aggregate_name": "stddev"})))
-        self.assertEqual(table.splitlines()[1].split(), ["x", "5", "ns"])
+        self.assertEqual(
+            self.table(("x", 1, "ns", {}), ("x", 9, "ns", {}),
+                       ("x", 5, "ns", {"aggregate_name": "median"}),
+                       ("x", 3, "ns", {"aggregate_name": "stddev"}))[1:],
+            ["x 5 ns"])
+
+    def test_a_failed_benchmark_is_no_result(self):
+        with self.assertRaises(subprocess.CalledProcessError):
+            self.table(("x", 0, "ns", {"error_occurred": True, "error_message": "no phone"}))
+
+
+class BenchPlots(unittest.TestCase):
+    def test_draws_what_was_measured_at_three_sizes(self):
+        with tempfile.TemporaryDirectory() as folder:
+            runs = pathlib.Path(folder, "runs.json")
+            runs.write_text(report(*(
+                (f"{name}/{size}", size * factor, "us", {})
+                for name, factor in (("change", 2), ("change_floor", 1)) for size in (10, 100, 1000)),
+                ("few/1", 1, "us", {}), ("few/2", 2, "us", {})))
+            subprocess.run([sys.executable, "-B", SCRIPTS / "bench_plots.py", f"{folder}/plots", runs],
+                           capture_output=True, text=True, check=True)
+            plots = {path.name: path.read_text() for path in pathlib.Path(folder, "plots").iterdir()}
+        self.assertEqual(list(plots), ["change.svg"])
+        paths = [node.get("d") for node in xml.etree.ElementTree.fromstring(plots["change.svg"]).iter()
+                 if node.get("stroke-width") == "2"]
+        # From 10 us to 10 ms up, from 10 to 1,000 across: each line rises by two decades of three.
+        self.assertEqual(paths, ["M64.0 237.1L264.0 161.1L464.0 85.1", "M64.0 260.0L264.0 184.0L464.0 108.0"])
 
 
 class CoverageTable(unittest.TestCase):
