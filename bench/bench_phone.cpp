@@ -36,8 +36,8 @@ void addFile(archive* writer, const std::string& name, ByteView bytes) {
 
 }  // namespace
 
-TemporaryFolder::TemporaryFolder() {
-  std::string name = (std::filesystem::temp_directory_path() / "appsync-bench-XXXXXX").string();
+TemporaryFolder::TemporaryFolder(const std::filesystem::path& parent) {
+  std::string name = (parent / "appsync-bench-XXXXXX").string();
   if (!mkdtemp(name.data())) throw std::runtime_error("no temporary folder");
   path_ = name;
 }
@@ -101,9 +101,15 @@ Bytes pngOf(std::uint32_t side) {
   return png;
 }
 
-void writePackage(const std::filesystem::path& file, std::size_t megabytes) {
+void writePackage(const std::filesystem::path& file, PackageForm form, std::size_t kib) {
   archive* writer = archive_write_new();
-  archive_write_set_format_zip(writer);
+  if (form == PackageForm::TarZst) {
+    archive_write_set_format_pax_restricted(writer);
+    archive_write_add_filter_zstd(writer);
+  } else {
+    archive_write_set_format_zip(writer);
+    if (form == PackageForm::Store) archive_write_zip_set_compression_store(writer);
+  }
   if (archive_write_open_filename(writer, file.c_str()) != ARCHIVE_OK) {
     throw std::runtime_error("cannot write " + file.string());
   }
@@ -112,10 +118,10 @@ void writePackage(const std::filesystem::path& file, std::size_t megabytes) {
                                       {std::string(KBBundleDisplayName), "Bench"}};
   addFile(writer, "Bench.app/Info.plist", *serializePropertyList(info, PropertyListFormat::Xml));
   std::mt19937 random(1);
-  Bytes content(64 << 10);
-  for (std::size_t index = 0; index < megabytes * 16; ++index) {
+  Bytes content((form == PackageForm::DeflateLarge ? kib : 64) << 10);
+  for (std::size_t done = 0; done < kib << 10; done += content.size()) {
     for (std::byte& byte : content) byte = std::byte(random() & 15);
-    addFile(writer, "Bench.app/data/" + std::to_string(index), content);
+    addFile(writer, "Bench.app/data/" + std::to_string(done >> 16), content);
   }
   archive_write_close(writer);
   archive_write_free(writer);

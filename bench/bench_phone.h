@@ -14,7 +14,8 @@ namespace appsync::bench {
 /// A folder that is gone with its owner.
 class TemporaryFolder {
  public:
-  TemporaryFolder();
+  explicit TemporaryFolder(
+      const std::filesystem::path& parent = std::filesystem::temp_directory_path());
   ~TemporaryFolder();
   TemporaryFolder(const TemporaryFolder&) = delete;
   TemporaryFolder& operator=(const TemporaryFolder&) = delete;
@@ -55,8 +56,10 @@ std::string identifierOf(std::size_t index);
 /// A square picture with something on it, as PNG.
 Bytes pngOf(std::uint32_t side);
 
-/// A zip package of `megabytes` in files of 64 KiB that compress to about half.
-void writePackage(const std::filesystem::path& file, std::size_t megabytes);
+/// How a package is packed; large: one file in place of many of 64 KiB.
+enum class PackageForm { Deflate, DeflateLarge, Store, TarZst };
+/// A package of so many KiB that compress to about half.
+void writePackage(const std::filesystem::path& file, PackageForm form, std::size_t kib);
 
 inline const std::string WorkArea = "/var/mobile/Library/ApplicationSync/HalvoStuff";
 inline const std::string TodoList = WorkArea + "/ApplicationsSync.plist";
