@@ -1,5 +1,6 @@
 // Unpacks arbitrary bytes as an application package. Whatever they are, only files and folders may
-// come of them, and only in the folder meant for them.
+// come of them, and only in the folder meant for them; and the same ones, or the same refusal, when
+// the archive library reads all of it.
 
 #include <fcntl.h>
 #include <stdlib.h>
@@ -8,6 +9,8 @@
 #include <cstdint>
 #include <cstdlib>
 #include <filesystem>
+#include <fstream>
+#include <map>
 
 #include "base/directory_tree.h"
 #include "base/file_descriptor.h"
@@ -61,6 +64,37 @@ void checkItems(const fs::path& target, const std::optional<ExtractedPackage>& p
   require(fs::is_regular_file(target / package->bundleName / "Info.plist"));
 }
 
+struct Unpacked {
+  std::optional<ExtractedPackage> package;
+  std::string refusal;
+  std::map<std::string, std::string> files;
+};
+
+std::string contents(const fs::path& file) {
+  std::ifstream stream(file, std::ios::binary);
+  return {std::istreambuf_iterator<char>(stream), {}};
+}
+
+Unpacked unpack(const Arena& arena, int package, const PackageLimits& limits) {
+  const fs::path folder = arena.path() / "target";
+  fs::create_directory(folder);
+  const FileDescriptor target(::openat(arena.fd(), "target", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  std::optional<appsync::Error> error;
+  Unpacked result;
+  result.package = extractPackage(package, target.get(), std::nullopt, limits, &error);
+  require(result.package.has_value() != error.has_value());
+  checkItems(folder, result.package);
+  if (error) {
+    result.refusal = error->localizedDescription();
+  } else {
+    for (const fs::directory_entry& entry : fs::recursive_directory_iterator(folder))
+      if (entry.is_regular_file()) result.files[entry.path()] = contents(entry.path());
+  }
+  require(removeTree(arena.fd(), "target"));
+  require(fs::is_empty(arena.path()));
+  return result;
+}
+
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
@@ -68,14 +102,11 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   FileDescriptor package(::memfd_create("package", MFD_CLOEXEC));
   require(writeAll(package.get(), std::as_bytes(std::span(data, size))));
 
-  fs::create_directory(arena.path() / "target");
-  const FileDescriptor target(::openat(arena.fd(), "target", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  const PackageLimits limits{300, std::uint64_t{4} << 20, 200};
-  std::optional<appsync::Error> error;
-  const auto unpacked = extractPackage(package.get(), target.get(), std::nullopt, limits, &error);
-  require(unpacked.has_value() != error.has_value());
-  checkItems(arena.path() / "target", unpacked);
-  require(removeTree(arena.fd(), "target"));
-  require(fs::is_empty(arena.path()));
+  PackageLimits limits{300, std::uint64_t{4} << 20, 200};
+  const Unpacked quickly = unpack(arena, package.get(), limits);
+  limits.wholeFile = 0;
+  const Unpacked slowly = unpack(arena, package.get(), limits);
+  require(quickly.refusal == slowly.refusal);
+  require(quickly.files == slowly.files);
   return 0;
 }

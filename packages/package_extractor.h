@@ -41,6 +41,9 @@ struct PackageLimits {
   std::uint64_t bytes = std::uint64_t{8} << 30;  ///< unpacked, all files together
   /// Unpacked bytes allowed for each byte of the package, beyond a free allowance of 16 MiB.
   std::uint64_t ratio = 200;
+  /// Files of a zip archive up to this size are unpacked in one piece, which takes twice as much
+  /// memory.
+  std::uint64_t wholeFile = std::uint64_t{1} << 20;
 };
 
 struct ExtractedPackage {

@@ -66,7 +66,9 @@ PackageReader::PackageReader(int packageFd, const PackageLimits& limits)
 PackageReader::~PackageReader() = default;
 
 std::optional<Error> PackageReader::openZip() {
-  if (auto error = checkZipDirectory(fd_, limits_.entries)) return error;
+  std::vector<ZipMember> members;
+  if (auto error = readZipDirectory(fd_, limits_.entries, members)) return error;
+  members_ = std::make_unique<ZipMembers>(fd_, std::move(members), limits_.wholeFile);
   ::archive_read_support_format_zip_seekable(archive_.get());
   ::archive_read_set_format_option(archive_.get(), "zip", "hdrcharset", "UTF-8");
   ::lseek(fd_, 0, SEEK_SET);
@@ -125,12 +127,34 @@ bool PackageReader::next(PackageItem& item, std::optional<Error>& error) {
   const bool readable =
       result == ARCHIVE_OK ||
       (result == ARCHIVE_WARN && isOnlyAboutNames(::archive_error_string(archive_.get())));
-  error = readable ? rules_.admit(announced(entry_), item) : failure();
+  if (!readable) {
+    error = failure();
+    return false;
+  }
+  const ArchiveEntry entry = announced(entry_);
+  name_ = entry.name;
+  ++entries_;
+  error = rules_.admit(entry, item);
   return !error;
+}
+
+/// What the current entry holds, without the archive library: it walks through the members of a zip
+/// archive in the order of the file too.
+std::optional<ByteView> PackageReader::wholeFile() {
+  if (!members_ || !::archive_entry_size_is_set(entry_)) return std::nullopt;
+  const std::optional<ByteView> bytes = members_->contents(entries_ - 1, name_);
+  const bool asAnnounced =
+      bytes && static_cast<std::int64_t>(bytes->size()) == ::archive_entry_size(entry_);
+  return asAnnounced ? bytes : std::nullopt;
 }
 
 std::optional<Error> PackageReader::readFile(const Sink& sink, std::uint64_t& size) {
   size = 0;
+  if (const std::optional<ByteView> bytes = wholeFile()) {
+    size = bytes->size();
+    if (auto error = rules_.admitFileBytes(size)) return error;
+    return sink(0, *bytes);
+  }
   while (true) {
     const void* block = nullptr;
     std::size_t count = 0;

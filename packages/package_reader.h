@@ -9,6 +9,7 @@
 #include "packages/package_entry_rules.h"
 #include "packages/package_extractor.h"
 #include "packages/package_stream.h"
+#include "packages/zip_members.h"
 
 struct archive;
 struct archive_entry;
@@ -45,6 +46,7 @@ class PackageReader {
 
   [[nodiscard]] std::optional<Error> openZip();
   void openTar();
+  std::optional<ByteView> wholeFile();
   [[nodiscard]] std::optional<Error> finish();
   [[nodiscard]] std::optional<Error> drain();
   Error failure() const;
@@ -56,6 +58,9 @@ class PackageReader {
   std::unique_ptr<PackageStream> stream_;  ///< of a tar archive
   std::unique_ptr<archive, Free> archive_;
   archive_entry* entry_ = nullptr;
+  std::string_view name_;                ///< of the entry
+  std::size_t entries_ = 0;              ///< so far, the current one included
+  std::unique_ptr<ZipMembers> members_;  ///< of a zip archive
   ByteView block_;                    ///< of the stream, the one that the archive library got last
   std::uint64_t handed_ = 0;          ///< bytes of the stream that it got
   std::optional<Error> streamError_;  ///< what went wrong below the archive library

@@ -10,33 +10,18 @@
 #include "base/file_descriptor.h"
 #include "base/text.h"
 #include "packages/package_entry_rules.h"
+#include "packages/zip_format.h"
 
 namespace appsync {
 
 namespace {
 
-constexpr std::uint32_t LocalSignature = 0x04034b50;
-constexpr std::uint32_t CentralSignature = 0x02014b50;
-constexpr std::uint32_t EndSignature = 0x06054b50;
-constexpr std::uint32_t LargeEndSignature = 0x06064b50;
-constexpr std::uint32_t LocatorSignature = 0x07064b50;
-constexpr std::size_t LocalSize = 30;
-constexpr std::size_t CentralSize = 46;
-constexpr std::size_t EndSize = 22;
-constexpr std::size_t LargeEndSize = 56;
-constexpr std::size_t LocatorSize = 20;
+using namespace zip;
+
 /// How far from the end of the file the archive library looks for the end record.
 constexpr std::uint64_t Tail = 16 << 10;
 constexpr std::uint32_t InLargeField = 0xffffffff;
 constexpr std::uint16_t LargeField = 0x0001;
-
-/// Little-endian number of `size` bytes; the caller has checked that they are there.
-std::uint64_t number(std::string_view bytes, std::size_t at, std::size_t size) {
-  std::uint64_t value = 0;
-  for (std::size_t i = size; i-- > 0;)
-    value = value << 8 | static_cast<unsigned char>(bytes[at + i]);
-  return value;
-}
 
 std::optional<Error> damaged(std::string_view detail) {
   return refusalError(PackageRefusal::Damaged, detail);
@@ -53,7 +38,7 @@ class ZipFile {
  public:
   ZipFile(int fd, std::uint64_t size) : fd_(fd), size_(size) {}
 
-  std::optional<Error> check(std::uint64_t maximumEntries) const {
+  std::optional<Error> read(std::uint64_t maximumEntries, std::vector<ZipMember>& members) const {
     Directory directory;
     if (auto error = findDirectory(directory)) return error;
     if (directory.offset > directory.end || directory.size != directory.end - directory.offset)
@@ -63,7 +48,9 @@ class ZipFile {
       if (entries == maximumEntries)
         return refusalError(PackageRefusal::TooManyEntries,
                             "more than " + std::to_string(maximumEntries) + " files and folders");
-      if (auto error = checkEntry(directory.end, at)) return error;
+      ZipMember member;
+      if (auto error = readEntry(directory.end, at, member)) return error;
+      members.push_back(member);
     }
     if (entries != directory.entries) return damaged("the table of contents is cut off");
     if (entries == 0) return refusalError(PackageRefusal::NoApplication, "the archive is empty");
@@ -112,7 +99,7 @@ class ZipFile {
     return std::nullopt;
   }
 
-  std::optional<Error> checkEntry(std::uint64_t end, std::uint64_t& at) const {
+  std::optional<Error> readEntry(std::uint64_t end, std::uint64_t& at, ZipMember& member) const {
     const std::string header = read(at, CentralSize);
     if (header.empty() || number(header, 0, 4) != CentralSignature)
       return damaged("the table of contents is wrong");
@@ -125,10 +112,16 @@ class ZipFile {
     at += whole;
     if (name.find('\0') != std::string_view::npos)
       return refusalError(PackageRefusal::UnsafeName, "\"" + shown(name) + "\" holds a NUL");
-    if ((number(header, 8, 2) & 1) != 0)
+    member = {localOffset(header, std::string_view(variable).substr(nameSize)),
+              number(header, 20, 4),
+              number(header, 24, 4),
+              static_cast<std::uint32_t>(number(header, 16, 4)),
+              static_cast<std::uint16_t>(number(header, 8, 2)),
+              static_cast<std::uint16_t>(number(header, 10, 2))};
+    if ((member.flags & Encrypted) != 0)
       return refusalError(PackageRefusal::Encrypted,
                           "\"" + shown(name) + "\" can be read only with a password");
-    return checkLocal(name, localOffset(header, std::string_view(variable).substr(nameSize)));
+    return checkLocal(name, member.offset);
   }
 
   static std::uint64_t localOffset(std::string_view header, std::string_view extra) {
@@ -170,10 +163,16 @@ bool looksLikeZip(int packageFd) noexcept {
   return value == LocalSignature || value == EndSignature;
 }
 
-std::optional<Error> checkZipDirectory(int packageFd, std::uint64_t maximumEntries) {
+std::optional<Error> readZipDirectory(int packageFd, std::uint64_t maximumEntries,
+                                      std::vector<ZipMember>& members) {
   struct stat status {};
   if (::fstat(packageFd, &status) != 0) return Error::posix(errno);
-  return ZipFile(packageFd, static_cast<std::uint64_t>(status.st_size)).check(maximumEntries);
+  const ZipFile file(packageFd, static_cast<std::uint64_t>(status.st_size));
+  if (auto error = file.read(maximumEntries, members)) return error;
+  std::ranges::sort(members, {}, &ZipMember::offset);
+  if (std::ranges::adjacent_find(members, {}, &ZipMember::offset) != members.end())
+    return refusalError(PackageRefusal::DuplicateName, "the table of contents lists a file twice");
+  return std::nullopt;
 }
 
 }  // namespace appsync
