@@ -285,7 +285,7 @@ class FolderDevice final : public EmbeddedDevice {
   StoredTransactionLog transactions_{*database_};
   DeviceHomeScreen homeScreen_{core_};
   DeviceIconRenderer iconRenderer_{files_};
-  PngEncoderService imageEncoders_;
+  PngEncoderService imageEncoders_{PngEncoderService::Compression::Quick};
   LocalNotifier notifier_;
   ThreadBackgroundQueue queue_;
   NoCoordination noCoordination_{queue_};

@@ -16,49 +16,48 @@ std::byte rounded(std::uint64_t sum, std::uint64_t weight) {
 
 }  // namespace
 
-IconScaler::IconScaler(std::uint32_t sourceWidth, std::uint32_t sourceHeight, std::uint32_t side)
-    : side_(side) {
-  const std::uint32_t longer = std::max(sourceWidth, sourceHeight);
-  const std::uint32_t width = fitted(sourceWidth, longer, side);
-  const std::uint32_t height = fitted(sourceHeight, longer, side);
-  columns_ = {sourceWidth, width, (side - width) / 2};
-  rows_ = {sourceHeight, height, (side - height) / 2};
-  rowSums_.resize(width);
-  sums_.resize(std::size_t{width} * height);
+IconScaler::Axis::Axis(std::uint32_t sourceLength, std::uint32_t targetLength, std::uint32_t side)
+    : source(sourceLength), target(targetLength), offset((side - targetLength) / 2) {
+  begins_.push_back(0);
+  for (std::uint64_t at = 0, pixel = 1; pixel <= source; ++pixel) {
+    while (at < pixel * target) {
+      const std::uint64_t touched = at / source;
+      const std::uint64_t stop = std::min(pixel * target, (touched + 1) * source);
+      parts_.push_back(
+          {static_cast<std::uint32_t>(touched), static_cast<std::uint32_t>(stop - at)});
+      at = stop;
+    }
+    begins_.push_back(static_cast<std::uint32_t>(parts_.size()));
+  }
 }
+
+IconScaler::IconScaler(std::uint32_t sourceWidth, std::uint32_t sourceHeight, std::uint32_t side)
+    : side_(side),
+      columns_(sourceWidth, fitted(sourceWidth, std::max(sourceWidth, sourceHeight), side), side),
+      rows_(sourceHeight, fitted(sourceHeight, std::max(sourceWidth, sourceHeight), side), side),
+      rowSums_(columns_.target),
+      sums_(columns_.target * rows_.target) {}
 
 void IconScaler::addRow(std::uint32_t row, std::uint32_t firstColumn, std::uint32_t columnStep,
                         const std::uint8_t* pixels, std::uint32_t count) {
-  std::fill(rowSums_.begin(), rowSums_.end(), Sum{});
+  std::ranges::fill(rowSums_, Sum<std::uint32_t>{});
   for (std::uint32_t i = 0; i < count; ++i, pixels += 4) {
-    const std::uint64_t alpha = pixels[3];
+    const std::uint32_t alpha = pixels[3];
     if (alpha == 0) continue;
-    const std::uint64_t column = firstColumn + std::uint64_t{columnStep} * i;
-    columns_.spread(column, [&](std::size_t target, std::uint64_t overlap) {
-      const std::uint64_t weight = overlap * alpha;
-      Sum& sum = rowSums_[target];
-      sum.red += weight * pixels[0];
-      sum.green += weight * pixels[1];
-      sum.blue += weight * pixels[2];
-      sum.alpha += weight;
-    });
+    const Sum<std::uint32_t> pixel{pixels[0] * alpha, pixels[1] * alpha, pixels[2] * alpha, alpha};
+    for (const Axis::Part& part : columns_.partsOf(firstColumn + columnStep * i))
+      rowSums_[part.target].add(pixel, part.overlap);
   }
-  rows_.spread(row, [&](std::size_t target, std::uint64_t overlap) {
-    Sum* sum = &sums_[target * rowSums_.size()];
-    for (const Sum& add : rowSums_) {
-      sum->red += overlap * add.red;
-      sum->green += overlap * add.green;
-      sum->blue += overlap * add.blue;
-      sum->alpha += overlap * add.alpha;
-      ++sum;
-    }
-  });
+  for (const Axis::Part& part : rows_.partsOf(row)) {
+    auto* sum = &sums_[part.target * rowSums_.size()];
+    for (const Sum<std::uint32_t>& add : rowSums_) sum++->add(add, part.overlap);
+  }
 }
 
 Image IconScaler::finish() const {
   Image image{side_, side_, Bytes(std::size_t{side_} * side_ * 4)};
   const std::uint64_t area = columns_.source * rows_.source;
-  const Sum* sum = sums_.data();
+  const Sum<std::uint64_t>* sum = sums_.data();
   for (std::size_t y = 0; y < rows_.target; ++y) {
     std::byte* out =
         image.pixels.data() + ((y + rows_.offset) * side_ + columns_.offset) * std::size_t{4};

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <span>
 #include <vector>
 
 #include "platform/icon_renderer.h"
@@ -24,34 +25,51 @@ class IconScaler {
   Image finish() const;
 
  private:
-  /// Sums of area, weighted by opacity; `alpha` also counts the opacity itself.
+  /// Sums of area, weighted by opacity; `alpha` counts the opacity itself.
+  template <class Number>
   struct Sum {
-    std::uint64_t red = 0, green = 0, blue = 0, alpha = 0;
+    Number red = 0, green = 0, blue = 0, alpha = 0;
+
+    template <class Other>
+    void add(const Sum<Other>& other, Number area) {
+      red += area * other.red;
+      green += area * other.green;
+      blue += area * other.blue;
+      alpha += area * other.alpha;
+    }
   };
   /// Where one axis of the source lands.
-  struct Axis {
-    std::uint64_t source;
-    std::uint64_t target;
-    std::uint32_t offset;  ///< of the picture in the square
+  class Axis {
+   public:
+    /// A target pixel that a source pixel touches; the overlaps with one target pixel add up to the
+    /// source's length.
+    struct Part {
+      std::uint32_t target;
+      std::uint32_t overlap;
+    };
 
-    /// Calls `add(target, overlap)` for each target pixel that a source pixel touches; the overlaps
-    /// with one target pixel add up to `source`.
-    template <class Add>
-    void spread(std::uint64_t sourcePixel, Add add) const {
-      const std::uint64_t begin = sourcePixel * target, end = begin + target;
-      for (std::uint64_t at = begin; at < end;) {
-        const std::uint64_t pixel = at / source;
-        const std::uint64_t stop = std::min(end, (pixel + 1) * source);
-        add(static_cast<std::size_t>(pixel), stop - at);
-        at = stop;
-      }
+    Axis(std::uint32_t source, std::uint32_t target, std::uint32_t side);
+
+    std::span<const Part> partsOf(std::uint32_t sourcePixel) const {
+      return std::span(parts_).subspan(begins_[sourcePixel],
+                                       begins_[sourcePixel + 1] - begins_[sourcePixel]);
     }
+
+    const std::uint64_t source, target;
+    const std::uint32_t offset;  ///< of the picture in the square
+
+   private:
+    // Worked out once: for each pixel of a picture it would cost more than the rest.
+    std::vector<Part> parts_;
+    std::vector<std::uint32_t> begins_;  ///< where each source pixel's parts begin
   };
 
   std::uint32_t side_;
   Axis columns_, rows_;
-  std::vector<Sum> rowSums_;  ///< one row of the fitted picture
-  std::vector<Sum> sums_;     ///< the fitted picture
+  /// One row of the fitted picture. Areas add up to the source's width: no more than 8192 * 255 *
+  /// 255.
+  std::vector<Sum<std::uint32_t>> rowSums_;
+  std::vector<Sum<std::uint64_t>> sums_;  ///< the fitted picture
 };
 
 }  // namespace appsync

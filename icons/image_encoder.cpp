@@ -33,12 +33,18 @@ bool isComplete(const Image& image) {
 }
 
 /// Leaves by longjmp on failure, so nothing here needs destruction.
-bool write(png_structp png, png_infop info, const Image& image, Bytes& buffer) {
+bool write(png_structp png, png_infop info, const Image& image,
+           PngEncoderService::Compression compression, Bytes& buffer) {
   if (setjmp(png_jmpbuf(png))) return false;
   png_set_write_fn(png, &buffer, appendBytes, flushNothing);
   png_set_user_limits(png, MaximumSide, MaximumSide);
   png_set_IHDR(png, info, image.width, image.height, 8, PNG_COLOR_TYPE_RGB_ALPHA,
                PNG_INTERLACE_NONE, PNG_COMPRESSION_TYPE_DEFAULT, PNG_FILTER_TYPE_DEFAULT);
+  if (compression == PngEncoderService::Compression::Quick) {
+    // Of all levels and filters the least time for photos and for flat pictures alike.
+    png_set_compression_level(png, 1);
+    png_set_filter(png, PNG_FILTER_TYPE_BASE, PNG_FILTER_UP);
+  }
   png_write_info(png, info);
   const auto* pixels = reinterpret_cast<png_const_bytep>(image.pixels.data());
   for (std::size_t row = 0; row < image.height; ++row)
@@ -49,7 +55,8 @@ bool write(png_structp png, png_infop info, const Image& image, Bytes& buffer) {
 
 class PngEncoder final : public ImageEncoder {
  public:
-  explicit PngEncoder(Bytes& buffer) : buffer_(buffer) {}
+  PngEncoder(Bytes& buffer, PngEncoderService::Compression compression)
+      : buffer_(buffer), compression_(compression) {}
 
   void addImage(const Image& image) noexcept override {
     image_ = &image;
@@ -63,7 +70,7 @@ class PngEncoder final : public ImageEncoder {
         png_create_write_struct(PNG_LIBPNG_VER_STRING, nullptr, jumpOnPngError, ignorePngWarning);
     png_infop info = png ? png_create_info_struct(png) : nullptr;
     const std::size_t before = buffer_.size();
-    const bool written = info && write(png, info, *image_, buffer_);
+    const bool written = info && write(png, info, *image_, compression_, buffer_);
     png_destroy_write_struct(&png, &info);
     if (!written) buffer_.resize(before);
     return written;
@@ -71,6 +78,7 @@ class PngEncoder final : public ImageEncoder {
 
  private:
   Bytes& buffer_;
+  const PngEncoderService::Compression compression_;
   const Image* image_ = nullptr;
   std::size_t count_ = 0;
   bool finalized_ = false;
@@ -81,7 +89,7 @@ class PngEncoder final : public ImageEncoder {
 std::unique_ptr<ImageEncoder> PngEncoderService::create(Bytes& buffer, std::string_view type,
                                                         std::size_t imageCount) noexcept {
   if (type != "public.png" || imageCount != 1) return nullptr;
-  return std::unique_ptr<ImageEncoder>(new (std::nothrow) PngEncoder(buffer));
+  return std::unique_ptr<ImageEncoder>(new (std::nothrow) PngEncoder(buffer, compression_));
 }
 
 }  // namespace appsync

@@ -13,9 +13,11 @@ Image gradient(std::uint32_t width, std::uint32_t height) {
   return image;
 }
 
-std::optional<Bytes> encoded(const Image& image) {
+using Compression = PngEncoderService::Compression;
+
+std::optional<Bytes> encoded(const Image& image, Compression compression = Compression::Small) {
   Bytes buffer;
-  const auto encoder = PngEncoderService().create(buffer, "public.png", 1);
+  const auto encoder = PngEncoderService(compression).create(buffer, "public.png", 1);
   encoder->addImage(image);
   if (!encoder->finalize()) return std::nullopt;
   return buffer;
@@ -44,6 +46,14 @@ TEST(PngEncoder, WritesEveryPixelAsItIs) {
     EXPECT_EQ(back.height, height);
     EXPECT_EQ(back.pixels, image.pixels);
   }
+}
+
+TEST(PngEncoder, WritesTheSamePixelsQuicklyInOtherBytes) {
+  const Image image = gradient(180, 180);
+  const auto quick = encoded(image, Compression::Quick);
+  ASSERT_TRUE(quick);
+  EXPECT_EQ(decoded(*quick).pixels, image.pixels);
+  EXPECT_NE(quick, encoded(image));
 }
 
 TEST(PngEncoder, AppendsToTheBuffer) {
