@@ -38,7 +38,7 @@ MAY_INCLUDE = {folder: PLUGIN | {"platform"} for folder in PLUGIN} | {
 }
 ORDER = {
     "device": "files state journal home services apps coordination".split(),
-    "host": "library report phone home_screen transfer sync backup restore cli".split(),
+    "host": "library report phone home_screen drawing transfer sync backup restore cli".split(),
 }
 # A phone is a folder only to the commands; all else sees it through phone/.
 DOOR = "device/embedded_device.h"

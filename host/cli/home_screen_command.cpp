@@ -11,7 +11,7 @@
 #include "base/text.h"
 #include "host/cli/cli.h"
 #include "host/home_screen/home_screen_icons.h"
-#include "host/home_screen/home_screen_picture.h"
+#include "host/home_screen/home_screen_module.h"
 #include "icons/image_encoder.h"
 
 namespace appsync::host {
@@ -83,7 +83,7 @@ ExitCode runHomeScreen(const HomeScreenOptions& options, CommandContext& context
   for (std::size_t i = first; i < end; ++i) {
     if (auto icon = source.iconOf(order[i])) icons.push_back(std::move(*icon));
   }
-  writeFile(fs::absolute(options.output), encode(drawHomeScreen(view, icons)));
+  writeFile(fs::absolute(options.output), encode(drawHomeScreenByModule(view, icons)));
   context.say({{"event", "home-screen"},
                {"file", options.output},
                {"pages", view.pagesShown},

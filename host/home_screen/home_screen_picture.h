@@ -29,24 +29,25 @@ struct ScreenIcon {
 inline constexpr std::size_t IconsPerPage = 24;
 
 /// The pages that so many icons need; one even for none.
-std::size_t pagesFor(std::size_t iconCount);
+inline std::size_t pagesFor(std::size_t iconCount) {
+  return iconCount == 0 ? 1 : (iconCount + IconsPerPage - 1) / IconsPerPage;
+}
 
 /// The part of a home screen that a picture shows.
 struct ScreenView {
   /// The most pages that one picture holds.
   static constexpr std::size_t MaximumPages = 96;
+  /// As many are drawn with two pixels for a point.
+  static constexpr std::size_t LargePages = 24;
+  static constexpr std::uint32_t IconPoints = 60;
 
   std::size_t pageCount = 1;  ///< of the whole home screen
   std::size_t firstPage = 0;
   std::size_t pagesShown = 1;
 
-  /// Pixels on each side of an icon; many pages are drawn smaller.
-  std::uint32_t iconSide() const;
+  std::uint32_t pixelsPerPoint() const { return pagesShown <= LargePages ? 2 : 1; }
+  /// Pixels on each side of an icon.
+  std::uint32_t iconSide() const { return IconPoints * pixelsPerPoint(); }
 };
-
-/// Draws these pages side by side, and in several rows if there are many. `icons` are those of the
-/// pages shown, in order. The same icons always give the same picture. Throws std::runtime_error
-/// when it cannot be drawn.
-Image drawHomeScreen(const ScreenView& view, const std::vector<ScreenIcon>& icons);
 
 }  // namespace appsync::host

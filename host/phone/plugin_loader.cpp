@@ -7,6 +7,7 @@
 #include <iterator>
 #include <system_error>
 
+#include "base/program_parts.h"
 #include "base/text.h"
 #include "platform/bundle.h"
 #include "platform/plugin.h"
@@ -131,16 +132,11 @@ std::shared_ptr<SyncClient> Plugin::createClient(const Platform& platform) {
 
 std::optional<fs::path> findPlugin(const fs::path& given, std::string& problem) {
   if (!given.empty()) return given;
-  std::error_code error;
-  const fs::path program = fs::read_symlink("/proc/self/exe", error);
-  const fs::path folder = program.parent_path();
-  const fs::path installed = folder.parent_path() / "lib" / "appsync";
-  for (const fs::path& place : {folder, installed}) {
-    if (fs::is_directory(place / PluginBundleName, error)) return place / PluginBundleName;
-  }
+  if (auto found = findProgramPart(PluginBundleName)) return found;
+  const std::vector<fs::path> folders = programPartFolders();
   problem =
       fmt::format("there is no {} in {} or {}; say where it is with --plugin or APPSYNC_PLUGIN",
-                  PluginBundleName, printable(folder.string()), printable(installed.string()));
+                  PluginBundleName, printable(folders[0].string()), printable(folders[1].string()));
   return std::nullopt;
 }
 

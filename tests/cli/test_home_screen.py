@@ -2,6 +2,7 @@
 
 import fcntl
 import json
+import shutil
 import signal
 import struct
 import zlib
@@ -207,6 +208,12 @@ class HomeScreen(support.Case):
         self.assertIn("--page", message("-o", self.picture, "--page", "0", code=2))
         self.environment["APPSYNC_DEVICE"] = str(self.folder / "nowhere")
         self.assertIn("there is no phone", message("-o", self.picture, code=3))
+        self.assertFalse(self.picture.exists())
+
+    def test_without_its_drawing_part_it_says_so(self):
+        command = shutil.copy(support.APPSYNC, self.folder)
+        _, err = self.run_appsync("home-screen", "-o", self.picture, executable=command, code=1)
+        self.assertIn("there is no HomeScreen.so beside appsync", err)
         self.assertFalse(self.picture.exists())
 
 

@@ -1,5 +1,3 @@
-#include "host/home_screen/home_screen_picture.h"
-
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -8,6 +6,8 @@
 #include <limits>
 #include <map>
 #include <set>
+
+#include "host/drawing/home_screen_drawing.h"
 
 namespace appsync::host {
 namespace {

@@ -1,4 +1,4 @@
-#include "host/home_screen/home_screen_surface.h"
+#include "host/drawing/home_screen_surface.h"
 
 #include <algorithm>
 #include <stdexcept>

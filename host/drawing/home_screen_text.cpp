@@ -1,4 +1,4 @@
-#include "host/home_screen/home_screen_text.h"
+#include "host/drawing/home_screen_text.h"
 
 #include <fontconfig/fontconfig.h>
 #include <pango/pangocairo.h>
@@ -10,7 +10,7 @@
 #include <vector>
 
 #include "base/text.h"
-#include "host/home_screen/home_screen_surface.h"
+#include "host/drawing/home_screen_surface.h"
 
 namespace appsync::host {
 namespace {

@@ -1,12 +1,12 @@
-#include "host/home_screen/home_screen_picture.h"
+#include "host/drawing/home_screen_drawing.h"
 
 #include <algorithm>
 #include <memory>
 #include <numbers>
 #include <stdexcept>
 
-#include "host/home_screen/home_screen_surface.h"
-#include "host/home_screen/home_screen_text.h"
+#include "host/drawing/home_screen_surface.h"
+#include "host/drawing/home_screen_text.h"
 
 namespace appsync::host {
 namespace {
@@ -15,12 +15,11 @@ namespace {
 constexpr std::size_t Columns = 4;
 constexpr double PageWidth = 376, PageHeight = 668, PageGap = 16, PageCorner = 30;
 constexpr double FirstIconLeft = 29, FirstIconTop = 34, CellWidth = 86, CellHeight = 97;
-constexpr double IconSide = 60, IconCorner = 0.225 * IconSide;
+constexpr double IconSide = ScreenView::IconPoints, IconCorner = 0.225 * IconSide;
 constexpr double NameBaseline = IconSide + 17, DotsTop = PageHeight - 22;
 constexpr HomeScreenText::Style NameStyle{12, 79};
 
 constexpr std::size_t PagesPerRow = 8;
-constexpr std::size_t LargePages = 24;  ///< as many are drawn with two pixels for a point
 constexpr std::size_t MaximumDots = 24;
 
 constexpr double Pi = std::numbers::pi;
@@ -35,8 +34,6 @@ constexpr Colour TileTop{0.62, 0.66, 0.74}, TileBottom{0.44, 0.48, 0.57};
 
 using Drawing = std::unique_ptr<cairo_t, Releaser<cairo_destroy>>;
 using Pattern = std::unique_ptr<cairo_pattern_t, Releaser<cairo_pattern_destroy>>;
-
-double pixelsPerPoint(const ScreenView& view) { return view.pagesShown <= LargePages ? 2 : 1; }
 
 bool isUsable(const std::optional<Image>& image) {
   return image && image->width > 0 && image->height > 0 &&
@@ -243,16 +240,8 @@ class Painter {
 
 }  // namespace
 
-std::size_t pagesFor(std::size_t iconCount) {
-  return std::max<std::size_t>(1, (iconCount + IconsPerPage - 1) / IconsPerPage);
-}
-
-std::uint32_t ScreenView::iconSide() const {
-  return static_cast<std::uint32_t>(IconSide * pixelsPerPoint(*this));
-}
-
 Image drawHomeScreen(const ScreenView& view, const std::vector<ScreenIcon>& icons) {
-  const double scale = pixelsPerPoint(view);
+  const double scale = view.pixelsPerPoint();
   const auto pixels = [scale](std::size_t count, double length) {
     return static_cast<std::uint32_t>(scale * (double(count) * (length + PageGap) - PageGap));
   };
