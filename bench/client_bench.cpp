@@ -15,6 +15,7 @@ void changeAssetID(benchmark::State& state) {
   phone.putTodoList(entries, false);
   const std::string identifier = identifierOf(entries - 1);
   const MemoryMeter memory;
+  phone.client().changeAssetID(identifier, "INSTALLED");  // the first one checks the list
   bool sent = false;
   for (auto _ : state) {
     sent = !sent;
@@ -42,6 +43,7 @@ void readOperation(benchmark::State& state) {
   phone.putTodoList(entries, false);
   const std::string identifier = identifierOf(entries / 2);
   const MemoryMeter memory;
+  phone.client()._operationStateForIdentifier(identifier);  // the first one checks the list
   for (auto _ : state) {
     if (phone.client()._operationStateForIdentifier(identifier) != "install")
       return state.SkipWithError("no operation");

@@ -13,7 +13,7 @@ import sys
 from bench_report import duration, floor_of, is_floor, read
 
 WIDTH, HEIGHT = 480, 300
-LEFT, RIGHT, TOP, BOTTOM = 64, 16, 32, 40
+LEFT, RIGHT, TOP, BOTTOM = 64, 32, 32, 40
 OURS, FLOOR, GRID, TEXT = "#1f6feb", "#8b949e", "#d0d7de", "#57606a"
 
 

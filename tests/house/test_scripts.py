@@ -151,7 +151,7 @@ class BenchPlots(unittest.TestCase):
         paths = [node.get("d") for node in xml.etree.ElementTree.fromstring(plots["change.svg"]).iter()
                  if node.get("stroke-width") == "2"]
         # From 10 us to 10 ms up, from 10 to 1,000 across: each line rises by two decades of three.
-        self.assertEqual(paths, ["M64.0 237.1L264.0 161.1L464.0 85.1", "M64.0 260.0L264.0 184.0L464.0 108.0"])
+        self.assertEqual(paths, ["M64.0 237.1L256.0 161.1L448.0 85.1", "M64.0 260.0L256.0 184.0L448.0 108.0"])
 
 
 class CoverageTable(unittest.TestCase):
