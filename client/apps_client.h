@@ -210,7 +210,8 @@ class AppsClient final : public SyncClient, public AppRegistryObserver, public C
   void _changeTodoList(std::span<TodoChange* const> changes) APPSYNC_EXCLUDES(_stateFileMutex);
   /// Makes a change in `_todoFile`, which is read first unless it is `unsaved`. True when it holds
   /// something unsaved then.
-  bool _changeTodoFile(const TodoChange& change, bool unsaved) APPSYNC_REQUIRES(_stateFileMutex);
+  [[nodiscard]] bool _changeTodoFile(const TodoChange& change, bool unsaved)
+      APPSYNC_REQUIRES(_stateFileMutex);
   /// Makes and writes a change of a list of any form.
   void _changeParsed(const Bytes& list, const TodoChange& change) APPSYNC_REQUIRES(_stateFileMutex);
   void _performDeletions(const PropertyList::Array& todoList);

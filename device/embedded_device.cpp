@@ -249,7 +249,7 @@ class FolderDevice final : public EmbeddedDevice {
     const auto effect = effectOfCancelling(core_, std::string(bundleId), &error);
     if (!effect || (effect == Cancelling::Forgetting && !mayRemove(core_, &error))) return error;
     if (coordination_ && coordination_->cancelInstall(bundleId)) {
-      // The install is over; what cannot be tidied up after it is in the log.
+      // What cannot be undone stays asked for, or waits; the log tells.
       std::ignore = registry_.change(bundleId, undoAsking, nullptr);
       std::ignore = registry_.change(bundleId, forgetWaitingData, nullptr);
       return std::nullopt;

@@ -3,7 +3,6 @@
 #include <fmt/format.h>
 
 #include <cerrno>
-#include <tuple>
 
 #include "base/identifiers.h"
 #include "device/apps/installs.h"

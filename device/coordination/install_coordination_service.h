@@ -95,7 +95,7 @@ class DeviceInstallCoordination final : public InstallCoordination {
                 CoordinationClientId client, Consequences& consequences);
   /// Enters a promise or a placeholder.
   template <typename Row>
-  bool enter(Row& row);
+  [[nodiscard]] bool enter(Row& row);
 
   // In the order in which they need one another.
   DeviceCore& device_;

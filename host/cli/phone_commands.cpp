@@ -99,7 +99,7 @@ void setPolicy(device::EmbeddedDevice& device, PolicySetting setting, const std:
   if (wish.empty()) return;
   const PolicyValue value = wish == "allow" ? PolicyValue::Yes : PolicyValue::ExplicitlyNo;
   std::optional<Error> error;
-  if (!device.setPolicy(setting, value, &error)) fail("set", "the policy", *error);
+  if (!device.setPolicy(setting, value, &error)) fail("set", "the policy", error);
 }
 
 ExitCode runPolicy(const PolicyOptions& options, CommandContext& context) {

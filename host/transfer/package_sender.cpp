@@ -1,6 +1,7 @@
 #include "host/transfer/package_sender.h"
 
 #include <cerrno>
+#include <tuple>
 
 namespace appsync::host {
 namespace {
@@ -81,7 +82,9 @@ void PackageSender::settle() {
 }
 
 void PackageSender::removeSentPackages() {
-  for (const auto& arrived : arrived_) phone_.files.removeItem(arrived.second.target);
+  for (const auto& arrived : arrived_) {
+    std::ignore = phone_.files.removeItem(arrived.second.target);  // else the next sync does
+  }
 }
 
 }  // namespace appsync::host
