@@ -24,6 +24,10 @@ CREATE TABLE IF NOT EXISTS install_coordinators (
 );
 CREATE UNIQUE INDEX IF NOT EXISTS install_coordinators_live
   ON install_coordinators (identifier) WHERE stage IN (0, 1);
+-- Who uses a promise is asked with each of its changes.
+CREATE INDEX IF NOT EXISTS install_coordinators_package ON install_coordinators (package_promise);
+CREATE INDEX IF NOT EXISTS install_coordinators_data ON install_coordinators (user_data_promise);
+CREATE INDEX IF NOT EXISTS install_coordinators_placeholder ON install_coordinators (placeholder);
 
 CREATE TABLE IF NOT EXISTS data_promises (
   number INTEGER PRIMARY KEY AUTOINCREMENT,
@@ -53,6 +57,7 @@ CREATE TABLE IF NOT EXISTS install_placeholders (
   presence INTEGER NOT NULL,
   over INTEGER NOT NULL
 );
+CREATE INDEX IF NOT EXISTS install_placeholders_icon ON install_placeholders (icon_promise);
 
 -- What is still to be told to somebody.
 CREATE TABLE IF NOT EXISTS coordinator_events (
@@ -143,7 +148,8 @@ std::vector<CoordinatorRow> coordinatorsUsingPromise(Connection& database, std::
                " FROM install_coordinators c "
                "WHERE c.stage IN (0, 1) AND (c.package_promise = ?1 OR c.user_data_promise = ?1 "
                "OR c.placeholder IN "
-               "(SELECT number FROM install_placeholders WHERE icon_promise = ?1))",
+               "(SELECT number FROM install_placeholders WHERE icon_promise = ?1)) "
+               "ORDER BY c.number",
                promise)
       .all(coordinatorIn);
 }
