@@ -19,10 +19,10 @@ inline constexpr std::string_view IconScratch = "/var/mobile/Library/Application
 
 // Files of a container and of a bundle, as an asset names them.
 inline std::string metadataIn(std::string_view container) {
-  return std::string(container).append("/").append(exchange::MetadataName);
+  return std::string(container) + "/HalvoMetadata.plist";
 }
 inline std::string artworkIn(std::string_view container) {
-  return std::string(container).append("/").append(exchange::ArtworkName);
+  return std::string(container) + "/HalvoArtwork";
 }
 inline std::string infoIn(std::string_view bundle) { return std::string(bundle) + "/Info.plist"; }
 
