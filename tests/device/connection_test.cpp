@@ -1,6 +1,7 @@
 #include "device/state/connection.h"
 
 #include <gtest/gtest.h>
+#include <sqlite3.h>
 
 #include "device/state/database.h"
 #include "tests/fakes/temporary_folder.h"
@@ -51,12 +52,18 @@ TEST_F(ConnectionTest, AStatementThatWasNotRunToItsEndHoldsNoTransactionOpen) {
 }
 
 TEST_F(ConnectionTest, KeepsNothingWhenItIsTold) {
-  const char* const text = "SELECT 1";
-  auto statement = connection_.prepare(text);
+  int prepared = 0;
+  const auto count = [](void* counter, int action, const char*, const char*, const char*,
+                        const char*) {
+    if (action == SQLITE_SELECT) ++*static_cast<int*>(counter);
+    return SQLITE_OK;
+  };
+  sqlite3_set_authorizer(connection_.getHandle(), count, &prepared);
+  for (int round = 0; round < 3; ++round) numbers(0);
+  EXPECT_EQ(prepared, 1);
   connection_.keepNothing();
-  connection_.giveBack(std::move(statement));
-  EXPECT_EQ(statement, nullptr);
-  EXPECT_EQ(numbers(0), std::vector<std::string>{});
+  for (int round = 0; round < 3; ++round) numbers(0);
+  EXPECT_EQ(prepared, 4);
 }
 
 }  // namespace
